@@ -1,0 +1,146 @@
+// Blocks of a cached file: peeking by copy, reading, writing, and the refill quantum.
+
+#include "flvdmx/fio/fio.h"
+#include "flvdmx/fio/tables.h"
+
+#include <algorithm>
+#include <cstring>
+
+namespace {
+
+// Elements of no size, or more bytes than 32 bits can count, are not moved.
+bool FLVD_FioIsBlock(uint32_t size, uint32_t count)
+{
+    return size != 0 && uint64_t{size} * count <= UINT32_MAX;
+}
+
+uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    return std::min(g_flvd_fioFuncs.file_read(destination, 1, n, file->handle), n);
+}
+
+// Moves n cached bytes to the destination and consumes them.
+void FLVD_FioTake(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    if (n != 0)
+        g_flvd_fioFuncs.mem_copy(destination, file->cache + file->head, n);
+    FLVD_FioConsume(file, n);
+}
+
+// Reads up to n bytes with one refill of the empty cache by its quantum. Returns what was missing.
+uint32_t FLVD_FioReadThroughCache(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    file->count = FLVD_FioHostRead(file, file->cache, file->read_size);
+    const uint32_t taken = std::min(n, file->count);
+    FLVD_FioTake(file, destination, taken);
+    return n - taken;
+}
+
+// Overread: whole quanta go straight to the destination, the rest through the cache. Returns what was missing.
+uint32_t FLVD_FioReadOver(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    while (n > file->read_size) {
+        const uint32_t got = FLVD_FioHostRead(file, destination, file->read_size);
+        destination += got;
+        n -= got;
+        if (got < file->read_size || got == 0)
+            break;
+    }
+    return FLVD_FioReadThroughCache(file, destination, n);
+}
+
+// Reads n bytes, nothing being cached. Returns what was missing.
+uint32_t FLVD_FioReadUncached(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    if (n < file->read_size)
+        return FLVD_FioReadThroughCache(file, destination, n);
+    if (file->overread != 0)
+        return FLVD_FioReadOver(file, destination, n);
+    return n - FLVD_FioHostRead(file, destination, n);
+}
+
+void FLVD_FioPutPending(fio_file_t* file, const void* source, uint32_t n)
+{
+    if (file->head != 0) {
+        std::memmove(file->cache, file->cache + file->head, file->count);
+        file->head = 0;
+    }
+    if (n != 0)
+        g_flvd_fioFuncs.mem_copy(file->cache + file->count, source, n);
+    file->count += n;
+}
+
+uint32_t FLVD_FioHostWrite(fio_file_t* file, const void* source, uint32_t n)
+{
+    return std::min(g_flvd_fioFuncs.file_write(source, 1, n, file->handle), n);
+}
+
+} // namespace
+
+uint32_t __FLV_DMX__fioShowBytesByCopy(void* destination, uint32_t n, fio_file_t* file)
+{
+    const uint32_t available = FLVD_FioRefill(file, n);
+    if (available != 0)
+        g_flvd_fioFuncs.mem_copy(destination, file->cache + file->head, available);
+    return available;
+}
+
+uint32_t __FLV_DMX__fioRead(void* destination, uint32_t size, uint32_t count, fio_file_t* file)
+{
+    if (!FLVD_FioIsBlock(size, count))
+        return 0;
+    const uint32_t total = size * count;
+    if (file->state == FIO_STATE_WRITE)
+        __FLV_DMX__fioFlush(file);
+    file->state = FIO_STATE_READ;
+    FLVD_FioDropBits(file);
+    auto* const bytes = static_cast<uint8_t*>(destination);
+    if (total < file->count) {
+        FLVD_FioTake(file, bytes, total);
+        return count;
+    }
+    const uint32_t cached = file->count;
+    FLVD_FioTake(file, bytes, cached);
+    const uint32_t missing = FLVD_FioReadUncached(file, bytes + cached, total - cached);
+    return (total - missing) / size;
+}
+
+uint32_t __FLV_DMX__fioWrite(const void* source, uint32_t size, uint32_t count, fio_file_t* file)
+{
+    if (!FLVD_FioIsBlock(size, count))
+        return 0;
+    const uint32_t total = size * count;
+    if (file->state == FIO_STATE_READ)
+        __FLV_DMX__fioFlush(file);
+    file->state = FIO_STATE_WRITE;
+    FLVD_FioDropBits(file);
+    if (uint64_t{file->count} + total < file->capacity) {
+        FLVD_FioPutPending(file, source, total);
+        return count;
+    }
+    if (file->count != 0) {
+        const uint32_t written = FLVD_FioHostWrite(file, file->cache + file->head, file->count);
+        const bool all = written == file->count;
+        FLVD_FioConsume(file, written);
+        if (!all)
+            return 0;
+    }
+    if (total < file->capacity) {
+        FLVD_FioPutPending(file, source, total);
+        return count;
+    }
+    return FLVD_FioHostWrite(file, source, total) / size;
+}
+
+int32_t __FLV_DMX__fioSetCacheReadSize(fio_file_t* file, uint32_t size)
+{
+    if (size > file->capacity)
+        return 0;
+    file->read_size = size == FLVD_WHOLE_CACHE ? file->capacity : size;
+    return 1;
+}
+
+uint32_t __FLV_DMX__fioGetCacheReadSize(fio_file_t* file)
+{
+    return file->read_size;
+}

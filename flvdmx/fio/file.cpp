@@ -1,0 +1,236 @@
+// The cached file: opening, closing, positions, the refill rule, peeking and consuming.
+//
+// While reading, the host's position is `count` bytes ahead of the logical one (read-ahead), while writing it is
+// `count` bytes behind (pending bytes). head + count never exceeds the bytes allocated for the cache.
+
+#include "flvdmx/fio/fio.h"
+#include "flvdmx/fio/tables.h"
+
+#include <algorithm>
+#include <cstring>
+#include <iterator>
+
+namespace {
+
+constexpr uint32_t FIO_ACCESS_MASK = 0x71;
+constexpr uint32_t FIO_FORMAT_MASK = 0x300;
+constexpr uint32_t FIO_SKIP_FAILED = 0xFFFFFFFF;
+constexpr size_t FIO_MODE_TEXT_MAX = 4; // "r+b" and its NUL
+
+struct fio_access_t {
+    uint32_t flags;
+    char text[3];
+};
+
+constexpr fio_access_t g_flvd_fioAccess[] = {
+    {FIO_MODE_READ, "r"},
+    {FIO_MODE_WRITE, "w"},
+    {FIO_MODE_WRITE | FIO_MODE_TRUNCATE, "w"},
+    {FIO_MODE_READ | FIO_MODE_WRITE, "r+"},
+    {FIO_MODE_READ | FIO_MODE_WRITE | FIO_MODE_TRUNCATE, "w+"},
+    {FIO_MODE_APPEND, "a"},
+    {FIO_MODE_READ | FIO_MODE_APPEND, "a+"},
+};
+
+// Writes the mode string of fopen. False for a combination that it has no string for.
+bool FLVD_FioModeText(uint32_t mode, char (&text)[FIO_MODE_TEXT_MAX])
+{
+    const auto* const access = std::find_if(std::begin(g_flvd_fioAccess), std::end(g_flvd_fioAccess),
+                                            [mode](const auto& a) { return a.flags == (mode & FIO_ACCESS_MASK); });
+    const uint32_t format = mode & FIO_FORMAT_MASK;
+    if (access == std::end(g_flvd_fioAccess) || format == FIO_FORMAT_MASK)
+        return false;
+    char* end = text;
+    for (const char* c = access->text; *c != '\0'; ++c)
+        *end++ = *c;
+    if (format != 0)
+        *end++ = format == FIO_MODE_TEXT ? 't' : 'b';
+    *end = '\0';
+    return true;
+}
+
+// The object and its cache around an open handle, or null; nothing stays allocated then.
+fio_file_t* FLVD_FioCreate(void* handle, uint32_t cache_size, uint32_t extra)
+{
+    auto* const file = static_cast<fio_file_t*>(g_flvd_fioFuncs.mem_alloc(sizeof(fio_file_t)));
+    if (file == nullptr)
+        return nullptr;
+    *file = fio_file_t{};
+    if (extra <= UINT32_MAX - cache_size)
+        file->cache = static_cast<uint8_t*>(g_flvd_fioFuncs.mem_alloc(cache_size + extra));
+    if (file->cache == nullptr) {
+        g_flvd_fioFuncs.mem_free(file);
+        return nullptr;
+    }
+    file->handle = handle;
+    file->state = FIO_STATE_IDLE;
+    file->read_size = cache_size;
+    file->capacity = cache_size;
+    file->overread_extra = extra;
+    return file;
+}
+
+// Logical position from the host's. A failed query stays negative whatever is pending.
+int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
+{
+    const uint64_t count = file->count;
+    const uint64_t moved = static_cast<uint64_t>(host) + (file->state == FIO_STATE_READ ? 0 - count : count);
+    const auto position = static_cast<int64_t>(moved);
+    return host < 0 && position >= 0 ? host : position;
+}
+
+enum class FioWidth { Bits32, Bits64 };
+
+int32_t FLVD_FioHostSeek(const fio_file_t* file, int64_t offset, int32_t whence, FioWidth width)
+{
+    if (width == FioWidth::Bits64 && g_flvd_fioFuncs.file_seek64 != nullptr)
+        return g_flvd_fioFuncs.file_seek64(file->handle, offset, whence);
+    const auto low = static_cast<uint32_t>(static_cast<uint64_t>(offset)); // all that the narrow function can take
+    return g_flvd_fioFuncs.file_seek(file->handle, static_cast<int32_t>(low), whence);
+}
+
+int32_t FLVD_FioSeekTo(fio_file_t* file, int64_t offset, int32_t whence, FioWidth width)
+{
+    if (file->state == FIO_STATE_WRITE)
+        __FLV_DMX__fioFlush(file);
+    FLVD_FioDropBits(file);
+    if (whence != FIO_SEEK_SET && whence != FIO_SEEK_CUR && whence != FIO_SEEK_END)
+        return -1;
+    if (whence == FIO_SEEK_CUR) {
+        if (offset >= 0 && static_cast<uint64_t>(offset) < file->count) {
+            FLVD_FioConsume(file, static_cast<uint32_t>(offset)); // below count, so it fits
+            return 0;
+        }
+        offset = static_cast<int64_t>(static_cast<uint64_t>(offset) - file->count); // the host is count bytes ahead
+    }
+    FLVD_FioEmpty(file);
+    return FLVD_FioHostSeek(file, offset, whence, width);
+}
+
+} // namespace
+
+fio_file_t* __FLV_DMX__fioOpen(const char* path, uint32_t mode, uint32_t cache_size, int32_t overread,
+                               uint32_t overread_extra)
+{
+    char text[FIO_MODE_TEXT_MAX];
+    if (!FLVD_FioModeText(mode, text))
+        return nullptr;
+    void* const handle = g_flvd_fioFuncs.file_open(path, text);
+    if (handle == nullptr)
+        return nullptr;
+    fio_file_t* const file = FLVD_FioCreate(handle, cache_size, overread != 0 ? overread_extra : 0);
+    if (file == nullptr) {
+        g_flvd_fioFuncs.file_close(handle);
+        return nullptr;
+    }
+    file->overread = overread;
+    return file;
+}
+
+int32_t __FLV_DMX__fioClose(fio_file_t* file)
+{
+    if (file == nullptr)
+        return 0;
+    if (file->state == FIO_STATE_WRITE)
+        __FLV_DMX__fioFlush(file);
+    void* const handle = file->handle;
+    if (file->cache != nullptr)
+        g_flvd_fioFuncs.mem_free(file->cache);
+    g_flvd_fioFuncs.mem_free(file);
+    return g_flvd_fioFuncs.file_close(handle);
+}
+
+int32_t __FLV_DMX__fioFlush(fio_file_t* file)
+{
+    FLVD_FioDropBits(file);
+    if (file->count != 0 && file->state == FIO_STATE_WRITE)
+        g_flvd_fioFuncs.file_write(file->cache + file->head, 1, file->count, file->handle);
+    FLVD_FioEmpty(file);
+    file->state = FIO_STATE_IDLE;
+    return g_flvd_fioFuncs.file_flush(file->handle);
+}
+
+int32_t __FLV_DMX__fioTell(fio_file_t* file)
+{
+    const int32_t host = g_flvd_fioFuncs.file_tell(file->handle);
+    const auto position = static_cast<int32_t>(static_cast<uint64_t>(FLVD_FioLogical(file, host)));
+    return host < 0 && position >= 0 ? host : position;
+}
+
+int64_t __FLV_DMX__fioTell64(fio_file_t* file)
+{
+    const int64_t host = g_flvd_fioFuncs.file_tell64 != nullptr ? g_flvd_fioFuncs.file_tell64(file->handle)
+                                                                : g_flvd_fioFuncs.file_tell(file->handle);
+    return FLVD_FioLogical(file, host);
+}
+
+int32_t __FLV_DMX__fioIsEof(fio_file_t* file)
+{
+    return file->count != 0 ? 0 : g_flvd_fioFuncs.file_eof(file->handle);
+}
+
+uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
+{
+    if (file->state == FIO_STATE_WRITE)
+        return 0;
+    file->state = FIO_STATE_READ;
+    const uint32_t allocated = file->capacity + file->overread_extra; // the sum was checked at open
+    n = std::min(n, allocated);
+    if (n <= file->count)
+        return n;
+    if (file->head != 0) {
+        std::memmove(file->cache, file->cache + file->head, file->count);
+        file->head = 0;
+    }
+    const uint32_t want = std::max(n, file->read_size);
+    const uint32_t ask = std::min(file->overread != 0 ? want : want - file->count, allocated - file->count);
+    const uint32_t got = g_flvd_fioFuncs.file_read(file->cache + file->count, 1, ask, file->handle);
+    file->count += std::min(got, ask); // a host that claims more than it was asked for causes no overrun
+    return std::min(file->count, n);
+}
+
+uint32_t __FLV_DMX__fioShowBytesByPtr(const uint8_t** bytes, uint32_t n, fio_file_t* file)
+{
+    if (file->state == FIO_STATE_WRITE)
+        return 0;
+    const uint32_t available = FLVD_FioRefill(file, n);
+    *bytes = file->cache + file->head;
+    return available;
+}
+
+uint32_t __FLV_DMX__fioSkipBytes(uint32_t n, fio_file_t* file)
+{
+    if (file->state == FIO_STATE_WRITE)
+        return FIO_SKIP_FAILED;
+    if (file->bit_skip_pending != 0)
+        file->bit_skip_pending = 0; // the bit reader moves itself: its bits stay those at the position
+    else
+        FLVD_FioDropBits(file);
+    if (n <= file->count) {
+        FLVD_FioConsume(file, n);
+        return n;
+    }
+    const uint32_t cached = file->count;
+    const uint32_t rest = n - cached;
+    FLVD_FioEmpty(file);
+    if (rest > INT32_MAX && g_flvd_fioFuncs.file_seek64 == nullptr)
+        return cached; // the narrow seek would take it as a way back
+    return FLVD_FioHostSeek(file, rest, FIO_SEEK_CUR, FioWidth::Bits64) == 0 ? n : cached;
+}
+
+int32_t __FLV_DMX__fioSeek(fio_file_t* file, int32_t offset, int32_t whence)
+{
+    return FLVD_FioSeekTo(file, offset, whence, FioWidth::Bits32);
+}
+
+int32_t __FLV_DMX__fioSeek64(fio_file_t* file, int64_t offset, int32_t whence)
+{
+    return FLVD_FioSeekTo(file, offset, whence, FioWidth::Bits64);
+}
+
+uint64_t __FLV_DMX__fiodbgReadBytes(void)
+{
+    return 0;
+}
+
+void __FLV_DMX__fiodbgReset(void) {}

@@ -1,0 +1,50 @@
+// Inside of the cached file layer, shared by its files, and the guard that its users narrow the refill quantum with.
+#ifndef FLVDMX_FIO_FIO_H
+#define FLVDMX_FIO_FIO_H
+
+#include "flvdmx/flvdmx.h"
+
+// Makes up to n bytes visible at cache + head with at most one host read; the logical position stays.
+// Returns how many are, or 0 in the writing state.
+uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
+
+// What every access but a peek does: the bit reader's bits are no longer those at the position.
+inline void FLVD_FioDropBits(fio_file_t* file)
+{
+    file->bits_left = 0;
+    file->bits = 0;
+}
+
+// Consumes n cached bytes, n being at most file->count.
+inline void FLVD_FioConsume(fio_file_t* file, uint32_t n)
+{
+    file->count -= n;
+    file->head = file->count == 0 ? 0 : file->head + n;
+}
+
+inline void FLVD_FioEmpty(fio_file_t* file)
+{
+    file->head = 0;
+    file->count = 0;
+}
+
+// Refill quantum for a while. `after` is part of each user's contract: the forward search puts back what it found,
+// the users that step through the file leave 0, the whole cache.
+class FLVD_ReadSizeGuard {
+public:
+    FLVD_ReadSizeGuard(fio_file_t* file, uint32_t during, uint32_t after) : m_file(file), m_after(after)
+    {
+        __FLV_DMX__fioSetCacheReadSize(m_file, during);
+    }
+    ~FLVD_ReadSizeGuard() { __FLV_DMX__fioSetCacheReadSize(m_file, m_after); }
+    FLVD_ReadSizeGuard(const FLVD_ReadSizeGuard&) = delete;
+    FLVD_ReadSizeGuard& operator=(const FLVD_ReadSizeGuard&) = delete;
+
+private:
+    fio_file_t* const m_file;
+    const uint32_t m_after;
+};
+
+constexpr uint32_t FLVD_WHOLE_CACHE = 0; // refill quantum: the capacity of the file's cache
+
+#endif

@@ -1,0 +1,119 @@
+// The file-backed bit reader. `bits` holds the next bits left-aligned and ends on a byte boundary; the file's byte
+// position is the first boundary at or behind the bit position, so bits_left / 8 whole bytes of `bits` lie behind it.
+//
+// A reader that another access has emptied (bits_left 0) goes on consuming the file's bytes and stays empty.
+
+#include "flvdmx/fio/bytes.h"
+#include "flvdmx/fio/fio.h"
+
+#include <algorithm>
+
+namespace {
+
+constexpr uint32_t FLVD_BIT_CACHE = 64;
+constexpr uint32_t FLVD_BIT_REFILL = 32; // refilled when no more than these are left, and by as many
+constexpr uint32_t FLVD_BIT_MAX = 32;    // the longest field
+
+void FLVD_BitConsumeBytes(fio_file_t* file, uint32_t n)
+{
+    file->bit_skip_pending = 1;
+    __FLV_DMX__fioSkipBytes(n, file);
+    file->bit_skip_pending = 0; // a skip that was refused leaves it set
+}
+
+void FLVD_BitRefill(fio_file_t* file)
+{
+    const auto left = static_cast<uint32_t>(file->bits_left);
+    const uint32_t held = left / 8; // whole bytes behind the position that are in `bits` already
+    const uint8_t* bytes = nullptr;
+    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, held + FLVD_BIT_REFILL / 8, file);
+    uint64_t word = 0;
+    for (uint32_t i = held; i < held + FLVD_BIT_REFILL / 8; ++i)
+        word = word << 8 | (i < available ? bytes[i] : 0u);
+    file->bits |= word << (FLVD_BIT_REFILL - left);
+    file->bits_left += static_cast<int32_t>(FLVD_BIT_REFILL);
+}
+
+// n is at most 32.
+void FLVD_BitConsume(fio_file_t* file, uint32_t n)
+{
+    const bool empty = file->bits_left == 0;
+    const auto partial = static_cast<uint32_t>(file->bits_left) % 8; // bits of a byte already consumed
+    if (!empty) {
+        file->bits <<= n;
+        file->bits_left -= static_cast<int32_t>(n);
+    }
+    if (n > partial)
+        FLVD_BitConsumeBytes(file, (n - partial + 7) / 8);
+    if (!empty && file->bits_left <= static_cast<int32_t>(FLVD_BIT_REFILL))
+        FLVD_BitRefill(file);
+}
+
+} // namespace
+
+int32_t __FLV_DMX__bitInit(fio_file_t* file)
+{
+    const uint8_t* bytes = nullptr;
+    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BIT_CACHE / 8, file);
+    uint64_t bits = 0;
+    for (uint32_t i = 0; i < FLVD_BIT_CACHE / 8; ++i)
+        bits = bits << 8 | (i < available ? bytes[i] : 0u);
+    file->bits = bits;
+    file->bits_left = static_cast<int32_t>(FLVD_BIT_CACHE);
+    return 1;
+}
+
+uint32_t __FLV_DMX__bitShowBit(fio_file_t* file)
+{
+    return __FLV_DMX__bitShowUBits(file, 1);
+}
+
+uint32_t __FLV_DMX__bitShowUBits(fio_file_t* file, uint32_t n)
+{
+    n = std::min(n, FLVD_BIT_MAX);
+    return n == 0 ? 0 : static_cast<uint32_t>(file->bits >> (FLVD_BIT_CACHE - n));
+}
+
+uint32_t __FLV_DMX__bitShowSBits(fio_file_t* file, uint32_t n)
+{
+    return __FLV_DMX__bitShowUBits(file, n);
+}
+
+void __FLV_DMX__bitSkipBits(fio_file_t* file, uint32_t n)
+{
+    __FLV_DMX__bitSkipBitsLong(file, n);
+}
+
+void __FLV_DMX__bitSkipBitsLong(fio_file_t* file, uint32_t n)
+{
+    if (n <= FLVD_BIT_MAX) {
+        FLVD_BitConsume(file, n);
+        return;
+    }
+    const uint32_t ahead = n - static_cast<uint32_t>(file->bits_left) % 8; // counted from the byte position
+    FLVD_BitConsumeBytes(file, ahead / 8);
+    __FLV_DMX__bitInit(file);
+    const uint32_t rest = ahead % 8;
+    if (rest == 0)
+        return;
+    file->bits <<= rest;
+    file->bits_left -= static_cast<int32_t>(rest);
+    FLVD_BitConsumeBytes(file, 1);
+}
+
+uint32_t __FLV_DMX__bitGetBit(fio_file_t* file)
+{
+    return __FLV_DMX__bitGetUBits(file, 1);
+}
+
+uint32_t __FLV_DMX__bitGetUBits(fio_file_t* file, uint32_t n)
+{
+    const uint32_t value = __FLV_DMX__bitShowUBits(file, n);
+    __FLV_DMX__bitSkipBits(file, n);
+    return value;
+}
+
+uint32_t __FLV_DMX__bitGetSBits(fio_file_t* file, uint32_t n)
+{
+    return __FLV_DMX__bitGetUBits(file, n);
+}
