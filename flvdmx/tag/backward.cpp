@@ -1,0 +1,114 @@
+// Backward navigation: the four bytes in front of a tag give the size of the tag before it. Where they do not lead to
+// a consistent tag the cursor slides back byte by byte until some four bytes do.
+//
+// The seeks are not checked on the way: a failed one shows as a failed peek or test at the next step.
+
+#include "flvdmx/tag/tag.h"
+
+#include "flvdmx/fio/bytes.h"
+#include "flvdmx/fio/fio.h"
+
+namespace {
+
+// The four bytes at the position as a back-pointer in front of cursor `c`, or 0 when they cannot be one.
+int32_t FLVD_PeekBackPointer(fio_file_t* file, int64_t cursor)
+{
+    const uint8_t* bytes = nullptr;
+    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
+        return 0;
+    const auto value = static_cast<int32_t>(FLVD_GetBE32(bytes));
+    return value > 0 && value < cursor ? value : 0;
+}
+
+// A candidate's size is bounded by the back-pointer that led to it, so the end of the valid data is not asked.
+bool FLVD_IsPreviousTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header, int32_t back_pointer)
+{
+    return header.info.data_size + FLVD_TAG_HEADER_SIZE == static_cast<uint32_t>(back_pointer) &&
+           FLVD_IsStreamTag(rules, header);
+}
+
+uint32_t FLVD_BackwardKind(const flvd_tag_header_t& header, uint32_t wanted)
+{
+    if (header.IsVideo()) {
+        if ((wanted & FLVD_TAG_KEYFRAME) != 0)
+            return FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME;
+        const bool config = (wanted & FLVD_TAG_CONFIG) != 0 && header.IsAvc();
+        return config ? FLVD_TAG_VIDEO | FLVD_TAG_CONFIG : FLVD_TAG_VIDEO;
+    }
+    if (header.IsAudio()) {
+        const bool config = (wanted & FLVD_TAG_CONFIG) != 0 && header.IsAac();
+        return config ? FLVD_TAG_AUDIO | FLVD_TAG_CONFIG : FLVD_TAG_AUDIO;
+    }
+    return FLVD_TAG_SCRIPT;
+}
+
+enum class FlvdStepBack { Found, Unwanted, Inconsistent, ShortData };
+
+// Follows the back-pointer at the cursor. Found and Unwanted leave the reader on the start of the tag before it.
+FlvdStepBack FLVD_StepBack(fio_file_t* file, const flvd_tag_rules_t& rules, int64_t cursor, uint32_t wanted,
+                           flvd_tag_header_t* header)
+{
+    const int32_t back_pointer = FLVD_PeekBackPointer(file, cursor);
+    if (back_pointer == 0)
+        return FlvdStepBack::Inconsistent;
+    __FLV_DMX__fioSeek64(file, -int64_t{back_pointer}, FIO_SEEK_CUR);
+    if (!FLVD_PeekTagHeader(file, header))
+        return FlvdStepBack::ShortData;
+    if (!FLVD_IsPreviousTag(rules, *header, back_pointer))
+        return FlvdStepBack::Inconsistent;
+    return FLVD_IsWantedTag(*header, wanted) ? FlvdStepBack::Found : FlvdStepBack::Unwanted;
+}
+
+// Finds the wanted tag before the back-pointer at `cursor`, on which the reader stands.
+int32_t FLVD_SearchBack(fio_file_t* file, const flvd_ctx_t* ctx, int64_t cursor, uint32_t wanted,
+                        flvd_tag_header_t* header)
+{
+    const flvd_tag_rules_t rules = FLVD_TagRules(ctx);
+    int32_t budget = FLVD_RESYNC_WINDOW;
+    while (cursor > ctx->data_offset) {
+        switch (FLVD_StepBack(file, rules, cursor, wanted, header)) {
+        case FlvdStepBack::Found:
+            return 0;
+        case FlvdStepBack::ShortData:
+            return FLVD_ERR_END_OF_DATA;
+        case FlvdStepBack::Unwanted: {
+            __FLV_DMX__fioSeek64(file, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_CUR);
+            const int64_t before = __FLV_DMX__fioTell64(file);
+            if (before < 0 || before >= cursor) // a host whose seeks fail would go round for ever
+                return FLVD_ERR_NOT_FOUND;
+            cursor = before;
+            budget = FLVD_RESYNC_WINDOW;
+            break;
+        }
+        case FlvdStepBack::Inconsistent:
+            --cursor;
+            __FLV_DMX__fioSeek64(file, cursor, FIO_SEEK_SET);
+            if (--budget <= 0)
+                return cursor > ctx->data_offset ? FLVD_ERR_NOT_FOUND : FLVD_ERR_AT_FIRST_TAG;
+            break;
+        }
+    }
+    return FLVD_ERR_AT_FIRST_TAG;
+}
+
+} // namespace
+
+int32_t FLVD_MoveToPrevTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, uint32_t* kind)
+{
+    if (kind != nullptr)
+        *kind = 0;
+    const int64_t position = __FLV_DMX__fioTell64(file);
+    if (position < 0)
+        return FLVD_ERR_NOT_FOUND;
+    if (position <= ctx->data_offset)
+        return FLVD_ERR_AT_FIRST_TAG;
+    __FLV_DMX__fioSeek64(file, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_CUR);
+    flvd_tag_header_t header;
+    const int32_t result = FLVD_SearchBack(file, ctx, position - FLVD_BACK_POINTER_SIZE, wanted, &header);
+    if (result != 0)
+        return result;
+    *info = header.info;
+    if (kind != nullptr)
+        *kind = FLVD_BackwardKind(header, wanted);
+    return 0;
+}

@@ -1,0 +1,358 @@
+// How far the valid data reaches and which timestamp its last tags carry. The file size is not taken as the end of
+// the tag chain: bytes that belong to no tag may follow the last one, and a download may have been cut short.
+
+#include "flvdmx/tag/tag.h"
+
+#include "flvdmx/fio/bytes.h"
+#include "flvdmx/fio/fio.h"
+#include "flvdmx/sites.h"
+
+#include <algorithm>
+
+namespace {
+
+constexpr uint32_t FLVD_TAIL_CURSORS_QUICK = 16;
+constexpr uint32_t FLVD_TAIL_CURSORS = 256;
+constexpr uint32_t FLVD_SCAN_CURSORS = FLVD_RESYNC_WINDOW;
+constexpr int64_t FLVD_BISECTION_END = FLVD_RESYNC_WINDOW;
+constexpr uint32_t FLVD_WALK_TAGS = 10;
+
+// Results of the last-tag search beside a position.
+constexpr int64_t FLVD_NO_LAST_TAG = 0; // none found, or a seek failed
+constexpr int64_t FLVD_NO_POSITION = -1;
+
+enum class FlvdProbe { Found, Nothing, SeekFailed };
+
+// Back-pointer probe: do the four bytes at the cursor, where the reader stands, lead back to a header of that size?
+// The tag's type is not asked.
+FlvdProbe FLVD_ProbeBackPointer(fio_file_t* file, uint32_t max_timestamp, int64_t cursor)
+{
+    const uint8_t* bytes = nullptr;
+    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
+        return FlvdProbe::Nothing;
+    const auto back = static_cast<int32_t>(FLVD_GetBE32(bytes));
+    if (back <= 0 || back >= cursor)
+        return FlvdProbe::Nothing;
+    if (__FLV_DMX__fioSeek64(file, -int64_t{back}, FIO_SEEK_CUR) != 0)
+        return FlvdProbe::SeekFailed;
+    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_HEADER_SIZE, file) < FLVD_TAG_HEADER_SIZE)
+        return FlvdProbe::Nothing;
+    const uint32_t data_size = FLVD_GetBE24(bytes + 1);
+    const bool agrees = data_size + FLVD_TAG_HEADER_SIZE == static_cast<uint32_t>(back);
+    return agrees && FLVD_TagTimestamp(bytes) <= max_timestamp ? FlvdProbe::Found : FlvdProbe::Nothing;
+}
+
+// Tries so many cursors, from `cursor` downwards. The end of the tag found; FLVD_NO_LAST_TAG with *failed telling a
+// failed seek from cursors that led nowhere.
+int64_t FLVD_ProbeCursors(const flvd_ctx_t* ctx, int64_t cursor, uint32_t cursors, bool* failed)
+{
+    fio_file_t* const file = ctx->cur_reader;
+    const uint32_t max_timestamp = FLVD_TagRules(ctx).max_timestamp;
+    *failed = false;
+    for (; cursors != 0; --cursors, --cursor) {
+        const FlvdProbe probe = FLVD_ProbeBackPointer(file, max_timestamp, cursor);
+        if (probe == FlvdProbe::Found)
+            return cursor + FLVD_BACK_POINTER_SIZE;
+        if (probe == FlvdProbe::SeekFailed || __FLV_DMX__fioSeek64(file, cursor - 1, FIO_SEEK_SET) != 0) {
+            *failed = true;
+            return FLVD_NO_LAST_TAG;
+        }
+    }
+    return FLVD_NO_LAST_TAG;
+}
+
+// Halves the file until the end of its valid data lies within the last MiB before the result. -1: a seek failed.
+int64_t FLVD_Bisect(flvd_ctx_t* ctx)
+{
+    fio_file_t* const file = ctx->cur_reader;
+    int64_t low = 0;
+    int64_t high = ctx->file_size;
+    while (high - low > FLVD_BISECTION_END) {
+        const int64_t probe = low + (high - low) / 2;
+        if (__FLV_DMX__fioSeek64(file, probe, FIO_SEEK_SET) != 0)
+            return -1;
+        flvd_tag_info_t tag;
+        const int32_t distance = FLVD_FindNextTag(ctx, file, FLVD_RESYNC_WINDOW);
+        if (distance >= 0 && FLVD_GetCurrTagInfo(ctx, file, &tag, FLVD_TAG_MEDIA, 1) == 0)
+            low = probe + distance;
+        else
+            high = probe;
+    }
+    return high;
+}
+
+// Keyframe index.
+
+bool FLVD_IsIndexUsable(const flvd_ctx_t* ctx)
+{
+    const flvd_keyframe_index_t& index = ctx->keyframe_index;
+    return index.times_offset != 0 && index.positions_offset != 0 && index.times_offset < ctx->file_size &&
+           index.positions_offset < ctx->file_size && index.entry_count > 1;
+}
+
+bool FLVD_IsIndexInMemory(const flvd_ctx_t* ctx)
+{
+    return ctx->keyframe_arrays.times_ms != nullptr && ctx->keyframe_arrays.positions != nullptr;
+}
+
+enum class FlvdElement { Number, NotANumber, ShortData };
+
+// Reads one element of an AMF0 strict array in the file.
+FlvdElement FLVD_ReadElement(fio_file_t* file, double* value)
+{
+    const uint8_t* bytes = nullptr;
+    if (__FLV_DMX__fioShowBytesByPtr(&bytes, 1 + FLVD_AMF_NUMBER_SIZE, file) < 1 + FLVD_AMF_NUMBER_SIZE)
+        return FlvdElement::ShortData;
+    const uint8_t marker = bytes[0];
+    const double number = FLVD_GetDouble(bytes + 1);
+    __FLV_DMX__fioSkipBytes(1, file);
+    if (marker != FLVD_AMF_NUMBER)
+        return FlvdElement::NotANumber;
+    __FLV_DMX__fioSkipBytes(FLVD_AMF_NUMBER_SIZE, file);
+    *value = number;
+    return FlvdElement::Number;
+}
+
+// The keyframe positions in order, from memory or from the file.
+struct flvd_positions_t {
+    flvd_ctx_t* ctx;
+    uint32_t available;
+    uint32_t read;
+};
+
+flvd_positions_t FLVD_Positions(flvd_ctx_t* ctx)
+{
+    const bool memory = FLVD_IsIndexInMemory(ctx);
+    return {ctx, memory ? ctx->keyframe_arrays.positions_count : ctx->keyframe_index.entry_count, 0};
+}
+
+FlvdElement FLVD_NextPosition(flvd_positions_t* positions, int64_t* value)
+{
+    if (FLVD_IsIndexInMemory(positions->ctx)) {
+        *value = positions->ctx->keyframe_arrays.positions[positions->read++];
+        return FlvdElement::Number;
+    }
+    double number = 0.0;
+    const FlvdElement element = FLVD_ReadElement(positions->ctx->cur_reader, &number);
+    if (element == FlvdElement::Number) {
+        ++positions->read;
+        *value = FLVD_DoubleToI64(number);
+    }
+    return element;
+}
+
+// Reads positions up to and including the first that is not below `limit`. `last_inside` gets the last one read
+// before that. False when the array runs out of data.
+bool FLVD_ReadPositions(flvd_positions_t* positions, int64_t limit, int64_t* last_inside)
+{
+    *last_inside = 0;
+    while (positions->read < positions->available) {
+        int64_t value = 0;
+        const FlvdElement element = FLVD_NextPosition(positions, &value);
+        if (element != FlvdElement::Number)
+            return element != FlvdElement::ShortData;
+        if (value >= limit)
+            return true;
+        *last_inside = value;
+    }
+    return true;
+}
+
+// End of the tag at the position, its PreviousTagSize included; negative when the position cannot be told.
+int64_t FLVD_TagEnd(fio_file_t* file, const flvd_tag_info_t& tag)
+{
+    const int64_t start = __FLV_DMX__fioTell64(file);
+    return start < 0 ? start : start + tag.data_size + FLVD_TAG_FRAME_SIZE;
+}
+
+// From the tag found at the last keyframe inside the file, walks forward to the end of the last tag.
+int32_t FLVD_WalkToEnd(flvd_ctx_t* ctx, int64_t* end)
+{
+    flvd_tag_info_t tag;
+    while (FLVD_MoveToNextTag(ctx, ctx->cur_reader, &tag, FLVD_TAG_ANY, nullptr) == 0) {
+        *end = FLVD_TagEnd(ctx->cur_reader, tag);
+        if (*end < 0)
+            return FLVD_Fail(ctx, FLVD_SITE_INDEX_FORWARD_POSITION);
+    }
+    return 0;
+}
+
+int32_t FLVD_LastTagEnd(flvd_ctx_t* ctx, flvd_site_t site, int64_t* end)
+{
+    *end = FLVD_FindLastTagEnd(ctx, false);
+    return *end < 0 ? FLVD_Fail(ctx, site) : 0;
+}
+
+// No tag follows the last keyframe inside the file: the end of the nearest one before it.
+int32_t FLVD_StepBackToEnd(flvd_ctx_t* ctx, int64_t last, int64_t* end)
+{
+    fio_file_t* const file = ctx->cur_reader;
+    if (__FLV_DMX__fioSeek64(file, last, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, FLVD_SITE_INDEX_BACK_SEEK);
+    const FLVD_ReadSizeGuard narrow(file, FLVD_NARROW_READ, FLVD_WHOLE_CACHE);
+    flvd_tag_info_t tag;
+    if (FLVD_MoveToPrevTag(ctx, file, &tag, FLVD_TAG_ANY, nullptr) != 0)
+        return FLVD_LastTagEnd(ctx, FLVD_SITE_INDEX_LAST_TAG, end);
+    *end = FLVD_TagEnd(file, tag);
+    return *end < 0 ? FLVD_Fail(ctx, FLVD_SITE_INDEX_BACK_POSITION) : 0;
+}
+
+// The end of the valid data of a file with a keyframe index.
+int32_t FLVD_IndexedEnd(flvd_ctx_t* ctx, int64_t* end)
+{
+    fio_file_t* const file = ctx->cur_reader;
+    const bool memory = FLVD_IsIndexInMemory(ctx);
+    if (!memory && __FLV_DMX__fioSeek64(file, ctx->keyframe_index.positions_offset, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, FLVD_SITE_INDEX_FILE_SEEK);
+    flvd_positions_t positions = FLVD_Positions(ctx);
+    int64_t last = 0;
+    if (!FLVD_ReadPositions(&positions, ctx->file_size, &last))
+        return -1;
+    if (positions.read == positions.available)
+        return FLVD_LastTagEnd(ctx, FLVD_SITE_INDEX_LAST_TAG, end);
+    // The file is shorter than its index says.
+    if (__FLV_DMX__fioSeek64(file, last, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, memory ? FLVD_SITE_INDEX_MEMORY_SEEK : FLVD_SITE_INDEX_FILE_SEEK);
+    flvd_tag_info_t tag;
+    if (FLVD_GetCurrTagInfo(ctx, file, &tag, FLVD_TAG_ANY, 1) != 0)
+        return FLVD_StepBackToEnd(ctx, last, end);
+    *end = last;
+    return FLVD_WalkToEnd(ctx, end);
+}
+
+// Cuts the entries behind the end of the valid data off. The entry that crosses it stays.
+int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end)
+{
+    flvd_keyframe_index_t& index = ctx->keyframe_index;
+    if (end == ctx->file_size)
+        return 0;
+    const bool memory = FLVD_IsIndexInMemory(ctx);
+    if (!memory && __FLV_DMX__fioSeek64(ctx->cur_reader, index.positions_offset, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, FLVD_SITE_TRIM_POSITIONS_SEEK);
+    flvd_positions_t positions = FLVD_Positions(ctx);
+    int64_t last = 0;
+    if (end >= 1 && !FLVD_ReadPositions(&positions, end, &last))
+        return -1;
+    index.entry_count = std::min(index.entry_count, positions.read); // "times" may be the shorter array
+    return 0;
+}
+
+// Time of the last entry kept.
+int32_t FLVD_ReadLastKeyTime(flvd_ctx_t* ctx, uint32_t* time)
+{
+    const uint32_t count = ctx->keyframe_index.entry_count;
+    *time = 0;
+    if (FLVD_IsIndexInMemory(ctx)) {
+        const uint32_t usable = std::min(count, ctx->keyframe_arrays.times_count);
+        if (usable != 0)
+            *time = ctx->keyframe_arrays.times_ms[usable - 1];
+        return 0;
+    }
+    if (count == 0)
+        return 0;
+    if (__FLV_DMX__fioSeek64(ctx->cur_reader, ctx->keyframe_index.times_offset, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, FLVD_SITE_TRIM_TIMES_SEEK);
+    double seconds = 0.0;
+    for (uint32_t i = 0; i < count; ++i) {
+        const FlvdElement element = FLVD_ReadElement(ctx->cur_reader, &seconds);
+        if (element == FlvdElement::ShortData)
+            return -1;
+        if (element == FlvdElement::NotANumber)
+            break;
+    }
+    *time = FLVD_SecondsToMs(seconds);
+    return 0;
+}
+
+int32_t FLVD_TrimIndex(flvd_ctx_t* ctx, int64_t end)
+{
+    if (FLVD_TrimEntries(ctx, end) != 0)
+        return -1;
+    uint32_t time = 0;
+    if (FLVD_ReadLastKeyTime(ctx, &time) != 0)
+        return -1;
+    ctx->last_keyframe_ms = time;
+    ctx->video_info.last_key_time_ms = time;
+    return 0;
+}
+
+// Backward walk: the largest timestamp of the last tags, until each stream was met.
+int32_t FLVD_WalkBack(flvd_ctx_t* ctx, int64_t end, flvd_site_t seek_site, flvd_site_t step_site)
+{
+    fio_file_t* const file = ctx->main_reader;
+    if (__FLV_DMX__fioSeek64(file, end, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, seek_site);
+    const FLVD_ReadSizeGuard narrow(file, FLVD_NARROW_READ, FLVD_WHOLE_CACHE);
+    uint32_t largest = 0;
+    uint32_t met = 0;
+    for (uint32_t taken = 0; taken < FLVD_WALK_TAGS && (met & ctx->streams) != ctx->streams; ++taken) {
+        flvd_tag_info_t tag;
+        if (FLVD_MoveToPrevTag(ctx, file, &tag, FLVD_TAG_MEDIA, nullptr) != 0)
+            return FLVD_Fail(ctx, step_site);
+        met |= tag.type == FLVD_TAG_TYPE_VIDEO ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
+        largest = std::max(largest, tag.timestamp);
+    }
+    ctx->last_ts = largest;
+    ctx->data_end = end;
+    return 0;
+}
+
+int32_t FLVD_ProbeExtentQuick(flvd_ctx_t* ctx)
+{
+    const int64_t end = FLVD_FindLastTagEnd(ctx, true);
+    if (end < 0)
+        return FLVD_Fail(ctx, FLVD_SITE_QUICK_LAST_TAG);
+    if (end == FLVD_NO_LAST_TAG || ctx->last_ts != 0) {
+        ctx->data_end = ctx->file_size;
+        return 0;
+    }
+    return FLVD_WalkBack(ctx, end, FLVD_SITE_QUICK_WALK_SEEK, FLVD_SITE_QUICK_WALK_STEP);
+}
+
+// The end of the valid data and the seek method, the index being trimmed to it.
+int32_t FLVD_FindEnd(flvd_ctx_t* ctx, int64_t* end)
+{
+    if (!FLVD_IsIndexUsable(ctx)) {
+        ctx->seek_method = ctx->keyframe_index.entry_count == 1 ? FLVD_SEEK_NONE : FLVD_SEEK_BY_SCAN;
+        return FLVD_LastTagEnd(ctx, FLVD_SITE_LAST_TAG, end);
+    }
+    ctx->seek_method = FLVD_SEEK_BY_INDEX;
+    const int32_t result = FLVD_IndexedEnd(ctx, end);
+    return result != 0 ? result : FLVD_TrimIndex(ctx, *end);
+}
+
+} // namespace
+
+int64_t FLVD_FindLastTagEnd(flvd_ctx_t* ctx, bool quick)
+{
+    fio_file_t* const file = ctx->cur_reader;
+    const FLVD_ReadSizeGuard narrow(file, FLVD_NARROW_READ, FLVD_WHOLE_CACHE);
+    if (__FLV_DMX__fioSeek64(file, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_END) != 0)
+        return FLVD_NO_LAST_TAG;
+    const int64_t tail = __FLV_DMX__fioTell64(file);
+    if (tail < 0)
+        return FLVD_NO_POSITION;
+    bool failed = false;
+    const int64_t end = FLVD_ProbeCursors(ctx, tail, quick ? FLVD_TAIL_CURSORS_QUICK : FLVD_TAIL_CURSORS, &failed);
+    if (end != FLVD_NO_LAST_TAG || failed || quick)
+        return end;
+    const int64_t start = FLVD_Bisect(ctx);
+    if (start < 0 || __FLV_DMX__fioSeek64(file, start, FIO_SEEK_SET) != 0)
+        return FLVD_NO_LAST_TAG;
+    const int64_t cursor = __FLV_DMX__fioTell64(file);
+    return cursor < 0 ? FLVD_NO_POSITION : FLVD_ProbeCursors(ctx, cursor, FLVD_SCAN_CURSORS, &failed);
+}
+
+int32_t FLVD_ProbeExtent(flvd_ctx_t* ctx, bool quick)
+{
+    if (quick)
+        return FLVD_ProbeExtentQuick(ctx);
+    int64_t end = 0;
+    if (FLVD_FindEnd(ctx, &end) != 0)
+        return -1;
+    if (end == FLVD_NO_LAST_TAG)
+        return FLVD_Fail(ctx, FLVD_SITE_NO_TAG);
+    if (ctx->first_ts == 0 && ctx->last_ts != 0 && end == ctx->file_size)
+        return 0;
+    return FLVD_WalkBack(ctx, end, FLVD_SITE_WALK_SEEK, FLVD_SITE_WALK_STEP);
+}

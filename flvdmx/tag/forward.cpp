@@ -1,0 +1,300 @@
+// Forward navigation: describing the tag at the position, resynchronising after damage, stepping to the next tag.
+
+#include "flvdmx/tag/tag.h"
+
+#include "flvdmx/fio/fio.h"
+
+#include <algorithm>
+
+namespace {
+
+// A plausible header whose back-pointer disagrees costs this much of the budget beside the distance: without it a
+// file made of such headers would cost two seeks and two reads for each of its bytes.
+constexpr int32_t FLVD_BAD_TAG_COST = 64;
+
+// Results inside a search, beside those of the navigation functions.
+constexpr int32_t FLVD_SEARCH_ON = 1;    // go on behind this tag
+constexpr int32_t FLVD_BUDGET_SPENT = 2; // no tag within the budget
+
+// One search for a tag, from one position query to its result.
+struct flvd_search_t {
+    flvd_ctx_t* ctx;
+    fio_file_t* file;
+    flvd_tag_rules_t rules;
+    uint32_t wanted;
+    bool verify;      // careful: back-pointers count, and positions are taken
+    int32_t budget;   // bytes that resynchronisation may still cross
+    int64_t position; // the last position taken
+    bool data_ended;  // the last resynchronisation ran out of data, not out of budget
+};
+
+flvd_search_t FLVD_Search(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted, bool verify, int64_t position)
+{
+    return {ctx, file, FLVD_TagRules(ctx), wanted, verify, FLVD_RESYNC_WINDOW, position, false};
+}
+
+// Index of the first candidate among the starts of a window, or `starts` when there is none.
+uint32_t FLVD_FindCandidate(const uint8_t* window, uint32_t starts, const flvd_tag_rules_t& rules)
+{
+    for (uint32_t i = 0; i < starts; ++i) {
+        const uint8_t type = window[i];
+        if (type != FLVD_TAG_TYPE_AUDIO && type != FLVD_TAG_TYPE_VIDEO && type != FLVD_TAG_TYPE_SCRIPT)
+            continue;
+        if (FLVD_IsPlausibleTag(rules, FLVD_ReadTagHeader(window + i)))
+            return i;
+    }
+    return starts;
+}
+
+// FLVD_FindNextTag, telling a spent limit (FLVD_ERR_NOT_FOUND) from the end of the data (FLVD_ERR_END_OF_DATA).
+int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
+{
+    const FLVD_ReadSizeGuard whole(file, FLVD_WHOLE_CACHE, __FLV_DMX__fioGetCacheReadSize(file));
+    if (limit == 0)
+        return FLVD_ERR_NOT_FOUND;
+    flvd_tag_rules_t rules = FLVD_TagRules(ctx);
+    --rules.max_timestamp; // here alone the ceiling itself is out of reach; it is never 0
+    int64_t scanned = 0;
+    do {
+        const uint8_t* window = nullptr;
+        const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&window, ctx->cache_size, file);
+        if (available < FLVD_TAG_PEEK_SIZE)
+            return FLVD_ERR_END_OF_DATA;
+        const uint32_t starts = available - (FLVD_TAG_PEEK_SIZE - 1); // the last 12 bytes begin the next window
+        const uint32_t found = FLVD_FindCandidate(window, starts, rules);
+        __FLV_DMX__fioSkipBytes(found, file);
+        scanned += found;
+        if (found < starts)
+            return scanned;
+    } while (scanned < limit);
+    return FLVD_ERR_NOT_FOUND;
+}
+
+// Charges a search its distance, or what a failed one costs.
+void FLVD_ChargeScan(flvd_search_t* search, int64_t distance, int32_t failed_cost)
+{
+    search->data_ended = distance == FLVD_ERR_END_OF_DATA;
+    search->budget -= distance < 0 ? failed_cost : static_cast<int32_t>(std::min<int64_t>(distance, INT32_MAX));
+}
+
+// Resynchronisation step: from the byte behind the position to the next candidate. A failed one ends the search.
+void FLVD_Resynchronise(flvd_search_t* search)
+{
+    __FLV_DMX__fioSkipBytes(1, search->file);
+    const int64_t distance = FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW);
+    FLVD_ChargeScan(search, distance, search->budget);
+}
+
+// Takes the position. False when the host cannot tell it.
+bool FLVD_TakePosition(flvd_search_t* search)
+{
+    search->position = __FLV_DMX__fioTell64(search->file);
+    return search->position >= 0;
+}
+
+// Peeks the back-pointer behind so many bytes, moving behind them.
+bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
+{
+    __FLV_DMX__fioSkipBytes(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
+    const uint32_t quantum = __FLV_DMX__fioGetCacheReadSize(file);
+    const FLVD_ReadSizeGuard narrow(file, std::min(quantum, FLVD_NARROW_READ), quantum);
+    const uint8_t* bytes = nullptr;
+    return __FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
+           FLVD_IsBackPointer(bytes, tag.data_size);
+}
+
+enum class FlvdCheck { Failed, PassedInPlace, PassedBehind, FailedInPlace };
+
+// Back-pointer check of the tag at the position. A tag that fits the cache is looked at in place and nothing moves;
+// otherwise the reader stands behind the tag's data afterwards.
+FlvdCheck FLVD_CheckBackPointer(flvd_search_t* search, const flvd_tag_info_t& tag)
+{
+    fio_file_t* const file = search->file;
+    // Many muxers write a wrong size behind the first script tag, which they fill in at the end.
+    const bool exempt = tag.type == FLVD_TAG_TYPE_SCRIPT && search->position <= search->rules.first_tag;
+    const uint32_t size = tag.data_size + FLVD_TAG_FRAME_SIZE;
+    if (size <= file->capacity && file->read_size == file->capacity) {
+        const uint8_t* bytes = nullptr;
+        if (__FLV_DMX__fioShowBytesByPtr(&bytes, size, file) == size) {
+            const bool passed = FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, tag.data_size);
+            return passed || exempt ? FlvdCheck::PassedInPlace : FlvdCheck::FailedInPlace;
+        }
+    }
+    const bool passed = FLVD_CheckBehind(file, tag);
+    return passed || exempt ? FlvdCheck::PassedBehind : FlvdCheck::Failed;
+}
+
+// Behind a tag whose back-pointer disagrees: the search goes on one byte after the tag's start.
+bool FLVD_PassBadTag(flvd_search_t* search, FlvdCheck check)
+{
+    const int64_t next = search->position + 1;
+    if (check == FlvdCheck::FailedInPlace)
+        __FLV_DMX__fioSkipBytes(1, search->file);
+    else if (__FLV_DMX__fioSeek64(search->file, next, FIO_SEEK_SET) != 0)
+        return false; // no tag may be described where the reader does not stand
+    FLVD_ChargeScan(search, FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW), 0);
+    search->budget -= FLVD_BAD_TAG_COST;
+    search->position = next;
+    return true;
+}
+
+// Behind a sound tag: the next one, with the whole budget.
+bool FLVD_PassGoodTag(flvd_search_t* search, FlvdCheck check, const flvd_tag_info_t& tag)
+{
+    const bool in_place = check == FlvdCheck::PassedInPlace;
+    __FLV_DMX__fioSkipBytes(in_place ? tag.data_size + FLVD_TAG_FRAME_SIZE : FLVD_BACK_POINTER_SIZE, search->file);
+    search->budget = FLVD_RESYNC_WINDOW;
+    return FLVD_TakePosition(search);
+}
+
+// Steps over the tag at the position, whatever its kind, after its back-pointer check. False: -1.
+bool FLVD_StepOver(flvd_search_t* search, FlvdCheck check, const flvd_tag_info_t& tag)
+{
+    const bool passed = check == FlvdCheck::PassedInPlace || check == FlvdCheck::PassedBehind;
+    return passed ? FLVD_PassGoodTag(search, check, tag) : FLVD_PassBadTag(search, check);
+}
+
+// Careful mode: a plausible header at the position is taken when its back-pointer agrees and its kind is wanted.
+int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header)
+{
+    if (!FLVD_TakePosition(search))
+        return FLVD_ERR_NOT_FOUND;
+    const FlvdCheck check = FLVD_CheckBackPointer(search, header.info);
+    if (FLVD_IsWantedTag(header, search->wanted)) {
+        if (check == FlvdCheck::PassedInPlace)
+            return 0;
+        if (check == FlvdCheck::PassedBehind)
+            return __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0 ? 0 : FLVD_ERR_NOT_FOUND;
+    }
+    return FLVD_StepOver(search, check, header.info) ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
+}
+
+// Trusting mode: the header alone decides; an unwanted tag is passed by its size.
+int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& header)
+{
+    if (FLVD_IsWantedTag(header, search->wanted))
+        return 0;
+    const uint32_t size = header.info.data_size + FLVD_TAG_FRAME_SIZE;
+    const bool moved = header.IsAudio() ? __FLV_DMX__fioSkipBytes(size, search->file) == size
+                                        : __FLV_DMX__fioSeek64(search->file, size, FIO_SEEK_CUR) == 0;
+    return moved ? FLVD_SEARCH_ON : FLVD_ERR_END_OF_DATA;
+}
+
+// The search from the position on: 0 with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
+int32_t FLVD_SearchTag(flvd_search_t* search, flvd_tag_header_t* header)
+{
+    for (;;) {
+        if (__FLV_DMX__fioIsEof(search->file) != 0)
+            return FLVD_ERR_END_OF_DATA;
+        if (search->budget <= 0)
+            return FLVD_BUDGET_SPENT;
+        if (!FLVD_PeekTagHeader(search->file, header))
+            return FLVD_ERR_END_OF_DATA;
+        if (!FLVD_IsPlausibleTag(search->rules, *header)) {
+            FLVD_Resynchronise(search);
+            if (search->verify && !FLVD_TakePosition(search))
+                return FLVD_ERR_NOT_FOUND;
+            continue;
+        }
+        const int32_t result =
+            search->verify ? FLVD_TakeVerified(search, *header) : FLVD_TakePlausible(search, *header);
+        if (result != FLVD_SEARCH_ON)
+            return result;
+    }
+}
+
+uint32_t FLVD_VideoKind(const flvd_tag_header_t& header, uint32_t wanted)
+{
+    if ((wanted & FLVD_TAG_KEYFRAME) != 0)
+        return FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME;
+    if ((wanted & FLVD_TAG_CONFIG) != 0 && header.IsAvc())
+        return FLVD_TAG_VIDEO | FLVD_TAG_CONFIG;
+    uint32_t kind = FLVD_TAG_VIDEO;
+    if (header.IsKeyframe())
+        kind |= FLVD_TAG_KEYFRAME;
+    if (!header.IsAvc() || header.second == FLVD_PACKET_SEQUENCE_HEADER)
+        kind |= FLVD_TAG_CONFIG;
+    return kind;
+}
+
+uint32_t FLVD_AudioKind(const flvd_tag_header_t& header)
+{
+    const bool media = header.IsAac() && header.second != FLVD_PACKET_SEQUENCE_HEADER;
+    return media ? FLVD_TAG_AUDIO : FLVD_TAG_AUDIO | FLVD_TAG_CONFIG;
+}
+
+uint32_t FLVD_ForwardKind(const flvd_tag_header_t& header, uint32_t wanted)
+{
+    if (header.IsVideo())
+        return FLVD_VideoKind(header, wanted);
+    return header.IsAudio() ? FLVD_AudioKind(header) : uint32_t{FLVD_TAG_SCRIPT};
+}
+
+// Moves from the tag at the position to where the next search begins. 0, or the result to return.
+int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
+{
+    if (search->position == search->ctx->data_offset) { // PreviousTagSize0: the first tag itself comes next
+        __FLV_DMX__fioSkipBytes(FLVD_BACK_POINTER_SIZE, search->file);
+        return FLVD_TakePosition(search) ? 0 : FLVD_ERR_NOT_FOUND;
+    }
+    flvd_tag_header_t header;
+    if (!FLVD_PeekTagHeader(search->file, &header))
+        return FLVD_ERR_END_OF_DATA;
+    if (!FLVD_IsPlausibleTag(search->rules, header)) {
+        FLVD_Resynchronise(search);
+        return FLVD_TakePosition(search) ? 0 : FLVD_ERR_NOT_FOUND;
+    }
+    if (!FLVD_TakePosition(search))
+        return FLVD_ERR_NOT_FOUND;
+    const FlvdCheck check = FLVD_CheckBackPointer(search, header.info);
+    return FLVD_StepOver(search, check, header.info) ? 0 : FLVD_ERR_NOT_FOUND;
+}
+
+} // namespace
+
+int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
+{
+    const int64_t position = __FLV_DMX__fioTell64(file);
+    if (position < 0)
+        return FLVD_ERR_NOT_FOUND;
+    flvd_search_t search = FLVD_Search(ctx, file, wanted, verify != 0, position);
+    if (position == ctx->data_offset)
+        __FLV_DMX__fioSkipBytes(FLVD_BACK_POINTER_SIZE, file);
+    flvd_tag_header_t header;
+    const int32_t result = FLVD_SearchTag(&search, &header);
+    if (result == FLVD_BUDGET_SPENT)
+        return search.data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+    if (result == 0)
+        *info = header.info;
+    return result;
+}
+
+int32_t FLVD_FindNextTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
+{
+    const int64_t distance = FLVD_ScanForTag(ctx, file, limit);
+    return distance < 0 || distance > INT32_MAX ? FLVD_ERR_NOT_FOUND : static_cast<int32_t>(distance);
+}
+
+int32_t FLVD_MoveToNextTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, uint32_t* kind)
+{
+    if (kind != nullptr)
+        *kind = 0;
+    const int64_t position = __FLV_DMX__fioTell64(file);
+    if (position < 0)
+        return FLVD_ERR_NOT_FOUND;
+    flvd_search_t search = FLVD_Search(ctx, file, wanted, true, position);
+    flvd_tag_header_t header;
+    int32_t result = FLVD_LeaveCurrentTag(&search);
+    if (result == 0)
+        result = FLVD_SearchTag(&search, &header);
+    if (result == FLVD_BUDGET_SPENT) {
+        const bool ended = ctx->data_end - search.position < int64_t{FLVD_TAG_PEEK_SIZE};
+        return ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+    }
+    if (result != 0)
+        return result;
+    *info = header.info;
+    if (kind != nullptr)
+        *kind = FLVD_ForwardKind(header, wanted);
+    return 0;
+}

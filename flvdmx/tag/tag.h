@@ -1,0 +1,101 @@
+// Tag navigation: the tag header as read, and the rules that all navigation functions share. The chain of tags is
+// never trusted: a header counts when it is plausible for this file, and in the careful paths when the back-pointer
+// behind its data agrees with its size.
+//
+// File: header, PreviousTagSize0, then for each tag an 11-byte header, DataSize bytes, and PreviousTagSize, which
+// is DataSize + 11 in a sound file.
+#ifndef FLVDMX_TAG_TAG_H
+#define FLVDMX_TAG_TAG_H
+
+#include "flvdmx/flvdmx.h"
+
+constexpr uint32_t FLVD_TAG_HEADER_SIZE = 11;
+constexpr uint32_t FLVD_BACK_POINTER_SIZE = 4;
+constexpr uint32_t FLVD_TAG_FRAME_SIZE =
+    FLVD_TAG_HEADER_SIZE + FLVD_BACK_POINTER_SIZE;                // what a tag has around its data
+constexpr uint32_t FLVD_TAG_PEEK_SIZE = FLVD_TAG_HEADER_SIZE + 2; // header and two data bytes
+
+constexpr uint32_t FLVD_ANY_CODEC = 0xFFFF; // filter value: no tag of that kind has been probed
+
+constexpr uint32_t FLVD_CODEC_ID_AVC = 7;
+constexpr uint32_t FLVD_SOUND_FORMAT_AAC = 10;
+constexpr uint32_t FLVD_PACKET_SEQUENCE_HEADER = 0; // AVCPacketType, AACPacketType
+constexpr uint32_t FLVD_PACKET_END_OF_SEQUENCE = 2; // AVCPacketType
+
+// Resynchronisation covers so many bytes before it gives up.
+constexpr int32_t FLVD_RESYNC_WINDOW = 0x100000;
+
+constexpr uint32_t FLVD_TAG_MEDIA = FLVD_TAG_VIDEO | FLVD_TAG_AUDIO;
+constexpr uint32_t FLVD_TAG_ANY = FLVD_TAG_MEDIA | FLVD_TAG_SCRIPT;
+
+// Refill quantum of the byte-by-byte paths: each look after a seek reads this much and not a whole cache.
+constexpr uint32_t FLVD_NARROW_READ = 16;
+
+// A tag header, taken from 13 peeked bytes.
+struct flvd_tag_header_t {
+    flvd_tag_info_t info;
+    uint8_t first;  // first data byte: FrameType and CodecID, or SoundFormat, rate, size and type
+    uint8_t second; // second data byte: AVCPacketType or AACPacketType
+
+    uint32_t CodecId() const { return first & 0x0Fu; }
+    uint32_t SoundFormat() const { return first >> 4u; }
+    bool IsVideo() const { return info.type == FLVD_TAG_TYPE_VIDEO; }
+    bool IsAudio() const { return info.type == FLVD_TAG_TYPE_AUDIO; }
+    bool IsKeyframe() const // FrameType 1 keyframe, 4 generated keyframe
+    {
+        return (first >> 4u) == 1 || (first >> 4u) == 4;
+    }
+    bool IsAvc() const { return CodecId() == FLVD_CODEC_ID_AVC; }
+    bool IsAac() const { return SoundFormat() == FLVD_SOUND_FORMAT_AAC; }
+};
+
+// What this file's headers must agree with, read from the instance once a call.
+struct flvd_tag_rules_t {
+    int64_t data_end;       // DataSize must be below it
+    int64_t first_tag;      // start of the first tag
+    uint32_t max_timestamp; // a timestamp may not be above it
+    uint32_t video_filter;
+    uint32_t audio_filter;
+};
+
+flvd_tag_rules_t FLVD_TagRules(const flvd_ctx_t* ctx);
+
+// Timestamp of the tag header at `bytes`, 11 bytes long, TimestampExtended being the top byte.
+uint32_t FLVD_TagTimestamp(const uint8_t* bytes);
+
+// Reads the header from 13 bytes.
+flvd_tag_header_t FLVD_ReadTagHeader(const uint8_t* bytes);
+
+// Peeks a header at the position. False when fewer than 13 bytes are left.
+bool FLVD_PeekTagHeader(fio_file_t* file, flvd_tag_header_t* header);
+
+// Header test without the size: type, timestamp ceiling and stream filters.
+bool FLVD_IsStreamTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header);
+
+// Header test: plausible for this file.
+bool FLVD_IsPlausibleTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header);
+
+// Wanted-kind filter.
+bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted);
+
+// True when the four bytes of a back-pointer belong to a tag of so much data.
+bool FLVD_IsBackPointer(const uint8_t* bytes, uint32_t data_size);
+
+// Passes the four bytes behind a tag's data when they are its back-pointer; anything else stays, for the next search
+// to cross. A back-pointer left standing could be taken for a tag: its low byte may be 8, 9 or 18.
+// False when fewer than 4 bytes are there.
+bool FLVD_PassBackPointer(fio_file_t* file, uint32_t data_size);
+
+// Puts a reader in front of the first tag, on PreviousTagSize0. Returns the host's seek result.
+int32_t FLVD_SeekToFirstTag(const flvd_ctx_t* ctx, fio_file_t* file);
+
+// End of the last tag whose back-pointer and header agree (its PreviousTagSize included); 0 when there is none or a
+// seek failed, -1 when a position query failed. `quick` looks at the last few bytes only. The position is left
+// anywhere.
+int64_t FLVD_FindLastTagEnd(flvd_ctx_t* ctx, bool quick);
+
+// Finds the end of the valid data, the last timestamp and the seek method, and trims the keyframe index.
+// 0, or -1 with error and error_line set (unless an index read from the file ends early: no line then).
+int32_t FLVD_ProbeExtent(flvd_ctx_t* ctx, bool quick);
+
+#endif
