@@ -1,0 +1,584 @@
+// Script data: parses AMF0 values (Adobe "Action Message Format, AMF 0") and takes sixteen known properties, at any
+// depth and whatever the script object is called, into the instance and its stream descriptions.
+//
+// Sizes are claims of the file: a value may not begin behind the payload, containers nest to a bound, and every loop
+// consumes at least a byte a turn.
+
+#include "flvdmx/fio/bytes.h"
+#include "flvdmx/flvdmx.h"
+
+#include <cstring>
+#include <iterator>
+
+namespace {
+
+constexpr uint32_t FLVD_META_CONTAINERS_MAX = 64;
+constexpr uint32_t FLVD_META_SIZE_MAX = 0x7FFFFFFF; // results are signed
+constexpr uint32_t FLVD_META_SCRATCH = 256;         // a key or text of up to 255 bytes and a NUL
+constexpr uint32_t FLVD_META_SCRATCH_TEXT = FLVD_META_SCRATCH - 1;
+constexpr uint32_t FLVD_META_DATE_SIZE = 10; // double and time zone
+constexpr uint32_t FLVD_META_END_SIZE = 3;   // 00 00 09
+constexpr uint32_t FLVD_META_END = 0x000009;
+constexpr uint32_t FLVD_META_ARRAY_HEADER = 5; // type marker and count
+
+// Flags of a parse.
+constexpr uint32_t FLVD_META_IN_KEYFRAMES = 0x10;
+constexpr uint32_t FLVD_META_TIMES_SEEN = 0x20;
+constexpr uint32_t FLVD_META_POSITIONS_SEEN = 0x40;
+constexpr uint32_t FLVD_META_INDEX_SEEN = FLVD_META_IN_KEYFRAMES | FLVD_META_TIMES_SEEN | FLVD_META_POSITIONS_SEEN;
+
+enum : uint32_t {
+    FLVD_AMF_BOOLEAN = 1,
+    FLVD_AMF_STRING = 2,
+    FLVD_AMF_OBJECT = 3,
+    FLVD_AMF_MOVIE_CLIP = 4,
+    FLVD_AMF_REFERENCE = 7,
+    FLVD_AMF_ECMA_ARRAY = 8,
+    FLVD_AMF_STRICT_ARRAY = 10,
+    FLVD_AMF_DATE = 11,
+    FLVD_AMF_LONG_STRING = 12
+};
+
+// The index of a key in the table is its identity.
+enum : uint32_t {
+    FLVD_META_KEY_TIMES,
+    FLVD_META_KEY_WIDTH,
+    FLVD_META_KEY_HEIGHT,
+    FLVD_META_KEY_DURATION,
+    FLVD_META_KEY_FILESIZE,
+    FLVD_META_KEY_FRAMERATE,
+    FLVD_META_KEY_KEYFRAMES,
+    FLVD_META_KEY_AUDIODELAY,
+    FLVD_META_KEY_AUDIODATARATE,
+    FLVD_META_KEY_FILEPOSITIONS,
+    FLVD_META_KEY_LASTTIMESTAMP,
+    FLVD_META_KEY_TOTALDURATION,
+    FLVD_META_KEY_AUDIOSAMPLERATE,
+    FLVD_META_KEY_AUDIOSAMPLESIZE,
+    FLVD_META_KEY_LASTKEYFRAMELOCATION,
+    FLVD_META_KEY_LASTKEYFRAMETIMESTAMP,
+    FLVD_META_KEY_NONE
+};
+
+struct flvd_meta_key_t {
+    uint32_t length;
+    const char* name;
+};
+
+// Sorted by length.
+constexpr flvd_meta_key_t g_flvd_metaKeyTable[] = {
+    {5, "times"},
+    {5, "width"},
+    {6, "height"},
+    {8, "duration"},
+    {8, "filesize"},
+    {9, "framerate"},
+    {9, "keyframes"},
+    {10, "audiodelay"},
+    {13, "audiodatarate"},
+    {13, "filepositions"},
+    {13, "lasttimestamp"},
+    {13, "totalduration"},
+    {15, "audiosamplerate"},
+    {15, "audiosamplesize"},
+    {20, "lastkeyframelocation"},
+    {21, "lastkeyframetimestamp"},
+    {0, nullptr},
+};
+static_assert(std::size(g_flvd_metaKeyTable) == FLVD_META_KEY_NONE + 1, "one entry a key, and the end");
+
+constexpr uint32_t FLVD_META_KEY_LENGTH_MAX = 21;
+
+// First entry of each length.
+struct flvd_meta_first_t {
+    uint8_t index[FLVD_META_KEY_LENGTH_MAX + 1];
+};
+
+constexpr flvd_meta_first_t FLVD_MetaFirstKeys()
+{
+    flvd_meta_first_t first = {};
+    for (uint32_t length = 0; length <= FLVD_META_KEY_LENGTH_MAX; ++length) {
+        uint8_t index = 0;
+        while (g_flvd_metaKeyTable[index].length != length && index < FLVD_META_KEY_NONE)
+            ++index;
+        first.index[length] = index;
+    }
+    return first;
+}
+
+constexpr flvd_meta_first_t g_flvd_metaFirstKey = FLVD_MetaFirstKeys();
+
+flvd_mem_alloc_fn g_flvd_pfnMetaAlloc;
+flvd_mem_free_fn g_flvd_pfnMetaFree;
+
+// Parse of one payload.
+struct flvd_script_state_t {
+    uint32_t flags;
+    uint32_t array_count;          // elements of the strict array begun last
+    uint32_t value_type;           // marker of the value being parsed
+    uint8_t value[sizeof(double)]; // the last number; other types overwrite its first bytes, or nothing
+    uint32_t pending_key;          // the property whose value is being parsed
+    uint32_t length;               // of the payload
+    uint64_t consumed;             // bytes of it, and of what lies behind it when a value runs over
+    uint32_t containers;           // open at present
+    uint8_t scratch[FLVD_META_SCRATCH];
+};
+
+double FLVD_SlotNumber(const flvd_script_state_t* state)
+{
+    double number = 0.0;
+    std::memcpy(&number, state->value, sizeof number);
+    return number;
+}
+
+// Reading. Each function fails when fewer bytes are left, and counts what it consumed.
+
+const uint8_t* FLVD_ScriptPeek(flvd_ctx_t* ctx, uint32_t n)
+{
+    const uint8_t* bytes = nullptr;
+    return __FLV_DMX__fioShowBytesByPtr(&bytes, n, ctx->cur_reader) == n ? bytes : nullptr;
+}
+
+bool FLVD_ScriptSkip(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
+{
+    const uint32_t skipped = __FLV_DMX__fioSkipBytes(n, ctx->cur_reader);
+    state->consumed += skipped;
+    return skipped == n;
+}
+
+bool FLVD_ScriptRead(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
+{
+    const uint32_t read = __FLV_DMX__fioRead(state->scratch, 1, n, ctx->cur_reader);
+    state->consumed += read;
+    return read == n;
+}
+
+// Consumes a text without keeping it.
+bool FLVD_ScriptPassText(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
+{
+    if (length == 0)
+        return true;
+    return length <= FLVD_META_SCRATCH_TEXT ? FLVD_ScriptRead(ctx, state, length) : FLVD_ScriptSkip(ctx, state, length);
+}
+
+// Payload bytes behind the position; a value may run over the end.
+uint64_t FLVD_ScriptLeft(const flvd_script_state_t* state)
+{
+    return state->length > state->consumed ? state->length - state->consumed : 0;
+}
+
+bool FLVD_KeepsIndex(const flvd_ctx_t* ctx)
+{
+    return (ctx->options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
+}
+
+// Keys.
+
+// Looks a lower-case key with its NUL up.
+uint32_t FLVD_FindKey(const uint8_t* key, uint32_t length)
+{
+    if (length > FLVD_META_KEY_LENGTH_MAX)
+        return FLVD_META_KEY_NONE;
+    uint32_t index = g_flvd_metaFirstKey.index[length];
+    for (; g_flvd_metaKeyTable[index].length == length && index < FLVD_META_KEY_NONE; ++index)
+        if (std::memcmp(key, g_flvd_metaKeyTable[index].name, length + 1) == 0)
+            return index;
+    return FLVD_META_KEY_NONE;
+}
+
+void FLVD_LowerCase(uint8_t* text)
+{
+    for (; *text != 0; ++text)
+        if (*text >= 'A' && *text <= 'Z')
+            *text = static_cast<uint8_t>(*text + ('a' - 'A'));
+}
+
+void FLVD_AssignFileSize(flvd_ctx_t* ctx, uint32_t size)
+{
+    if (ctx->file_size == 0)
+        ctx->file_size = size;
+    else if (ctx->file_size < int64_t{size})
+        ctx->file_shorter_than_meta = 1;
+}
+
+void FLVD_AssignEntryCount(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    if (state->array_count < ctx->keyframe_index.entry_count)
+        ctx->keyframe_index.entry_count = state->array_count;
+    if (state->flags == FLVD_META_INDEX_SEEN)
+        state->flags = 0;
+}
+
+// Gives the pending property the number in the slot, whatever type its value had.
+void FLVD_AssignPendingKey(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    const double number = FLVD_SlotNumber(state);
+    switch (state->pending_key) {
+    case FLVD_META_KEY_TIMES:
+    case FLVD_META_KEY_FILEPOSITIONS:
+        FLVD_AssignEntryCount(ctx, state);
+        break;
+    case FLVD_META_KEY_WIDTH:
+        ctx->video_info.width = FLVD_DoubleToU32(number);
+        break;
+    case FLVD_META_KEY_HEIGHT:
+        ctx->video_info.height = FLVD_DoubleToU32(number);
+        break;
+    case FLVD_META_KEY_FILESIZE:
+        FLVD_AssignFileSize(ctx, FLVD_DoubleToU32(number));
+        break;
+    case FLVD_META_KEY_FRAMERATE:
+        ctx->video_info.frame_rate = FLVD_DoubleToU32(number * 1000.0); // thousandths of a frame a second
+        break;
+    case FLVD_META_KEY_AUDIODELAY:
+        ctx->audio_delay_ms = FLVD_SecondsToMs(number);
+        break;
+    case FLVD_META_KEY_AUDIODATARATE:
+        ctx->audio_info.data_rate = FLVD_DoubleToU32(number);
+        break;
+    case FLVD_META_KEY_AUDIOSAMPLERATE:
+        ctx->audio_info.sample_rate = FLVD_DoubleToU32(number);
+        break;
+    case FLVD_META_KEY_AUDIOSAMPLESIZE:
+        ctx->audio_info.sample_size = FLVD_DoubleToU32(number);
+        break;
+    case FLVD_META_KEY_LASTKEYFRAMELOCATION:
+        ctx->last_keyframe_pos = FLVD_DoubleToI64(number);
+        break;
+    case FLVD_META_KEY_LASTKEYFRAMETIMESTAMP:
+        ctx->last_keyframe_ms = FLVD_SecondsToMs(number);
+        ctx->video_info.last_key_time_ms = ctx->last_keyframe_ms;
+        break;
+    default:
+        break;
+    }
+    state->pending_key = FLVD_META_KEY_NONE;
+}
+
+// Inside "keyframes", remembers where the array behind the key has its first element.
+void FLVD_NoteArray(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t seen, int64_t* offset)
+{
+    if ((state->flags & FLVD_META_IN_KEYFRAMES) == 0)
+        return;
+    const int64_t position = __FLV_DMX__fioTell64(ctx->cur_reader);
+    if (position < 0)
+        return;
+    state->flags |= seen;
+    *offset = position + FLVD_META_ARRAY_HEADER;
+    state->array_count = 0;
+}
+
+// What meeting a key does before its value is parsed.
+void FLVD_MeetKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t key)
+{
+    if (key == FLVD_META_KEY_NONE) {
+        FLVD_AssignPendingKey(ctx, state);
+        return;
+    }
+    state->pending_key = key;
+    if (key == FLVD_META_KEY_TIMES) {
+        FLVD_NoteArray(ctx, state, FLVD_META_TIMES_SEEN, &ctx->keyframe_index.times_offset);
+    } else if (key == FLVD_META_KEY_FILEPOSITIONS) {
+        FLVD_NoteArray(ctx, state, FLVD_META_POSITIONS_SEEN, &ctx->keyframe_index.positions_offset);
+    } else if (key == FLVD_META_KEY_KEYFRAMES) {
+        state->flags |= FLVD_META_IN_KEYFRAMES;
+        ctx->keyframe_index.entry_count = UINT32_MAX; // each array lowers it
+    }
+}
+
+// Values. Each function returns the bytes of the value, its marker included, 0 for a value that yields nothing, or -1.
+
+int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state);
+
+int32_t FLVD_ParseNumber(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, FLVD_AMF_NUMBER_SIZE);
+    if (bytes == nullptr)
+        return -1;
+    const double number = FLVD_GetDouble(bytes);
+    std::memcpy(state->value, &number, sizeof number);
+    FLVD_ScriptSkip(ctx, state, FLVD_AMF_NUMBER_SIZE);
+    return 1 + FLVD_AMF_NUMBER_SIZE;
+}
+
+int32_t FLVD_ParseBoolean(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 1);
+    if (bytes == nullptr)
+        return -1;
+    state->value[0] = *bytes;
+    FLVD_ScriptSkip(ctx, state, 1);
+    return 1 + 1;
+}
+
+int32_t FLVD_ParseReference(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 2);
+    if (bytes == nullptr)
+        return -1;
+    const auto reference = static_cast<uint16_t>(FLVD_GetBE16(bytes));
+    std::memcpy(state->value, &reference, sizeof reference);
+    FLVD_ScriptSkip(ctx, state, 2);
+    return 1 + 2;
+}
+
+int32_t FLVD_ParseString(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 2);
+    if (bytes == nullptr)
+        return -1;
+    const uint32_t length = FLVD_GetBE16(bytes);
+    FLVD_ScriptSkip(ctx, state, 2);
+    return FLVD_ScriptPassText(ctx, state, length) ? static_cast<int32_t>(1 + 2 + length) : -1;
+}
+
+int32_t FLVD_ParseLongString(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 4);
+    if (bytes == nullptr)
+        return -1;
+    const uint32_t length = FLVD_GetBE32(bytes);
+    FLVD_ScriptSkip(ctx, state, 4);
+    if (length > FLVD_META_SIZE_MAX - (1 + 4))
+        return -1;
+    return FLVD_ScriptPassText(ctx, state, length) ? static_cast<int32_t>(1 + 4 + length) : -1;
+}
+
+int32_t FLVD_ParseDate(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    return FLVD_ScriptSkip(ctx, state, FLVD_META_DATE_SIZE) ? static_cast<int32_t>(1 + FLVD_META_DATE_SIZE) : -1;
+}
+
+// Memory for a keyframe array, zeroed; null also when so many elements cannot be in the payload.
+void* FLVD_AllocateArray(const flvd_script_state_t* state, uint32_t count, uint32_t element)
+{
+    if (count > UINT32_MAX / element || count > FLVD_ScriptLeft(state))
+        return nullptr;
+    void* const array = g_flvd_pfnMetaAlloc(count * element);
+    if (array != nullptr)
+        std::memset(array, 0, count * element);
+    return array;
+}
+
+// Replaces a keyframe array of the instance by an empty one of `count` elements, or by none.
+template <typename Element>
+void FLVD_ReplaceArray(const flvd_script_state_t* state, uint32_t count, uint32_t* array_count, Element** array)
+{
+    if (*array != nullptr)
+        g_flvd_pfnMetaFree(*array);
+    *array_count = 0;
+    *array = static_cast<Element*>(FLVD_AllocateArray(state, count, sizeof(Element)));
+    if (*array != nullptr)
+        *array_count = count;
+}
+
+// Stores an element in the keyframe array that stands now: an element parsed before may have replaced it.
+void FLVD_StoreElement(flvd_ctx_t* ctx, const flvd_script_state_t* state, uint32_t key, uint32_t index)
+{
+    flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
+    if (key == FLVD_META_KEY_TIMES && index < arrays.times_count)
+        arrays.times_ms[index] = FLVD_SecondsToMs(FLVD_SlotNumber(state));
+    else if (key == FLVD_META_KEY_FILEPOSITIONS && index < arrays.positions_count)
+        arrays.positions[index] = FLVD_DoubleToI64(FLVD_SlotNumber(state));
+}
+
+int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 4);
+    if (bytes == nullptr)
+        return -1;
+    const uint32_t count = FLVD_GetBE32(bytes);
+    FLVD_ScriptSkip(ctx, state, 4);
+    state->array_count = count;
+    flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
+    const uint32_t key = FLVD_KeepsIndex(ctx) ? state->pending_key : uint32_t{FLVD_META_KEY_NONE};
+    if (key == FLVD_META_KEY_TIMES)
+        FLVD_ReplaceArray(state, count, &arrays.times_count, &arrays.times_ms);
+    else if (key == FLVD_META_KEY_FILEPOSITIONS)
+        FLVD_ReplaceArray(state, count, &arrays.positions_count, &arrays.positions);
+    uint32_t size = FLVD_META_ARRAY_HEADER;
+    for (uint32_t i = 0; i < count; ++i) {
+        const int32_t element = FLVD_ParseScriptValue(ctx, state);
+        if (element < 0 || static_cast<uint32_t>(element) > FLVD_META_SIZE_MAX - size)
+            return -1;
+        FLVD_StoreElement(ctx, state, key, i);
+        size += static_cast<uint32_t>(element);
+    }
+    return static_cast<int32_t>(size);
+}
+
+// How a property loop ended.
+enum class FlvdLoop { AtEnd, AtEmptyKey, Failed };
+
+// Passes the end marker when it is next. False when fewer than three bytes are left.
+bool FLVD_PassEndMarker(flvd_ctx_t* ctx, flvd_script_state_t* state, bool* passed)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, FLVD_META_END_SIZE);
+    if (bytes == nullptr)
+        return false;
+    *passed = FLVD_GetBE24(bytes) == FLVD_META_END;
+    if (*passed)
+        FLVD_ScriptSkip(ctx, state, FLVD_META_END_SIZE);
+    return true;
+}
+
+// Reads a key of this length and does what meeting it does. A long one cannot be known.
+bool FLVD_ParseKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
+{
+    if (length > FLVD_META_SCRATCH_TEXT)
+        return FLVD_ScriptSkip(ctx, state, length);
+    if (!FLVD_ScriptRead(ctx, state, length))
+        return false;
+    state->scratch[length] = 0;
+    FLVD_LowerCase(state->scratch);
+    FLVD_MeetKey(ctx, state, FLVD_FindKey(state->scratch, length));
+    return true;
+}
+
+// One property whose key has this length; adds its bytes to the sum.
+bool FLVD_ParseProperty(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t key_length, uint32_t* sum)
+{
+    if (!FLVD_ParseKey(ctx, state, key_length))
+        return false;
+    const int32_t value = FLVD_ParseScriptValue(ctx, state);
+    if (value < 0)
+        return false;
+    const uint64_t total = uint64_t{*sum} + 2 + key_length + static_cast<uint32_t>(value);
+    if (total > FLVD_META_SIZE_MAX)
+        return false;
+    *sum = static_cast<uint32_t>(total);
+    FLVD_AssignPendingKey(ctx, state);
+    return true;
+}
+
+FlvdLoop FLVD_ParseProperties(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t* sum)
+{
+    bool ended = false;
+    if (!FLVD_PassEndMarker(ctx, state, &ended))
+        return FlvdLoop::Failed;
+    while (!ended) {
+        if (__FLV_DMX__fioIsEof(ctx->cur_reader) != 0) {
+            FLVD_ScriptSkip(ctx, state, FLVD_META_END_SIZE);
+            return FlvdLoop::AtEnd;
+        }
+        const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 2);
+        if (bytes == nullptr)
+            return FlvdLoop::Failed;
+        const uint32_t key_length = FLVD_GetBE16(bytes);
+        if (key_length == 0)
+            return FlvdLoop::AtEmptyKey;
+        FLVD_ScriptSkip(ctx, state, 2);
+        if (!FLVD_ParseProperty(ctx, state, key_length, sum) || !FLVD_PassEndMarker(ctx, state, &ended))
+            return FlvdLoop::Failed;
+    }
+    return FlvdLoop::AtEnd;
+}
+
+// An object or ECMA array behind its header of so many bytes; `failed` is what a failure of it returns.
+int32_t FLVD_ParsePropertyList(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t header, int32_t failed)
+{
+    uint32_t sum = 0;
+    const FlvdLoop loop = FLVD_ParseProperties(ctx, state, &sum);
+    if (loop == FlvdLoop::Failed)
+        return failed;
+    const uint32_t around = header + (loop == FlvdLoop::AtEnd ? FLVD_META_END_SIZE : 0);
+    return sum > FLVD_META_SIZE_MAX - around ? failed : static_cast<int32_t>(around + sum);
+}
+
+int32_t FLVD_ParseEcmaArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    if (FLVD_ScriptPeek(ctx, 4) == nullptr)
+        return -1;
+    FLVD_ScriptSkip(ctx, state, 4); // the count is a hint
+    return FLVD_ParsePropertyList(ctx, state, FLVD_META_ARRAY_HEADER, -1);
+}
+
+// The containers are the only values that hold values, so they bound the recursion.
+int32_t FLVD_ParseContainer(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    if (state->containers == FLVD_META_CONTAINERS_MAX)
+        return -1;
+    ++state->containers;
+    int32_t size = 0;
+    if (state->value_type == FLVD_AMF_OBJECT)
+        size = FLVD_ParsePropertyList(ctx, state, 1, 0); // its bytes are lost, what encloses it goes on
+    else if (state->value_type == FLVD_AMF_ECMA_ARRAY)
+        size = FLVD_ParseEcmaArray(ctx, state);
+    else
+        size = FLVD_ParseStrictArray(ctx, state);
+    --state->containers;
+    return size;
+}
+
+int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state)
+{
+    if (FLVD_ScriptLeft(state) == 0)
+        return -1;
+    const uint8_t* const marker = FLVD_ScriptPeek(ctx, 1);
+    if (marker == nullptr)
+        return -1;
+    state->value_type = *marker;
+    FLVD_ScriptSkip(ctx, state, 1);
+    switch (state->value_type) {
+    case FLVD_AMF_NUMBER:
+        return FLVD_ParseNumber(ctx, state);
+    case FLVD_AMF_BOOLEAN:
+        return FLVD_ParseBoolean(ctx, state);
+    case FLVD_AMF_STRING:
+    case FLVD_AMF_MOVIE_CLIP:
+        return FLVD_ParseString(ctx, state);
+    case FLVD_AMF_REFERENCE:
+        return FLVD_ParseReference(ctx, state);
+    case FLVD_AMF_OBJECT:
+    case FLVD_AMF_ECMA_ARRAY:
+    case FLVD_AMF_STRICT_ARRAY:
+        return FLVD_ParseContainer(ctx, state);
+    case FLVD_AMF_DATE:
+        return FLVD_ParseDate(ctx, state);
+    case FLVD_AMF_LONG_STRING:
+        return FLVD_ParseLongString(ctx, state);
+    default:
+        return 0; // null, undefined, object end, and what AMF0 does not know
+    }
+}
+
+// Parses values until the payload is used up or one yields nothing. Returns the bytes they occupy.
+uint64_t FLVD_ParseScriptValues(flvd_ctx_t* ctx, flvd_script_state_t* state, bool* stopped)
+{
+    uint64_t total = 0;
+    *stopped = false;
+    while (!*stopped && total < state->length && __FLV_DMX__fioIsEof(ctx->cur_reader) == 0) {
+        const int32_t size = FLVD_ParseScriptValue(ctx, state);
+        if (size > 0)
+            total += static_cast<uint32_t>(size);
+        else
+            *stopped = true;
+    }
+    return total;
+}
+
+} // namespace
+
+void FLVD_SetCallbackforMeta(const flvd_init_t* init)
+{
+    g_flvd_pfnMetaAlloc = init->mem_alloc;
+    g_flvd_pfnMetaFree = init->mem_free;
+}
+
+int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length)
+{
+    const int64_t start = __FLV_DMX__fioTell64(ctx->cur_reader);
+    if (start < 0 || length == 0)
+        return -1;
+    flvd_script_state_t state = {};
+    state.pending_key = FLVD_META_KEY_NONE;
+    state.length = length;
+    bool stopped = false;
+    const uint64_t total = FLVD_ParseScriptValues(ctx, &state, &stopped);
+    if (stopped || total != length || state.consumed != length) {
+        const int32_t moved = __FLV_DMX__fioSeek64(ctx->cur_reader, start + length, FIO_SEEK_SET);
+        if (stopped && moved != 0)
+            return FLVD_ERR_END_OF_DATA;
+    }
+    return total > 0 ? 0 : -1;
+}
