@@ -1,0 +1,304 @@
+// Frame delivery: the next wanted tag's payload, without its codec header bytes, in the frame buffer.
+//
+// A growing file has a variant of its own: a tag that is not yet whole in the file is taken back, by the position
+// saved in front of it, and tried again by the next request. Complete files pass such a tag over.
+
+#include "flvdmx/front/front.h"
+
+#include "flvdmx/fio/tables.h"
+#include "flvdmx/tag/tag.h"
+
+namespace {
+
+constexpr uint32_t FLVD_FRAME_BUFFER_STEP = 16384; // the frame buffer grows to multiples of it
+constexpr uint32_t FLVD_PAYLOAD_PEEK = 2;          // codec byte and packet type
+
+constexpr uint32_t FLVD_AVC_HEADER = 5;   // codec byte, AVCPacketType, CompositionTime
+constexpr uint32_t FLVD_AAC_HEADER = 2;   // codec byte, AACPacketType
+constexpr uint32_t FLVD_CODEC_HEADER = 1; // codec byte
+
+// Failures that the two variants record at lines of their own.
+struct flvd_frame_sites_t {
+    flvd_site_t info_only;
+    flvd_site_t no_video;
+    flvd_site_t no_audio;
+    flvd_site_t bad_stream;
+    flvd_site_t end;
+};
+
+constexpr flvd_frame_sites_t g_flvd_completeSites = {
+    {FLVD_ERR_INFO_ONLY, 2638},  {FLVD_ERR_NO_VIDEO, 2651},   {FLVD_ERR_NO_AUDIO, 2661},
+    {FLVD_ERR_BAD_STREAM, 2667}, {FLVD_ERR_SHORT_DATA, 2737},
+};
+constexpr flvd_frame_sites_t g_flvd_growingSites = {
+    {FLVD_ERR_INFO_ONLY, 2767},  {FLVD_ERR_NO_VIDEO, 2783},   {FLVD_ERR_NO_AUDIO, 2796},
+    {FLVD_ERR_BAD_STREAM, 2802}, {FLVD_ERR_SHORT_DATA, 2957},
+};
+
+// Failures on one tag, by what it carries.
+struct flvd_payload_sites_t {
+    flvd_site_t short_peek;
+    flvd_site_t no_room; // code 0: the frame was passed over on purpose
+    flvd_site_t short_read;
+    flvd_site_t rollback_payload;
+    flvd_site_t rollback_back_pointer;
+};
+
+constexpr flvd_payload_sites_t g_flvd_videoSites = {
+    {FLVD_ERR_SHORT_DATA, 2579}, {FLVD_ERR_NONE, 2602}, {FLVD_ERR_SHORT_DATA, 2606},
+    {FLVD_ERR_SEEK, 2881},       {FLVD_ERR_SEEK, 2859},
+};
+constexpr flvd_payload_sites_t g_flvd_aacSites = {
+    {FLVD_ERR_SHORT_DATA, 2521}, {FLVD_ERR_NONE, 2536}, {FLVD_ERR_SHORT_DATA, 2540},
+    {FLVD_ERR_SEEK, 2921},       {FLVD_ERR_SEEK, 2899},
+};
+constexpr flvd_payload_sites_t g_flvd_soundSites = {
+    {FLVD_ERR_SHORT_DATA, 2521}, {FLVD_ERR_NONE, 2550}, {FLVD_ERR_SHORT_DATA, 2554},
+    {FLVD_ERR_SEEK, 2921},       {FLVD_ERR_SEEK, 2899},
+};
+
+// One request.
+struct flvd_delivery_t {
+    flvd_ctx_t* ctx;
+    fio_file_t* reader;
+    int64_t* saved; // growing file: position in front of the tag being delivered
+    const flvd_frame_sites_t* sites;
+    uint32_t wanted;
+    bool growing;
+    flvd_tag_info_t tag; // the last tag described
+};
+
+// What a tag led to: go on with the next, return 0, or return -1 as recorded.
+enum class FlvdTurn { Next, Delivered, Failed };
+
+// How a payload is laid out; header is 0 for a configuration packet, which is no frame.
+struct flvd_payload_t {
+    const flvd_payload_sites_t* sites;
+    uint32_t header;
+};
+
+flvd_payload_t FLVD_Classify(uint32_t tag_type, const uint8_t* payload)
+{
+    const uint8_t packet_type = payload[1];
+    if (tag_type == FLVD_TAG_TYPE_VIDEO) {
+        if ((payload[0] & 0x0Fu) != FLVD_CODEC_ID_AVC)
+            return {&g_flvd_videoSites, FLVD_CODEC_HEADER};
+        const bool config = packet_type == FLVD_PACKET_SEQUENCE_HEADER || packet_type == FLVD_PACKET_END_OF_SEQUENCE;
+        return {&g_flvd_videoSites, config ? 0 : FLVD_AVC_HEADER};
+    }
+    if (payload[0] >> 4u != FLVD_SOUND_FORMAT_AAC)
+        return {&g_flvd_soundSites, FLVD_CODEC_HEADER};
+    return {&g_flvd_aacSites, packet_type == FLVD_PACKET_SEQUENCE_HEADER ? 0 : FLVD_AAC_HEADER};
+}
+
+FlvdTurn FLVD_FailRequest(const flvd_delivery_t& delivery, flvd_site_t site)
+{
+    FLVD_Record(delivery.ctx, site);
+    return FlvdTurn::Failed;
+}
+
+// Moves to the saved position, which is used up when that worked.
+bool FLVD_GoBack(const flvd_delivery_t& delivery)
+{
+    if (__FLV_DMX__fioSeek64(delivery.reader, *delivery.saved, FIO_SEEK_SET) != 0)
+        return false;
+    *delivery.saved = 0;
+    return true;
+}
+
+// A tag that is cut short: a growing file takes it back and ends the request, a complete file goes on behind it.
+FlvdTurn FLVD_GiveUpTag(const flvd_delivery_t& delivery, flvd_site_t rollback)
+{
+    if (!delivery.growing)
+        return FlvdTurn::Next;
+    return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? delivery.sites->end : rollback);
+}
+
+// Behind a payload that is not delivered.
+FlvdTurn FLVD_PassPayload(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
+{
+    __FLV_DMX__fioSkipBytes(left, delivery.reader);
+    if (FLVD_PassBackPointer(delivery.reader, delivery.tag.data_size))
+        return FlvdTurn::Next;
+    return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
+}
+
+// Makes room for n bytes in the frame buffer, whose contents are lost. The caller's buffer cannot grow.
+bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
+{
+    if (n <= ctx->frame_buffer_size)
+        return true;
+    if ((ctx->options & FLVD_OPT_USER_BUFFER) != 0)
+        return false;
+    g_flvd_memFuncs.mem_free(ctx->frame_buffer);
+    const uint32_t size = (n + FLVD_FRAME_BUFFER_STEP - 1) & ~(FLVD_FRAME_BUFFER_STEP - 1); // n has 24 bits
+    ctx->frame_buffer = static_cast<uint8_t*>(g_flvd_memFuncs.mem_alloc(size));
+    ctx->frame_buffer_size = ctx->frame_buffer != nullptr ? size : 0;
+    return ctx->frame_buffer != nullptr;
+}
+
+void FLVD_Report(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+{
+    flvd_ctx_t* const ctx = delivery.ctx;
+    const bool video = delivery.tag.type == FLVD_TAG_TYPE_VIDEO;
+    frame->data = ctx->frame_buffer;
+    frame->size = ctx->last_frame_size;
+    frame->stream = video ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
+    frame->timestamp_ms = delivery.tag.timestamp - ctx->first_ts;
+    (video ? ctx->last_video_ts : ctx->last_audio_ts) = frame->timestamp_ms;
+}
+
+// Copies a frame of n bytes, at which the reader stands.
+FlvdTurn FLVD_CopyFrame(const flvd_delivery_t& delivery, uint32_t n, const flvd_payload_sites_t& sites,
+                        flvd_frame_t* frame)
+{
+    flvd_ctx_t* const ctx = delivery.ctx;
+    if (!FLVD_MakeRoom(ctx, n)) {
+        FLVD_Record(ctx, sites.no_room);
+        return FLVD_PassPayload(delivery, n, sites);
+    }
+    const uint32_t read = __FLV_DMX__fioRead(ctx->frame_buffer, 1, n, delivery.reader);
+    if (read < n) {
+        FLVD_Record(ctx, sites.short_read);
+        return FLVD_GiveUpTag(delivery, sites.rollback_payload);
+    }
+    ctx->last_frame_size = read;
+    const uint8_t* back_pointer = nullptr;
+    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&back_pointer, FLVD_BACK_POINTER_SIZE, delivery.reader);
+    if (delivery.growing && available < FLVD_BACK_POINTER_SIZE)
+        return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
+    FLVD_Report(delivery, frame);
+    __FLV_DMX__fioSkipBytes(FLVD_BACK_POINTER_SIZE, delivery.reader);
+    if (delivery.growing)
+        *delivery.saved = 0;
+    return FlvdTurn::Delivered;
+}
+
+// Handles the media tag whose header the reader stands on.
+FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+{
+    fio_file_t* const reader = delivery.reader;
+    const flvd_tag_info_t& tag = delivery.tag;
+    __FLV_DMX__fioSkipBytes(FLVD_TAG_HEADER_SIZE, reader);
+    const uint8_t* bytes = nullptr;
+    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_PAYLOAD_PEEK, reader) < FLVD_PAYLOAD_PEEK) {
+        const bool video = tag.type == FLVD_TAG_TYPE_VIDEO;
+        const flvd_payload_sites_t& sites = video ? g_flvd_videoSites : g_flvd_soundSites;
+        FLVD_Record(delivery.ctx, sites.short_peek);
+        return FLVD_GiveUpTag(delivery, sites.rollback_payload);
+    }
+    const flvd_payload_t payload = FLVD_Classify(tag.type, bytes);
+    if (payload.header == 0 || tag.data_size < payload.header)
+        return FLVD_PassPayload(delivery, tag.data_size, *payload.sites);
+    __FLV_DMX__fioSkipBytes(payload.header, reader);
+    return FLVD_CopyFrame(delivery, tag.data_size - payload.header, *payload.sites, frame);
+}
+
+// Complete file: describes the next tag, or passes what is there by the size of the last one.
+FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
+{
+    if (__FLV_DMX__fioIsEof(delivery->reader) != 0)
+        return FLVD_FailRequest(*delivery, delivery->sites->end);
+    if (FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 1) == 0)
+        return FLVD_HandleTag(*delivery, frame);
+    const uint32_t skipped = __FLV_DMX__fioSkipBytes(delivery->tag.data_size + FLVD_TAG_FRAME_SIZE, delivery->reader);
+    return skipped != 0 ? FlvdTurn::Next : FLVD_FailRequest(*delivery, delivery->sites->end);
+}
+
+// Saves the position in front of the next tag. At the end of what was there the seek clears the host's end flag: the
+// file may have grown since.
+bool FLVD_SavePosition(const flvd_delivery_t& delivery)
+{
+    const bool at_end = __FLV_DMX__fioIsEof(delivery.reader) != 0;
+    const int64_t position = __FLV_DMX__fioTell64(delivery.reader);
+    if (position < 0) {
+        FLVD_Record(delivery.ctx, FLVD_SITE_FRAME_POSITION);
+        return false;
+    }
+    *delivery.saved = position;
+    if (at_end && __FLV_DMX__fioSeek64(delivery.reader, position, FIO_SEEK_SET) != 0) {
+        FLVD_Record(delivery.ctx, FLVD_SITE_FRAME_RESUME);
+        return false;
+    }
+    return true;
+}
+
+FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
+{
+    if (!FLVD_SavePosition(*delivery))
+        return FlvdTurn::Failed;
+    const int32_t result = FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 0);
+    if (result == 0)
+        return FLVD_HandleTag(*delivery, frame);
+    if (result == FLVD_ERR_END_OF_DATA)
+        return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_END);
+    const int64_t size = int64_t{delivery->tag.data_size} + FLVD_TAG_FRAME_SIZE;
+    if (__FLV_DMX__fioSeek64(delivery->reader, size, FIO_SEEK_CUR) != 0)
+        return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_SKIP);
+    return FlvdTurn::Next;
+}
+
+// Chooses reader and tags by the request. False when it is refused, as recorded.
+bool FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
+{
+    flvd_ctx_t* const ctx = delivery->ctx;
+    if ((ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) == 0)
+        return true;
+    if (stream != FLVD_STREAM_VIDEO && stream != FLVD_STREAM_AUDIO) {
+        FLVD_Record(ctx, delivery->sites->bad_stream);
+        return false;
+    }
+    const bool video = stream == FLVD_STREAM_VIDEO;
+    if ((ctx->streams & stream) == 0) {
+        FLVD_Record(ctx, video ? delivery->sites->no_video : delivery->sites->no_audio);
+        return false;
+    }
+    delivery->wanted = video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO;
+    if (!video) {
+        delivery->reader = ctx->audio_reader;
+        delivery->saved = &ctx->saved_audio_pos;
+    }
+    return true;
+}
+
+void FLVD_TakeUserBuffer(flvd_ctx_t* ctx, const flvd_frame_request_t* request)
+{
+    if ((ctx->options & FLVD_OPT_USER_BUFFER) == 0)
+        return;
+    ctx->frame_buffer = request->buffer;
+    ctx->frame_buffer_size = request->buffer != nullptr ? request->buffer_size : 0;
+}
+
+// The tag loop.
+FlvdTurn FLVD_Deliver(flvd_delivery_t* delivery, flvd_frame_t* frame)
+{
+    for (uint32_t turns = 0; turns < FLVD_TAG_BUDGET; ++turns) {
+        const FlvdTurn turn =
+            delivery->growing ? FLVD_TurnGrowing(delivery, frame) : FLVD_TurnComplete(delivery, frame);
+        if (turn != FlvdTurn::Next)
+            return turn;
+    }
+    return FLVD_FailRequest(*delivery, delivery->sites->end);
+}
+
+} // namespace
+
+int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd_frame_t* frame)
+{
+    const bool growing = (ctx->options & FLVD_OPT_PROGRESSIVE) != 0;
+    const flvd_frame_sites_t& sites = growing ? g_flvd_growingSites : g_flvd_completeSites;
+    flvd_delivery_t delivery = {ctx, ctx->main_reader, &ctx->saved_main_pos, &sites, FLVD_TAG_MEDIA, growing, {}};
+    if (ctx->opened_for_info != 0) {
+        FLVD_Record(ctx, sites.info_only);
+        return -1;
+    }
+    if (!FLVD_ChooseStream(&delivery, request->stream))
+        return -1;
+    FLVD_TakeUserBuffer(ctx, request);
+    *frame = {};
+    if (growing && *delivery.saved != 0 && !FLVD_GoBack(delivery)) {
+        FLVD_Record(ctx, FLVD_SITE_FRAME_RESUME);
+        return -1;
+    }
+    return FLVD_Deliver(&delivery, frame) == FlvdTurn::Delivered ? 0 : -1;
+}

@@ -1,0 +1,210 @@
+// Stream probing: walks the first tags for the streams, their configuration and the metadata, derives duration and byte
+// rate, and fills the host's records.
+
+#include "flvdmx/front/front.h"
+
+#include "flvdmx/codec/codec.h"
+#include "flvdmx/tag/tag.h"
+
+#include <algorithm>
+
+namespace {
+
+constexpr uint32_t FLVD_FOUND_METADATA = 0x4; // beside the stream bits
+constexpr uint32_t FLVD_FOUND_ALL = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO | FLVD_FOUND_METADATA;
+constexpr uint32_t FLVD_NO_TIMESTAMP = 0xFFFFFFFF;
+constexpr uint32_t FLVD_BYTE_RATE_SHIFT = 10; // bytes per 1024 ms
+
+struct flvd_probing_t {
+    uint32_t wanted;
+    uint32_t found;
+    uint32_t first_ts;
+};
+
+bool FLVD_IsGrowing(const flvd_ctx_t* ctx)
+{
+    return (ctx->options & FLVD_OPT_PROGRESSIVE) != 0;
+}
+
+bool FLVD_IsProbed(const flvd_probing_t& probing)
+{
+    return probing.found == probing.wanted && probing.first_ts != FLVD_NO_TIMESTAMP;
+}
+
+// Probes a media tag unless its stream was found already. Returns the codec probe's result, 0 when there was none.
+int32_t FLVD_ProbeTag(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t tag_type)
+{
+    const uint32_t stream = tag_type == FLVD_TAG_TYPE_VIDEO ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
+    if ((probing->found & stream) != 0)
+        return 0;
+    const int32_t result = stream == FLVD_STREAM_VIDEO ? FLVD_ProbeVideoTag(ctx) : FLVD_ProbeAudioTag(ctx);
+    if (result == 0)
+        probing->found |= stream;
+    return result;
+}
+
+// Reads a script tag whose header the reader stands on.
+int32_t FLVD_ProbeScript(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t data_size)
+{
+    __FLV_DMX__fioSkipBytes(FLVD_TAG_HEADER_SIZE, ctx->cur_reader);
+    const int32_t result = FLVD_ReadMetadata(ctx, data_size);
+    if (result == 0)
+        probing->found |= FLVD_FOUND_METADATA;
+    return result;
+}
+
+// A tag of a complete file. Configurations do not count for the first timestamp, whatever time they carry.
+void FLVD_ProbeCompleteTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag, uint32_t kind)
+{
+    const bool config = (kind & FLVD_TAG_CONFIG) != 0;
+    bool media = false;
+    if (tag.type == FLVD_TAG_TYPE_SCRIPT) {
+        FLVD_ProbeScript(ctx, probing, tag.data_size);
+    } else if (tag.type == FLVD_TAG_TYPE_VIDEO) {
+        if (config)
+            FLVD_ProbeTag(ctx, probing, tag.type);
+        media = !config;
+    } else {
+        FLVD_ProbeTag(ctx, probing, tag.type);
+        media = !config || ctx->audio_info.format_tag != FLVD_AUDIO_TAG_AAC;
+    }
+    if (media)
+        probing->first_ts = std::min(probing->first_ts, tag.timestamp);
+}
+
+void FLVD_ProbeCompleteTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
+{
+    for (uint32_t tags = 0; tags < FLVD_TAG_BUDGET && !FLVD_IsProbed(*probing); ++tags) {
+        flvd_tag_info_t tag;
+        uint32_t kind = 0;
+        if (FLVD_MoveToNextTag(ctx, ctx->cur_reader, &tag, FLVD_TAG_ANY, &kind) != 0)
+            return;
+        FLVD_ProbeCompleteTag(ctx, probing, tag, kind);
+    }
+}
+
+// A tag of a growing file; the reader is behind it afterwards, a script tag's back-pointer included when it is there.
+bool FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag, flvd_site_t* site)
+{
+    if (tag.type == FLVD_TAG_TYPE_SCRIPT) {
+        *site = FLVD_SITE_PROBE_GROWING;
+        if (FLVD_ProbeScript(ctx, probing, tag.data_size) == FLVD_ERR_END_OF_DATA)
+            return false;
+        FLVD_PassBackPointer(ctx->cur_reader, tag.data_size);
+        return true;
+    }
+    *site = FLVD_SITE_PROBE_GROWING_SHORT;
+    if (FLVD_ProbeTag(ctx, probing, tag.type) == FLVD_ERR_END_OF_DATA)
+        return false;
+    probing->first_ts = std::min(probing->first_ts, tag.timestamp);
+    return __FLV_DMX__fioSeek64(ctx->cur_reader, int64_t{tag.data_size} + FLVD_TAG_FRAME_SIZE, FIO_SEEK_CUR) == 0;
+}
+
+bool FLVD_ProbeGrowingTags(flvd_ctx_t* ctx, flvd_probing_t* probing, flvd_site_t* site)
+{
+    for (uint32_t tags = 0; tags < FLVD_TAG_BUDGET && !FLVD_IsProbed(*probing); ++tags) {
+        flvd_tag_info_t tag;
+        if (FLVD_GetCurrTagInfo(ctx, ctx->cur_reader, &tag, FLVD_TAG_ANY, 0) != 0)
+            break;
+        if (!FLVD_ProbeGrowingTag(ctx, probing, tag, site))
+            return false;
+    }
+    return true;
+}
+
+// Walks the first tags and stores the streams found and the first timestamp. False on failure, recorded in *site.
+bool FLVD_ProbeTags(flvd_ctx_t* ctx, flvd_site_t* site)
+{
+    const bool growing = FLVD_IsGrowing(ctx);
+    const flvd_site_t no_stream = growing ? FLVD_SITE_PROBE_GROWING : FLVD_SITE_PROBE_COMPLETE;
+    *site = no_stream;
+    if (FLVD_SeekToFirstTag(ctx, ctx->cur_reader) != 0)
+        return false;
+    const uint32_t wanted = ctx->streams == 0 ? FLVD_FOUND_ALL : ctx->streams | FLVD_FOUND_METADATA;
+    flvd_probing_t probing = {wanted, 0, FLVD_NO_TIMESTAMP};
+    if (!growing)
+        FLVD_ProbeCompleteTags(ctx, &probing);
+    else if (!FLVD_ProbeGrowingTags(ctx, &probing, site))
+        return false;
+    *site = no_stream;
+    const uint32_t streams = probing.found & (FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
+    if (streams == 0)
+        return false;
+    if (probing.first_ts != FLVD_NO_TIMESTAMP)
+        ctx->first_ts = probing.first_ts;
+    ctx->streams = streams;
+    return true;
+}
+
+// Last timestamp, end of the valid data and seek method.
+bool FLVD_MeasureExtent(flvd_ctx_t* ctx)
+{
+    if (!FLVD_IsGrowing(ctx))
+        return FLVD_ProbeExtent(ctx, ctx->opened_for_info != 0) == 0;
+    const bool indexed = ctx->keyframe_arrays.times_ms != nullptr && ctx->keyframe_arrays.positions != nullptr;
+    ctx->seek_method = indexed ? FLVD_SEEK_BY_INDEX : FLVD_SEEK_NONE;
+    ctx->file_size = 0;
+    return true;
+}
+
+uint32_t FLVD_ByteRate(const flvd_ctx_t* ctx)
+{
+    if (ctx->duration_ms == 0 || ctx->data_end == INT64_MAX)
+        return 0;
+    const auto scaled = static_cast<int64_t>(static_cast<uint64_t>(ctx->data_end) << FLVD_BYTE_RATE_SHIFT);
+    return static_cast<uint32_t>(static_cast<uint64_t>(scaled / int64_t{ctx->duration_ms}));
+}
+
+void FLVD_DeriveDuration(flvd_ctx_t* ctx)
+{
+    if (ctx->last_ts < ctx->first_ts) {
+        ctx->seek_method = FLVD_SEEK_NONE;
+        ctx->first_ts = 0;
+        ctx->last_ts = 0;
+        ctx->duration_ms = 0;
+        ctx->byte_rate = 0;
+        return;
+    }
+    ctx->duration_ms = ctx->last_ts - ctx->first_ts;
+    ctx->byte_rate = FLVD_ByteRate(ctx);
+}
+
+void FLVD_FillRecords(flvd_ctx_t* ctx, flvd_open_info_t* info)
+{
+    ctx->file_info.duration_ms = ctx->duration_ms;
+    ctx->file_info.file_size = ctx->file_size;
+    ctx->file_info.seek_method = ctx->seek_method;
+    info->file_info = &ctx->file_info;
+    if ((ctx->streams & FLVD_STREAM_VIDEO) != 0) {
+        info->has_video = 1;
+        info->video_info = &ctx->video_info;
+        info->video_config = &ctx->video_info;
+    }
+    if ((ctx->streams & FLVD_STREAM_AUDIO) != 0) {
+        info->has_audio = 1;
+        info->audio_info = &ctx->audio_info;
+        info->audio_config = &ctx->audio_info;
+    }
+}
+
+bool FLVD_Rewind(flvd_ctx_t* ctx)
+{
+    if (FLVD_SeekToFirstTag(ctx, ctx->main_reader) != 0)
+        return false;
+    return ctx->audio_reader == ctx->main_reader || FLVD_SeekToFirstTag(ctx, ctx->audio_reader) == 0;
+}
+
+} // namespace
+
+bool FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info, flvd_site_t* site)
+{
+    if (!FLVD_ProbeTags(ctx, site))
+        return false;
+    *site = FLVD_SITE_PROBE_EXTENT;
+    if (!FLVD_MeasureExtent(ctx))
+        return false;
+    FLVD_DeriveDuration(ctx);
+    FLVD_FillRecords(ctx, info);
+    *site = FLVD_SITE_OPEN_REWIND;
+    return FLVD_Rewind(ctx);
+}
