@@ -1,0 +1,276 @@
+// Frame seek by scanning: from the nearest of a few starting places, walks from tag to tag until the target is reached.
+//
+// A walk never ends on an AVC configuration or end-of-sequence tag: they are keyframes by their FrameType, but no
+// picture. Forward means at or after the target, so only a backward seek may end in front of the first tag.
+
+#include "flvdmx/seek/seek.h"
+
+#include "flvdmx/fio/fio.h"
+#include "flvdmx/sites.h"
+#include "flvdmx/tag/tag.h"
+
+namespace {
+
+constexpr uint32_t FLVD_BYTE_RATE_MS = 1024; // byte_rate counts bytes per so many ms
+// A tag may hold 16 MiB, and one search for the next covers 1 MiB.
+constexpr uint32_t FLVD_FIRST_STEP_TRIES = 16;
+
+// One scan seek.
+struct flvd_scan_t {
+    flvd_ctx_t* ctx;
+    fio_file_t* file;
+    uint32_t kind; // tags that walks stop at
+    uint32_t target;
+    uint32_t* result;
+    bool backward;
+    bool audio;
+    flvd_tag_info_t tag; // the tag reached last
+};
+
+int32_t FLVD_SeekBackward(flvd_scan_t* scan);
+
+// The results of seeks made to start a walk are not looked at: a failed one shows at the first step.
+void FLVD_StartAt(const flvd_scan_t* scan, int64_t position)
+{
+    __FLV_DMX__fioSeek64(scan->file, position, FIO_SEEK_SET);
+}
+
+int32_t FLVD_FailWalk(const flvd_scan_t* scan, int32_t code)
+{
+    FLVD_Record(scan->ctx, scan->audio ? FLVD_SITE_AUDIO_WALK : FLVD_SITE_VIDEO_WALK);
+    return code == FLVD_ERR_END_OF_DATA ? FLVD_ERR_NOT_FOUND : code; // data that ends on the way back is no miss
+}
+
+int32_t FLVD_Answer(const flvd_scan_t* scan)
+{
+    *scan->result = scan->tag.timestamp;
+    return 0;
+}
+
+int32_t FLVD_Rewind(const flvd_scan_t* scan)
+{
+    FLVD_SeekToFirstTag(scan->ctx, scan->file);
+    *scan->result = scan->ctx->first_ts;
+    return 0;
+}
+
+// True on an AVC tag that carries no picture.
+bool FLVD_IsPictureless(const flvd_tag_header_t& header)
+{
+    return header.IsVideo() && header.IsAvc() &&
+           (header.second == FLVD_PACKET_SEQUENCE_HEADER || header.second == FLVD_PACKET_END_OF_SEQUENCE);
+}
+
+bool FLVD_MayStop(const flvd_scan_t* scan)
+{
+    flvd_tag_header_t header;
+    return scan->audio || !FLVD_PeekTagHeader(scan->file, &header) || !FLVD_IsPictureless(header);
+}
+
+int32_t FLVD_Step(flvd_scan_t* scan, bool forward)
+{
+    const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
+    return step(scan->ctx, scan->file, &scan->tag, scan->kind, nullptr);
+}
+
+// The single step after a walk.
+int32_t FLVD_StepToFrame(flvd_scan_t* scan, bool forward)
+{
+    int32_t code = 0;
+    do
+        code = FLVD_Step(scan, forward);
+    while (code == 0 && !FLVD_MayStop(scan));
+    return code;
+}
+
+// Walks until the target is reached or passed. 0, or the code of the step that failed.
+int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
+{
+    for (bool stepped = false;; stepped = true) {
+        if (__FLV_DMX__fioIsEof(scan->file) != 0)
+            return stepped && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+        const int32_t code = FLVD_Step(scan, forward);
+        if (code != 0)
+            return code;
+        const bool reached = forward ? scan->tag.timestamp >= scan->target : scan->tag.timestamp <= scan->target;
+        if (reached && FLVD_MayStop(scan))
+            return 0;
+    }
+}
+
+// The tags end before the target.
+int32_t FLVD_SeekAtEnd(flvd_scan_t* scan)
+{
+    FLVD_StartAt(scan, scan->ctx->data_end);
+    if (scan->backward && !scan->audio)
+        return FLVD_SeekBackward(scan);
+    *scan->result = scan->ctx->last_ts;
+    return scan->audio ? 0 : FLVD_ERR_END_OF_DATA;
+}
+
+// Walks forward from the position and answers.
+int32_t FLVD_SeekForward(flvd_scan_t* scan)
+{
+    int32_t code = FLVD_Walk(scan, true);
+    if (code == FLVD_ERR_END_OF_DATA)
+        return FLVD_SeekAtEnd(scan);
+    if (code == 0 && scan->backward && scan->tag.timestamp != scan->target) {
+        code = FLVD_StepToFrame(scan, false);
+        if (code == FLVD_ERR_AT_FIRST_TAG)
+            return FLVD_Rewind(scan);
+    }
+    return code == 0 ? FLVD_Answer(scan) : FLVD_FailWalk(scan, code);
+}
+
+int32_t FLVD_SeekFromStart(flvd_scan_t* scan)
+{
+    FLVD_StartAt(scan, scan->ctx->data_offset);
+    return FLVD_SeekForward(scan);
+}
+
+// Stepping back reached the first tag.
+int32_t FLVD_SeekAtStart(flvd_scan_t* scan)
+{
+    return scan->backward ? FLVD_Rewind(scan) : FLVD_SeekFromStart(scan);
+}
+
+// Walks backward from the position and answers.
+int32_t FLVD_SeekBackward(flvd_scan_t* scan)
+{
+    int32_t code = FLVD_Walk(scan, false);
+    if (code == FLVD_ERR_AT_FIRST_TAG)
+        return FLVD_SeekAtStart(scan);
+    if (code == 0 && !scan->backward && scan->tag.timestamp != scan->target) {
+        code = FLVD_StepToFrame(scan, true);
+        if (code == FLVD_ERR_END_OF_DATA)
+            return scan->audio ? FLVD_SeekAtEnd(scan) : FLVD_ERR_END_OF_DATA;
+    }
+    return code == 0 ? FLVD_Answer(scan) : FLVD_FailWalk(scan, code);
+}
+
+int32_t FLVD_SeekFromEnd(flvd_scan_t* scan)
+{
+    FLVD_StartAt(scan, scan->ctx->data_end);
+    return FLVD_SeekBackward(scan);
+}
+
+// From the tag at the position.
+int32_t FLVD_SeekFromTag(flvd_scan_t* scan)
+{
+    return scan->target > scan->tag.timestamp ? FLVD_SeekForward(scan) : FLVD_SeekBackward(scan);
+}
+
+// Which of start, end and a known place in the file is nearest to the target.
+enum class FlvdNearest { Start, Known, End };
+
+FlvdNearest FLVD_Nearest(const flvd_scan_t* scan, uint32_t known)
+{
+    const uint32_t distance = FLVD_TimeDistance(scan->target, known);
+    if (distance > scan->target)
+        return FlvdNearest::Start;
+    return int64_t{distance} >= int64_t{scan->ctx->last_ts} - scan->target ? FlvdNearest::End : FlvdNearest::Known;
+}
+
+// The first tag of a kind at or behind an estimated place, else the last one of the file. 0 with the tag,
+// FLVD_ERR_AT_FIRST_TAG when there is none, or -1.
+int32_t FLVD_FirstTag(flvd_scan_t* scan, uint32_t kind, flvd_site_t site)
+{
+    int32_t code = FLVD_ERR_NOT_FOUND;
+    for (uint32_t tries = 0; tries < FLVD_FIRST_STEP_TRIES && code == FLVD_ERR_NOT_FOUND; ++tries)
+        code = FLVD_MoveToNextTag(scan->ctx, scan->file, &scan->tag, kind, nullptr);
+    if (code == FLVD_ERR_NOT_FOUND)
+        return FLVD_Fail(scan->ctx, site);
+    if (code != FLVD_ERR_END_OF_DATA)
+        return code;
+    FLVD_StartAt(scan, scan->ctx->data_end);
+    code = FLVD_MoveToPrevTag(scan->ctx, scan->file, &scan->tag, kind, nullptr);
+    return code == 0 || code == FLVD_ERR_AT_FIRST_TAG ? code : FLVD_ERR_NOT_FOUND;
+}
+
+// True when the tag at the position is itself the keyframe sought.
+bool FLVD_IsKeyframeSought(const flvd_scan_t* scan)
+{
+    flvd_tag_header_t header;
+    return scan->tag.timestamp == scan->target && FLVD_PeekTagHeader(scan->file, &header) && header.IsKeyframe() &&
+           !FLVD_IsPictureless(header);
+}
+
+int64_t FLVD_EstimatePosition(const flvd_ctx_t* ctx, uint32_t target)
+{
+    const uint64_t time = target > ctx->first_ts ? target - ctx->first_ts : 0;
+    return static_cast<int64_t>(time * ctx->byte_rate / FLVD_BYTE_RATE_MS); // two 32-bit factors: below 2^54
+}
+
+int32_t FLVD_SeekFromFirstTag(flvd_scan_t* scan)
+{
+    if (FLVD_IsKeyframeSought(scan))
+        return FLVD_Answer(scan);
+    switch (FLVD_Nearest(scan, scan->tag.timestamp)) {
+    case FlvdNearest::Start:
+        return FLVD_SeekFromStart(scan);
+    case FlvdNearest::End:
+        return FLVD_SeekFromEnd(scan);
+    default:
+        return FLVD_SeekFromTag(scan);
+    }
+}
+
+// Audio with a reader of its own starts where the video seek has put the main reader.
+int32_t FLVD_SeekAfterVideo(flvd_scan_t* scan)
+{
+    const int64_t position = __FLV_DMX__fioTell64(scan->ctx->main_reader);
+    if (position < 0)
+        return FLVD_Fail(scan->ctx, FLVD_SITE_AUDIO_FOLLOW_POSITION);
+    if (__FLV_DMX__fioSeek64(scan->file, position, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(scan->ctx, FLVD_SITE_AUDIO_FOLLOW_SEEK);
+    const int32_t code = FLVD_FirstTag(scan, FLVD_TAG_AUDIO, FLVD_SITE_AUDIO_FIRST_STEP);
+    if (code == FLVD_ERR_AT_FIRST_TAG)
+        return FLVD_SeekAtStart(scan);
+    if (code != 0)
+        return code;
+    return scan->tag.timestamp == scan->target ? FLVD_Answer(scan) : FLVD_SeekFromTag(scan);
+}
+
+int32_t FLVD_SeekFromHere(flvd_scan_t* scan)
+{
+    if (FLVD_GetCurrTagInfo(scan->ctx, scan->file, &scan->tag, FLVD_TAG_AUDIO, 1) != 0)
+        return FLVD_SeekFromEnd(scan);
+    return scan->tag.timestamp == scan->target ? FLVD_Answer(scan) : FLVD_SeekFromTag(scan);
+}
+
+int32_t FLVD_SeekAudioAlone(flvd_scan_t* scan)
+{
+    switch (FLVD_Nearest(scan, scan->ctx->last_audio_ts + scan->ctx->first_ts)) {
+    case FlvdNearest::Start:
+        return FLVD_SeekFromStart(scan);
+    case FlvdNearest::End:
+        return FLVD_SeekFromEnd(scan);
+    default:
+        return FLVD_SeekFromHere(scan);
+    }
+}
+
+} // namespace
+
+int32_t FLVD_RunVideoScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, uint32_t direction)
+{
+    const bool backward = direction == FLVD_DIRECTION_BACKWARD;
+    flvd_scan_t scan = {ctx, ctx->main_reader, FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME, target, result, backward, false, {}};
+    const FLVD_ReadSizeGuard narrow(scan.file, ctx->scan_read_size, FLVD_WHOLE_CACHE);
+    if (__FLV_DMX__fioSeek64(scan.file, FLVD_EstimatePosition(ctx, target), FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, FLVD_SITE_VIDEO_ESTIMATE);
+    const int32_t code = FLVD_FirstTag(&scan, FLVD_TAG_VIDEO, FLVD_SITE_VIDEO_FIRST_STEP);
+    if (code == FLVD_ERR_AT_FIRST_TAG)
+        return FLVD_SeekAtStart(&scan);
+    return code == 0 ? FLVD_SeekFromFirstTag(&scan) : code;
+}
+
+int32_t FLVD_RunAudioScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, uint32_t direction)
+{
+    const bool backward = direction == FLVD_DIRECTION_BACKWARD;
+    flvd_scan_t scan = {ctx, ctx->audio_reader, FLVD_TAG_AUDIO, target, result, backward, true, {}};
+    const FLVD_ReadSizeGuard narrow(scan.file, ctx->scan_read_size, FLVD_WHOLE_CACHE);
+    const bool separate = (ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0;
+    const bool after_video = separate && (ctx->streams & FLVD_STREAM_VIDEO) != 0;
+    return after_video ? FLVD_SeekAfterVideo(&scan) : FLVD_SeekAudioAlone(&scan);
+}

@@ -1,0 +1,327 @@
+// Time seek: turns the host's time into a target timestamp and a direction, moves the readers by frame seeks, and puts
+// them back when anything fails, so that delivery goes on where it was.
+//
+// last_video_ts and last_audio_ts count from first_ts; frame seeks work on the file's own timestamps.
+
+#include "flvdmx/seek/seek.h"
+
+#include "flvdmx/sites.h"
+#include "flvdmx/tag/tag.h"
+
+namespace {
+
+// Moving one stream: its position cannot be taken, its frame seek failed.
+struct flvd_stream_sites_t {
+    flvd_site_t position;
+    flvd_site_t seek;
+};
+
+// Failures that the variants record at lines of their own.
+struct flvd_seek_sites_t {
+    flvd_site_t info_only;
+    flvd_site_t not_seekable;
+    flvd_site_t rewind;
+    flvd_site_t miss;
+    flvd_stream_sites_t main;
+    flvd_stream_sites_t audio;
+};
+
+constexpr flvd_stream_sites_t g_flvd_oneReaderSites = {{FLVD_ERR_POSITION, 3111}, {FLVD_ERR_FRAME_SEEK, 3118}};
+
+constexpr flvd_seek_sites_t g_flvd_completeSites = {
+    {FLVD_ERR_INFO_ONLY, 2982},
+    {FLVD_ERR_NOT_SEEKABLE, 2987},
+    {FLVD_ERR_SEEK, 3045},
+    {FLVD_ERR_SEEK_MISS, 3161},
+    {{FLVD_ERR_POSITION, 3065}, {FLVD_ERR_FRAME_SEEK, 3072}},
+    {{FLVD_ERR_POSITION, 3088}, {FLVD_ERR_FRAME_SEEK, 3095}},
+};
+constexpr flvd_seek_sites_t g_flvd_growingSites = {
+    {FLVD_ERR_INFO_ONLY, 3190},
+    {FLVD_ERR_NOT_SEEKABLE, 3195},
+    {FLVD_ERR_SEEK, 3252},
+    {FLVD_ERR_SEEK_MISS, 3338},
+    {{FLVD_ERR_POSITION, 3269}, {FLVD_ERR_FRAME_SEEK, 3276}},
+    {{FLVD_ERR_POSITION, 3288}, {}}, // audio tags are not searched there
+};
+
+constexpr int32_t FLVD_MISS = FLVD_ERR_END_OF_DATA;
+
+// One time seek.
+struct flvd_time_seek_t {
+    flvd_ctx_t* ctx;
+    const flvd_seek_sites_t* sites;
+    int32_t time;
+    uint32_t mode;
+    bool growing;
+    int64_t target; // file timestamp
+    uint32_t direction;
+    uint32_t reached; // file timestamp
+};
+
+bool FLVD_HasVideo(const flvd_ctx_t* ctx)
+{
+    return (ctx->streams & FLVD_STREAM_VIDEO) != 0;
+}
+
+bool FLVD_HasAudio(const flvd_ctx_t* ctx)
+{
+    return (ctx->streams & FLVD_STREAM_AUDIO) != 0;
+}
+
+bool FLVD_HasTwoReaders(const flvd_ctx_t* ctx)
+{
+    return (ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0;
+}
+
+bool FLVD_IsByZero(const flvd_time_seek_t& seek)
+{
+    return (seek.mode & FLVD_SEEK_RELATIVE) != 0 && seek.time == 0;
+}
+
+// Current position, from first_ts.
+uint32_t FLVD_CurrentTime(const flvd_time_seek_t& seek)
+{
+    const flvd_ctx_t* const ctx = seek.ctx;
+    return seek.growing || FLVD_HasVideo(ctx) ? ctx->last_video_ts : ctx->last_audio_ts;
+}
+
+// In 64 bits: a file's times may use all 32 of theirs.
+void FLVD_ChooseTarget(flvd_time_seek_t* seek)
+{
+    const uint32_t current = FLVD_CurrentTime(*seek) + seek->ctx->first_ts;
+    bool backward = false;
+    if ((seek->mode & FLVD_SEEK_RELATIVE) != 0) {
+        seek->target = int64_t{current} + seek->time;
+        backward = seek->time < 0;
+    } else {
+        seek->target = int64_t{seek->ctx->first_ts} + seek->time;
+        backward = seek->target < int64_t{current};
+    }
+    const uint32_t forced = seek->mode & FLVD_SEEK_DIRECTION_MASK;
+    if (forced == FLVD_SEEK_BACKWARD || forced == FLVD_SEEK_FORWARD)
+        backward = forced == FLVD_SEEK_BACKWARD;
+    seek->direction = backward ? FLVD_DIRECTION_BACKWARD : FLVD_DIRECTION_FORWARD;
+}
+
+// Remembers where a reader stands, unless a place to go back to is known. False when the position cannot be taken.
+bool FLVD_SavePosition(fio_file_t* reader, int64_t* saved)
+{
+    if (*saved != 0)
+        return true;
+    const int64_t position = __FLV_DMX__fioTell64(reader);
+    if (position < 0)
+        return false;
+    *saved = position;
+    return true;
+}
+
+void FLVD_ForgetPositions(flvd_ctx_t* ctx)
+{
+    ctx->saved_main_pos = 0;
+    ctx->saved_audio_pos = 0;
+}
+
+void FLVD_RestorePosition(fio_file_t* reader, int64_t* saved)
+{
+    if (*saved != 0 && __FLV_DMX__fioSeek64(reader, *saved, FIO_SEEK_SET) == 0)
+        *saved = 0;
+}
+
+void FLVD_RestorePositions(flvd_ctx_t* ctx)
+{
+    FLVD_RestorePosition(ctx->main_reader, &ctx->saved_main_pos);
+    if (FLVD_HasTwoReaders(ctx) && FLVD_HasAudio(ctx))
+        FLVD_RestorePosition(ctx->audio_reader, &ctx->saved_audio_pos);
+}
+
+// To the first tag. A position that cannot be taken is no failure here, it only cannot be gone back to.
+int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
+{
+    flvd_ctx_t* const ctx = seek->ctx;
+    FLVD_SavePosition(ctx->main_reader, &ctx->saved_main_pos);
+    if (FLVD_HasTwoReaders(ctx))
+        FLVD_SavePosition(ctx->audio_reader, &ctx->saved_audio_pos);
+    if (FLVD_SeekToFirstTag(ctx, ctx->main_reader) != 0)
+        return FLVD_Fail(ctx, seek->sites->rewind);
+    if (FLVD_HasTwoReaders(ctx) && FLVD_SeekToFirstTag(ctx, ctx->audio_reader) != 0)
+        return FLVD_Fail(ctx, seek->sites->rewind);
+    ctx->last_video_ts = 0;
+    ctx->last_audio_ts = 0;
+    seek->reached = ctx->first_ts;
+    return 0;
+}
+
+// Saves a reader's position and moves it by a frame seek. The time found ends in seek->reached.
+int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, fio_file_t* reader, int64_t* saved,
+                        const flvd_stream_sites_t& sites)
+{
+    flvd_ctx_t* const ctx = seek->ctx;
+    if (!FLVD_SavePosition(reader, saved))
+        return FLVD_Fail(ctx, sites.position);
+    const auto frame_seek = seek->growing ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
+    uint32_t found = 0;
+    const int32_t result = frame_seek(ctx, static_cast<uint32_t>(seek->target), &found, stream, seek->direction);
+    if (result < 0) {
+        FLVD_Record(ctx, sites.seek);
+        return result;
+    }
+    seek->reached = found;
+    return 0;
+}
+
+int32_t FLVD_MoveOneReader(flvd_time_seek_t* seek)
+{
+    flvd_ctx_t* const ctx = seek->ctx;
+    const uint32_t stream = FLVD_HasVideo(ctx) ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
+    const int32_t result = FLVD_MoveStream(seek, stream, ctx->main_reader, &ctx->saved_main_pos, g_flvd_oneReaderSites);
+    if (result < 0)
+        return result;
+    if (FLVD_HasVideo(ctx))
+        ctx->last_video_ts = seek->reached - ctx->first_ts;
+    if (FLVD_HasAudio(ctx))
+        ctx->last_audio_ts = seek->reached - ctx->first_ts;
+    return 0;
+}
+
+int32_t FLVD_MoveVideo(flvd_time_seek_t* seek)
+{
+    flvd_ctx_t* const ctx = seek->ctx;
+    const int32_t result =
+        FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, ctx->main_reader, &ctx->saved_main_pos, seek->sites->main);
+    if (result == 0)
+        ctx->last_video_ts = seek->reached - ctx->first_ts;
+    return result;
+}
+
+int32_t FLVD_MoveAudio(flvd_time_seek_t* seek)
+{
+    flvd_ctx_t* const ctx = seek->ctx;
+    const int32_t result =
+        FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, ctx->audio_reader, &ctx->saved_audio_pos, seek->sites->audio);
+    if (result == 0)
+        ctx->last_audio_ts = seek->reached - ctx->first_ts;
+    return result;
+}
+
+// Video first; the audio then goes to the time that the video reached. With video, that is the time to report.
+int32_t FLVD_MoveTwoReaders(flvd_time_seek_t* seek)
+{
+    const flvd_ctx_t* const ctx = seek->ctx;
+    if (!FLVD_HasVideo(ctx))
+        return FLVD_MoveAudio(seek);
+    const int32_t result = FLVD_MoveVideo(seek);
+    if (result < 0 || !FLVD_HasAudio(ctx))
+        return result;
+    const uint32_t video = seek->reached;
+    seek->target = video;
+    seek->direction = FLVD_DIRECTION_BACKWARD;
+    const int32_t audio = FLVD_MoveAudio(seek);
+    seek->reached = video;
+    return audio;
+}
+
+// Growing file: the audio reader, if there is one, follows the main reader; no audio tag is searched.
+int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
+{
+    flvd_ctx_t* const ctx = seek.ctx;
+    if (!FLVD_SavePosition(ctx->audio_reader, &ctx->saved_audio_pos))
+        return FLVD_Fail(ctx, seek.sites->audio.position);
+    const int64_t position = __FLV_DMX__fioTell64(ctx->main_reader);
+    if (position < 0)
+        return FLVD_Fail(ctx, FLVD_SITE_SEEK_FOLLOW_POSITION);
+    if (__FLV_DMX__fioSeek64(ctx->audio_reader, position, FIO_SEEK_SET) != 0)
+        return FLVD_Fail(ctx, FLVD_SITE_SEEK_FOLLOW);
+    ctx->last_audio_ts = seek.reached - ctx->first_ts;
+    return 0;
+}
+
+int32_t FLVD_MoveGrowing(flvd_time_seek_t* seek)
+{
+    const int32_t result = FLVD_MoveVideo(seek);
+    const bool follows = FLVD_HasTwoReaders(seek->ctx) && FLVD_HasAudio(seek->ctx);
+    return result == 0 && follows ? FLVD_FollowVideo(*seek) : result;
+}
+
+// A target that the file cannot have. A growing file does not know its last timestamp: its index decides.
+bool FLVD_IsBeyondEnd(const flvd_time_seek_t& seek)
+{
+    const bool unknown = seek.growing && seek.ctx->last_ts == 0;
+    return seek.target > (unknown ? int64_t{UINT32_MAX} : int64_t{seek.ctx->last_ts});
+}
+
+// Everything up to the readers standing at their new places. 0, FLVD_MISS or another negative value.
+int32_t FLVD_MoveReaders(flvd_time_seek_t* seek)
+{
+    flvd_ctx_t* const ctx = seek->ctx;
+    if (ctx->opened_for_info != 0)
+        return FLVD_Fail(ctx, seek->sites->info_only);
+    if (ctx->seek_method == FLVD_SEEK_NONE || (seek->growing && !FLVD_HasVideo(ctx)))
+        return FLVD_Fail(ctx, seek->sites->not_seekable);
+    if (FLVD_IsByZero(*seek)) {
+        seek->reached = FLVD_CurrentTime(*seek) + ctx->first_ts;
+        return 0;
+    }
+    FLVD_ChooseTarget(seek);
+    if (seek->target <= 0)
+        return FLVD_RewindReaders(seek);
+    if (FLVD_IsBeyondEnd(*seek))
+        return FLVD_MISS;
+    if (seek->growing)
+        return FLVD_MoveGrowing(seek);
+    return FLVD_HasTwoReaders(ctx) ? FLVD_MoveTwoReaders(seek) : FLVD_MoveOneReader(seek);
+}
+
+// One attempt: moves the readers, or puts them back. 0, FLVD_MISS or another negative value.
+int32_t FLVD_Attempt(flvd_time_seek_t* seek, int32_t* result)
+{
+    const int32_t moved = FLVD_MoveReaders(seek);
+    if (moved < 0) {
+        FLVD_RestorePositions(seek->ctx);
+        return moved;
+    }
+    *result = static_cast<int32_t>(seek->reached - seek->ctx->first_ts);
+    if (!seek->growing || !FLVD_IsByZero(*seek)) // a growing file's tag that waits to be retried goes on waiting
+        FLVD_ForgetPositions(seek->ctx);
+    return 0;
+}
+
+// After a miss: puts the readers at their end when asked to.
+void FLVD_SeekToEnd(const flvd_time_seek_t& seek)
+{
+    if ((seek.mode & FLVD_SEEK_TO_END_ON_MISS) == 0)
+        return;
+    __FLV_DMX__fioSeek64(seek.ctx->main_reader, 0, FIO_SEEK_END);
+    if (FLVD_HasTwoReaders(seek.ctx))
+        __FLV_DMX__fioSeek64(seek.ctx->audio_reader, 0, FIO_SEEK_END);
+}
+
+int32_t FLVD_RunSeek(flvd_time_seek_t seek, int32_t* result)
+{
+    int32_t moved = FLVD_Attempt(&seek, result);
+    if (moved == FLVD_MISS) {
+        FLVD_SeekToEnd(seek);
+        if ((seek.mode & FLVD_SEEK_RETRY_BACKWARD) != 0) {
+            seek.mode = FLVD_SEEK_BACKWARD; // the time counts from the start then
+            moved = FLVD_Attempt(&seek, result);
+        }
+    }
+    if (moved == FLVD_MISS)
+        FLVD_Record(seek.ctx, seek.sites->miss);
+    return moved == 0 ? 0 : -1;
+}
+
+} // namespace
+
+int32_t FLVD_RunTimeSeek(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode)
+{
+    const flvd_time_seek_t seek = {ctx, &g_flvd_completeSites, time, mode, false, 0, FLVD_DIRECTION_FORWARD, 0};
+    if (!FLVD_IsByZero(seek))
+        FLVD_ForgetPositions(ctx); // a restore that failed may have left one
+    return FLVD_RunSeek(seek, result);
+}
+
+int32_t FLVD_RunTimeSeekProgressive(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode)
+{
+    return FLVD_RunSeek({ctx, &g_flvd_growingSites, time, mode, true, 0, FLVD_DIRECTION_FORWARD, 0}, result);
+}
