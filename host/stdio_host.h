@@ -1,0 +1,36 @@
+/*
+ * Host functions over the C library, for flvd_init_t: malloc and friends, and stdio files with 64-bit positions.
+ *
+ * Usable from C11 and C++17. A host that reads from ordinary files needs nothing else:
+ *
+ *     flvd_init_t init;
+ *     flvd_stdio_host_fill(&init);
+ *     init.file_name = path;
+ *     result = QVX_FLV_DMX(FLVD_OP_OPEN, &handle, &init, &info);
+ */
+#ifndef FLVDMX_HOST_STDIO_HOST_H
+#define FLVDMX_HOST_STDIO_HOST_H
+
+#include "flvdmx/flvdmx.h"
+
+#ifdef __cplusplus
+extern "C" {
+#endif
+
+/**
+ * Clears the block and puts all host functions into it; file name, options and sizes are left to the caller.
+ *
+ * @param init block to fill; it may go away after the open, the functions are valid for the whole process
+ * @note  Files are read without a buffer of stdio's own, since the library caches. Reads fill the request or have
+ *        reached the end; seeks and tells reach beyond 2 GiB through the 64-bit slots, the 32-bit tell fails there.
+ */
+void flvd_stdio_host_fill(flvd_init_t* init);
+
+/** @return errno of the newest open that failed on this thread (EISDIR for a directory), 0 when none has failed */
+int flvd_stdio_host_open_error(void);
+
+#ifdef __cplusplus
+}
+#endif
+
+#endif /* FLVDMX_HOST_STDIO_HOST_H */

@@ -1,0 +1,195 @@
+// The entry point behind a class, and the words for what can go wrong.
+#include "tools/demuxer.h"
+
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+
+#include <fmt/core.h>
+
+#include "host/stdio_host.h"
+#include "tools/crc32.h"
+#include "tools/time_text.h"
+
+namespace tool {
+
+namespace {
+
+struct CodeText {
+    int32_t code;
+    const char* text;
+};
+
+constexpr CodeText CODE_TEXTS[] = {
+    {FLVD_ERR_POSITION, "the position in the file cannot be told"},
+    {FLVD_ERR_SEEK, "seeking in the file failed"},
+    {FLVD_ERR_NO_MEMORY, "no memory for the codec configuration"},
+    {FLVD_ERR_INSTANCE_MEMORY, "no memory"},
+    {FLVD_ERR_FRAME_BUFFER, "no memory for the frame buffer"},
+    {FLVD_ERR_NO_STREAM, "neither a video nor an audio stream was found"},
+    {FLVD_ERR_EXTENT, "the end of the valid data was not found"},
+    {FLVD_ERR_FRAME_SEEK, "no tag was found to land on"},
+    {FLVD_ERR_SEEK_PLACE, "the tag at the place sought is not the one expected"},
+    {FLVD_ERR_INDEX_ELEMENT, "the keyframe index holds something that is not a number"},
+    {FLVD_ERR_NO_VIDEO, "the file has no video stream"},
+    {FLVD_ERR_NO_AUDIO, "the file has no audio stream"},
+    {FLVD_ERR_NO_TAG, "no valid tag was found"},
+    {FLVD_ERR_SHORT_DATA, "the file ends too early"},
+    {FLVD_ERR_NOT_SEEKABLE, "the file cannot be seeked in: it has no usable keyframe index and cannot be scanned"},
+};
+
+std::string TextOf(int32_t code)
+{
+    for (const CodeText& entry : CODE_TEXTS) {
+        if (entry.code == code)
+            return entry.text;
+    }
+    return "demuxing failed";
+}
+
+bool BeginsWithSignature(const std::string& path)
+{
+    constexpr char SIGNATURE[] = {'F', 'L', 'V'};
+    char bytes[sizeof SIGNATURE] = {};
+    std::ifstream(path, std::ios::binary).read(bytes, sizeof bytes);
+    return std::memcmp(bytes, SIGNATURE, sizeof SIGNATURE) == 0;
+}
+
+// The library says only that there is no sound header; the file itself tells the user more.
+std::string HeaderFailureText(const std::string& path)
+{
+    std::error_code failure;
+    if (!std::filesystem::is_regular_file(path, failure))
+        return "no FLV file: a pipe or device cannot be read at any place";
+    const auto size = std::filesystem::file_size(path, failure);
+    if (failure)
+        return "no FLV file header";
+    if (size == 0)
+        return "no FLV file header: the file is empty";
+    if (BeginsWithSignature(path))
+        return fmt::format("the FLV file header is damaged or cut short (the file has {} bytes)", size);
+    return "no FLV file header: this is not an FLV file";
+}
+
+std::string OpenFailureText(const std::string& path, int32_t code)
+{
+    if (code == FLVD_ERR_OPEN_MAIN || code == FLVD_ERR_OPEN_AUDIO) {
+        const int error = flvd_stdio_host_open_error();
+        return fmt::format("cannot be opened: {}", error != 0 ? std::strerror(error) : "no memory");
+    }
+    if (code == FLVD_ERR_FILE_HEADER)
+        return HeaderFailureText(path);
+    return TextOf(code);
+}
+
+bool SeeksForward(int64_t target, int64_t current, uint32_t mode)
+{
+    if ((mode & FLVD_SEEK_RETRY_BACKWARD) != 0)
+        return false; // the last attempt
+    const uint32_t direction = mode & FLVD_SEEK_DIRECTION_MASK;
+    if (direction == FLVD_SEEK_BACKWARD || direction == FLVD_SEEK_FORWARD)
+        return direction == FLVD_SEEK_FORWARD;
+    return target >= current;
+}
+
+} // namespace
+
+std::string DemuxError::Message() const
+{
+    return m_code == 0 ? std::string(what()) : fmt::format("{} (code {}, line {})", what(), m_code, m_line);
+}
+
+Demuxer::Demuxer(const std::string& path, uint32_t options) : m_path(path)
+{
+    flvd_init_t init;
+    flvd_stdio_host_fill(&init);
+    init.file_name = m_path.c_str();
+    init.options = options;
+    if (QVX_FLV_DMX(FLVD_OP_OPEN, &m_instance, &init, &m_info) != 0)
+        throw DemuxError(OpenFailureText(path, g_flvd_lLastError), g_flvd_lLastError, g_flvd_lErrorLine);
+}
+
+Demuxer::~Demuxer()
+{
+    QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
+}
+
+fio_file_t* Demuxer::Reader(uint32_t stream) const
+{
+    return stream == FLVD_STREAM_AUDIO ? m_instance->audio_reader : m_instance->main_reader;
+}
+
+int64_t Demuxer::Position(uint32_t stream) const
+{
+    return __FLV_DMX__fioTell64(Reader(stream));
+}
+
+void Demuxer::ThrowLastError() const
+{
+    throw DemuxError(TextOf(m_instance->error), m_instance->error, m_instance->error_line);
+}
+
+// A request gives up after a bounded number of unusable tags. While the reader comes further and has not passed the
+// valid data, there may be frames behind a long damaged stretch, so the next request is worth making.
+std::optional<Frame> Demuxer::NextFrame(uint32_t stream)
+{
+    int64_t reached = -1;
+    for (;;) {
+        flvd_frame_request_t request{};
+        request.stream = stream;
+        flvd_frame_t frame{};
+        const int32_t result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &request, &frame);
+        if (result == 0)
+            return Describe(frame);
+        if (result != FLVD_RET_END)
+            ThrowLastError();
+        const int64_t position = Position(stream);
+        if (position <= reached || position >= m_instance->data_end)
+            return std::nullopt;
+        reached = position;
+    }
+}
+
+Frame Demuxer::Describe(const flvd_frame_t& frame) const
+{
+    // Only a tag before the first timestamp can wrap, and every tag that is taken lies at or before the last one.
+    const bool wrapped = m_instance->first_ts != 0 && frame.timestamp_ms > m_instance->duration_ms;
+    const int64_t time = frame.timestamp_ms - (wrapped ? int64_t{1} << 32 : 0);
+    return {frame.stream, time, frame.size, Crc32(frame.data, frame.size)};
+}
+
+int64_t Demuxer::CurrentTime() const
+{
+    return Video() != nullptr ? m_instance->last_video_ts : m_instance->last_audio_ts;
+}
+
+void Demuxer::ThrowMiss(int64_t target, uint32_t mode) const
+{
+    const bool beyondEnd = m_instance->last_ts != 0 && target > m_instance->duration_ms;
+    const std::string reason = beyondEnd
+                                   ? fmt::format("that is beyond the end at {}", FormatTime(m_instance->duration_ms))
+                                   : fmt::format("no keyframe lies at or {} it",
+                                                 SeeksForward(target, CurrentTime(), mode) ? "after" : "before");
+    throw SeekMiss(fmt::format("seek to {} missed: {}", FormatTime(target), reason), beyondEnd, m_instance->error,
+                   m_instance->error_line);
+}
+
+int32_t Demuxer::Seek(int32_t time, uint32_t mode)
+{
+    const int64_t target = (mode & FLVD_SEEK_RELATIVE) != 0 ? CurrentTime() + time : time;
+    const flvd_seek_request_t request = {time, mode};
+    int32_t reached = 0;
+    if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) >= 0)
+        return reached;
+    if (m_instance->error == FLVD_ERR_SEEK_MISS)
+        ThrowMiss(target, mode);
+    ThrowLastError();
+}
+
+int64_t BytesBehindLastTag(const flvd_ctx_t& instance)
+{
+    return instance.data_end < instance.file_size ? instance.file_size - instance.data_end : 0;
+}
+
+} // namespace tool

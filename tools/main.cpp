@@ -1,0 +1,228 @@
+// The command line.
+#include <csignal>
+#include <cstdio>
+#include <exception>
+#include <functional>
+#include <map>
+#include <string>
+#include <system_error>
+#include <vector>
+
+#include <CLI/CLI.hpp>
+#include <fmt/core.h>
+
+#include "tools/commands.h"
+#include "tools/report.h"
+#include "tools/time_text.h"
+
+#ifndef FLVDMX_VERSION
+#define FLVDMX_VERSION "unknown version"
+#endif
+
+namespace tool {
+
+namespace {
+
+constexpr const char* TIME_HELP = "TIME is seconds (12.5) or [HH:]MM:SS[.FRACTION].";
+
+// What CLI11 shows when a value is refused; an empty text accepts it.
+const CLI::Validator IS_TIME(
+    [](const std::string& text) {
+        return ParseTime(text) ? std::string() : fmt::format("'{}' is no time: seconds or [HH:]MM:SS[.FRACTION]", text);
+    },
+    "", "time");
+
+// Signs are refused, which the conversion to an unsigned number lets pass.
+const CLI::Validator IS_COUNT(
+    [](const std::string& text) {
+        const bool digits = text.find_first_not_of("0123456789") == std::string::npos;
+        return digits ? std::string() : fmt::format("'{}' is no number of frames", text);
+    },
+    "", "count");
+
+const CLI::Validator IS_SECONDS(
+    [](const std::string& text) {
+        double seconds = -1;
+        const bool valid = CLI::detail::lexical_cast(text, seconds) && seconds >= 0;
+        return valid ? std::string() : fmt::format("'{}' is no number of seconds", text);
+    },
+    "", "seconds");
+
+CLI::Option* AddTime(CLI::App* command, const char* name, const std::function<void(int32_t)>& take, const char* help)
+{
+    const auto parse = [take](const std::string& text) { take(ParseTime(text).value_or(0)); };
+    return command->add_option_function<std::string>(name, parse, help)->check(IS_TIME)->type_name("TIME");
+}
+
+void AddCount(CLI::App* command, const char* name, uint64_t& count, const char* help)
+{
+    command->add_option(name, count, help)->check(IS_COUNT)->type_name("N");
+}
+
+using Choices = std::map<std::string, uint32_t>;
+
+void AddChoice(CLI::App* command, const char* name, const Choices& choices, const std::function<void(uint32_t)>& take,
+               const char* help)
+{
+    const auto check = [choices](const std::string& text) {
+        return choices.count(text) != 0 ? std::string() : fmt::format("'{}' is not among the choices", text);
+    };
+    command
+        ->add_option_function<std::string>(
+            name, [choices, take](const std::string& text) { take(choices.at(text)); }, help)
+        ->check(CLI::Validator(check, "", "choice"))
+        ->type_name("NAME");
+}
+
+void AddInfo(CLI::App& app, InfoOptions& options)
+{
+    CLI::App* const command = app.add_subcommand("info", "Show what is in each file");
+    command->add_option("FILE", options.files, "FLV files")->required()->type_name("");
+    command->add_flag("--json", options.json, "Print one JSON document");
+}
+
+void AddFollow(CLI::App* command, FramesOptions& options)
+{
+    command->add_flag("--follow", options.follow,
+                      "The file is still being written: wait for more and print it as it comes");
+    const CLI::Option* const timeout =
+        command
+            ->add_option("--timeout", options.timeoutSeconds,
+                         "With --follow: stop when the file has not grown for S seconds (default 5)")
+            ->check(IS_SECONDS)
+            ->type_name("S");
+    command->callback([&options, timeout] {
+        if (timeout->count() != 0 && !options.follow)
+            throw CLI::RequiresError("--timeout", "--follow");
+    });
+}
+
+void AddFrames(CLI::App& app, FramesOptions& options)
+{
+    CLI::App* const command = app.add_subcommand("frames", "List the frames, one a line");
+    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
+    command->add_flag("--json", options.json, "Print one JSON object a line");
+    AddChoice(
+        command, "--stream", {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}},
+        [&options](uint32_t stream) { options.streams = stream; }, "List only this stream: video or audio");
+    AddCount(command, "--count", options.count, "Stop after N frames");
+    AddTime(
+        command, "--from", [&options](int32_t ms) { options.fromMs = ms; }, "Begin at the keyframe at or before TIME");
+    AddTime(
+        command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "Leave out frames later than TIME");
+    command->add_flag("--separate-audio", options.separateAudio,
+                      "Read audio with a reader of its own; the streams are merged by time");
+    AddFollow(command, options);
+    command->footer(fmt::format("Each line holds number, stream, time, size in bytes and CRC-32 of the bytes.\n{}\n\n"
+                                "  flvdmx frames clip.flv\n"
+                                "  flvdmx frames --stream video --from 1:30 --to 1:35 clip.flv\n"
+                                "  flvdmx frames --follow --timeout 10 recording.flv",
+                                TIME_HELP));
+}
+
+void AddSeekModes(CLI::App* command, SeekOptions& options)
+{
+    AddChoice(
+        command, "--mode", {{"auto", 0}, {"backward", FLVD_SEEK_BACKWARD}, {"forward", FLVD_SEEK_FORWARD}},
+        [&options](uint32_t bits) { options.mode |= bits; },
+        "Land on the keyframe at or before TIME (backward) or at or after it (forward); "
+        "auto, the default: forward, unless TIME lies before the current position");
+    const auto addBit = [&](const char* name, uint32_t bit, const char* help) {
+        command->add_flag_callback(
+            name, [&options, bit] { options.mode |= bit; }, help);
+    };
+    addBit("--relative", FLVD_SEEK_RELATIVE, "TIME is an offset from the current position and may be negative");
+    addBit("--end-on-miss", FLVD_SEEK_TO_END_ON_MISS, "Go to the end of the file when there is nothing to land on");
+    addBit("--retry-backward", FLVD_SEEK_RETRY_BACKWARD, "Try backward when there is nothing to land on");
+}
+
+void AddSeek(CLI::App& app, SeekOptions& options)
+{
+    CLI::App* const command = app.add_subcommand("seek", "Seek, show the landing place and the frames from there on");
+    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
+    AddTime(
+        command, "TIME", [&options](int32_t ms) { options.timeMs = ms; }, "Where to seek to")
+        ->required()
+        ->type_name("");
+    AddSeekModes(command, options);
+    AddCount(command, "--play", options.play, "Read N frames before the seek (default 0)");
+    AddCount(command, "--count", options.count, "Show N frames from the landing place on (default 5)");
+    command->add_flag("--separate-audio", options.separateAudio, "Read audio with a reader of its own");
+    command->add_flag("--json", options.json, "Print one JSON document");
+    command->footer(fmt::format("{}\n\n"
+                                "  flvdmx seek clip.flv 12.5\n"
+                                "  flvdmx seek --mode forward clip.flv 1:02:03\n"
+                                "  flvdmx seek --play 500 --relative clip.flv -10",
+                                TIME_HELP));
+    command->callback([&options] {
+        if (options.timeMs < 0 && (options.mode & FLVD_SEEK_RELATIVE) == 0)
+            throw CLI::ValidationError("TIME", "a negative time needs --relative");
+    });
+}
+
+// CLI11 takes `-5` for an option. A blank in front makes it a value, and ParseTime passes over blanks.
+std::vector<std::string> Arguments(int argc, char** argv)
+{
+    std::vector<std::string> arguments(argv + 1, argv + argc);
+    for (std::string& text : arguments) {
+        if (!text.empty() && text.front() == '-' && ParseTime(text))
+            text.insert(0, 1, ' ');
+    }
+    return {arguments.rbegin(), arguments.rend()}; // as CLI11 wants them
+}
+
+int Usage(const CLI::App& app, const CLI::ParseError& error)
+{
+    if (error.get_exit_code() == static_cast<int>(CLI::ExitCodes::Success)) // help or version
+        return app.exit(error);
+    const std::vector<CLI::App*> commands = app.get_subcommands();
+    fmt::print(stderr, "flvdmx: {}\nTry 'flvdmx {}--help'.\n", error.what(),
+               commands.empty() ? "" : commands.front()->get_name() + " ");
+    return WRONG_USE;
+}
+
+int Run(int argc, char** argv)
+{
+    CLI::App app("Shows what is in FLV files: streams, frames, and where seeks land.", "flvdmx");
+    app.set_version_flag("--version", "flvdmx " FLVDMX_VERSION);
+    app.footer("Exit codes: 0 done, 1 a file could not be demuxed, 2 wrong use.");
+    app.require_subcommand(0, 1); // none is told below, behind what CLI11 has to say of unknown words
+    InfoOptions info;
+    FramesOptions frames;
+    SeekOptions seek;
+    AddInfo(app, info);
+    AddFrames(app, frames);
+    AddSeek(app, seek);
+    try {
+        app.parse(Arguments(argc, argv));
+        if (app.get_subcommands().empty())
+            throw CLI::RequiredError("A subcommand (info, frames or seek)");
+    } catch (const CLI::ParseError& error) {
+        return Usage(app, error);
+    }
+    if (app.got_subcommand("info"))
+        return RunInfo(info);
+    return app.got_subcommand("frames") ? RunFrames(frames) : RunSeek(seek);
+}
+
+} // namespace
+
+} // namespace tool
+
+// A reader that has seen enough, such as `head`, closes the pipe: that is no failure.
+int main(int argc, char** argv)
+{
+    std::signal(SIGPIPE, SIG_IGN);
+    try {
+        const int exitCode = tool::Run(argc, argv);
+        tool::Flush();
+        return exitCode;
+    } catch (const std::system_error& error) {
+        if (error.code() == std::errc::broken_pipe)
+            return tool::DONE;
+        fmt::print(stderr, "flvdmx: cannot write: {}\n", error.code().message());
+    } catch (const std::exception& error) {
+        fmt::print(stderr, "flvdmx: {}\n", error.what());
+    }
+    return tool::FAILED;
+}
