@@ -1,0 +1,99 @@
+#!/usr/bin/env python3
+"""Writes expected/NAME.txt for every sample: what ffprobe finds in it, in lines of `kind key=value ...`.
+
+file    size= duration_ms=           duration as ffprobe reports it (0: unknown)
+stream  kind= codec= width= height= rate= channels= extradata=
+packet  kind= pos= dts= size= crc= key=   in file order; pos is the tag's start, dts the tag's timestamp in ms
+
+Every packet is compared with the tag at its position, so that no change by the prober goes unnoticed. The truncated
+and the damaged sample are expected to give the packets of avc_aac.flv whose tags are whole and untouched.
+"""
+import json
+import pathlib
+import subprocess
+import zlib
+
+HERE = pathlib.Path(__file__).resolve().parent
+TAG_HEADER, BACK_POINTER = 11, 4
+
+
+def probe(path):
+    command = ["ffprobe", "-v", "error", "-show_format", "-show_streams", "-show_packets", "-show_data",
+               "-show_data_hash", "CRC32", "-of", "json", str(path)]
+    return json.loads(subprocess.run(command, check=True, capture_output=True, text=True).stdout)
+
+
+def hexdump_bytes(text):
+    lines = [line[10:50] for line in text.splitlines() if line]
+    return "".join(lines).replace(" ", "")
+
+
+def media_tags(data):
+    """Offsets of all tags that carry a frame, by the chain alone: {offset: (kind, timestamp, frame bytes)}."""
+    tags, pos = {}, int.from_bytes(data[5:9], "big") + BACK_POINTER
+    while pos + TAG_HEADER < len(data):
+        size = int.from_bytes(data[pos + 1:pos + 4], "big")
+        timestamp = int.from_bytes(data[pos + 4:pos + 7], "big") | data[pos + 7] << 24
+        body = data[pos + TAG_HEADER:pos + TAG_HEADER + size]
+        if data[pos] == 9:
+            avc = body[0] & 15 == 7
+            if not avc or body[1] not in (0, 2):
+                tags[pos] = ("video", timestamp, body[5 if avc else 1:])
+        elif data[pos] == 8:
+            aac = body[0] >> 4 == 10
+            if not aac or body[1] != 0:
+                tags[pos] = ("audio", timestamp, body[2 if aac else 1:])
+        pos += TAG_HEADER + size + BACK_POINTER
+    return tags
+
+
+def stream_line(stream):
+    fields = {"kind": stream["codec_type"], "codec": stream["codec_name"], "width": stream.get("width", 0),
+              "height": stream.get("height", 0), "rate": stream.get("sample_rate", 0),
+              "channels": stream.get("channels", 0), "extradata": hexdump_bytes(stream.get("extradata", ""))}
+    return "stream " + " ".join(f"{key}={value}" for key, value in fields.items())
+
+
+def packet_line(packet, tag):
+    kind, timestamp, frame = tag
+    assert kind == packet["codec_type"] and timestamp == packet["dts"], packet
+    assert len(frame) == int(packet["size"]), packet
+    crc = packet["data_hash"].split(":")[1]
+    assert int(crc, 16) == zlib.crc32(frame), packet
+    key = int(packet["flags"][0] == "K")
+    return f"packet kind={kind} pos={packet['pos']} dts={timestamp} size={len(frame)} crc={crc} key={key}"
+
+
+def sound_file(path):
+    data, found = path.read_bytes(), probe(path)
+    tags = media_tags(data)
+    assert [int(p["pos"]) for p in found["packets"]] == list(tags), path
+    duration = round(float(found["format"].get("duration", 0)) * 1000)
+    packets = {int(p["pos"]): packet_line(p, tags[int(p["pos"])]) for p in found["packets"]}
+    return duration, [stream_line(s) for s in found["streams"]], packets
+
+
+def write(name, size, duration, streams, packets):
+    lines = [f"file size={size} duration_ms={duration}", *streams, *packets]
+    (HERE / "expected" / f"{name}.txt").write_text("\n".join(lines) + "\n")
+
+
+def main():
+    broken = ["truncated", "damaged"]
+    for path in sorted(HERE.glob("*.flv")):
+        if path.stem not in broken:
+            duration, streams, packets = sound_file(path)
+            write(path.stem, path.stat().st_size, duration, streams, packets.values())
+    whole = (HERE / "avc_aac.flv").read_bytes()
+    _, streams, packets = sound_file(HERE / "avc_aac.flv")
+    for name in broken:
+        data = (HERE / f"{name}.flv").read_bytes()
+        kept = []
+        for pos, line in packets.items():
+            end = pos + TAG_HEADER + int.from_bytes(whole[pos + 1:pos + 4], "big") + BACK_POINTER
+            if data[pos:end] == whole[pos:end]:
+                kept.append(line)
+        write(name, len(data), 0, streams, kept)
+
+
+main()

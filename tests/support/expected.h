@@ -1,0 +1,47 @@
+/* Expected results of the sample files, as tests/data/make_expected.py writes them. */
+#pragma once
+
+#include "flv_writer.h"
+
+namespace flvd_test {
+
+/** CRC-32 of zlib and of ffmpeg's -show_data_hash. */
+uint32_t Crc32(const Bytes& bytes);
+
+/** A whole file of tests/data; throws when it cannot be read. FLVDMX_TEST_DATA names the directory. */
+Bytes ReadSample(const std::string& name);
+
+struct ExpectedStream {
+    uint32_t stream = 0; /**< 1 video, 2 audio */
+    std::string codec;   /**< as ffprobe names it */
+    uint32_t width = 0;
+    uint32_t height = 0;
+    uint32_t sample_rate = 0;
+    uint32_t channels = 0;
+    Bytes extradata;
+};
+
+struct ExpectedPacket {
+    uint32_t stream = 0;
+    int64_t pos = 0;        /**< of the tag */
+    uint32_t timestamp = 0; /**< of the tag, ms */
+    uint32_t size = 0;
+    uint32_t crc = 0;
+    bool key = false;
+};
+/** Compares all that a delivered frame shows: stream, size, timestamp from `first_ts` on, CRC-32. */
+bool SameFrame(const ExpectedPacket& packet, const Frame& frame, uint32_t first_ts = 0);
+
+struct Expected {
+    int64_t file_size = 0;
+    uint32_t duration_ms = 0; /**< the container's; 0 unknown */
+    std::vector<ExpectedStream> streams;
+    std::vector<ExpectedPacket> packets; /**< in file order */
+
+    const ExpectedStream* find(uint32_t stream) const;
+};
+
+/** expected/NAME.txt; throws when it cannot be read. */
+Expected ReadExpected(const std::string& name);
+
+} // namespace flvd_test

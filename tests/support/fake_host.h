@@ -1,0 +1,171 @@
+/*
+ * A host in memory: files, memory functions and file functions that can be made to fail, that count and log every
+ * call, and that watch over the contract: every block and handle is given back once, nothing is used after that,
+ * copies have a length, reads stay inside the block that they begin in.
+ *
+ * The library's tables carry no context, so there is one current host: the newest FakeHost object, until it ends.
+ * A breach of the contract, and whatever is still held when the host ends, goes to the violation handler; without
+ * one it is printed and the process aborts. Include report.h in a GoogleTest source to have it fail the test.
+ */
+#pragma once
+
+#include "flvdmx/flvdmx.h"
+
+#include "flv_writer.h"
+
+#include <array>
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+
+namespace flvd_test {
+
+/** Seek and Tell stand for the 32- and the 64-bit function; in the log they differ. */
+enum class HostFn { Alloc, Free, Copy, Set, Open, Close, Read, Write, Seek, Tell, Eof, Flush, Count };
+
+class FakeHost {
+public:
+    FakeHost();
+    /** A host with one file, "a.flv". */
+    explicit FakeHost(Bytes file);
+    ~FakeHost();
+    FakeHost(const FakeHost&) = delete;
+    FakeHost& operator=(const FakeHost&) = delete;
+
+    static FakeHost& current();
+    using ViolationHandler = void (*)(const std::string& what);
+    static void set_violation_handler(ViolationHandler handler);
+
+    /* -- files */
+
+    static constexpr const char* DEFAULT_FILE = "a.flv";
+    void add_file(const std::string& path, Bytes contents);
+    /** A file of `size` bytes, zero but for the given extents {offset: bytes}. May be far beyond 4 GiB. */
+    void add_sparse_file(const std::string& path, int64_t size, std::map<int64_t, Bytes> extents);
+    void remove_file(const std::string& path) { m_files.erase(path); }
+    /** Shows only the first `size` bytes (at most all): what a growing file has so far. Open handles see it at once. */
+    void set_visible(int64_t size, const std::string& path = DEFAULT_FILE);
+    /** Shows n bytes more. @return false when everything was visible already */
+    bool grow(int64_t n, const std::string& path = DEFAULT_FILE);
+    int64_t visible(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->visible; }
+    /** Contents of a file that is not sparse. */
+    const Bytes& contents(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->data; }
+
+    /* -- tables for the library */
+
+    /** An initialisation block; words that the library must not read hold garbage. */
+    flvd_init_t init(uint32_t options = 0, uint32_t cache_size = 0, uint32_t scan_read_size = 0,
+                     const char* path = DEFAULT_FILE) const;
+    fio_funcs_t funcs() const;
+    /** Leaves out the 64-bit functions; the 32-bit ones then fail behind 2 GiB. Set before init() or funcs(). */
+    void use_32_bit_only() { m_only_32 = true; }
+
+    /* -- faults. Calls are numbered from 1, from the construction or the last reset_calls() on. */
+
+    /** The nth call of `fn` fails: null, -1, 0 bytes, 0 elements. */
+    void fail_nth(HostFn fn, uint64_t n) { m_faults[index(fn)] = {n, n}; }
+    /** The nth call of `fn` and all later ones fail. */
+    void fail_from(HostFn fn, uint64_t n) { m_faults[index(fn)] = {n, UINT64_MAX}; }
+    /** The nth call of a function that can fail (alloc, open, read, write, seek, tell, flush) fails. */
+    void fail_nth_call(uint64_t n) { m_fail_call = n; }
+    void fail_nothing();
+    /** The nth read or write moves at most k bytes. */
+    void shorten_nth(HostFn fn, uint64_t n, uint32_t k) { m_shortened[index(fn)] = {n, k}; }
+    /** Every read moves at most k bytes. */
+    void limit_reads(uint32_t k) { m_read_limit = k; }
+    /** Lets allocations of more than 64 MiB through. */
+    void allow_huge_allocations() { m_allow_huge = true; }
+    /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
+    std::function<void(HostFn)> on_call;
+
+    /* -- what happened */
+
+    uint64_t calls(HostFn fn) const { return m_calls[index(fn)]; }
+    /** Calls of functions that can fail. */
+    uint64_t failable_calls() const { return m_failable_calls; }
+    /** Reads, writes, seeks and tells. */
+    uint64_t io_calls() const;
+    uint64_t bytes_read() const { return m_bytes_read; }
+    void reset_calls();
+    /** Starts a log of all file calls (of memory calls too with `memory`). */
+    void start_log(bool memory = false);
+    /**
+     * The log so far, emptied. Entries are separated by a blank, each `name(arguments)=result`: open(a.flv,rb)=1
+     * read(4096)=100 write(8)=8 seek(10,1)=0 seek64(10,0)=0 tell()=5 tell64()=5 eof()=1 flush()=0 close()=0
+     * alloc(64)=1 free(1)= copy(16)= set(0,16)=. Blocks show as 1, or 0 for null.
+     */
+    std::string take_log();
+
+    size_t live_blocks() const { return m_blocks.size(); }
+    size_t live_bytes() const;
+    size_t open_handles() const;
+    /** All file_open modes so far, successful or not. */
+    const std::vector<std::string>& open_modes() const { return m_open_modes; }
+    size_t violations() const { return m_violations; }
+
+private:
+    struct File {
+        Bytes data;
+        std::map<int64_t, Bytes> extents;
+        int64_t size = 0;
+        int64_t visible = 0;
+    };
+    struct Handle {
+        std::shared_ptr<File> file;
+        std::string mode;
+        int64_t pos = 0;
+        bool eof = false;
+        bool open = true;
+    };
+    struct Range {
+        uint64_t first = 0;
+        uint64_t last = 0;
+    };
+    struct Shortened {
+        uint64_t nth = 0;
+        uint32_t bytes = 0;
+    };
+    struct Functions; // the C functions behind the tables
+    static constexpr size_t FN_COUNT = static_cast<size_t>(HostFn::Count);
+    static size_t index(HostFn fn) { return static_cast<size_t>(fn); }
+
+    void violation(const std::string& what);
+    bool begin(HostFn fn);
+    uint32_t limited(HostFn fn, uint32_t count) const;
+    template <class... Args> void log(const char* name, int64_t result, const Args&... args);
+    void log_memory(const char* name, const std::string& arguments, const std::string& result);
+    Handle* handle(void* pointer);
+    void check_range(const char* what, const void* pointer, uint32_t count);
+
+    void* alloc(uint32_t size);
+    void release(void* memory);
+    void* open(const char* path, const char* mode);
+    int32_t close(void* pointer);
+    uint32_t read(void* buffer, uint32_t size, uint32_t count, void* pointer);
+    uint32_t write(const void* buffer, uint32_t size, uint32_t count, void* pointer);
+    int32_t seek(void* pointer, int64_t offset, int32_t whence, bool wide);
+    int64_t tell(void* pointer, bool wide);
+    static void fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count);
+
+    FakeHost* m_previous;
+    std::map<std::string, std::shared_ptr<File>> m_files;
+    std::vector<std::unique_ptr<Handle>> m_handles;
+    std::map<const uint8_t*, uint32_t> m_blocks;
+    std::array<uint64_t, FN_COUNT> m_calls{};
+    std::array<Range, FN_COUNT> m_faults{};
+    std::array<Shortened, FN_COUNT> m_shortened{};
+    std::vector<std::string> m_open_modes;
+    uint64_t m_failable_calls = 0;
+    uint64_t m_fail_call = 0;
+    uint64_t m_bytes_read = 0;
+    uint32_t m_read_limit = UINT32_MAX;
+    bool m_only_32 = false;
+    bool m_allow_huge = false;
+    bool m_logging = false;
+    bool m_log_memory = false;
+    std::string m_log;
+    size_t m_violations = 0;
+};
+
+} // namespace flvd_test

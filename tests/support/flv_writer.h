@@ -1,0 +1,191 @@
+/*
+ * Builds FLV files in memory: tags with right or deliberately wrong fields, AMF0 values, onMetaData with a keyframe
+ * index whose positions are the real ones, and the codec headers that the demuxer reads. What was written is kept as
+ * a list of tags, so that a test can compare it with what was delivered.
+ */
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <iosfwd>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace flvd_test {
+
+using Bytes = std::vector<uint8_t>;
+
+/** Appends the low `bytes` bytes of `value`, big-endian. */
+void Put(Bytes& out, uint64_t value, int bytes);
+void Append(Bytes& out, const Bytes& more);
+Bytes Concat(std::initializer_list<Bytes> parts);
+/** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
+Bytes Noise(size_t size, uint32_t seed = 1);
+
+/** Most significant bit first. */
+class BitWriter {
+public:
+    BitWriter& u(int bits, uint32_t value);
+    BitWriter& ue(uint32_t value);
+    BitWriter& se(int32_t value);
+    /** The bytes so far, the last one filled up with zero bits. */
+    Bytes bytes() const { return m_bytes; }
+
+private:
+    Bytes m_bytes;
+    int m_free = 0;
+};
+
+/** AMF0 values, type marker included. */
+namespace amf {
+using Property = std::pair<std::string, Bytes>;
+
+Bytes Number(double value);
+Bytes Boolean(uint8_t value);
+Bytes String(const std::string& text);
+Bytes LongString(const std::string& text);
+Bytes Null();
+Bytes Undefined();
+Bytes Reference(uint16_t index);
+Bytes Date(double milliseconds, int16_t zone = 0);
+/** Properties with their end marker, without type marker. */
+Bytes Properties(const std::vector<Property>& properties);
+Bytes Object(const std::vector<Property>& properties);
+/** `count` defaults to the number of properties. */
+Bytes EcmaArray(const std::vector<Property>& properties, std::optional<uint32_t> count = {});
+Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count = {});
+Bytes NumberArray(const std::vector<double>& numbers);
+/** The string "onMetaData" and an ECMA array. */
+Bytes OnMetaData(const std::vector<Property>& properties);
+} // namespace amf
+
+/* Tag data (what follows the 11-byte tag header), codec header bytes included. */
+
+Bytes VideoData(uint8_t frame_type, uint8_t codec, const Bytes& payload);
+Bytes AudioData(uint8_t header, const Bytes& payload);
+Bytes AvcConfig(const Bytes& record);
+Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms = 0, uint8_t packet_type = 1);
+Bytes AvcEnd();
+/** header: SoundFormat 10 with rate, size and type bits; 0xAF in every usual file. */
+Bytes AacConfig(const Bytes& config, uint8_t header = 0xAF);
+Bytes AacRaw(const Bytes& payload, uint8_t header = 0xAF);
+
+/* Codec payloads, behind the codec header bytes. */
+
+/** AVCDecoderConfigurationRecord with the given parameter sets. */
+Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
+/** A record of one baseline parameter set, 320 x 240. */
+Bytes SmallAvcRecord();
+/** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
+Bytes Mp3Frame(size_t size = 200, uint32_t seed = 1);
+/** Sorenson H.263 picture header; size_code 0 and 1 carry width and height, 2 to 6 a fixed size. */
+Bytes H263Picture(uint32_t size_code, uint32_t width = 0, uint32_t height = 0, size_t size = 200, uint32_t seed = 1);
+/** VP6 intra picture of profile 3 showing columns x rows macroblocks; `adjust` is cropped from width, height. */
+Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust = 0, size_t size = 200, uint32_t seed = 1);
+
+constexpr uint8_t SOUND_MP3 = 0x2F;
+constexpr uint8_t SOUND_PCM = 0x3E;
+constexpr uint8_t SOUND_SPEEX = 0xB2;
+constexpr uint8_t CODEC_H263 = 2;
+constexpr uint8_t CODEC_SCREEN = 3;
+constexpr uint8_t CODEC_VP6 = 4;
+constexpr uint8_t CODEC_VP6A = 5;
+
+/** A delivered frame, or one that is expected to be. */
+struct Frame {
+    uint32_t stream = 0;    /**< 1 video, 2 audio */
+    uint32_t timestamp = 0; /**< ms, from the first timestamp */
+    Bytes data;
+};
+using Frames = std::vector<Frame>;
+bool operator==(const Frame& a, const Frame& b);
+void PrintTo(const Frame& frame, std::ostream* out);
+
+/** One tag as it is to be written. */
+struct Tag {
+    uint8_t type = 0;
+    uint32_t timestamp = 0;
+    Bytes data;
+    std::optional<uint32_t> back_pointer = {}; /**< PreviousTagSize behind it; default: data size + 11 */
+    std::optional<uint32_t> data_size = {};    /**< DataSize in the header; default: that of the data */
+    uint32_t stream_id = 0;
+    int64_t offset = 0; /**< of the tag header; filled by build() */
+
+    int64_t size() const { return static_cast<int64_t>(data.size()) + 15; } /**< header, data and back-pointer */
+    int64_t end() const { return offset + size(); }
+    /** Codec header bytes in front of the frame: 5, 2 or 1. */
+    size_t codec_bytes() const;
+    /** It carries a frame: no script data, no configuration packet, not too short. */
+    bool is_frame() const;
+    /** A video frame of FrameType 1. */
+    bool is_keyframe() const;
+    uint32_t stream() const { return type == 9 ? 1u : 2u; }
+};
+
+/** A file as built. */
+struct Flv {
+    Bytes bytes;
+    std::vector<Tag> tags; /**< in file order, with their offsets */
+
+    /** Smallest timestamp among the frames: what the library takes as first_ts when all frames count. */
+    uint32_t first_ts() const;
+    /** The frames that a player gets; streams: bits 1 video, 2 audio. */
+    Frames frames(uint32_t streams = 3) const { return frames(streams, first_ts()); }
+    Frames frames(uint32_t streams, uint32_t first_ts) const;
+};
+
+/** Changes the keyframe index before it is written: times in seconds, positions in bytes. */
+using IndexHook = std::function<void(std::vector<double>& times, std::vector<double>& positions)>;
+
+/** Collects tags and builds the file. All adders return the builder. */
+class FlvBuilder {
+public:
+    /** header: flags byte of the file header (1 video, 4 audio); data_offset: DataOffset as written. */
+    explicit FlvBuilder(uint8_t flags = 5, uint32_t data_offset = 9) : m_flags(flags), m_data_offset(data_offset) {}
+
+    FlvBuilder& add(Tag tag);
+    FlvBuilder& video(uint32_t timestamp, Bytes data) { return add({9, timestamp, std::move(data)}); }
+    FlvBuilder& audio(uint32_t timestamp, Bytes data) { return add({8, timestamp, std::move(data)}); }
+    FlvBuilder& script(Bytes data, uint32_t timestamp = 0) { return add({18, timestamp, std::move(data)}); }
+    /** onMetaData without keyframe index. */
+    FlvBuilder& metadata(const std::vector<amf::Property>& properties) { return script(amf::OnMetaData(properties)); }
+    /** onMetaData with "keyframes" behind the given properties: every keyframe of the file, at its real place. */
+    FlvBuilder& indexed_metadata(std::vector<amf::Property> properties, IndexHook hook = {});
+    /** Bytes between the last tag and the next one, outside the tag chain. */
+    FlvBuilder& garbage(Bytes bytes);
+    /** Bytes in front of the file header. */
+    FlvBuilder& prefix(Bytes bytes);
+
+    Flv build() const;
+
+private:
+    Bytes index_data(const std::vector<Tag>& tags) const;
+    Flv lay_out(std::vector<Tag> tags) const;
+
+    uint8_t m_flags;
+    uint32_t m_data_offset;
+    Bytes m_prefix;
+    std::vector<Tag> m_tags;
+    std::vector<std::pair<size_t, Bytes>> m_garbage; // in front of the tag of this number
+    std::optional<size_t> m_index_tag;
+    std::vector<amf::Property> m_index_properties;
+    IndexHook m_index_hook;
+};
+
+/** An ordinary file: AVC and AAC, one keyframe every `gop` pictures, pictures and sound interleaved by time. */
+struct ChainOptions {
+    bool video = true;
+    bool audio = true;
+    bool metadata = true;
+    bool index = false;
+    uint32_t pictures = 20; /**< 40 ms each */
+    uint32_t gop = 5;
+    uint32_t first_ts = 0;    /**< of configuration packets and the first frames */
+    size_t video_bytes = 300; /**< about, varying */
+    size_t audio_bytes = 80;  /**< about, varying; a sound frame every 23 ms */
+};
+Flv MakeChain(const ChainOptions& options = {});
+
+} // namespace flvd_test

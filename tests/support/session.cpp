@@ -1,0 +1,65 @@
+#include "session.h"
+
+namespace flvd_test {
+
+static constexpr uint32_t POISON = 0x5A5A5A5A;
+
+Session::Session(FakeHost& host, const OpenOptions& options)
+{
+    const flvd_init_t init = host.init(options.options, options.cache_size, options.scan_read_size, options.path);
+    if ((options.options & FLVD_OPT_USER_BUFFER) != 0)
+        m_user_buffer.resize(options.user_buffer_size);
+    m_open_rc = QVX_FLV_DMX(options.for_info ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN, &m_ctx, &init, &m_info);
+}
+
+Session::~Session()
+{
+    if (m_ctx != nullptr)
+        close();
+}
+
+FrameResult Session::frame(uint32_t stream)
+{
+    uint8_t* const buffer = m_user_buffer.empty() ? nullptr : m_user_buffer.data();
+    const flvd_frame_request_t request{buffer, static_cast<uint32_t>(m_user_buffer.size()), stream};
+    flvd_frame_t out{nullptr, POISON, POISON, POISON, {POISON, POISON}};
+    FrameResult result;
+    result.rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &out);
+    result.frame.stream = out.stream;
+    result.frame.timestamp = out.timestamp_ms;
+    if (result.rc == 0 && out.data != nullptr)
+        result.frame.data.assign(out.data, out.data + out.size);
+    return result;
+}
+
+int32_t Session::seek(int32_t time, uint32_t mode, int32_t* reached)
+{
+    const flvd_seek_request_t request{time, mode};
+    int32_t ignored = 0;
+    return QVX_FLV_DMX(FLVD_OP_SEEK, &m_ctx, &request, reached != nullptr ? reached : &ignored);
+}
+
+int32_t Session::last_error()
+{
+    return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr);
+}
+
+int32_t Session::close()
+{
+    const int32_t rc = QVX_FLV_DMX(FLVD_OP_CLOSE, &m_ctx, nullptr, nullptr);
+    m_ctx = nullptr;
+    return rc;
+}
+
+Frames play(Session& session, uint32_t stream, int32_t* rc)
+{
+    Frames frames;
+    FrameResult result = session.frame(stream);
+    for (; result.rc == 0; result = session.frame(stream))
+        frames.push_back(std::move(result.frame));
+    if (rc != nullptr)
+        *rc = result.rc;
+    return frames;
+}
+
+} // namespace flvd_test

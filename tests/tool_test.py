@@ -1,0 +1,387 @@
+#!/usr/bin/env python3
+"""Runs the command-line tool as a user does. Needs FLVDMX_TOOL (the program) and FLVDMX_TEST_DATA (the samples)."""
+import json
+import os
+import pathlib
+import pty
+import random
+import re
+import subprocess
+import tempfile
+import threading
+import time
+import unittest
+
+TOOL = os.environ["FLVDMX_TOOL"]
+DATA = pathlib.Path(os.environ["FLVDMX_TEST_DATA"])
+SAMPLES = sorted(path.stem for path in DATA.glob("*.flv"))
+CODECS = {"h264": "H.264 (AVC)", "flv1": "Sorenson H.263", "flashsv": "screen video", "aac": "AAC", "mp3": "MP3",
+          "speex": "Speex", "pcm_s16le": "PCM, little-endian"}
+ALWAYS_KEYED = ("flv1", "flashsv")  # their tags never set the first timestamp
+
+
+def sample(name):
+    return str(DATA / f"{name}.flv")
+
+
+def run(*arguments, **options):
+    return subprocess.run([TOOL, *map(str, arguments)], capture_output=True, text=True, timeout=60, **options)
+
+
+class Expected:
+    """What an independent prober found in a sample; times relative to the first timestamp, as the library gives them."""
+
+    def __init__(self, name):
+        self.streams, self.packets = {}, []
+        for line in (DATA / "expected" / f"{name}.txt").read_text().splitlines():
+            kind, *fields = line.split(" ")
+            fields = dict(field.split("=", 1) for field in fields)
+            if kind == "file":
+                self.size = int(fields["size"])
+            elif kind == "stream":
+                self.streams[fields["kind"]] = fields
+            else:
+                self.packets.append(fields)
+        self.first = min((int(p["dts"]) for p in self.packets
+                          if self.streams[p["kind"]]["codec"] not in ALWAYS_KEYED), default=0)
+        self.frames = [(p["kind"], int(p["dts"]) - self.first, int(p["size"]), p["crc"]) for p in self.packets]
+        self.keyframes = [(int(p["dts"]) - self.first, int(p["pos"]), i) for i, p in enumerate(self.packets)
+                          if p["kind"] == "video" and p["key"] == "1"]
+
+
+def frames_of(objects):
+    return [(o["stream"], o["time_ms"], o["size"], o["crc32"]) for o in objects]
+
+
+def json_frames(text):
+    return frames_of(json.loads(line) for line in text.splitlines())
+
+
+def milliseconds(text):
+    hours, minutes, seconds = text.split(":")
+    return round((int(hours) * 3600 + int(minutes) * 60 + float(seconds)) * 1000)
+
+
+class Case(unittest.TestCase):
+    def succeed(self, *arguments, stderr=""):
+        result = run(*arguments)
+        self.assertEqual((result.returncode, result.stderr), (0, stderr))
+        return result.stdout
+
+
+class Frames(Case):
+    def test_every_sample(self):
+        for name in SAMPLES:
+            expected = Expected(name)
+            with self.subTest(name):
+                result = run("frames", "--json", sample(name))
+                self.assertEqual(result.returncode, 0)
+                self.assertEqual(json_frames(result.stdout), expected.frames)
+                numbers = [json.loads(line)["number"] for line in result.stdout.splitlines()]
+                self.assertEqual(numbers, list(range(1, len(numbers) + 1)))
+                self.assertEqual("no whole tag" in result.stderr, name == "truncated")
+
+    def test_text_says_the_same(self):
+        for name in ("avc_aac", "pcm_only"):
+            lines = [line.split() for line in self.succeed("frames", sample(name)).splitlines()]
+            self.assertEqual([(s, milliseconds(t), int(n), c) for _, s, t, n, c in lines], Expected(name).frames)
+
+    def test_lines_are_aligned(self):
+        self.assertEqual(len({len(line) for line in self.succeed("frames", sample("avc_aac")).splitlines()}), 1)
+
+    def test_separate_audio_is_merged_by_time(self):
+        for name in ("avc_aac", "avc_bframes_aac", "h263_mp3", "avc_only", "mp3_only", "damaged"):
+            with self.subTest(name):
+                frames = json_frames(self.succeed("frames", "--json", "--separate-audio", sample(name)))
+                self.assertEqual([f[1] for f in frames], sorted(f[1] for f in frames))
+                for kind in ("video", "audio"):
+                    self.assertEqual([f for f in frames if f[0] == kind],
+                                     [f for f in Expected(name).frames if f[0] == kind])
+
+    def test_selection(self):
+        frames = Expected("avc_aac").frames
+        start = max(k for k in Expected("avc_aac").keyframes if k[0] <= 1500)
+        for arguments, wanted in (
+                (["--stream", "video"], [f for f in frames if f[0] == "video"]),
+                (["--stream", "audio", "--separate-audio"], [f for f in frames if f[0] == "audio"]),
+                (["--count", 7], frames[:7]), (["--count", 0], []),
+                (["--stream", "audio", "--count", 3], [f for f in frames if f[0] == "audio"][:3]),
+                (["--to", "0.5"], [f for f in frames if f[1] <= 500]),
+                (["--from", "0:01.5"], frames[start[2]:]),
+                (["--from", "1.5", "--to", "0:00:01.75"], [f for f in frames[start[2]:] if f[1] <= 1750])):
+            with self.subTest(arguments):
+                self.assertEqual(json_frames(self.succeed("frames", "--json", sample("avc_aac"), *arguments)), wanted)
+
+
+class Info(Case):
+    def test_every_sample(self):
+        document = json.loads(run("info", "--json", *map(sample, SAMPLES)).stdout)
+        self.assertEqual([f["file"] for f in document["files"]], [sample(name) for name in SAMPLES])
+        for name, found in zip(SAMPLES, document["files"]):
+            with self.subTest(name):
+                self.check_file(found, Expected(name), name)
+
+    def check_file(self, found, expected, name):
+        self.assertEqual((found["container"], found["size"]), ("FLV", expected.size))
+        last = max(f[1] for f in expected.frames)
+        self.assertTrue(last <= found["duration_ms"] <= last + 100, (last, found["duration_ms"]))
+        self.assertEqual(found["seek_method"], "index" if name == "avc_aac_index" else "scan")
+        self.assertEqual([kind for kind in ("video", "audio") if kind in found], sorted(expected.streams, reverse=True))
+        for kind, stream in expected.streams.items():
+            self.assertEqual(found[kind]["codec"], CODECS[stream["codec"]])
+            self.assertEqual(found[kind]["config"] or "", stream["extradata"])
+        if "video" in found:
+            size = [int(expected.streams["video"][key]) for key in ("width", "height")]
+            self.assertEqual([found["video"]["width"], found["video"]["height"]], size)
+        if "audio" in found and name != "speex_only":  # a header byte has no word for 16000 Hz
+            stream = [int(expected.streams["audio"][key]) for key in ("rate", "channels")]
+            self.assertEqual([found["audio"]["sample_rate"], found["audio"]["channels"]], stream)
+
+    def test_text(self):
+        text = self.succeed("info", sample("avc_aac_index"), sample("mp3_only"))
+        for line in (r"size +30584 bytes", r"streams +video and audio", r"duration +0:00:0[23]\.\d{3}",
+                     r"seek method +by the keyframe index", r"keyframe index +\d+ entries", r"picture size +160 x 120",
+                     r"frame rate +25 frames/s", r"sample rate +44100 Hz", r"channels +1", r"configuration +\d+ bytes: 01",
+                     r"audio +MP3", r"streams +audio only", r"data rate +32 kbit/s"):
+            self.assertRegex(text, line)
+
+
+class Seek(Case):
+    def seek(self, *arguments):
+        result = run("seek", "--json", "--count", 1000, *arguments)
+        return json.loads(result.stdout), result
+
+    def test_lands_on_the_right_keyframe(self):
+        for name in ("avc_aac", "avc_bframes_aac", "avc_only", "screen", "h263_mp3"):
+            expected = Expected(name)
+            rewound = (0, 9, 0)  # backward from before the first keyframe: the start of the tags
+            for target in range(1, expected.keyframes[-1][0] + 1, 171):
+                backward = [k for k in expected.keyframes if k[0] <= target]
+                forward = [k for k in expected.keyframes if k[0] >= target]
+                for mode, place in (("backward", [rewound, *backward][-1:]), ("forward", forward[:1]), ("auto", forward[:1])):
+                    with self.subTest(name=name, target=target, mode=mode):
+                        found, result = self.seek("--mode", mode, sample(name), target / 1000)
+                        if not place:
+                            self.assertEqual((found["landed"], found["miss"]), (None, "no_keyframe"))
+                            continue
+                        self.assertEqual((result.returncode, result.stderr), (0, ""))
+                        self.assertEqual(found["landed"], {"time_ms": place[0][0], "position": place[0][1],
+                                                           "keyframe": True})
+                        self.assertEqual(frames_of(found["frames"]), expected.frames[place[0][2]:])
+
+    def test_indexed_file_lands_on_a_keyframe(self):
+        expected = Expected("avc_aac_index")
+        for target in range(1, 2500, 399):
+            found, _ = self.seek("--mode", "backward", sample("avc_aac_index"), target / 1000)
+            place = [k for k in expected.keyframes if k[1] == found["landed"]["position"]]
+            self.assertTrue(found["landed"]["keyframe"] and place and place[0][0] <= target + 1000, found["landed"])
+            self.assertEqual(frames_of(found["frames"]), expected.frames[place[0][2]:])
+
+    def test_separate_audio_starts_near_the_picture(self):
+        found, _ = self.seek("--separate-audio", "--mode", "backward", sample("avc_aac"), "1.5")
+        frames = frames_of(found["frames"])
+        audio = [f for f in frames if f[0] == "audio"]
+        self.assertEqual([f for f in frames if f[0] == "video"][0][1], found["landed"]["time_ms"])
+        self.assertTrue(found["landed"]["time_ms"] - 50 <= audio[0][1] <= found["landed"]["time_ms"])
+        self.assertEqual(audio, [f for f in Expected("avc_aac").frames if f[0] == "audio"][-len(audio):])
+
+    def test_relative_goes_from_the_last_picture_played(self):
+        expected = Expected("avc_aac")
+        frames = expected.frames[:150]
+        current = [f for f in frames if f[0] == "video"][-1][1]
+        found, _ = self.seek("--play", len(frames), "--relative", sample("avc_aac"), "-0.3")
+        self.assertEqual(found["landed"]["time_ms"], max(k[0] for k in expected.keyframes if k[0] <= current - 300))
+        found, _ = self.seek("--play", len(frames), "--relative", sample("avc_aac"), "0")
+        self.assertEqual(found["landed"]["time_ms"], current)
+        self.assertEqual(frames_of(found["frames"]), expected.frames[150:])
+
+    def test_misses_in_words(self):
+        last_keyframe = Expected("avc_aac").keyframes[-1]
+        behind = (last_keyframe[0] + 10) / 1000
+        for arguments, miss, words in (
+                (["99"], "beyond_end", "seek to 0:01:39.000 missed: that is beyond the end at 0:00:0"),
+                (["99", "--end-on-miss"], "beyond_end", "code -2003, line 3161"),
+                (["--mode", "forward", behind], "no_keyframe", "no keyframe lies at or after it")):
+            with self.subTest(arguments):
+                found, result = self.seek(sample("avc_aac"), *arguments)
+                self.assertEqual((result.returncode, found["landed"], found["miss"]), (1, None, miss))
+                self.assertIn(words, result.stderr)
+                size = Expected("avc_aac").size
+                self.assertEqual(found["position"] == size, "--end-on-miss" in arguments)
+        found, result = self.seek(sample("avc_aac"), "--mode", "forward", "--retry-backward", behind)
+        self.assertEqual((result.returncode, found["landed"]["position"]), (0, last_keyframe[1]))
+
+    def test_text(self):
+        time_ms, position, _ = Expected("avc_aac").keyframes[1]
+        text = self.succeed("seek", "--count", 2, "--mode", "forward", sample("avc_aac"), time_ms / 1000)
+        self.assertRegex(text, rf"landed +0:00:0\d\.\d{{3}}\nkeyframe +yes\nposition +byte {position}\n")
+        self.assertEqual(len(text.splitlines()), 6)
+
+
+class Failures(Case):
+    def setUp(self):
+        self.folder = tempfile.TemporaryDirectory()
+        self.addCleanup(self.folder.cleanup)
+
+    def write(self, name, data):
+        path = pathlib.Path(self.folder.name) / name
+        path.write_bytes(data)
+        return path
+
+    def test_unusable_files(self):
+        header = b"FLV\x01\x05\x00\x00\x00\x09"
+        for path, words in (
+                (pathlib.Path(self.folder.name) / "missing.flv", "No such file or directory (code -5, line 2386)"),
+                (self.folder.name, "Is a directory (code -5, line 2386)"),
+                (self.write("empty.flv", b""), "the file is empty (code -1004, line 2423)"),
+                (self.write("tiny.flv", b"FLV\x01\x05"), "damaged or cut short (the file has 5 bytes) (code -1004"),
+                (self.write("text.flv", b"no video here\n" * 9), "this is not an FLV file (code -1004, line 2423)"),
+                (self.write("offset.flv", header + bytes(2)[:0]), "damaged or cut short (the file has 9 bytes)"),
+                (self.write("header.flv", header + bytes(4)), "neither a video nor an audio stream was found (code -1002"),
+                ("/dev/null", "a pipe or device")):
+            for arguments in (["info"], ["info", "--json"], ["frames"], ["frames", "--json"], ["seek", "--json"]):
+                with self.subTest(path=path, arguments=arguments):
+                    result = run(*arguments, path, *(["1"] if arguments[0] == "seek" else []))
+                    self.assertEqual(result.returncode, 1)
+                    self.assertTrue(result.stderr.startswith(f"flvdmx: {path}: "), result.stderr)
+                    self.assertIn(words, result.stderr)
+                    self.assertEqual(len(result.stderr.splitlines()), 1)
+                    if arguments == ["info", "--json"]:
+                        [entry] = json.loads(result.stdout)["files"]
+                        self.assertTrue(entry["file"] == str(path) and entry["error"]["code"] < 0)
+                    else:
+                        self.assertEqual(result.stdout, "")
+
+    def test_one_bad_file_among_good_ones(self):
+        result = run("info", "--json", sample("aac_only"), "missing.flv", sample("avc_only"))
+        self.assertEqual((result.returncode, len(result.stderr.splitlines())), (1, 1))
+        self.assertEqual(["error" in f for f in json.loads(result.stdout)["files"]], [False, True, False])
+
+    def test_any_cut_ends_cleanly(self):
+        data = pathlib.Path(sample("avc_aac_index")).read_bytes()
+        cuts = list(range(0, 1500, 77)) + list(range(1500, len(data), 2999))
+        for cut in cuts:
+            with self.subTest(cut=cut):
+                result = run("frames", "--json", self.write("cut.flv", data[:cut]))
+                self.assertIn(result.returncode, (0, 1))
+                self.assertRegex(result.stderr, r"\Aflvdmx: .*cut\.flv: ")
+                frames = json_frames(result.stdout)
+                self.assertEqual(frames, Expected("avc_aac_index").frames[:len(frames)])
+
+    def test_stream_that_is_not_there(self):
+        for arguments in ([], ["--separate-audio"]):
+            result = run("frames", "--stream", "video", sample("mp3_only"), *arguments)
+            self.assertEqual((result.returncode, result.stdout), (1, ""))
+            self.assertIn("the file has no video stream", result.stderr)
+
+    def test_wrong_use(self):
+        file = sample("avc_aac")
+        for arguments in ([], ["play", file], ["info"], ["info", "--count", "1", file], ["frames"], ["frames", file, file],
+                          ["frames", "--stream", "subtitles", file], ["frames", "--count", "-1", file],
+                          ["frames", "--count", "x", file], ["frames", "--timeout", "1", file],
+                          ["frames", "--follow", "--timeout", "-1", file], ["frames", "--from", "soon", file],
+                          ["seek", file], ["seek", file, "-1"], ["seek", file, "1:60"], ["seek", file, "1:2:3:4"],
+                          ["seek", file, "1."], ["seek", file, ""], ["seek", file, "3000000"],
+                          ["seek", file, "99999999999999999999"], ["seek", "--mode", "up", file, "1"]):
+            with self.subTest(arguments):
+                result = run(*arguments)
+                self.assertEqual((result.returncode, result.stdout), (2, ""))
+                self.assertRegex(result.stderr, r"\Aflvdmx: .+\nTry 'flvdmx .*--help'\.\n\Z")
+
+    def test_help_and_version(self):
+        self.assertRegex(self.succeed("--version"), r"\Aflvdmx \d+\.\d+\.\d+\n\Z")
+        for arguments in (["--help"], ["info", "--help"], ["frames", "--help"], ["seek", "--help"]):
+            self.assertIn("Usage: flvdmx", self.succeed(*arguments))
+
+
+class Output(Case):
+    def test_closed_pipe_ends_quietly(self):
+        for arguments in (["frames"], ["frames", "--json"], ["info"], ["frames", "--follow", "--timeout", "30"]):
+            reading, writing = os.pipe()
+            os.close(reading)
+            with self.subTest(arguments):
+                result = subprocess.run([TOOL, *arguments, sample("avc_aac")], stdout=writing, stderr=subprocess.PIPE,
+                                        timeout=20)
+                self.assertEqual((result.returncode, result.stderr), (0, b""))
+            os.close(writing)
+
+    def test_full_disk_is_told(self):
+        with open("/dev/full", "wb") as full:
+            result = subprocess.run([TOOL, "frames", sample("avc_aac")], stdout=full, stderr=subprocess.PIPE, text=True)
+        self.assertEqual((result.returncode, result.stderr), (1, "flvdmx: cannot write: No space left on device\n"))
+
+    def test_progress_only_on_a_terminal(self):
+        terminal, end = pty.openpty()
+        result = subprocess.run([TOOL, "frames", sample("avc_aac")], stdout=subprocess.PIPE, stderr=end)
+        os.close(end)
+        shown = os.read(terminal, 1000)
+        os.close(terminal)
+        self.assertRegex(shown, rb"\A\r\x1b\[K1 frames, 0:00:00\.\d{3}.*\r\x1b\[K\Z")
+        self.assertEqual(len(result.stdout.splitlines()), len(Expected("avc_aac").frames))
+
+
+class Follow(Case):
+    """A thread plays the writer; the file starts empty and grows in uneven steps."""
+
+    def follow(self, data, *arguments, gate_at=None):
+        with tempfile.TemporaryDirectory() as folder:
+            path = pathlib.Path(folder) / "growing.flv"
+            path.touch()
+            gate = threading.Event()
+            writer = threading.Thread(target=self.write, args=(path, data, gate_at, gate))
+            with subprocess.Popen([TOOL, "frames", "--json", "--follow", path, *arguments], stdout=subprocess.PIPE,
+                                  stderr=subprocess.PIPE, text=True) as process:
+                writer.start()
+                lines = [process.stdout.readline()]
+                gate.set()  # the rest is written only after the first frame has been seen
+                lines += process.stdout.readlines()
+                stderr = process.stderr.read()
+            writer.join()
+        return json_frames("".join(lines)), process.returncode, stderr
+
+    @staticmethod
+    def write(path, data, gate_at, gate):
+        rng, position = random.Random(7), 0
+        with open(path, "ab", buffering=0) as file:
+            while position < len(data):
+                if gate_at is not None and position >= gate_at and not gate.wait(10):
+                    return
+                step = rng.choice((1, 13, 700, 2500))
+                file.write(data[position:position + step])
+                position += step
+                time.sleep(0.01)
+
+    def test_growing_file(self):
+        for name, arguments in (("avc_aac", []), ("avc_aac", ["--separate-audio"]), ("h263_mp3", []), ("aac_only", []),
+                                ("avc_aac_index", ["--separate-audio"])):
+            data = pathlib.Path(sample(name)).read_bytes()
+            with self.subTest(name=name, arguments=arguments):
+                frames, code, stderr = self.follow(data, "--timeout", "1", *arguments, gate_at=len(data) // 2)
+                self.assertEqual((code, stderr), (0, ""))
+                wanted = [(p["kind"], int(p["dts"]), int(p["size"]), p["crc"]) for p in Expected(name).packets]
+                for kind in ("video", "audio"):
+                    self.assertEqual([f for f in frames if f[0] == kind], [f for f in wanted if f[0] == kind])
+
+    def test_ends_at_the_wanted_frame_without_waiting(self):
+        data = pathlib.Path(sample("avc_aac")).read_bytes()
+        for arguments, last in ((["--count", "9"], None), (["--to", "0.3"], 300)):
+            start = time.monotonic()
+            frames, code, _ = self.follow(data, "--timeout", "20", *arguments)
+            self.assertEqual(code, 0)
+            self.assertEqual(frames, Expected("avc_aac").frames[:9] if last is None else
+                             [f for f in Expected("avc_aac").frames if f[1] <= last])
+            self.assertLess(time.monotonic() - start, 15)
+
+    def test_writer_that_stops(self):
+        data = pathlib.Path(sample("avc_aac")).read_bytes()
+        for size, code, words in ((len(data) // 2 + 3, 0, r"warning: the last \d+ bytes hold no whole tag"),
+                                  (8, 1, "damaged or cut short"), (30, 1, "stream was found|ends too early")):
+            with self.subTest(size):
+                frames, found_code, stderr = self.follow(data[:size], "--timeout", "0.3")
+                self.assertEqual(found_code, code)
+                self.assertTrue(re.search(words, stderr), stderr)
+                self.assertEqual(frames, Expected("avc_aac").frames[:len(frames)])
+
+
+if __name__ == "__main__":
+    unittest.main()
