@@ -1,0 +1,28 @@
+# Checks of the sources, one test a file so that they run side by side, and of the samples under valgrind.
+
+find_program(CLANG_FORMAT clang-format REQUIRED)
+find_program(CLANG_TIDY clang-tidy REQUIRED)
+find_program(VALGRIND valgrind REQUIRED)
+
+foreach(folder IN ITEMS flvdmx host tools tests bench fuzz)
+    file(GLOB_RECURSE found CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${folder}/*.cpp ${folder}/*.h)
+    list(APPEND sources ${found})
+endforeach()
+
+add_test(NAME format COMMAND ${CLANG_FORMAT} --dry-run -Werror ${sources} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
+
+# Headers are checked with the sources that include them.
+foreach(source IN LISTS sources)
+    if(source MATCHES "\\.cpp$")
+        add_test(NAME tidy/${source} COMMAND ${CLANG_TIDY} --quiet -p ${PROJECT_BINARY_DIR} ${source}
+            WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
+        set_tests_properties(tidy/${source} PROPERTIES LABELS tidy)
+    endif()
+endforeach()
+
+file(GLOB samples CONFIGURE_DEPENDS ${PROJECT_SOURCE_DIR}/tests/data/*.flv)
+foreach(sample IN LISTS samples)
+    cmake_path(GET sample STEM name)
+    add_test(NAME valgrind/${name} COMMAND ${VALGRIND} --quiet --error-exitcode=99 --leak-check=full
+        --errors-for-leak-kinds=definite,indirect,possible $<TARGET_FILE:flvdmx-tool> frames ${sample})
+endforeach()

@@ -1,0 +1,16 @@
+# Builds the C example of the README as it stands there and runs it on a sample.
+
+set(readme ${PROJECT_SOURCE_DIR}/README.md)
+set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${readme})
+file(READ ${readme} text)
+if(NOT text MATCHES "\n```c\n(.*)\n```")
+    message(FATAL_ERROR "README.md has no C example")
+endif()
+file(CONFIGURE OUTPUT ${PROJECT_BINARY_DIR}/readme_example.c CONTENT "${CMAKE_MATCH_1}\n" @ONLY)
+
+add_executable(readme-example ${PROJECT_BINARY_DIR}/readme_example.c)
+flvdmx_target(readme-example)
+target_link_libraries(readme-example PRIVATE flvdmx)
+add_test(NAME ${FLVDMX_TEST_PREFIX}readme_example
+    COMMAND readme-example ${PROJECT_SOURCE_DIR}/tests/data/avc_aac.flv)
+set_tests_properties(${FLVDMX_TEST_PREFIX}readme_example PROPERTIES PASS_REGULAR_EXPRESSION "[1-9][0-9]* frames")
