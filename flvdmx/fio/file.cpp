@@ -15,6 +15,7 @@ namespace {
 constexpr uint32_t FIO_ACCESS_MASK = 0x71;
 constexpr uint32_t FIO_FORMAT_MASK = 0x300;
 constexpr uint32_t FIO_SKIP_FAILED = 0xFFFFFFFF;
+constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62;
 constexpr size_t FIO_MODE_TEXT_MAX = 4; // "r+b" and its NUL
 
 struct fio_access_t {
@@ -49,20 +50,31 @@ bool FLVD_FioModeText(uint32_t mode, char (&text)[FIO_MODE_TEXT_MAX])
     return true;
 }
 
-// The object and its cache around an open handle, or null; nothing stays allocated then.
+// A cache of this size, or null, also when the sum does not fit 32 bits.
+uint8_t* FLVD_FioAllocateCache(uint32_t cache_size, uint32_t extra)
+{
+    if (extra > UINT32_MAX - cache_size)
+        return nullptr;
+    return static_cast<uint8_t*>(g_flvd_fioFuncs.mem_alloc(cache_size + extra));
+}
+
+// The object and its cache around an open handle. Without memory the handle is closed and null returned.
 fio_file_t* FLVD_FioCreate(void* handle, uint32_t cache_size, uint32_t extra)
 {
     auto* const file = static_cast<fio_file_t*>(g_flvd_fioFuncs.mem_alloc(sizeof(fio_file_t)));
-    if (file == nullptr)
+    if (file == nullptr) {
+        g_flvd_fioFuncs.file_close(handle);
         return nullptr;
-    *file = fio_file_t{};
-    if (extra <= UINT32_MAX - cache_size)
-        file->cache = static_cast<uint8_t*>(g_flvd_fioFuncs.mem_alloc(cache_size + extra));
-    if (file->cache == nullptr) {
+    }
+    uint8_t* const cache = FLVD_FioAllocateCache(cache_size, extra);
+    if (cache == nullptr) {
+        g_flvd_fioFuncs.file_close(handle);
         g_flvd_fioFuncs.mem_free(file);
         return nullptr;
     }
+    *file = fio_file_t{};
     file->handle = handle;
+    file->cache = cache;
     file->state = FIO_STATE_IDLE;
     file->read_size = cache_size;
     file->capacity = cache_size;
@@ -70,12 +82,15 @@ fio_file_t* FLVD_FioCreate(void* handle, uint32_t cache_size, uint32_t extra)
     return file;
 }
 
-// Logical position from the host's. A failed query stays negative whatever is pending.
+// Logical position from the host's. A failed query stays negative whatever is pending, and a position that no file can
+// have is a failed query: adding sizes to positions never overflows.
 int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
 {
     const uint64_t count = file->count;
     const uint64_t moved = static_cast<uint64_t>(host) + (file->state == FIO_STATE_READ ? 0 - count : count);
     const auto position = static_cast<int64_t>(moved);
+    if (host > FIO_POSITION_MAX)
+        return -1;
     return host < 0 && position >= 0 ? host : position;
 }
 
@@ -119,11 +134,8 @@ fio_file_t* __FLV_DMX__fioOpen(const char* path, uint32_t mode, uint32_t cache_s
     if (handle == nullptr)
         return nullptr;
     fio_file_t* const file = FLVD_FioCreate(handle, cache_size, overread != 0 ? overread_extra : 0);
-    if (file == nullptr) {
-        g_flvd_fioFuncs.file_close(handle);
-        return nullptr;
-    }
-    file->overread = overread;
+    if (file != nullptr)
+        file->overread = overread;
     return file;
 }
 
