@@ -65,6 +65,7 @@ void* Open(const char* path, const char* mode)
         return nullptr;
     }
     std::setvbuf(file, nullptr, _IONBF, 0);
+    openError = 0;
     return file;
 }
 

@@ -26,7 +26,7 @@ extern "C" {
  */
 void flvd_stdio_host_fill(flvd_init_t* init);
 
-/** @return errno of the newest open that failed on this thread (EISDIR for a directory), 0 when none has failed */
+/** @return errno of this thread's newest open (EISDIR for a directory), 0 when it worked */
 int flvd_stdio_host_open_error(void);
 
 #ifdef __cplusplus

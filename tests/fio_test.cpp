@@ -359,7 +359,7 @@ TEST(FioRead, TakesTheCachedBytesThenTheCheapestWay)
         uint32_t total;
         const char* host_calls;
         uint32_t held;   // cached bytes afterwards
-        uint64_t copies; // out of the cache
+        uint32_t copies; // out of the cache
     };
     const ReadCase cases[] = {
         {"less than cached", 20, 32, 19, "", 1, 1},
@@ -592,9 +592,11 @@ protected:
     {
         const uint32_t size = m_limit == UINT32_MAX ? 1 + below(3) : 1;
         const uint32_t count = below(m_cache + 20);
+        const uint32_t total = size * count;
+        const auto there = static_cast<uint32_t>(std::min<int64_t>(total, left()));
         const Bytes got = file.read(size, count);
-        check(got, static_cast<uint32_t>(std::min<int64_t>(size * count, left()) / size * size), UINT32_MAX);
-        m_pos += std::min<int64_t>(size == 1 ? static_cast<int64_t>(got.size()) : size * count, left());
+        check(got, there / size * size, UINT32_MAX);
+        m_pos += size == 1 ? static_cast<int64_t>(got.size()) : there; // a part of an element is consumed too
     }
     void skip(const Cached& file)
     {
@@ -606,8 +608,7 @@ protected:
     {
         const auto target = static_cast<int64_t>(below(FILE_SIZE + 20));
         const int64_t bases[] = {0, m_pos, static_cast<int64_t>(m_model.size())};
-        // Not from the end while bytes that belong behind it may be pending.
-        const auto whence = static_cast<int32_t>(below(file->state == FIO_STATE_WRITE ? 2 : 3));
+        const auto whence = static_cast<int32_t>(below(3));
         const int64_t offset = target - bases[whence];
         ASSERT_EQ(below(2) != 0 ? file.seek64(offset, whence) : file.seek(static_cast<int32_t>(offset), whence), 0);
         m_pos = target;
@@ -710,7 +711,7 @@ TEST(BitReader, CountsAByteAsConsumedWithItsFirstBit)
 
     const struct {
         uint32_t bits;
-        int64_t pos;
+        int32_t pos;
         uint32_t next;
     } cases[] = {{40, 5, 0xFF}, {44, 6, 0xFF}, {52, 7, 0x00}, {33, 5, 0xFF}, {64, 8, 0}, {32, 4, 0xFF}};
     for (const auto& c : cases) {

@@ -62,7 +62,24 @@ def milliseconds(text):
     return round((int(hours) * 3600 + int(minutes) * 60 + float(seconds)) * 1000)
 
 
+def split_tags(data):
+    """The file header, and each tag with its back-pointer."""
+    header, position, tags = data[:13], 13, []
+    while position < len(data):
+        end = position + 15 + int.from_bytes(data[position + 1:position + 4], "big")
+        tags.append(data[position:end])
+        position = end
+    return header, tags
+
+
 class Case(unittest.TestCase):
+    def write(self, name, data):
+        folder = tempfile.TemporaryDirectory()
+        self.addCleanup(folder.cleanup)
+        path = pathlib.Path(folder.name) / name
+        path.write_bytes(data)
+        return path
+
     def succeed(self, *arguments, stderr=""):
         result = run(*arguments)
         self.assertEqual((result.returncode, result.stderr), (0, stderr))
@@ -111,6 +128,26 @@ class Frames(Case):
                 (["--from", "1.5", "--to", "0:00:01.75"], [f for f in frames[start[2]:] if f[1] <= 1750])):
             with self.subTest(arguments):
                 self.assertEqual(json_frames(self.succeed("frames", "--json", sample("avc_aac"), *arguments)), wanted)
+
+
+    def test_streams_that_are_not_interleaved(self):
+        header, tags = split_tags(pathlib.Path(sample("avc_aac")).read_bytes())
+        path = self.write("apart.flv", header + b"".join(sorted(tags, key=lambda tag: -tag[0])))  # script, video, audio
+        expected = Expected("avc_aac")
+        first = expected.keyframes[0][0]  # probing ends at the audio configuration and has seen only pictures by then
+        frames = [(kind, time_ms - first, size, crc) for kind, time_ms, size, crc in expected.frames]
+        apart = [f for f in frames if f[0] == "video"] + [f for f in frames if f[0] == "audio"]
+        self.assertLess(min(apart, key=lambda f: f[1])[1], 0)
+        for arguments, wanted in (([], apart), (["--to", "0.5"], [f for f in apart if f[1] <= 500]),
+                                  (["--separate-audio"], sorted(apart, key=lambda f: f[1]))):
+            with self.subTest(arguments):
+                self.assertEqual(json_frames(self.succeed("frames", "--json", path, *arguments)), wanted)
+
+    def test_more_unplayed_tags_than_one_request_passes(self):
+        header, tags = split_tags(pathlib.Path(sample("avc_aac")).read_bytes())
+        config = next(tag for tag in tags if tag[0] == 9)
+        path = self.write("configs.flv", header + b"".join(tags[:40] + [config] * 250 + tags[40:]))
+        self.assertEqual(json_frames(self.succeed("frames", "--json", path)), Expected("avc_aac").frames)
 
 
 class Info(Case):
@@ -194,6 +231,13 @@ class Seek(Case):
         found, _ = self.seek("--play", len(frames), "--relative", sample("avc_aac"), "0")
         self.assertEqual(found["landed"]["time_ms"], current)
         self.assertEqual(frames_of(found["frames"]), expected.frames[150:])
+        next_picture = next(p for p in expected.packets[150:] if p["kind"] == "video")
+        self.assertEqual((found["landed"]["keyframe"], next_picture["key"]), (False, "0"))
+
+    def test_times(self):
+        for text, time_ms in (("1.0226", 1023), ("1.9996", 2000), ("0:01.5", 1500), ("0:0:1", 1000), ("00:00:01.25", 1250),
+                              ("+1", 1000), ("90", 90000), ("1:30", 90000), ("01:00:02.003", 3602003)):
+            self.assertEqual(self.seek(sample("avc_aac"), text)[0]["time_ms"], time_ms, text)
 
     def test_misses_in_words(self):
         last_keyframe = Expected("avc_aac").keyframes[-1]
@@ -219,24 +263,16 @@ class Seek(Case):
 
 
 class Failures(Case):
-    def setUp(self):
-        self.folder = tempfile.TemporaryDirectory()
-        self.addCleanup(self.folder.cleanup)
-
-    def write(self, name, data):
-        path = pathlib.Path(self.folder.name) / name
-        path.write_bytes(data)
-        return path
-
     def test_unusable_files(self):
         header = b"FLV\x01\x05\x00\x00\x00\x09"
+        folder = self.write("any", b"").parent
         for path, words in (
-                (pathlib.Path(self.folder.name) / "missing.flv", "No such file or directory (code -5, line 2386)"),
-                (self.folder.name, "Is a directory (code -5, line 2386)"),
+                (folder / "missing.flv", "No such file or directory (code -5, line 2386)"),
+                (folder, "Is a directory (code -5, line 2386)"),
                 (self.write("empty.flv", b""), "the file is empty (code -1004, line 2423)"),
                 (self.write("tiny.flv", b"FLV\x01\x05"), "damaged or cut short (the file has 5 bytes) (code -1004"),
                 (self.write("text.flv", b"no video here\n" * 9), "this is not an FLV file (code -1004, line 2423)"),
-                (self.write("offset.flv", header + bytes(2)[:0]), "damaged or cut short (the file has 9 bytes)"),
+                (self.write("bare.flv", header), "damaged or cut short (the file has 9 bytes)"),
                 (self.write("header.flv", header + bytes(4)), "neither a video nor an audio stream was found (code -1002"),
                 ("/dev/null", "a pipe or device")):
             for arguments in (["info"], ["info", "--json"], ["frames"], ["frames", "--json"], ["seek", "--json"]):
@@ -374,7 +410,7 @@ class Follow(Case):
 
     def test_writer_that_stops(self):
         data = pathlib.Path(sample("avc_aac")).read_bytes()
-        for size, code, words in ((len(data) // 2 + 3, 0, r"warning: the last \d+ bytes hold no whole tag"),
+        for size, code, words in ((len(data) // 2 + 3, 0, r"warning: the last \d+ bytes hold no whole frame"),
                                   (8, 1, "damaged or cut short"), (30, 1, "stream was found|ends too early")):
             with self.subTest(size):
                 frames, found_code, stderr = self.follow(data[:size], "--timeout", "0.3")

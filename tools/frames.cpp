@@ -167,7 +167,7 @@ void WarnOfRest(const Demuxer& demuxer, const Growth& growth)
     const int64_t rest =
         growth.Size() - std::max(demuxer.Position(FLVD_STREAM_VIDEO), demuxer.Position(FLVD_STREAM_AUDIO));
     if (rest > 0)
-        Complain(demuxer.Path(), fmt::format("warning: the last {} bytes hold no whole tag", rest));
+        Complain(demuxer.Path(), fmt::format("warning: the last {} bytes hold no whole frame", rest));
 }
 
 void PrintGrowing(const FramesOptions& options)

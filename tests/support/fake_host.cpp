@@ -341,6 +341,8 @@ void FakeHost::release(void* memory)
         violation("release of memory that is not held");
         return;
     }
+    if (on_release)
+        on_release(memory, block->second);
     std::memset(memory, RELEASED_MEMORY, block->second);
     m_blocks.erase(block);
     std::free(memory);

@@ -78,6 +78,8 @@ public:
     void allow_huge_allocations() { m_allow_huge = true; }
     /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
+    /** Called with every block that is given back, while it still holds what it held. */
+    std::function<void(const void* block, uint32_t size)> on_release;
 
     /* -- what happened */
 
