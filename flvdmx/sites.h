@@ -1,5 +1,6 @@
-// Every place where a failure is recorded: its code and its line, a number fixed for all releases. The names stand
-// in the order in which a host meets the operations.
+// Places where a failure is recorded: a code and a line, a number fixed for all releases. Places that variants of one
+// algorithm have in common, each at lines of its own, stand in tables beside that algorithm (frame.cpp, frame_seek.cpp,
+// time_seek.cpp); all others are here, in the order in which a host meets the operations.
 #ifndef FLVDMX_SITES_H
 #define FLVDMX_SITES_H
 

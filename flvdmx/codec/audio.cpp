@@ -3,6 +3,7 @@
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
 #include "flvdmx/fio/bytes.h"
+#include "flvdmx/format.h"
 #include "flvdmx/sites.h"
 
 #include <algorithm>
@@ -13,13 +14,7 @@ namespace {
 // How much of the tag is looked at.
 constexpr uint32_t FLVD_AUDIO_PEEK = 12;
 constexpr uint32_t FLVD_AAC_PEEK = 13;
-constexpr uint32_t FLVD_MP3_PEEK = 16;       // tag header, audio byte and one MPEG frame header
-constexpr uint32_t FLVD_AAC_CODEC_BYTES = 2; // audio byte and packet type
-
-// SoundFormat.
-constexpr uint32_t FLVD_FORMAT_MP3 = 2;
-constexpr uint32_t FLVD_FORMAT_AAC = 10;
-constexpr uint32_t FLVD_FORMAT_MP3_8KHZ = 14;
+constexpr uint32_t FLVD_MP3_PEEK = 16; // tag header, audio byte and one MPEG frame header
 
 constexpr uint32_t FLVD_SAMPLE_BITS = 16; // whatever SoundSize says: it is the size after decoding
 
@@ -138,6 +133,8 @@ bool FLVD_ReadMpegHeader(const uint8_t* p, flvd_audio_info_t* info)
 
 int32_t FLVD_ParseMpegAudioHeader(const uint8_t* data, int32_t length, flvd_audio_info_t* info)
 {
+    if (length < FLVD_MPEG_HEADER_SIZE)
+        return -1;
     for (int32_t p = 0; p <= length - FLVD_MPEG_HEADER_SIZE; ++p)
         if (FLVD_ReadMpegHeader(data + p, info))
             return 0;
@@ -163,7 +160,7 @@ int32_t FLVD_ProbeAacConfig(flvd_ctx_t* ctx, uint32_t data_size)
     const uint32_t size = data_size + FLVD_CODEC_BYTE;
     if (__FLV_DMX__fioShowBytesByPtr(&tag, size, ctx->cur_reader) < size)
         return FLVD_FailShort(ctx, FLVD_SITE_AAC_DATA);
-    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AAC_CODEC_BYTES))
+    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AAC_HEADER_SIZE))
         return FLVD_Fail(ctx, FLVD_SITE_AAC_MEMORY);
     FLVD_ParseAudioSpecificConfig(info.config, info.config_size, &info);
     return 0;
@@ -174,7 +171,7 @@ int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
     const uint8_t* tag = nullptr;
     if (__FLV_DMX__fioShowBytesByPtr(&tag, FLVD_AAC_PEEK, ctx->cur_reader) < FLVD_AAC_PEEK)
         return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
-    const bool sequence_header = tag[FLVD_PACKET_TYPE] == 0;
+    const bool sequence_header = tag[FLVD_PACKET_TYPE] == FLVD_PACKET_SEQUENCE_HEADER;
     const int32_t result = sequence_header ? FLVD_ProbeAacConfig(ctx, FLVD_GetBE24(tag + FLVD_DATA_SIZE_FIELD)) : 0;
     if (result == 0)
         ctx->audio_info.format_tag = FLVD_AUDIO_TAG_AAC;
@@ -184,11 +181,11 @@ int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 int32_t FLVD_ProbeSoundFormat(flvd_ctx_t* ctx, uint32_t format)
 {
     switch (format) {
-    case FLVD_FORMAT_MP3:
+    case FLVD_SOUND_MP3:
         return FLVD_ProbeMp3(ctx, format, FLVD_SITE_MP3_DATA, FLVD_SITE_MP3_HEADER);
-    case FLVD_FORMAT_MP3_8KHZ:
+    case FLVD_SOUND_MP3_8KHZ:
         return FLVD_ProbeMp3(ctx, format, FLVD_SITE_MP3_8KHZ_DATA, FLVD_SITE_MP3_8KHZ_HEADER);
-    case FLVD_FORMAT_AAC:
+    case FLVD_SOUND_AAC:
         return FLVD_ProbeAac(ctx);
     default:
         ctx->audio_info.format_tag = 0;
@@ -201,11 +198,11 @@ int32_t FLVD_ProbeSoundFormat(flvd_ctx_t* ctx, uint32_t format)
 int32_t FLVD_ParseAudioHeader(int32_t format, const uint8_t* data, int32_t length, flvd_audio_info_t* info)
 {
     switch (format) {
-    case FLVD_FORMAT_AAC:
+    case FLVD_SOUND_AAC:
         FLVD_ParseAudioSpecificConfig(data, static_cast<uint32_t>(std::max(length, 0)), info);
         return 0;
-    case FLVD_FORMAT_MP3:
-    case FLVD_FORMAT_MP3_8KHZ:
+    case FLVD_SOUND_MP3:
+    case FLVD_SOUND_MP3_8KHZ:
         return FLVD_ParseMpegAudioHeader(data, length, info);
     default:
         return -1;
@@ -223,7 +220,7 @@ int32_t FLVD_ProbeAudioTag(flvd_ctx_t* ctx)
     info.sample_rate = g_flvd_soundRate[audio_byte >> 2u & 3u];
     info.sample_size = FLVD_SAMPLE_BITS;
     info.channels = (audio_byte & 1u) != 0 ? 2 : 1;
-    const int32_t result = FLVD_ProbeSoundFormat(ctx, audio_byte >> 4u);
+    const int32_t result = FLVD_ProbeSoundFormat(ctx, uint32_t{audio_byte} >> FLVD_SOUND_FORMAT_SHIFT);
     if (result == 0)
         info.reserved2 = 0;
     return result;

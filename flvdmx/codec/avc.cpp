@@ -69,7 +69,7 @@ struct flvd_sps_bits_t {
     const uint8_t* start; // payload behind the NAL header byte
 };
 flvd_sps_bits_t g_flvd_spsBits;
-int32_t g_flvd_spsSize; // bytes from start on; bits behind them read as 0
+int32_t g_flvd_spsSize; // bytes from start on, set with it; bits behind them read as 0
 
 uint32_t FLVD_SpsByte(int32_t index)
 {
@@ -198,7 +198,7 @@ int32_t FLVD_FindSps(const uint8_t* data, int32_t length)
 
 int32_t FLVD_GetAVCSeqHeaderFromAvcC(const uint8_t* record, int32_t length, uint8_t* out, int32_t capacity)
 {
-    if (length < FLVD_AVCC_MIN || record[0] != FLVD_AVCC_VERSION)
+    if (length < FLVD_AVCC_MIN || record[0] != FLVD_AVCC_VERSION || capacity < 0)
         return 0;
     constexpr int32_t sets = FLVD_AVCC_SPS_COUNT + 1;
     flvd_avcc_t avcc = {record + sets, length - sets, out, capacity};

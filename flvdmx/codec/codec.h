@@ -4,11 +4,6 @@
 
 #include "flvdmx/flvdmx.h"
 
-// Bytes of a media tag, counted from its header.
-constexpr uint32_t FLVD_DATA_SIZE_FIELD = 1; // 24 bits
-constexpr uint32_t FLVD_CODEC_BYTE = 11;     // the audio or video tag header byte, where DataSize begins to count
-constexpr uint32_t FLVD_PACKET_TYPE = 12;    // AACPacketType or AVCPacketType
-
 // Describe the stream whose first tag the current reader stands on. They peek only. They may run again on another tag
 // when one failed. 0; FLVD_ERR_END_OF_DATA when the tag is cut short; -1 on any other failure, error and error_line
 // being set in both cases.

@@ -3,6 +3,7 @@
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
 #include "flvdmx/fio/bytes.h"
+#include "flvdmx/format.h"
 #include "flvdmx/sites.h"
 
 #include <cstring>
@@ -12,19 +13,7 @@ namespace {
 
 constexpr uint32_t FLVD_VIDEO_PAYLOAD = FLVD_CODEC_BYTE + 1; // codecs without a packet type
 constexpr uint32_t FLVD_VIDEO_PEEK = 13;
-constexpr uint32_t FLVD_PICTURE_PEEK = 128;  // as much of the tag as a picture header is looked for in
-constexpr uint32_t FLVD_AVC_CODEC_BYTES = 5; // video byte, packet type, composition time
-
-// CodecID.
-enum : uint32_t {
-    FLVD_CODEC_JPEG = 1,
-    FLVD_CODEC_H263 = 2,
-    FLVD_CODEC_SCREEN = 3,
-    FLVD_CODEC_VP6 = 4,
-    FLVD_CODEC_VP6_ALPHA = 5,
-    FLVD_CODEC_SCREEN2 = 6,
-    FLVD_CODEC_AVC = 7
-};
+constexpr uint32_t FLVD_PICTURE_PEEK = 128; // as much of the tag as a picture header is looked for in
 
 constexpr int32_t FLVD_VIDEO_HEADER_MIN = 8; // less is no header of any codec
 constexpr int32_t FLVD_AVC_OUT_CAPACITY = 128;
@@ -119,11 +108,11 @@ int32_t FLVD_ProbeAvc(flvd_ctx_t* ctx, uint32_t data_size)
     const uint32_t size = data_size + FLVD_CODEC_BYTE;
     if (__FLV_DMX__fioShowBytesByPtr(&tag, size, ctx->cur_reader) < size)
         return FLVD_FailShort(ctx, FLVD_SITE_AVC_DATA);
-    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AVC_CODEC_BYTES))
+    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AVC_HEADER_SIZE))
         return FLVD_Fail(ctx, FLVD_SITE_AVC_MEMORY);
     uint8_t parameters[FLVD_AVC_OUT_CAPACITY];
-    const int32_t length = FLVD_GetAVCSeqHeaderFromAvcC(info.config, static_cast<int32_t>(info.config_size), parameters,
-                                                        FLVD_AVC_OUT_CAPACITY); // DataSize has 24 bits
+    const auto record_size = static_cast<int32_t>(info.config_size); // below DataSize, which has 24 bits
+    const int32_t length = FLVD_GetAVCSeqHeaderFromAvcC(info.config, record_size, parameters, FLVD_AVC_OUT_CAPACITY);
     if (length <= 0)
         return FLVD_Fail(ctx, FLVD_SITE_AVC_CONFIG);
     if (FLVD_ParseVideoHeader(FLVD_CODEC_AVC, parameters, length, &info) != 0)
@@ -151,7 +140,8 @@ int32_t FLVD_ProbeCodec(flvd_ctx_t* ctx, uint32_t codec, uint32_t packet_type, u
     case FLVD_CODEC_VP6_ALPHA:
         return FLVD_ProbePicture(ctx, codec, "VP6A", FLVD_SITE_VP6A_DATA, FLVD_SITE_VP6A_HEADER);
     case FLVD_CODEC_AVC:
-        return packet_type == 0 ? FLVD_ProbeAvc(ctx, data_size) : FLVD_Fail(ctx, FLVD_SITE_AVC_NO_SEQ_HEADER);
+        return packet_type == FLVD_PACKET_SEQUENCE_HEADER ? FLVD_ProbeAvc(ctx, data_size)
+                                                          : FLVD_Fail(ctx, FLVD_SITE_AVC_NO_SEQ_HEADER);
     default:
         FLVD_SetFourcc(ctx, "\0\0\0");
         return 0;
@@ -184,5 +174,6 @@ int32_t FLVD_ProbeVideoTag(flvd_ctx_t* ctx)
         return FLVD_FailShort(ctx, FLVD_SITE_VIDEO_TAG);
     const uint8_t video_byte = tag[FLVD_CODEC_BYTE];
     ctx->video_codec_filter = video_byte;
-    return FLVD_ProbeCodec(ctx, video_byte & 0x0Fu, tag[FLVD_PACKET_TYPE], FLVD_GetBE24(tag + FLVD_DATA_SIZE_FIELD));
+    return FLVD_ProbeCodec(ctx, video_byte & FLVD_CODEC_ID_MASK, tag[FLVD_PACKET_TYPE],
+                           FLVD_GetBE24(tag + FLVD_DATA_SIZE_FIELD));
 }

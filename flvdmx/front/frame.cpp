@@ -13,10 +13,6 @@ namespace {
 constexpr uint32_t FLVD_FRAME_BUFFER_STEP = 16384; // the frame buffer grows to multiples of it
 constexpr uint32_t FLVD_PAYLOAD_PEEK = 2;          // codec byte and packet type
 
-constexpr uint32_t FLVD_AVC_HEADER = 5;   // codec byte, AVCPacketType, CompositionTime
-constexpr uint32_t FLVD_AAC_HEADER = 2;   // codec byte, AACPacketType
-constexpr uint32_t FLVD_CODEC_HEADER = 1; // codec byte
-
 // Failures that the two variants record at lines of their own.
 struct flvd_frame_sites_t {
     flvd_site_t info_only;
@@ -81,14 +77,13 @@ flvd_payload_t FLVD_Classify(uint32_t tag_type, const uint8_t* payload)
 {
     const uint8_t packet_type = payload[1];
     if (tag_type == FLVD_TAG_TYPE_VIDEO) {
-        if ((payload[0] & 0x0Fu) != FLVD_CODEC_ID_AVC)
-            return {&g_flvd_videoSites, FLVD_CODEC_HEADER};
-        const bool config = packet_type == FLVD_PACKET_SEQUENCE_HEADER || packet_type == FLVD_PACKET_END_OF_SEQUENCE;
-        return {&g_flvd_videoSites, config ? 0 : FLVD_AVC_HEADER};
+        if ((payload[0] & FLVD_CODEC_ID_MASK) != FLVD_CODEC_AVC)
+            return {&g_flvd_videoSites, FLVD_CODEC_HEADER_SIZE};
+        return {&g_flvd_videoSites, FLVD_IsPicturelessPacket(packet_type) ? 0 : FLVD_AVC_HEADER_SIZE};
     }
-    if (payload[0] >> 4u != FLVD_SOUND_FORMAT_AAC)
-        return {&g_flvd_soundSites, FLVD_CODEC_HEADER};
-    return {&g_flvd_aacSites, packet_type == FLVD_PACKET_SEQUENCE_HEADER ? 0 : FLVD_AAC_HEADER};
+    if (uint32_t{payload[0]} >> FLVD_SOUND_FORMAT_SHIFT != FLVD_SOUND_AAC)
+        return {&g_flvd_soundSites, FLVD_CODEC_HEADER_SIZE};
+    return {&g_flvd_aacSites, packet_type == FLVD_PACKET_SEQUENCE_HEADER ? 0 : FLVD_AAC_HEADER_SIZE};
 }
 
 FlvdTurn FLVD_FailRequest(const flvd_delivery_t& delivery, flvd_site_t site)
@@ -201,7 +196,7 @@ FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
         return FLVD_FailRequest(*delivery, delivery->sites->end);
     if (FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 1) == 0)
         return FLVD_HandleTag(*delivery, frame);
-    const uint32_t skipped = __FLV_DMX__fioSkipBytes(delivery->tag.data_size + FLVD_TAG_FRAME_SIZE, delivery->reader);
+    const uint32_t skipped = __FLV_DMX__fioSkipBytes(delivery->tag.data_size + FLVD_TAG_OVERHEAD, delivery->reader);
     return skipped != 0 ? FlvdTurn::Next : FLVD_FailRequest(*delivery, delivery->sites->end);
 }
 
@@ -232,7 +227,7 @@ FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
         return FLVD_HandleTag(*delivery, frame);
     if (result == FLVD_ERR_END_OF_DATA)
         return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_END);
-    const int64_t size = int64_t{delivery->tag.data_size} + FLVD_TAG_FRAME_SIZE;
+    const int64_t size = int64_t{delivery->tag.data_size} + FLVD_TAG_OVERHEAD;
     if (__FLV_DMX__fioSeek64(delivery->reader, size, FIO_SEEK_CUR) != 0)
         return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_SKIP);
     return FlvdTurn::Next;

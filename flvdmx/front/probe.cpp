@@ -97,7 +97,7 @@ bool FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_t
     if (FLVD_ProbeTag(ctx, probing, tag.type) == FLVD_ERR_END_OF_DATA)
         return false;
     probing->first_ts = std::min(probing->first_ts, tag.timestamp);
-    return __FLV_DMX__fioSeek64(ctx->cur_reader, int64_t{tag.data_size} + FLVD_TAG_FRAME_SIZE, FIO_SEEK_CUR) == 0;
+    return __FLV_DMX__fioSeek64(ctx->cur_reader, int64_t{tag.data_size} + FLVD_TAG_OVERHEAD, FIO_SEEK_CUR) == 0;
 }
 
 bool FLVD_ProbeGrowingTags(flvd_ctx_t* ctx, flvd_probing_t* probing, flvd_site_t* site)

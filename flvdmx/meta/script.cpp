@@ -21,6 +21,8 @@ constexpr uint32_t FLVD_META_END_SIZE = 3;   // 00 00 09
 constexpr uint32_t FLVD_META_END = 0x000009;
 constexpr uint32_t FLVD_META_ARRAY_HEADER = 5; // type marker and count
 
+constexpr double FLVD_META_FRAME_RATE_UNIT = 1000.0; // frame_rate counts thousandths of a frame a second
+
 // Flags of a parse.
 constexpr uint32_t FLVD_META_IN_KEYFRAMES = 0x10;
 constexpr uint32_t FLVD_META_TIMES_SEEN = 0x20;
@@ -65,7 +67,7 @@ struct flvd_meta_key_t {
     const char* name;
 };
 
-// Sorted by length.
+// Sorted by length; the last entry ends every search.
 constexpr flvd_meta_key_t g_flvd_metaKeyTable[] = {
     {5, "times"},
     {5, "width"},
@@ -99,7 +101,7 @@ constexpr flvd_meta_first_t FLVD_MetaFirstKeys()
     flvd_meta_first_t first = {};
     for (uint32_t length = 0; length <= FLVD_META_KEY_LENGTH_MAX; ++length) {
         uint8_t index = 0;
-        while (g_flvd_metaKeyTable[index].length != length && index < FLVD_META_KEY_NONE)
+        while (index < FLVD_META_KEY_NONE && g_flvd_metaKeyTable[index].length != length)
             ++index;
         first.index[length] = index;
     }
@@ -180,7 +182,7 @@ uint32_t FLVD_FindKey(const uint8_t* key, uint32_t length)
     if (length > FLVD_META_KEY_LENGTH_MAX)
         return FLVD_META_KEY_NONE;
     uint32_t index = g_flvd_metaFirstKey.index[length];
-    for (; g_flvd_metaKeyTable[index].length == length && index < FLVD_META_KEY_NONE; ++index)
+    for (; g_flvd_metaKeyTable[index].length == length; ++index)
         if (std::memcmp(key, g_flvd_metaKeyTable[index].name, length + 1) == 0)
             return index;
     return FLVD_META_KEY_NONE;
@@ -228,7 +230,7 @@ void FLVD_AssignPendingKey(flvd_ctx_t* ctx, flvd_script_state_t* state)
         FLVD_AssignFileSize(ctx, FLVD_DoubleToU32(number));
         break;
     case FLVD_META_KEY_FRAMERATE:
-        ctx->video_info.frame_rate = FLVD_DoubleToU32(number * 1000.0); // thousandths of a frame a second
+        ctx->video_info.frame_rate = FLVD_DoubleToU32(number * FLVD_META_FRAME_RATE_UNIT);
         break;
     case FLVD_META_KEY_AUDIODELAY:
         ctx->audio_delay_ms = FLVD_SecondsToMs(number);
@@ -268,7 +270,8 @@ void FLVD_NoteArray(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t seen, 
     state->array_count = 0;
 }
 
-// What meeting a key does before its value is parsed.
+// What meeting a key does before its value is parsed. An unknown key inside a known property ends it: the property
+// takes the number parsed last.
 void FLVD_MeetKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t key)
 {
     if (key == FLVD_META_KEY_NONE) {
@@ -382,6 +385,23 @@ void FLVD_StoreElement(flvd_ctx_t* ctx, const flvd_script_state_t* state, uint32
         arrays.positions[index] = FLVD_DoubleToI64(FLVD_SlotNumber(state));
 }
 
+// Begins the keyframe array that the pending property asks for. Returns its key, or none when nothing is to be kept.
+uint32_t FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, const flvd_script_state_t* state, uint32_t count)
+{
+    flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
+    if (!FLVD_KeepsIndex(ctx))
+        return FLVD_META_KEY_NONE;
+    if (state->pending_key == FLVD_META_KEY_TIMES) {
+        FLVD_ReplaceArray(state, count, &arrays.times_count, &arrays.times_ms);
+        return arrays.times_ms != nullptr ? FLVD_META_KEY_TIMES : FLVD_META_KEY_NONE;
+    }
+    if (state->pending_key == FLVD_META_KEY_FILEPOSITIONS) {
+        FLVD_ReplaceArray(state, count, &arrays.positions_count, &arrays.positions);
+        return arrays.positions != nullptr ? FLVD_META_KEY_FILEPOSITIONS : FLVD_META_KEY_NONE;
+    }
+    return FLVD_META_KEY_NONE;
+}
+
 int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 4);
@@ -390,12 +410,7 @@ int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
     const uint32_t count = FLVD_GetBE32(bytes);
     FLVD_ScriptSkip(ctx, state, 4);
     state->array_count = count;
-    flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
-    const uint32_t key = FLVD_KeepsIndex(ctx) ? state->pending_key : uint32_t{FLVD_META_KEY_NONE};
-    if (key == FLVD_META_KEY_TIMES)
-        FLVD_ReplaceArray(state, count, &arrays.times_count, &arrays.times_ms);
-    else if (key == FLVD_META_KEY_FILEPOSITIONS)
-        FLVD_ReplaceArray(state, count, &arrays.positions_count, &arrays.positions);
+    const uint32_t key = FLVD_BeginKeyframeArray(ctx, state, count);
     uint32_t size = FLVD_META_ARRAY_HEADER;
     for (uint32_t i = 0; i < count; ++i) {
         const int32_t element = FLVD_ParseScriptValue(ctx, state);
@@ -422,7 +437,8 @@ bool FLVD_PassEndMarker(flvd_ctx_t* ctx, flvd_script_state_t* state, bool* passe
     return true;
 }
 
-// Reads a key of this length and does what meeting it does. A long one cannot be known.
+// Reads a key of this length and does what meeting it does. One too long to be known is not met at all: it leaves the
+// pending property as it is.
 bool FLVD_ParseKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
 {
     if (length > FLVD_META_SCRATCH_TEXT)

@@ -57,8 +57,7 @@ int32_t FLVD_Rewind(const flvd_scan_t* scan)
 // True on an AVC tag that carries no picture.
 bool FLVD_IsPictureless(const flvd_tag_header_t& header)
 {
-    return header.IsVideo() && header.IsAvc() &&
-           (header.second == FLVD_PACKET_SEQUENCE_HEADER || header.second == FLVD_PACKET_END_OF_SEQUENCE);
+    return header.IsVideo() && header.IsAvc() && FLVD_IsPicturelessPacket(header.second);
 }
 
 bool FLVD_MayStop(const flvd_scan_t* scan)

@@ -10,7 +10,7 @@
 
 namespace {
 
-// The four bytes at the position as a back-pointer in front of cursor `c`, or 0 when they cannot be one.
+// The four bytes at the cursor, where the reader stands, as a back-pointer; 0 when they cannot be one.
 int32_t FLVD_PeekBackPointer(fio_file_t* file, int64_t cursor)
 {
     const uint8_t* bytes = nullptr;

@@ -18,8 +18,9 @@ constexpr int64_t FLVD_BISECTION_END = FLVD_RESYNC_WINDOW;
 constexpr uint32_t FLVD_WALK_TAGS = 10;
 
 // Results of the last-tag search beside a position.
-constexpr int64_t FLVD_NO_LAST_TAG = 0; // none found, or a seek failed
+constexpr int64_t FLVD_NO_LAST_TAG = 0;
 constexpr int64_t FLVD_NO_POSITION = -1;
+constexpr int64_t FLVD_NO_SEEK = -2; // inside the search: ends it without a tag
 
 enum class FlvdProbe { Found, Nothing, SeekFailed };
 
@@ -37,31 +38,36 @@ FlvdProbe FLVD_ProbeBackPointer(fio_file_t* file, uint32_t max_timestamp, int64_
         return FlvdProbe::SeekFailed;
     if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_HEADER_SIZE, file) < FLVD_TAG_HEADER_SIZE)
         return FlvdProbe::Nothing;
-    const uint32_t data_size = FLVD_GetBE24(bytes + 1);
+    const uint32_t data_size = FLVD_GetBE24(bytes + FLVD_DATA_SIZE_FIELD);
     const bool agrees = data_size + FLVD_TAG_HEADER_SIZE == static_cast<uint32_t>(back);
     return agrees && FLVD_TagTimestamp(bytes) <= max_timestamp ? FlvdProbe::Found : FlvdProbe::Nothing;
 }
 
-// Tries so many cursors, from `cursor` downwards. The end of the tag found; FLVD_NO_LAST_TAG with *failed telling a
-// failed seek from cursors that led nowhere.
-int64_t FLVD_ProbeCursors(const flvd_ctx_t* ctx, int64_t cursor, uint32_t cursors, bool* failed)
+// Tries so many cursors, from `cursor` downwards. The end of the tag found, FLVD_NO_LAST_TAG or FLVD_NO_SEEK.
+int64_t FLVD_ProbeCursors(const flvd_ctx_t* ctx, int64_t cursor, uint32_t cursors)
 {
     fio_file_t* const file = ctx->cur_reader;
     const uint32_t max_timestamp = FLVD_TagRules(ctx).max_timestamp;
-    *failed = false;
     for (; cursors != 0; --cursors, --cursor) {
         const FlvdProbe probe = FLVD_ProbeBackPointer(file, max_timestamp, cursor);
         if (probe == FlvdProbe::Found)
             return cursor + FLVD_BACK_POINTER_SIZE;
-        if (probe == FlvdProbe::SeekFailed || __FLV_DMX__fioSeek64(file, cursor - 1, FIO_SEEK_SET) != 0) {
-            *failed = true;
-            return FLVD_NO_LAST_TAG;
-        }
+        if (probe == FlvdProbe::SeekFailed || __FLV_DMX__fioSeek64(file, cursor - 1, FIO_SEEK_SET) != 0)
+            return FLVD_NO_SEEK;
     }
     return FLVD_NO_LAST_TAG;
 }
 
-// Halves the file until the end of its valid data lies within the last MiB before the result. -1: a seek failed.
+// Moves by a seek and tries so many cursors from there downwards. Results as above, or FLVD_NO_POSITION.
+int64_t FLVD_ProbeFrom(const flvd_ctx_t* ctx, int64_t offset, int32_t whence, uint32_t cursors)
+{
+    if (__FLV_DMX__fioSeek64(ctx->cur_reader, offset, whence) != 0)
+        return FLVD_NO_SEEK;
+    const int64_t cursor = __FLV_DMX__fioTell64(ctx->cur_reader);
+    return cursor < 0 ? FLVD_NO_POSITION : FLVD_ProbeCursors(ctx, cursor, cursors);
+}
+
+// Halves the file until the end of its valid data lies within the last MiB before the result, or FLVD_NO_SEEK.
 int64_t FLVD_Bisect(flvd_ctx_t* ctx)
 {
     fio_file_t* const file = ctx->cur_reader;
@@ -70,7 +76,7 @@ int64_t FLVD_Bisect(flvd_ctx_t* ctx)
     while (high - low > FLVD_BISECTION_END) {
         const int64_t probe = low + (high - low) / 2;
         if (__FLV_DMX__fioSeek64(file, probe, FIO_SEEK_SET) != 0)
-            return -1;
+            return FLVD_NO_SEEK;
         flvd_tag_info_t tag;
         const int32_t distance = FLVD_FindNextTag(ctx, file, FLVD_RESYNC_WINDOW);
         if (distance >= 0 && FLVD_GetCurrTagInfo(ctx, file, &tag, FLVD_TAG_MEDIA, 1) == 0)
@@ -115,25 +121,27 @@ FlvdElement FLVD_ReadElement(fio_file_t* file, double* value)
 
 // The keyframe positions in order, from memory or from the file.
 struct flvd_positions_t {
-    flvd_ctx_t* ctx;
+    fio_file_t* file;
+    const int64_t* memory; // null: from the file
     uint32_t available;
-    uint32_t read;
+    uint32_t read; // those read, the one beyond a limit included
 };
 
-flvd_positions_t FLVD_Positions(flvd_ctx_t* ctx)
+flvd_positions_t FLVD_Positions(const flvd_ctx_t* ctx)
 {
-    const bool memory = FLVD_IsIndexInMemory(ctx);
-    return {ctx, memory ? ctx->keyframe_arrays.positions_count : ctx->keyframe_index.entry_count, 0};
+    if (FLVD_IsIndexInMemory(ctx))
+        return {ctx->cur_reader, ctx->keyframe_arrays.positions, ctx->keyframe_arrays.positions_count, 0};
+    return {ctx->cur_reader, nullptr, ctx->keyframe_index.entry_count, 0};
 }
 
 FlvdElement FLVD_NextPosition(flvd_positions_t* positions, int64_t* value)
 {
-    if (FLVD_IsIndexInMemory(positions->ctx)) {
-        *value = positions->ctx->keyframe_arrays.positions[positions->read++];
+    if (positions->memory != nullptr) {
+        *value = positions->memory[positions->read++];
         return FlvdElement::Number;
     }
     double number = 0.0;
-    const FlvdElement element = FLVD_ReadElement(positions->ctx->cur_reader, &number);
+    const FlvdElement element = FLVD_ReadElement(positions->file, &number);
     if (element == FlvdElement::Number) {
         ++positions->read;
         *value = FLVD_DoubleToI64(number);
@@ -162,7 +170,7 @@ bool FLVD_ReadPositions(flvd_positions_t* positions, int64_t limit, int64_t* las
 int64_t FLVD_TagEnd(fio_file_t* file, const flvd_tag_info_t& tag)
 {
     const int64_t start = __FLV_DMX__fioTell64(file);
-    return start < 0 ? start : start + tag.data_size + FLVD_TAG_FRAME_SIZE;
+    return start < 0 ? start : start + tag.data_size + FLVD_TAG_OVERHEAD;
 }
 
 // From the tag found at the last keyframe inside the file, walks forward to the end of the last tag.
@@ -325,22 +333,14 @@ int32_t FLVD_FindEnd(flvd_ctx_t* ctx, int64_t* end)
 
 int64_t FLVD_FindLastTagEnd(flvd_ctx_t* ctx, bool quick)
 {
-    fio_file_t* const file = ctx->cur_reader;
-    const FLVD_ReadSizeGuard narrow(file, FLVD_NARROW_READ, FLVD_WHOLE_CACHE);
-    if (__FLV_DMX__fioSeek64(file, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_END) != 0)
-        return FLVD_NO_LAST_TAG;
-    const int64_t tail = __FLV_DMX__fioTell64(file);
-    if (tail < 0)
-        return FLVD_NO_POSITION;
-    bool failed = false;
-    const int64_t end = FLVD_ProbeCursors(ctx, tail, quick ? FLVD_TAIL_CURSORS_QUICK : FLVD_TAIL_CURSORS, &failed);
-    if (end != FLVD_NO_LAST_TAG || failed || quick)
-        return end;
-    const int64_t start = FLVD_Bisect(ctx);
-    if (start < 0 || __FLV_DMX__fioSeek64(file, start, FIO_SEEK_SET) != 0)
-        return FLVD_NO_LAST_TAG;
-    const int64_t cursor = __FLV_DMX__fioTell64(file);
-    return cursor < 0 ? FLVD_NO_POSITION : FLVD_ProbeCursors(ctx, cursor, FLVD_SCAN_CURSORS, &failed);
+    const FLVD_ReadSizeGuard narrow(ctx->cur_reader, FLVD_NARROW_READ, FLVD_WHOLE_CACHE);
+    const uint32_t tail = quick ? FLVD_TAIL_CURSORS_QUICK : FLVD_TAIL_CURSORS;
+    int64_t end = FLVD_ProbeFrom(ctx, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_END, tail);
+    if (end == FLVD_NO_LAST_TAG && !quick) {
+        const int64_t start = FLVD_Bisect(ctx);
+        end = start != FLVD_NO_SEEK ? FLVD_ProbeFrom(ctx, start, FIO_SEEK_SET, FLVD_SCAN_CURSORS) : FLVD_NO_SEEK;
+    }
+    return end == FLVD_NO_SEEK ? FLVD_NO_LAST_TAG : end;
 }
 
 int32_t FLVD_ProbeExtent(flvd_ctx_t* ctx, bool quick)

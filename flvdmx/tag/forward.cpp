@@ -85,14 +85,18 @@ void FLVD_Resynchronise(flvd_search_t* search)
     FLVD_ChargeScan(search, distance, search->budget);
 }
 
-// Takes the position. False when the host cannot tell it.
+// Takes the position. False when the host cannot tell it, or tells one before the last: a search only moves forward,
+// and a host that lies could send it round for ever.
 bool FLVD_TakePosition(flvd_search_t* search)
 {
-    search->position = __FLV_DMX__fioTell64(search->file);
-    return search->position >= 0;
+    const int64_t position = __FLV_DMX__fioTell64(search->file);
+    const bool taken = position >= search->position;
+    search->position = position;
+    return taken;
 }
 
-// Peeks the back-pointer behind so many bytes, moving behind them.
+// Moves behind a tag's data and looks at its back-pointer. The tag is mostly gone back to, which empties the cache, so
+// no more is read here than needed.
 bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
 {
     __FLV_DMX__fioSkipBytes(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
@@ -103,35 +107,36 @@ bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
            FLVD_IsBackPointer(bytes, tag.data_size);
 }
 
-enum class FlvdCheck { Failed, PassedInPlace, PassedBehind, FailedInPlace };
+// Outcome of a back-pointer check. In place, the reader still stands on the tag; else it stands behind the tag's data.
+struct flvd_check_t {
+    bool passed;
+    bool in_place;
+};
 
-// Back-pointer check of the tag at the position. A tag that fits the cache is looked at in place and nothing moves;
-// otherwise the reader stands behind the tag's data afterwards.
-FlvdCheck FLVD_CheckBackPointer(flvd_search_t* search, const flvd_tag_info_t& tag)
+// Back-pointer check of the tag at the position. One that fits the cache is looked at in place.
+flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_info_t& tag)
 {
     fio_file_t* const file = search->file;
     // Many muxers write a wrong size behind the first script tag, which they fill in at the end.
     const bool exempt = tag.type == FLVD_TAG_TYPE_SCRIPT && search->position <= search->rules.first_tag;
-    const uint32_t size = tag.data_size + FLVD_TAG_FRAME_SIZE;
+    const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size <= file->capacity && file->read_size == file->capacity) {
         const uint8_t* bytes = nullptr;
-        if (__FLV_DMX__fioShowBytesByPtr(&bytes, size, file) == size) {
-            const bool passed = FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, tag.data_size);
-            return passed || exempt ? FlvdCheck::PassedInPlace : FlvdCheck::FailedInPlace;
-        }
+        if (__FLV_DMX__fioShowBytesByPtr(&bytes, size, file) == size)
+            return {FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, tag.data_size) || exempt, true};
     }
-    const bool passed = FLVD_CheckBehind(file, tag);
-    return passed || exempt ? FlvdCheck::PassedBehind : FlvdCheck::Failed;
+    return {FLVD_CheckBehind(file, tag) || exempt, false};
 }
 
-// Behind a tag whose back-pointer disagrees: the search goes on one byte after the tag's start.
-bool FLVD_PassBadTag(flvd_search_t* search, FlvdCheck check)
+// Behind a tag whose back-pointer disagrees: the search goes on one byte after the tag's start. False when the reader
+// cannot be put there: no tag may be described where the reader does not stand.
+bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
 {
     const int64_t next = search->position + 1;
-    if (check == FlvdCheck::FailedInPlace)
+    if (in_place)
         __FLV_DMX__fioSkipBytes(1, search->file);
     else if (__FLV_DMX__fioSeek64(search->file, next, FIO_SEEK_SET) != 0)
-        return false; // no tag may be described where the reader does not stand
+        return false;
     FLVD_ChargeScan(search, FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW), 0);
     search->budget -= FLVD_BAD_TAG_COST;
     search->position = next;
@@ -139,19 +144,18 @@ bool FLVD_PassBadTag(flvd_search_t* search, FlvdCheck check)
 }
 
 // Behind a sound tag: the next one, with the whole budget.
-bool FLVD_PassGoodTag(flvd_search_t* search, FlvdCheck check, const flvd_tag_info_t& tag)
+bool FLVD_PassGoodTag(flvd_search_t* search, bool in_place, const flvd_tag_info_t& tag)
 {
-    const bool in_place = check == FlvdCheck::PassedInPlace;
-    __FLV_DMX__fioSkipBytes(in_place ? tag.data_size + FLVD_TAG_FRAME_SIZE : FLVD_BACK_POINTER_SIZE, search->file);
+    const int64_t start = search->position;
+    __FLV_DMX__fioSkipBytes(in_place ? tag.data_size + FLVD_TAG_OVERHEAD : FLVD_BACK_POINTER_SIZE, search->file);
     search->budget = FLVD_RESYNC_WINDOW;
-    return FLVD_TakePosition(search);
+    return FLVD_TakePosition(search) && search->position > start;
 }
 
-// Steps over the tag at the position, whatever its kind, after its back-pointer check. False: -1.
-bool FLVD_StepOver(flvd_search_t* search, FlvdCheck check, const flvd_tag_info_t& tag)
+// Steps over the checked tag, whatever its kind. False: -1.
+bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_info_t& tag)
 {
-    const bool passed = check == FlvdCheck::PassedInPlace || check == FlvdCheck::PassedBehind;
-    return passed ? FLVD_PassGoodTag(search, check, tag) : FLVD_PassBadTag(search, check);
+    return check.passed ? FLVD_PassGoodTag(search, check.in_place, tag) : FLVD_PassBadTag(search, check.in_place);
 }
 
 // Careful mode: a plausible header at the position is taken when its back-pointer agrees and its kind is wanted.
@@ -159,14 +163,11 @@ int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header
 {
     if (!FLVD_TakePosition(search))
         return FLVD_ERR_NOT_FOUND;
-    const FlvdCheck check = FLVD_CheckBackPointer(search, header.info);
-    if (FLVD_IsWantedTag(header, search->wanted)) {
-        if (check == FlvdCheck::PassedInPlace)
-            return 0;
-        if (check == FlvdCheck::PassedBehind)
-            return __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0 ? 0 : FLVD_ERR_NOT_FOUND;
-    }
-    return FLVD_StepOver(search, check, header.info) ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
+    const flvd_check_t check = FLVD_CheckBackPointer(search, header.info);
+    if (!check.passed || !FLVD_IsWantedTag(header, search->wanted))
+        return FLVD_StepOver(search, check, header.info) ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
+    const bool on_tag = check.in_place || __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
+    return on_tag ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
 // Trusting mode: the header alone decides; an unwanted tag is passed by its size.
@@ -174,7 +175,7 @@ int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& heade
 {
     if (FLVD_IsWantedTag(header, search->wanted))
         return 0;
-    const uint32_t size = header.info.data_size + FLVD_TAG_FRAME_SIZE;
+    const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
     const bool moved = header.IsAudio() ? __FLV_DMX__fioSkipBytes(size, search->file) == size
                                         : __FLV_DMX__fioSeek64(search->file, size, FIO_SEEK_CUR) == 0;
     return moved ? FLVD_SEARCH_ON : FLVD_ERR_END_OF_DATA;
@@ -246,7 +247,7 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
     }
     if (!FLVD_TakePosition(search))
         return FLVD_ERR_NOT_FOUND;
-    const FlvdCheck check = FLVD_CheckBackPointer(search, header.info);
+    const flvd_check_t check = FLVD_CheckBackPointer(search, header.info);
     return FLVD_StepOver(search, check, header.info) ? 0 : FLVD_ERR_NOT_FOUND;
 }
 

@@ -12,7 +12,7 @@ bool FLVD_IsStreamVideo(const flvd_tag_rules_t& rules, const flvd_tag_header_t& 
 {
     if (rules.video_filter == FLVD_ANY_CODEC)
         return true;
-    return header.CodecId() == (rules.video_filter & 0x0F) && header.first <= FLVD_VIDEO_BYTE_MAX;
+    return header.CodecId() == (rules.video_filter & FLVD_CODEC_ID_MASK) && header.first <= FLVD_VIDEO_BYTE_MAX;
 }
 
 bool FLVD_IsStreamAudio(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header)
@@ -35,15 +35,16 @@ flvd_tag_rules_t FLVD_TagRules(const flvd_ctx_t* ctx)
 
 uint32_t FLVD_TagTimestamp(const uint8_t* bytes)
 {
-    return FLVD_GetBE24(bytes + 4) | uint32_t{bytes[7]} << 24;
+    return FLVD_GetBE24(bytes + FLVD_TIMESTAMP_FIELD) | uint32_t{bytes[FLVD_TIMESTAMP_FIELD + 3]} << 24;
 }
 
 flvd_tag_header_t FLVD_ReadTagHeader(const uint8_t* bytes)
 {
     return {
-        {bytes[0], FLVD_GetBE24(bytes + 1), FLVD_TagTimestamp(bytes), FLVD_GetBE24(bytes + 8)},
-        bytes[11],
-        bytes[12],
+        {bytes[0], FLVD_GetBE24(bytes + FLVD_DATA_SIZE_FIELD), FLVD_TagTimestamp(bytes),
+         FLVD_GetBE24(bytes + FLVD_STREAM_ID_FIELD)},
+        bytes[FLVD_CODEC_BYTE],
+        bytes[FLVD_PACKET_TYPE],
     };
 }
 

@@ -1,26 +1,15 @@
 // Tag navigation: the tag header as read, and the rules that all navigation functions share. The chain of tags is
 // never trusted: a header counts when it is plausible for this file, and in the careful paths when the back-pointer
 // behind its data agrees with its size.
-//
-// File: header, PreviousTagSize0, then for each tag an 11-byte header, DataSize bytes, and PreviousTagSize, which
-// is DataSize + 11 in a sound file.
 #ifndef FLVDMX_TAG_TAG_H
 #define FLVDMX_TAG_TAG_H
 
 #include "flvdmx/flvdmx.h"
+#include "flvdmx/format.h"
 
-constexpr uint32_t FLVD_TAG_HEADER_SIZE = 11;
-constexpr uint32_t FLVD_BACK_POINTER_SIZE = 4;
-constexpr uint32_t FLVD_TAG_FRAME_SIZE =
-    FLVD_TAG_HEADER_SIZE + FLVD_BACK_POINTER_SIZE;                // what a tag has around its data
-constexpr uint32_t FLVD_TAG_PEEK_SIZE = FLVD_TAG_HEADER_SIZE + 2; // header and two data bytes
+constexpr uint32_t FLVD_TAG_PEEK_SIZE = FLVD_TAG_HEADER_SIZE + 2; // header, codec byte and packet type
 
 constexpr uint32_t FLVD_ANY_CODEC = 0xFFFF; // filter value: no tag of that kind has been probed
-
-constexpr uint32_t FLVD_CODEC_ID_AVC = 7;
-constexpr uint32_t FLVD_SOUND_FORMAT_AAC = 10;
-constexpr uint32_t FLVD_PACKET_SEQUENCE_HEADER = 0; // AVCPacketType, AACPacketType
-constexpr uint32_t FLVD_PACKET_END_OF_SEQUENCE = 2; // AVCPacketType
 
 // Resynchronisation covers so many bytes before it gives up.
 constexpr int32_t FLVD_RESYNC_WINDOW = 0x100000;
@@ -37,16 +26,16 @@ struct flvd_tag_header_t {
     uint8_t first;  // first data byte: FrameType and CodecID, or SoundFormat, rate, size and type
     uint8_t second; // second data byte: AVCPacketType or AACPacketType
 
-    uint32_t CodecId() const { return first & 0x0Fu; }
-    uint32_t SoundFormat() const { return first >> 4u; }
+    uint32_t CodecId() const { return first & FLVD_CODEC_ID_MASK; }
+    uint32_t SoundFormat() const { return uint32_t{first} >> FLVD_SOUND_FORMAT_SHIFT; }
     bool IsVideo() const { return info.type == FLVD_TAG_TYPE_VIDEO; }
     bool IsAudio() const { return info.type == FLVD_TAG_TYPE_AUDIO; }
     bool IsKeyframe() const // FrameType 1 keyframe, 4 generated keyframe
     {
         return (first >> 4u) == 1 || (first >> 4u) == 4;
     }
-    bool IsAvc() const { return CodecId() == FLVD_CODEC_ID_AVC; }
-    bool IsAac() const { return SoundFormat() == FLVD_SOUND_FORMAT_AAC; }
+    bool IsAvc() const { return CodecId() == FLVD_CODEC_AVC; }
+    bool IsAac() const { return SoundFormat() == FLVD_SOUND_AAC; }
 };
 
 // What this file's headers must agree with, read from the instance once a call.

@@ -1,0 +1,50 @@
+// Numbers of the FLV format that several layers read ("Adobe Flash Video File Format Specification", annex E).
+#ifndef FLVDMX_FORMAT_H
+#define FLVDMX_FORMAT_H
+
+#include <cstdint>
+
+// A tag: header, DataSize bytes, and PreviousTagSize, the back-pointer, which is DataSize + 11 in a sound file.
+constexpr uint32_t FLVD_TAG_HEADER_SIZE = 11;
+constexpr uint32_t FLVD_BACK_POINTER_SIZE = 4;
+constexpr uint32_t FLVD_TAG_OVERHEAD = FLVD_TAG_HEADER_SIZE + FLVD_BACK_POINTER_SIZE; // beside its data
+
+// Offsets in a tag.
+constexpr uint32_t FLVD_DATA_SIZE_FIELD = 1; // 24 bits
+constexpr uint32_t FLVD_TIMESTAMP_FIELD = 4; // 24 bits, then TimestampExtended
+constexpr uint32_t FLVD_STREAM_ID_FIELD = 8; // 24 bits
+constexpr uint32_t FLVD_CODEC_BYTE = 11;     // first data byte: what the data is
+constexpr uint32_t FLVD_PACKET_TYPE = 12;    // AAC and AVC only
+
+// Codec byte of video: FrameType above CodecID.
+constexpr uint32_t FLVD_CODEC_ID_MASK = 0x0F;
+enum : uint32_t {
+    FLVD_CODEC_JPEG = 1,
+    FLVD_CODEC_H263 = 2, // Sorenson
+    FLVD_CODEC_SCREEN = 3,
+    FLVD_CODEC_VP6 = 4,
+    FLVD_CODEC_VP6_ALPHA = 5,
+    FLVD_CODEC_SCREEN2 = 6,
+    FLVD_CODEC_AVC = 7
+};
+
+// Codec byte of audio: SoundFormat above SoundRate, SoundSize and SoundType.
+constexpr uint32_t FLVD_SOUND_FORMAT_SHIFT = 4;
+enum : uint32_t { FLVD_SOUND_MP3 = 2, FLVD_SOUND_AAC = 10, FLVD_SOUND_MP3_8KHZ = 14 };
+
+// AACPacketType and AVCPacketType.
+constexpr uint32_t FLVD_PACKET_SEQUENCE_HEADER = 0; // the codec configuration
+constexpr uint32_t FLVD_PACKET_END_OF_SEQUENCE = 2; // AVC only
+
+// Codec header bytes in front of a payload.
+constexpr uint32_t FLVD_AVC_HEADER_SIZE = 5; // codec byte, packet type, CompositionTime
+constexpr uint32_t FLVD_AAC_HEADER_SIZE = 2; // codec byte, packet type
+constexpr uint32_t FLVD_CODEC_HEADER_SIZE = 1;
+
+// An AVC packet without a picture.
+constexpr bool FLVD_IsPicturelessPacket(uint32_t packet_type)
+{
+    return packet_type == FLVD_PACKET_SEQUENCE_HEADER || packet_type == FLVD_PACKET_END_OF_SEQUENCE;
+}
+
+#endif
