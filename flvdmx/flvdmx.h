@@ -23,8 +23,8 @@
  * - Memory. `mem_alloc` returns memory aligned for any type, or null when there is none: that is a failure
  *   that the library survives. `mem_free` must accept null. `mem_copy` is never asked for 0 bytes and its
  *   ranges do not overlap. An open allocates the instance, a reader with its cache (two with
- *   FLVD_OPT_SEPARATE_AUDIO_READER) and the frame buffer; codec configurations and keyframe arrays follow.
- *   A frame allocates only when it is larger than every frame before it.
+ *   FLVD_OPT_SEPARATE_AUDIO_READER) and, unless FLVD_OPT_USER_BUFFER is set, a frame buffer of 512,000 bytes;
+ *   codec configurations and keyframe arrays follow. A frame allocates only when the buffer is too small for it.
  * - Reading. `file_read` is called with an element size of 1 and returns the number of bytes read. A short
  *   read means the end of the data: a host function must fill the request or have reached the end. A host
  *   that reads from a pipe or socket has to loop. There is no retry and no separate error.
@@ -35,8 +35,9 @@
  *   every open overwrites the process-wide tables, and all instances, older ones included, go on with the
  *   newest functions. Give every open the same functions.
  * - Threads. The library starts none and takes no locks. An open must not run beside any other call; calls
- *   on different instances may run at the same time only while no open and no failing close runs; one
- *   instance is used by one thread at a time.
+ *   on different instances may run at the same time only while no open and no call without an instance runs; one
+ *   instance is used by one thread at a time. FLVD_ParseVideoHeader counts as an open: its reader for AVC is
+ *   one for the process.
  */
 #ifndef FLVDMX_FLVDMX_H
 #define FLVDMX_FLVDMX_H
@@ -64,20 +65,20 @@ enum {
     FLVD_OP_SEEK = 3,           /**< time seek: flvd_seek_request_t, int32_t */
     FLVD_OP_RESERVED = 4,       /**< always refused */
     FLVD_OP_GET_LAST_ERROR = 5, /**< last error code: both arguments unused */
-    FLVD_OP_OPEN_INFO = 10      /**< open for information only: as FLVD_OP_OPEN */
+    FLVD_OP_OPEN_INFO = 10      /**< as FLVD_OP_OPEN, for information only: frames and seeks are refused */
 };
 
 /** Results of a failed QVX_FLV_DMX. FLVD_OP_GET_LAST_ERROR says more. */
 enum {
     FLVD_RET_FAILED = -1,      /**< general failure */
-    FLVD_RET_END = -2,         /**< end of the data, or reading failed */
+    FLVD_RET_END = -2,         /**< end of the data, or reading failed; see FLVD_OP_GET_FRAME below */
     FLVD_RET_NO_INSTANCE = -3, /**< the handle holds no instance */
     FLVD_RET_CANNOT_OPEN = -4  /**< the file cannot be opened */
 };
 
 /** Option bits of flvd_init_t::options; other bits are ignored. */
 enum {
-    FLVD_OPT_SEPARATE_AUDIO_READER = 0x1, /**< second reader for audio; each request then names its stream */
+    FLVD_OPT_SEPARATE_AUDIO_READER = 0x1, /**< audio reader beside the main one; not for _OPEN_INFO */
     FLVD_OPT_USER_BUFFER = 0x2,           /**< each request brings its frame buffer */
     FLVD_OPT_PROGRESSIVE = 0x4,           /**< the file may still be growing */
     FLVD_OPT_INDEX_IN_MEMORY = 0x8        /**< keep the metadata's keyframe index in memory */
@@ -125,14 +126,14 @@ enum {
 
 /** flvd_audio_info_t::format_tag values: registered WAVE format tags, and the library's own for AAC. */
 enum {
-    FLVD_AUDIO_TAG_MPEG = 0x50, /**< MPEG audio layer 2 */
-    FLVD_AUDIO_TAG_MP3 = 0x55,  /**< MPEG audio layer 3 */
+    FLVD_AUDIO_TAG_MPEG = 0x50, /**< MPEG audio layer 2, from FLVD_ParseAudioHeader alone */
+    FLVD_AUDIO_TAG_MP3 = 0x55,  /**< MPEG audio layer 3 or 1; every stream that FLV calls MP3 */
     FLVD_AUDIO_TAG_AAC = 0xAAC0 /**< AAC */
 };
 
 /** Results of the navigation functions; the last two are places in the file, not faults. */
 enum {
-    FLVD_ERR_NOT_FOUND = -1,      /**< a position query failed, or 1 MiB held no plausible tag */
+    FLVD_ERR_NOT_FOUND = -1,      /**< a position query or a seek failed, or 1 MiB held no plausible tag */
     FLVD_ERR_AT_FIRST_TAG = -100, /**< stepping backward reached the first tag */
     FLVD_ERR_END_OF_DATA = -101   /**< the data ended */
 };
@@ -154,7 +155,7 @@ enum {
     FLVD_ERR_SEEK_MISS = -2003,         /**< the target is beyond the end, or no keyframe lies in that direction */
     FLVD_ERR_SEEK_PLACE = -2006,        /**< the tag at the place sought is not the one expected */
     FLVD_ERR_INDEX_ELEMENT = -2007,     /**< a keyframe position in the metadata is not a number */
-    FLVD_ERR_AVC_CONFIG = -3001,        /**< no parameter set in an AVC decoder configuration record */
+    FLVD_ERR_AVC_CONFIG = -3001,        /**< AVC record: damaged, or not 1 to 128 bytes of parameter sets */
     FLVD_ERR_VIDEO_HEADER = -3002,      /**< a picture header or sequence parameter set was not understood */
     FLVD_ERR_AUDIO_HEADER = -3003,      /**< no MPEG audio frame header */
     FLVD_ERR_AVC_NO_SEQ_HEADER = -3004, /**< the first AVC tag is not a sequence header */
@@ -309,7 +310,7 @@ typedef struct flvd_video_info_t {
     char fourcc[4];            /**< "JPEG" "FLV1" "SCR1" "VP60" "VP6A" "SCR2" "H264"; zeros: unknown CodecID */
     uint8_t* config;           /**< AVC: AVCDecoderConfigurationRecord (ISO/IEC 14496-15), else null; the instance's */
     uint32_t config_size;      /**< its bytes */
-    uint32_t last_key_time_ms; /**< time of the last keyframe */
+    uint32_t last_key_time_ms; /**< file timestamp of the last keyframe, ms, from the index or the metadata */
 } flvd_video_info_t;
 
 /** Audio description. Lives inside the instance until close; 0 in all that the file does not tell. */
@@ -336,14 +337,17 @@ typedef struct flvd_open_info_t {
     const flvd_audio_info_t* audio_config; /**< the same pointer again */
 } flvd_open_info_t;
 
-/** First argument of operation 2. */
+/** First argument of operation 2. A null buffer counts as one of 0 bytes. */
 typedef struct flvd_frame_request_t {
     uint8_t* buffer;      /**< with FLVD_OPT_USER_BUFFER: where the frame goes; else not looked at */
     uint32_t buffer_size; /**< its bytes */
     uint32_t stream;      /**< with FLVD_OPT_SEPARATE_AUDIO_READER: FLVD_STREAM_VIDEO or _AUDIO; else not looked at */
 } flvd_frame_request_t;
 
-/** Second argument of operation 2. `data` is valid until the next request on the instance. */
+/**
+ * Second argument of operation 2, cleared at the start of every request that is not refused. `data` is valid until the
+ * next request on the instance.
+ */
 typedef struct flvd_frame_t {
     uint8_t* data;         /**< payload without the FLV codec header bytes */
     uint32_t size;         /**< bytes */
@@ -370,7 +374,7 @@ typedef struct flvd_tag_info_t {
 typedef struct flvd_keyframe_index_t {
     int64_t times_offset;     /**< file offset of the first element of "times", 0 when there is none */
     int64_t positions_offset; /**< file offset of the first element of "filepositions", 0 when there is none */
-    uint32_t entry_count;     /**< usable entries */
+    uint32_t entry_count;     /**< usable entries; 0xFFFFFFFF when "keyframes" held no array */
 } flvd_keyframe_index_t;
 
 /** Keyframe index in memory, with FLVD_OPT_PROGRESSIVE or FLVD_OPT_INDEX_IN_MEMORY; owned by the instance. */
@@ -421,32 +425,6 @@ typedef struct flvd_ctx_t {
     int32_t error_line;                     /**< fixed number of the place of failure */
 } flvd_ctx_t;
 
-#if defined(__arm__)
-#ifdef __cplusplus
-#define FLVD_LAYOUT(condition) static_assert(condition, "the records are part of the interface")
-#else
-#define FLVD_LAYOUT(condition) _Static_assert(condition, "the records are part of the interface")
-#endif
-FLVD_LAYOUT(sizeof(flvd_init_t) == 144 && offsetof(flvd_init_t, file_open) == 64);
-FLVD_LAYOUT(offsetof(flvd_init_t, file_seek64) == 100 && offsetof(flvd_init_t, file_name) == 128);
-FLVD_LAYOUT(sizeof(flvd_mem_funcs_t) == 24 && sizeof(fio_funcs_t) == 68);
-FLVD_LAYOUT(sizeof(fio_file_t) == 56 && offsetof(fio_file_t, overread_extra) == 32);
-FLVD_LAYOUT(offsetof(fio_file_t, bits) == 40 && offsetof(fio_file_t, bit_skip_pending) == 48);
-FLVD_LAYOUT(sizeof(flvd_file_info_t) == 24 && offsetof(flvd_file_info_t, file_size) == 8);
-FLVD_LAYOUT(sizeof(flvd_video_info_t) == 32 && offsetof(flvd_video_info_t, config) == 20);
-FLVD_LAYOUT(sizeof(flvd_audio_info_t) == 36 && offsetof(flvd_audio_info_t, config) == 20);
-FLVD_LAYOUT(sizeof(flvd_open_info_t) == 28 && sizeof(flvd_frame_request_t) == 12 && sizeof(flvd_frame_t) == 24);
-FLVD_LAYOUT(sizeof(flvd_seek_request_t) == 8 && sizeof(flvd_tag_info_t) == 16);
-FLVD_LAYOUT(sizeof(flvd_keyframe_index_t) == 24 && sizeof(flvd_keyframe_arrays_t) == 16);
-FLVD_LAYOUT(sizeof(flvd_ctx_t) == 280 && offsetof(flvd_ctx_t, file_info) == 48);
-FLVD_LAYOUT(offsetof(flvd_ctx_t, video_info) == 72 && offsetof(flvd_ctx_t, audio_info) == 104);
-FLVD_LAYOUT(offsetof(flvd_ctx_t, file_size) == 144 && offsetof(flvd_ctx_t, data_offset) == 160);
-FLVD_LAYOUT(offsetof(flvd_ctx_t, audio_format_filter) == 196 && offsetof(flvd_ctx_t, keyframe_index) == 200);
-FLVD_LAYOUT(offsetof(flvd_ctx_t, saved_main_pos) == 240 && offsetof(flvd_ctx_t, keyframe_arrays) == 256);
-FLVD_LAYOUT(offsetof(flvd_ctx_t, error) == 272);
-#undef FLVD_LAYOUT
-#endif
-
 /* ---------------------------------------------------------------------------------- entry point */
 
 /** Error code of the last failure that had no instance to be recorded in (a failed open, a call without instance). */
@@ -463,9 +441,14 @@ FLVD_API extern int32_t g_flvd_lErrorLine;
  * @param arg1      what the operation reads: flvd_init_t, flvd_frame_request_t or flvd_seek_request_t
  * @param arg2      what it fills: flvd_open_info_t, flvd_frame_t or int32_t
  * @return FLVD_OP_OPEN, _OPEN_INFO, _CLOSE, _GET_FRAME, _SEEK: 0, or FLVD_RET_*.
- *         FLVD_OP_GET_LAST_ERROR: the instance's error code, without an instance g_flvd_lLastError.
+ *         FLVD_OP_GET_LAST_ERROR: the instance's last error code, which later successes leave in place; without an
+ *         instance g_flvd_lLastError.
  *         A handle without instance: FLVD_RET_NO_INSTANCE for operations 1 to 3, FLVD_RET_FAILED for operation 4.
  *         A null argument that the operation needs: FLVD_RET_FAILED, nothing recorded, nothing touched.
+ *         FLVD_OP_GET_FRAME returns FLVD_RET_END at the end of the data, and after 102 tags without a frame, however
+ *         much follows them: a host that wants to be sure asks again while the reader's position moves. With
+ *         FLVD_OPT_PROGRESSIVE it also means that the next tag is not whole yet, or was not when its beginning was
+ *         read: ask again after a while, once more after the file has stopped growing.
  */
 FLVD_API int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2);
 
@@ -490,10 +473,17 @@ FLVD_API void __FLV_DMX__fioSetFunc(const fio_funcs_t* funcs);
 FLVD_API fio_file_t* __FLV_DMX__fioOpen(const char* path, uint32_t mode, uint32_t cache_size, int32_t overread,
                                         uint32_t overread_extra);
 
-/** Closes and releases `file`, pending bytes being written first. @return the host's result; 0 for null */
+/**
+ * Closes and releases `file`, pending bytes being written first; those that the host does not take are lost.
+ * @return the host's result of file_close; 0 for null
+ */
 FLVD_API int32_t __FLV_DMX__fioClose(fio_file_t* file);
 
-/** Writes pending bytes or drops the read-ahead (the host's position is not moved back). @return the host's result */
+/**
+ * Writes pending bytes (those that the host does not take are lost) or drops the read-ahead (the host's position is not
+ * moved back).
+ * @return the host's result of file_flush
+ */
 FLVD_API int32_t __FLV_DMX__fioFlush(fio_file_t* file);
 
 /** @return logical position in bytes through the host's 32-bit tell; negative when the host failed */
@@ -511,29 +501,41 @@ FLVD_API int32_t __FLV_DMX__fioIsEof(fio_file_t* file);
  * @param bytes receives a pointer into the cache, valid until the next call on `file`; untouched while writing
  * @param n     bytes wanted; more than the cache holds comes back short
  * @param file  reader
- * @return bytes available at *bytes, at most n; fewer than n: the data ended; 0 while writing
+ * @return bytes available at *bytes, at most n; fewer than n: the data ended, or the cache is smaller; 0 while writing
  */
 FLVD_API uint32_t __FLV_DMX__fioShowBytesByPtr(const uint8_t** bytes, uint32_t n, fio_file_t* file);
 
 /** Copies the next n bytes to `destination`, consuming nothing. @return bytes copied, at most n; 0 while writing */
 FLVD_API uint32_t __FLV_DMX__fioShowBytesByCopy(void* destination, uint32_t n, fio_file_t* file);
 
-/** Consumes n bytes. @return n; fewer when the host seek failed; 0xFFFFFFFF while writing */
+/**
+ * Consumes n bytes. Going behind the end of the file succeeds when the host's seek does.
+ * @return n; only those that were cached when the host's seek failed, or cannot go so far without file_seek64;
+ *         0xFFFFFFFF while writing
+ */
 FLVD_API uint32_t __FLV_DMX__fioSkipBytes(uint32_t n, fio_file_t* file);
 
-/** Moves the logical position. @return 0; the host's result when it failed; -1 for an unknown origin */
+/**
+ * Moves the logical position, pending bytes being written first. What was read ahead is dropped, also when the host's
+ * seek fails, unless the target lies inside it.
+ * @return 0; the host's result when it failed; -1 for an unknown origin, which drops nothing
+ */
 FLVD_API int32_t __FLV_DMX__fioSeek(fio_file_t* file, int32_t offset, int32_t whence);
 
-/** The same in 64 bits; without file_seek64 the host gets the low 32 bits. */
+/** The same in 64 bits; without file_seek64 the host gets the low 32 bits. @return as __FLV_DMX__fioSeek */
 FLVD_API int32_t __FLV_DMX__fioSeek64(fio_file_t* file, int64_t offset, int32_t whence);
 
 /**
- * Reads and consumes `count` elements of `size` bytes; what is not cached goes straight to `destination`.
+ * Reads and consumes `count` elements of `size` bytes. What is cached is copied; what is missing goes straight to
+ * `destination`, or through the cache when it is less than the refill quantum.
  * @return whole elements delivered; 0, nothing moved, when `size` is 0 or size × count does not fit 32 bits
  */
 FLVD_API uint32_t __FLV_DMX__fioRead(void* destination, uint32_t size, uint32_t count, fio_file_t* file);
 
-/** Writes `count` elements of `size` bytes through the cache. @return whole elements accepted; 0 as for reading */
+/**
+ * Writes `count` elements of `size` bytes through the cache.
+ * @return whole elements accepted; 0 as for reading, and when pending bytes could not be written: they stay pending
+ */
 FLVD_API uint32_t __FLV_DMX__fioWrite(const void* source, uint32_t size, uint32_t count, fio_file_t* file);
 
 /** Sets the refill quantum; 0 means the whole cache. @return 1; 0 when `size` is above the capacity */
@@ -575,25 +577,27 @@ FLVD_API uint32_t __FLV_DMX__bitGetSBits(fio_file_t* file, uint32_t n);
 /* ------------------------------------------------------------------------------- tag navigation */
 
 /**
- * Describes the first tag of a wanted kind at or after the reader's position.
+ * Describes the first tag of a wanted kind at or after the reader's position; on PreviousTagSize0, the first tag's.
  *
  * @param ctx    open instance, borrowed; its description of the file is read, not changed
  * @param file   reader; on success it stands on the first byte of the tag header
  * @param info   caller's record, written on success only
  * @param wanted FLVD_TAG_* bits
- * @param verify 0: header test only; else the PreviousTagSize behind the data must agree as well
- * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_END_OF_DATA
+ * @param verify 0: header test only; else the PreviousTagSize behind the data must agree as well, except behind a
+ *               script tag that is the first tag of the file
+ * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_END_OF_DATA; on failure the reader may stand anywhere
  */
 FLVD_API int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
                                      int32_t verify);
 
 /**
- * Resynchronises: looks for the next place where a plausible tag header stands and moves there.
+ * Resynchronises: looks for the next place where a plausible tag header stands and moves there. Here alone a timestamp
+ * equal to the file's last one is not plausible.
  *
  * @param ctx   open instance, borrowed
  * @param file  reader; its refill quantum is the whole cache for the time of the call
- * @param limit bytes after which the search ends (it may overrun by one cache)
- * @return bytes moved, 0 or more; -1 when there is none within the limit or the data
+ * @param limit bytes after which the search ends (it may overrun by one cache); 0 finds nothing
+ * @return bytes moved, 0 or more; -1 when there is none within the limit or the data, the reader having moved
  */
 FLVD_API int32_t FLVD_FindNextTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit);
 
@@ -606,16 +610,18 @@ FLVD_API int32_t FLVD_FindNextTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t li
  * @param info   caller's record, written on success only
  * @param wanted FLVD_TAG_* bits
  * @param kind   receives the FLVD_TAG_* bits of the tag found, 0 on failure; may be null
- * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_END_OF_DATA
+ * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_END_OF_DATA; on failure the reader may stand anywhere
  */
 FLVD_API int32_t FLVD_MoveToNextTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
                                     uint32_t* kind);
 
 /**
  * Steps back to the previous tag of a wanted kind through the PreviousTagSize chain, sliding back byte by byte
- * where the chain is damaged. Parameters as FLVD_MoveToNextTag; the kind reported is coarser (video or audio
- * alone, unless keyframes or configurations were wanted).
- * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_AT_FIRST_TAG; FLVD_ERR_END_OF_DATA
+ * where the chain is damaged. The reader must stand on a tag or on the end of the valid data. Parameters as
+ * FLVD_MoveToNextTag; the kind reported is coarser (video or audio alone, unless keyframes or configurations were
+ * wanted).
+ * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_AT_FIRST_TAG; FLVD_ERR_END_OF_DATA; on failure the reader may stand anywhere,
+ *         in front of the first tag included
  */
 FLVD_API int32_t FLVD_MoveToPrevTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
                                     uint32_t* kind);
@@ -628,7 +634,7 @@ FLVD_API int32_t FLVD_MoveToPrevTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_
  * @param format SoundFormat of FLV: 10 AAC, `data` being an AudioSpecificConfig (ISO/IEC 14496-3); 2 or 14 MPEG
  *               audio, `data` holding a frame header (ISO/IEC 11172-3, 13818-3) somewhere
  * @param data   bytes, borrowed
- * @param length their number
+ * @param length their number; MPEG needs 4, a short AudioSpecificConfig reads as if zeros followed
  * @param info   AAC: sample_rate and channels are written; MPEG: those, sample_size, format_tag and data_rate
  * @return 0; -1 for another format or when no frame header was found (nothing is written)
  */
@@ -639,16 +645,22 @@ FLVD_API int32_t FLVD_ParseAudioHeader(int32_t format, const uint8_t* data, int3
  *
  * @param codec  CodecID of FLV: 2 Sorenson H.263, 4 VP6, 5 VP6 with alpha, 7 AVC as start-code prefixed NAL units
  * @param data   bytes, borrowed
- * @param length their number, at least 8
+ * @param length their number; fewer than 8 are no header
  * @param info   width and height are written, for AVC fourcc too
  * @return 0; -1 for another codec or a header that was not understood
+ * @note   AVC: the reader is one for the process, so no two of these calls may run at the same time.
  */
 FLVD_API int32_t FLVD_ParseVideoHeader(int32_t codec, const uint8_t* data, int32_t length, flvd_video_info_t* info);
 
 /**
  * Turns an AVCDecoderConfigurationRecord (ISO/IEC 14496-15) into parameter sets with four-byte start codes
  * (ISO/IEC 14496-10, annex B).
- * @return bytes written to `out`; 0 when the record is damaged, holds no parameter set or does not fit `capacity`
+ *
+ * @param record   bytes, borrowed
+ * @param length   their number; fewer than 7 are no record
+ * @param out      caller's buffer; holds part of the sets when they do not fit
+ * @param capacity its bytes
+ * @return bytes written to `out`; 0 when the record is damaged, holds no parameter set or does not fit
  */
 FLVD_API int32_t FLVD_GetAVCSeqHeaderFromAvcC(const uint8_t* record, int32_t length, uint8_t* out, int32_t capacity);
 
@@ -658,12 +670,13 @@ FLVD_API int32_t FLVD_GetAVCSeqHeaderFromAvcC(const uint8_t* record, int32_t len
 FLVD_API void FLVD_SetCallbackforMeta(const flvd_init_t* init);
 
 /**
- * Reads a script-data payload (AMF0) into the instance: picture size, rates, keyframe index.
+ * Reads a script-data payload (AMF0) into the instance: picture size, rates, keyframe index. A keyframe array that the
+ * instance holds is released when the payload brings another. FLVD_SetCallbackforMeta comes first.
  *
  * @param ctx    instance; its current reader stands on the first byte of the payload and ends behind it
  * @param length bytes of the payload
- * @return 0 when at least one value was parsed; -1 when none was; FLVD_ERR_END_OF_DATA when the reader could not be
- *         put behind the payload
+ * @return 0 when at least one value was parsed; -1 when none was (with a length of 0, or when the position cannot be
+ *         taken, the reader has not moved); FLVD_ERR_END_OF_DATA when the reader could not be put behind the payload
  */
 FLVD_API int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length);
 

@@ -11,6 +11,14 @@ struct flvd_site_t {
     int32_t line;
 };
 
+constexpr flvd_site_t FLVD_SITE_NONE = {FLVD_ERR_NONE, 0};
+
+// For functions that return where they failed, or FLVD_SITE_NONE.
+constexpr bool FLVD_IsFailure(flvd_site_t site)
+{
+    return site.line != 0;
+}
+
 inline void FLVD_Record(flvd_ctx_t* ctx, flvd_site_t site)
 {
     ctx->error = site.code;

@@ -4,7 +4,6 @@
 #include "flvdmx/fio/tables.h"
 
 #include <algorithm>
-#include <cstring>
 
 namespace {
 
@@ -12,11 +11,6 @@ namespace {
 bool FLVD_FioIsBlock(uint32_t size, uint32_t count)
 {
     return size != 0 && uint64_t{size} * count <= UINT32_MAX;
-}
-
-uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n)
-{
-    return std::min(g_flvd_fioFuncs.file_read(destination, 1, n, file->handle), n);
 }
 
 // Moves n cached bytes to the destination and consumes them.
@@ -43,7 +37,7 @@ uint32_t FLVD_FioReadOver(fio_file_t* file, uint8_t* destination, uint32_t n)
         const uint32_t got = FLVD_FioHostRead(file, destination, file->read_size);
         destination += got;
         n -= got;
-        if (got < file->read_size || got == 0)
+        if (got < file->read_size || got == 0) // 0: a file without a cache has a quantum of 0
             break;
     }
     return FLVD_FioReadThroughCache(file, destination, n);
@@ -61,10 +55,7 @@ uint32_t FLVD_FioReadUncached(fio_file_t* file, uint8_t* destination, uint32_t n
 
 void FLVD_FioPutPending(fio_file_t* file, const void* source, uint32_t n)
 {
-    if (file->head != 0) {
-        std::memmove(file->cache, file->cache + file->head, file->count);
-        file->head = 0;
-    }
+    FLVD_FioCompact(file);
     if (n != 0)
         g_flvd_fioFuncs.mem_copy(file->cache + file->count, source, n);
     file->count += n;

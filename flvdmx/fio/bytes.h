@@ -1,5 +1,5 @@
 // Big-endian fields and AMF0 numbers as an FLV file holds them. File bytes are never cast: a load at an odd address
-// traps on some of the targets, and every compiler turns these into one load and a byte swap.
+// traps on some of the targets, while compilers turn these into a load and a byte swap.
 #ifndef FLVDMX_FIO_BYTES_H
 #define FLVDMX_FIO_BYTES_H
 

@@ -59,38 +59,31 @@ uint8_t* FLVD_FioAllocateCache(uint32_t cache_size, uint32_t extra)
 }
 
 // The object and its cache around an open handle. Without memory the handle is closed and null returned.
-fio_file_t* FLVD_FioCreate(void* handle, uint32_t cache_size, uint32_t extra)
+fio_file_t* FLVD_FioAllocate(uint32_t cache_size, uint32_t extra, void* handle)
 {
     auto* const file = static_cast<fio_file_t*>(g_flvd_fioFuncs.mem_alloc(sizeof(fio_file_t)));
-    if (file == nullptr) {
-        g_flvd_fioFuncs.file_close(handle);
-        return nullptr;
+    uint8_t* const cache = file != nullptr ? FLVD_FioAllocateCache(cache_size, extra) : nullptr;
+    if (cache != nullptr) {
+        *file = fio_file_t{};
+        file->handle = handle;
+        file->cache = cache;
+        return file;
     }
-    uint8_t* const cache = FLVD_FioAllocateCache(cache_size, extra);
-    if (cache == nullptr) {
-        g_flvd_fioFuncs.file_close(handle);
+    g_flvd_fioFuncs.file_close(handle);
+    if (file != nullptr)
         g_flvd_fioFuncs.mem_free(file);
-        return nullptr;
-    }
-    *file = fio_file_t{};
-    file->handle = handle;
-    file->cache = cache;
-    file->state = FIO_STATE_IDLE;
-    file->read_size = cache_size;
-    file->capacity = cache_size;
-    file->overread_extra = extra;
-    return file;
+    return nullptr;
 }
 
 // Logical position from the host's. A failed query stays negative whatever is pending, and a position that no file can
 // have is a failed query: adding sizes to positions never overflows.
 int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
 {
+    if (host > FIO_POSITION_MAX)
+        return -1;
     const uint64_t count = file->count;
     const uint64_t moved = static_cast<uint64_t>(host) + (file->state == FIO_STATE_READ ? 0 - count : count);
     const auto position = static_cast<int64_t>(moved);
-    if (host > FIO_POSITION_MAX)
-        return -1;
     return host < 0 && position >= 0 ? host : position;
 }
 
@@ -133,9 +126,15 @@ fio_file_t* __FLV_DMX__fioOpen(const char* path, uint32_t mode, uint32_t cache_s
     void* const handle = g_flvd_fioFuncs.file_open(path, text);
     if (handle == nullptr)
         return nullptr;
-    fio_file_t* const file = FLVD_FioCreate(handle, cache_size, overread != 0 ? overread_extra : 0);
-    if (file != nullptr)
-        file->overread = overread;
+    const uint32_t extra = overread != 0 ? overread_extra : 0;
+    fio_file_t* const file = FLVD_FioAllocate(cache_size, extra, handle);
+    if (file == nullptr)
+        return nullptr;
+    file->state = FIO_STATE_IDLE;
+    file->read_size = cache_size;
+    file->capacity = cache_size;
+    file->overread = overread;
+    file->overread_extra = extra;
     return file;
 }
 
@@ -164,9 +163,8 @@ int32_t __FLV_DMX__fioFlush(fio_file_t* file)
 
 int32_t __FLV_DMX__fioTell(fio_file_t* file)
 {
-    const int32_t host = g_flvd_fioFuncs.file_tell(file->handle);
-    const auto position = static_cast<int32_t>(static_cast<uint64_t>(FLVD_FioLogical(file, host)));
-    return host < 0 && position >= 0 ? host : position;
+    const int64_t position = FLVD_FioLogical(file, g_flvd_fioFuncs.file_tell(file->handle));
+    return static_cast<int32_t>(std::max<int64_t>(position, INT32_MIN)); // above 2 GiB pending bytes make it negative
 }
 
 int64_t __FLV_DMX__fioTell64(fio_file_t* file)
@@ -181,6 +179,20 @@ int32_t __FLV_DMX__fioIsEof(fio_file_t* file)
     return file->count != 0 ? 0 : g_flvd_fioFuncs.file_eof(file->handle);
 }
 
+uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    const uint32_t got = g_flvd_fioFuncs.file_read(destination, 1, n, file->handle);
+    return got <= n ? got : 0;
+}
+
+void FLVD_FioCompact(fio_file_t* file)
+{
+    if (file->head == 0)
+        return;
+    std::memmove(file->cache, file->cache + file->head, file->count);
+    file->head = 0;
+}
+
 uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
 {
     if (file->state == FIO_STATE_WRITE)
@@ -190,14 +202,10 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
     n = std::min(n, allocated);
     if (n <= file->count)
         return n;
-    if (file->head != 0) {
-        std::memmove(file->cache, file->cache + file->head, file->count);
-        file->head = 0;
-    }
+    FLVD_FioCompact(file);
     const uint32_t want = std::max(n, file->read_size);
     const uint32_t ask = std::min(file->overread != 0 ? want : want - file->count, allocated - file->count);
-    const uint32_t got = g_flvd_fioFuncs.file_read(file->cache + file->count, 1, ask, file->handle);
-    file->count += std::min(got, ask); // a host that claims more than it was asked for causes no overrun
+    file->count += FLVD_FioHostRead(file, file->cache + file->count, ask);
     return std::min(file->count, n);
 }
 

@@ -4,6 +4,15 @@
 
 #include "flvdmx/flvdmx.h"
 
+constexpr uint32_t FLVD_WHOLE_CACHE = 0; // as a refill quantum: the capacity of the file's cache
+
+// Reads up to n bytes from the host. One that claims more than it was asked for has failed: nothing it says is
+// believed.
+uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n);
+
+// Moves the cached bytes to the front of the cache.
+void FLVD_FioCompact(fio_file_t* file);
+
 // Makes up to n bytes visible at cache + head with at most one host read; the logical position stays.
 // Returns how many are, or 0 in the writing state.
 uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
@@ -44,7 +53,5 @@ private:
     fio_file_t* const m_file;
     const uint32_t m_after;
 };
-
-constexpr uint32_t FLVD_WHOLE_CACHE = 0; // refill quantum: the capacity of the file's cache
 
 #endif

@@ -2,33 +2,25 @@
 
 #include "flvdmx/front/front.h"
 
+#include "flvdmx/instance.h"
 #include "flvdmx/seek/seek.h"
-
-#include <cstddef>
 
 int32_t g_flvd_lLastError;
 int32_t g_flvd_lErrorLine;
 
 namespace {
 
-// The words of the two wide records are pointer-wide, so that word n lies at n pointer sizes on every machine.
-constexpr size_t FLVD_WORD = sizeof(void*);
-static_assert(sizeof(flvd_init_t) == 36 * FLVD_WORD);
-static_assert(offsetof(flvd_init_t, file_open) == 16 * FLVD_WORD);
-static_assert(offsetof(flvd_init_t, file_seek64) == 25 * FLVD_WORD);
-static_assert(offsetof(flvd_init_t, file_name) == 32 * FLVD_WORD);
-static_assert(offsetof(flvd_init_t, scan_read_size) == 35 * FLVD_WORD);
-static_assert(sizeof(flvd_open_info_t) == 7 * FLVD_WORD);
-static_assert(sizeof(flvd_mem_funcs_t) == 6 * FLVD_WORD && sizeof(fio_funcs_t) == 17 * FLVD_WORD);
+// Two ranges of error codes that the results tell apart.
+constexpr int32_t FLVD_ERR_RESOURCE_LAST = -2002; // resources, file header and probing
+constexpr int32_t FLVD_ERR_PLACE_LAST = -2005;    // places that the data does not have
 
 // What a host sees of a failure; `result` is the operation's own.
 int32_t FLVD_TranslateError(int32_t result, int32_t error)
 {
-    if (error >= -2002 && error <= -1)
+    if (error >= FLVD_ERR_RESOURCE_LAST && error <= -1)
         return error == FLVD_ERR_OPEN_MAIN || error == FLVD_ERR_OPEN_AUDIO ? FLVD_RET_CANNOT_OPEN : result;
-    if (error >= -2005 && error <= -2003)
-        return FLVD_RET_END;
-    if (error == FLVD_ERR_SHORT_DATA)
+    const bool no_place = error >= FLVD_ERR_PLACE_LAST && error < FLVD_ERR_RESOURCE_LAST;
+    if (no_place || error == FLVD_ERR_SHORT_DATA)
         return FLVD_RET_END;
     return error == FLVD_ERR_NO_INSTANCE ? FLVD_RET_NO_INSTANCE : result;
 }
@@ -54,26 +46,28 @@ int32_t FLVD_RefuseMissing()
     return FLVD_RET_NO_INSTANCE;
 }
 
-int32_t FLVD_GetFrameOrSeek(uint32_t operation, flvd_ctx_t* ctx, const void* arg1, void* arg2)
+int32_t FLVD_Close(flvd_ctx_t* ctx)
 {
-    if (operation == FLVD_OP_GET_FRAME)
-        return FLVD_GetFrame(ctx, static_cast<const flvd_frame_request_t*>(arg1), static_cast<flvd_frame_t*>(arg2));
-    const auto* const request = static_cast<const flvd_seek_request_t*>(arg1);
-    const bool growing = (ctx->options & FLVD_OPT_PROGRESSIVE) != 0;
-    const auto seek = growing ? FLVD_RunTimeSeekProgressive : FLVD_RunTimeSeek;
-    return seek(ctx, request->time, static_cast<int32_t*>(arg2), request->mode);
+    FLVD_ReleaseInstance(ctx);
+    return 0;
 }
 
-// Operations 1 to 3 on an instance.
-int32_t FLVD_Run(uint32_t operation, flvd_ctx_t* ctx, const void* arg1, void* arg2)
+int32_t FLVD_Deliver(flvd_ctx_t* ctx, const void* request, void* frame)
 {
-    if (operation == FLVD_OP_CLOSE) {
-        FLVD_ReleaseInstance(ctx);
-        return 0;
-    }
-    if (arg1 == nullptr || arg2 == nullptr)
+    if (request == nullptr || frame == nullptr)
         return FLVD_RET_FAILED;
-    const int32_t result = FLVD_GetFrameOrSeek(operation, ctx, arg1, arg2);
+    const int32_t result =
+        FLVD_GetFrame(ctx, static_cast<const flvd_frame_request_t*>(request), static_cast<flvd_frame_t*>(frame));
+    return result >= 0 ? result : FLVD_TranslateError(result, ctx->error);
+}
+
+int32_t FLVD_Seek(flvd_ctx_t* ctx, const void* arguments, void* reached)
+{
+    if (arguments == nullptr || reached == nullptr)
+        return FLVD_RET_FAILED;
+    const auto* const request = static_cast<const flvd_seek_request_t*>(arguments);
+    const auto seek = FLVD_IsGrowing(ctx) ? FLVD_RunTimeSeekProgressive : FLVD_RunTimeSeek;
+    const int32_t result = seek(ctx, request->time, static_cast<int32_t*>(reached), request->mode);
     return result >= 0 ? result : FLVD_TranslateError(result, ctx->error);
 }
 
@@ -87,15 +81,19 @@ void FLVD_RecordGlobal(flvd_site_t site)
 
 int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2)
 {
-    flvd_ctx_t* const ctx = handle != nullptr && operation <= FLVD_OP_GET_LAST_ERROR ? *handle : nullptr;
+    // Opening only writes the word.
+    const bool reads_handle = operation >= FLVD_OP_CLOSE && operation <= FLVD_OP_GET_LAST_ERROR;
+    flvd_ctx_t* const ctx = reads_handle && handle != nullptr ? *handle : nullptr;
     switch (operation) {
     case FLVD_OP_OPEN:
     case FLVD_OP_OPEN_INFO:
         return FLVD_Open(handle, arg1, arg2, operation == FLVD_OP_OPEN_INFO);
     case FLVD_OP_CLOSE:
+        return ctx != nullptr ? FLVD_Close(ctx) : FLVD_RefuseMissing();
     case FLVD_OP_GET_FRAME:
+        return ctx != nullptr ? FLVD_Deliver(ctx, arg1, arg2) : FLVD_RefuseMissing();
     case FLVD_OP_SEEK:
-        return ctx != nullptr ? FLVD_Run(operation, ctx, arg1, arg2) : FLVD_RefuseMissing();
+        return ctx != nullptr ? FLVD_Seek(ctx, arg1, arg2) : FLVD_RefuseMissing();
     case FLVD_OP_RESERVED:
         return FLVD_RefuseReserved(ctx);
     case FLVD_OP_GET_LAST_ERROR:

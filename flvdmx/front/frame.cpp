@@ -6,6 +6,7 @@
 #include "flvdmx/front/front.h"
 
 #include "flvdmx/fio/tables.h"
+#include "flvdmx/instance.h"
 #include "flvdmx/tag/tag.h"
 
 namespace {
@@ -123,7 +124,7 @@ bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
 {
     if (n <= ctx->frame_buffer_size)
         return true;
-    if ((ctx->options & FLVD_OPT_USER_BUFFER) != 0)
+    if (FLVD_HasUserBuffer(ctx))
         return false;
     g_flvd_memFuncs.mem_free(ctx->frame_buffer);
     const uint32_t size = (n + FLVD_FRAME_BUFFER_STEP - 1) & ~(FLVD_FRAME_BUFFER_STEP - 1); // n has 24 bits
@@ -178,7 +179,7 @@ FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
     const uint8_t* bytes = nullptr;
     if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_PAYLOAD_PEEK, reader) < FLVD_PAYLOAD_PEEK) {
         const bool video = tag.type == FLVD_TAG_TYPE_VIDEO;
-        const flvd_payload_sites_t& sites = video ? g_flvd_videoSites : g_flvd_soundSites;
+        const flvd_payload_sites_t& sites = video ? g_flvd_videoSites : g_flvd_soundSites; // of AAC alike so far
         FLVD_Record(delivery.ctx, sites.short_peek);
         return FLVD_GiveUpTag(delivery, sites.rollback_payload);
     }
@@ -202,26 +203,22 @@ FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 
 // Saves the position in front of the next tag. At the end of what was there the seek clears the host's end flag: the
 // file may have grown since.
-bool FLVD_SavePosition(const flvd_delivery_t& delivery)
+flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
 {
     const bool at_end = __FLV_DMX__fioIsEof(delivery.reader) != 0;
     const int64_t position = __FLV_DMX__fioTell64(delivery.reader);
-    if (position < 0) {
-        FLVD_Record(delivery.ctx, FLVD_SITE_FRAME_POSITION);
-        return false;
-    }
+    if (position < 0)
+        return FLVD_SITE_FRAME_POSITION;
     *delivery.saved = position;
-    if (at_end && __FLV_DMX__fioSeek64(delivery.reader, position, FIO_SEEK_SET) != 0) {
-        FLVD_Record(delivery.ctx, FLVD_SITE_FRAME_RESUME);
-        return false;
-    }
-    return true;
+    const bool resumed = !at_end || __FLV_DMX__fioSeek64(delivery.reader, position, FIO_SEEK_SET) == 0;
+    return resumed ? FLVD_SITE_NONE : FLVD_SITE_FRAME_RESUME;
 }
 
 FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
-    if (!FLVD_SavePosition(*delivery))
-        return FlvdTurn::Failed;
+    const flvd_site_t site = FLVD_SavePosition(*delivery);
+    if (FLVD_IsFailure(site))
+        return FLVD_FailRequest(*delivery, site);
     const int32_t result = FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 0);
     if (result == 0)
         return FLVD_HandleTag(*delivery, frame);
@@ -233,32 +230,29 @@ FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
     return FlvdTurn::Next;
 }
 
-// Chooses reader and tags by the request. False when it is refused, as recorded.
-bool FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
+// Chooses reader and tags by the request. Returns why it is refused.
+flvd_site_t FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
 {
     flvd_ctx_t* const ctx = delivery->ctx;
-    if ((ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) == 0)
-        return true;
-    if (stream != FLVD_STREAM_VIDEO && stream != FLVD_STREAM_AUDIO) {
-        FLVD_Record(ctx, delivery->sites->bad_stream);
-        return false;
-    }
-    const bool video = stream == FLVD_STREAM_VIDEO;
-    if ((ctx->streams & stream) == 0) {
-        FLVD_Record(ctx, video ? delivery->sites->no_video : delivery->sites->no_audio);
-        return false;
-    }
-    delivery->wanted = video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO;
-    if (!video) {
+    if (!FLVD_HasAudioReader(ctx))
+        return FLVD_SITE_NONE;
+    switch (stream) {
+    case FLVD_STREAM_VIDEO:
+        delivery->wanted = FLVD_TAG_VIDEO;
+        return FLVD_HasVideo(ctx) ? FLVD_SITE_NONE : delivery->sites->no_video;
+    case FLVD_STREAM_AUDIO:
+        delivery->wanted = FLVD_TAG_AUDIO;
         delivery->reader = ctx->audio_reader;
         delivery->saved = &ctx->saved_audio_pos;
+        return FLVD_HasAudio(ctx) ? FLVD_SITE_NONE : delivery->sites->no_audio;
+    default:
+        return delivery->sites->bad_stream;
     }
-    return true;
 }
 
 void FLVD_TakeUserBuffer(flvd_ctx_t* ctx, const flvd_frame_request_t* request)
 {
-    if ((ctx->options & FLVD_OPT_USER_BUFFER) == 0)
+    if (!FLVD_HasUserBuffer(ctx))
         return;
     ctx->frame_buffer = request->buffer;
     ctx->frame_buffer_size = request->buffer != nullptr ? request->buffer_size : 0;
@@ -280,20 +274,17 @@ FlvdTurn FLVD_Deliver(flvd_delivery_t* delivery, flvd_frame_t* frame)
 
 int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd_frame_t* frame)
 {
-    const bool growing = (ctx->options & FLVD_OPT_PROGRESSIVE) != 0;
+    const bool growing = FLVD_IsGrowing(ctx);
     const flvd_frame_sites_t& sites = growing ? g_flvd_growingSites : g_flvd_completeSites;
     flvd_delivery_t delivery = {ctx, ctx->main_reader, &ctx->saved_main_pos, &sites, FLVD_TAG_MEDIA, growing, {}};
-    if (ctx->opened_for_info != 0) {
-        FLVD_Record(ctx, sites.info_only);
-        return -1;
-    }
-    if (!FLVD_ChooseStream(&delivery, request->stream))
-        return -1;
+    if (ctx->opened_for_info != 0)
+        return FLVD_Fail(ctx, sites.info_only);
+    const flvd_site_t refused = FLVD_ChooseStream(&delivery, request->stream);
+    if (FLVD_IsFailure(refused))
+        return FLVD_Fail(ctx, refused);
     FLVD_TakeUserBuffer(ctx, request);
     *frame = {};
-    if (growing && *delivery.saved != 0 && !FLVD_GoBack(delivery)) {
-        FLVD_Record(ctx, FLVD_SITE_FRAME_RESUME);
-        return -1;
-    }
+    if (growing && *delivery.saved != 0 && !FLVD_GoBack(delivery))
+        return FLVD_Fail(ctx, FLVD_SITE_FRAME_RESUME);
     return FLVD_Deliver(&delivery, frame) == FlvdTurn::Delivered ? 0 : -1;
 }

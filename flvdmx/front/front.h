@@ -19,8 +19,8 @@ void FLVD_ReleaseInstance(flvd_ctx_t* ctx);
 bool FLVD_ReadFileHeader(flvd_ctx_t* ctx);
 
 // Second half of opening: finds the streams, their configuration, metadata and the file's extent, fills the host's
-// records and puts the readers on the first tag. False on failure, recorded in *site.
-bool FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info, flvd_site_t* site);
+// records and puts the readers on the first tag. Returns where it failed.
+flvd_site_t FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info);
 
 // Delivers the next frame. 0, or -1 with error and error_line set.
 int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd_frame_t* frame);

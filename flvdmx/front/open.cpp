@@ -3,6 +3,7 @@
 #include "flvdmx/front/front.h"
 
 #include "flvdmx/fio/tables.h"
+#include "flvdmx/instance.h"
 #include "flvdmx/tag/tag.h"
 
 #include <algorithm>
@@ -60,45 +61,37 @@ void FLVD_Configure(flvd_ctx_t* ctx, const flvd_init_t* init, bool for_info)
     ctx->file_info.file_name = init->file_name;
 }
 
-bool FLVD_HasAudioReader(const flvd_ctx_t* ctx)
-{
-    return ctx->opened_for_info == 0 && (ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0;
-}
-
 fio_file_t* FLVD_OpenReader(const flvd_ctx_t* ctx, const char* file_name)
 {
     return __FLV_DMX__fioOpen(file_name, FIO_MODE_READ | FIO_MODE_BINARY, ctx->cache_size, 0, 0);
 }
 
-// Opens the readers and allocates the frame buffer. False on failure, recorded in *site.
-bool FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name, flvd_site_t* site)
+// Opens the readers and allocates the frame buffer.
+flvd_site_t FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name)
 {
-    *site = FLVD_SITE_OPEN_MAIN;
     ctx->main_reader = FLVD_OpenReader(ctx, file_name);
     if (ctx->main_reader == nullptr)
-        return false;
-    *site = FLVD_SITE_OPEN_AUDIO;
+        return FLVD_SITE_OPEN_MAIN;
     ctx->audio_reader = FLVD_HasAudioReader(ctx) ? FLVD_OpenReader(ctx, file_name) : ctx->main_reader;
     if (ctx->audio_reader == nullptr)
-        return false;
+        return FLVD_SITE_OPEN_AUDIO;
     ctx->cur_reader = ctx->main_reader;
-    if ((ctx->options & FLVD_OPT_USER_BUFFER) != 0)
-        return true;
-    *site = FLVD_SITE_OPEN_BUFFER;
+    if (FLVD_HasUserBuffer(ctx))
+        return FLVD_SITE_NONE;
     ctx->frame_buffer = static_cast<uint8_t*>(g_flvd_memFuncs.mem_alloc(FLVD_FRAME_BUFFER_SIZE));
     if (ctx->frame_buffer == nullptr)
-        return false;
+        return FLVD_SITE_OPEN_BUFFER;
     ctx->frame_buffer_size = FLVD_FRAME_BUFFER_SIZE;
-    return true;
+    return FLVD_SITE_NONE;
 }
 
-// Everything of opening behind the allocation of the instance. False on failure, recorded in *site.
-bool FLVD_Fill(flvd_ctx_t* ctx, const flvd_init_t* init, flvd_open_info_t* info, flvd_site_t* site)
+// Everything of opening behind the allocation of the instance.
+flvd_site_t FLVD_Fill(flvd_ctx_t* ctx, const char* file_name, flvd_open_info_t* info)
 {
-    if (!FLVD_Acquire(ctx, init->file_name, site))
-        return false;
-    *site = FLVD_SITE_OPEN_HEADER;
-    return FLVD_ReadFileHeader(ctx) && FLVD_ProbeStreams(ctx, info, site);
+    const flvd_site_t site = FLVD_Acquire(ctx, file_name);
+    if (FLVD_IsFailure(site))
+        return site;
+    return FLVD_ReadFileHeader(ctx) ? FLVD_ProbeStreams(ctx, info) : FLVD_SITE_OPEN_HEADER;
 }
 
 // Moves the bit reader to the first "FLV". After a MiB without one the bytes there are taken for a header all the same.
@@ -146,7 +139,7 @@ bool FLVD_ReadFileHeader(flvd_ctx_t* ctx)
     ctx->data_offset = static_cast<int32_t>(__FLV_DMX__bitGetUBits(file, 32));
     if (ctx->data_offset < FLVD_DATA_OFFSET_MIN)
         return false;
-    if ((ctx->options & FLVD_OPT_PROGRESSIVE) == 0)
+    if (!FLVD_IsGrowing(ctx))
         return FLVD_MeasureFile(ctx);
     ctx->file_size = INT64_MAX;
     ctx->data_end = INT64_MAX;
@@ -166,8 +159,8 @@ flvd_ctx_t* FLVD_OpenInstance(const flvd_init_t* init, flvd_open_info_t* info, b
     FLVD_Configure(ctx, init, for_info);
     FLVD_SetFileFuncs(init);
     FLVD_SetCallbackforMeta(init);
-    flvd_site_t site = {};
-    if (FLVD_Fill(ctx, init, info, &site))
+    const flvd_site_t site = FLVD_Fill(ctx, init->file_name, info);
+    if (!FLVD_IsFailure(site))
         return ctx;
     FLVD_RecordGlobal(site);
     FLVD_ReleaseInstance(ctx);
@@ -184,7 +177,7 @@ void FLVD_ReleaseInstance(flvd_ctx_t* ctx)
         release(ctx->video_info.config);
     if (ctx->audio_info.config != nullptr)
         release(ctx->audio_info.config);
-    if ((ctx->options & FLVD_OPT_USER_BUFFER) == 0)
+    if (!FLVD_HasUserBuffer(ctx))
         release(ctx->frame_buffer);
     if (ctx->keyframe_arrays.times_ms != nullptr)
         release(ctx->keyframe_arrays.times_ms);

@@ -4,6 +4,7 @@
 #include "flvdmx/front/front.h"
 
 #include "flvdmx/codec/codec.h"
+#include "flvdmx/instance.h"
 #include "flvdmx/tag/tag.h"
 
 #include <algorithm>
@@ -20,11 +21,6 @@ struct flvd_probing_t {
     uint32_t found;
     uint32_t first_ts;
 };
-
-bool FLVD_IsGrowing(const flvd_ctx_t* ctx)
-{
-    return (ctx->options & FLVD_OPT_PROGRESSIVE) != 0;
-}
 
 bool FLVD_IsProbed(const flvd_probing_t& probing)
 {
@@ -84,56 +80,56 @@ void FLVD_ProbeCompleteTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
 }
 
 // A tag of a growing file; the reader is behind it afterwards, a script tag's back-pointer included when it is there.
-bool FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag, flvd_site_t* site)
+flvd_site_t FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag)
 {
     if (tag.type == FLVD_TAG_TYPE_SCRIPT) {
-        *site = FLVD_SITE_PROBE_GROWING;
         if (FLVD_ProbeScript(ctx, probing, tag.data_size) == FLVD_ERR_END_OF_DATA)
-            return false;
+            return FLVD_SITE_PROBE_GROWING;
         FLVD_PassBackPointer(ctx->cur_reader, tag.data_size);
-        return true;
+        return FLVD_SITE_NONE;
     }
-    *site = FLVD_SITE_PROBE_GROWING_SHORT;
     if (FLVD_ProbeTag(ctx, probing, tag.type) == FLVD_ERR_END_OF_DATA)
-        return false;
+        return FLVD_SITE_PROBE_GROWING_SHORT;
     probing->first_ts = std::min(probing->first_ts, tag.timestamp);
-    return __FLV_DMX__fioSeek64(ctx->cur_reader, int64_t{tag.data_size} + FLVD_TAG_OVERHEAD, FIO_SEEK_CUR) == 0;
+    const int64_t size = int64_t{tag.data_size} + FLVD_TAG_OVERHEAD;
+    const bool moved = __FLV_DMX__fioSeek64(ctx->cur_reader, size, FIO_SEEK_CUR) == 0;
+    return moved ? FLVD_SITE_NONE : FLVD_SITE_PROBE_GROWING_SHORT;
 }
 
-bool FLVD_ProbeGrowingTags(flvd_ctx_t* ctx, flvd_probing_t* probing, flvd_site_t* site)
+flvd_site_t FLVD_ProbeGrowingTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
 {
     for (uint32_t tags = 0; tags < FLVD_TAG_BUDGET && !FLVD_IsProbed(*probing); ++tags) {
         flvd_tag_info_t tag;
         if (FLVD_GetCurrTagInfo(ctx, ctx->cur_reader, &tag, FLVD_TAG_ANY, 0) != 0)
             break;
-        if (!FLVD_ProbeGrowingTag(ctx, probing, tag, site))
-            return false;
+        const flvd_site_t site = FLVD_ProbeGrowingTag(ctx, probing, tag);
+        if (FLVD_IsFailure(site))
+            return site;
     }
-    return true;
+    return FLVD_SITE_NONE;
 }
 
-// Walks the first tags and stores the streams found and the first timestamp. False on failure, recorded in *site.
-bool FLVD_ProbeTags(flvd_ctx_t* ctx, flvd_site_t* site)
+// Walks the first tags and stores the streams found and the first timestamp.
+flvd_site_t FLVD_ProbeTags(flvd_ctx_t* ctx)
 {
-    const bool growing = FLVD_IsGrowing(ctx);
-    const flvd_site_t no_stream = growing ? FLVD_SITE_PROBE_GROWING : FLVD_SITE_PROBE_COMPLETE;
-    *site = no_stream;
+    const flvd_site_t no_stream = FLVD_IsGrowing(ctx) ? FLVD_SITE_PROBE_GROWING : FLVD_SITE_PROBE_COMPLETE;
     if (FLVD_SeekToFirstTag(ctx, ctx->cur_reader) != 0)
-        return false;
+        return no_stream;
     const uint32_t wanted = ctx->streams == 0 ? FLVD_FOUND_ALL : ctx->streams | FLVD_FOUND_METADATA;
     flvd_probing_t probing = {wanted, 0, FLVD_NO_TIMESTAMP};
-    if (!growing)
+    if (FLVD_IsGrowing(ctx)) {
+        const flvd_site_t site = FLVD_ProbeGrowingTags(ctx, &probing);
+        if (FLVD_IsFailure(site))
+            return site;
+    } else {
         FLVD_ProbeCompleteTags(ctx, &probing);
-    else if (!FLVD_ProbeGrowingTags(ctx, &probing, site))
-        return false;
-    *site = no_stream;
-    const uint32_t streams = probing.found & (FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
-    if (streams == 0)
-        return false;
+    }
+    ctx->streams = probing.found & (FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
+    if (ctx->streams == 0)
+        return no_stream;
     if (probing.first_ts != FLVD_NO_TIMESTAMP)
         ctx->first_ts = probing.first_ts;
-    ctx->streams = streams;
-    return true;
+    return FLVD_SITE_NONE;
 }
 
 // Last timestamp, end of the valid data and seek method.
@@ -141,8 +137,7 @@ bool FLVD_MeasureExtent(flvd_ctx_t* ctx)
 {
     if (!FLVD_IsGrowing(ctx))
         return FLVD_ProbeExtent(ctx, ctx->opened_for_info != 0) == 0;
-    const bool indexed = ctx->keyframe_arrays.times_ms != nullptr && ctx->keyframe_arrays.positions != nullptr;
-    ctx->seek_method = indexed ? FLVD_SEEK_BY_INDEX : FLVD_SEEK_NONE;
+    ctx->seek_method = FLVD_IsIndexInMemory(ctx) ? FLVD_SEEK_BY_INDEX : FLVD_SEEK_NONE;
     ctx->file_size = 0;
     return true;
 }
@@ -175,12 +170,12 @@ void FLVD_FillRecords(flvd_ctx_t* ctx, flvd_open_info_t* info)
     ctx->file_info.file_size = ctx->file_size;
     ctx->file_info.seek_method = ctx->seek_method;
     info->file_info = &ctx->file_info;
-    if ((ctx->streams & FLVD_STREAM_VIDEO) != 0) {
+    if (FLVD_HasVideo(ctx)) {
         info->has_video = 1;
         info->video_info = &ctx->video_info;
         info->video_config = &ctx->video_info;
     }
-    if ((ctx->streams & FLVD_STREAM_AUDIO) != 0) {
+    if (FLVD_HasAudio(ctx)) {
         info->has_audio = 1;
         info->audio_info = &ctx->audio_info;
         info->audio_config = &ctx->audio_info;
@@ -191,20 +186,19 @@ bool FLVD_Rewind(flvd_ctx_t* ctx)
 {
     if (FLVD_SeekToFirstTag(ctx, ctx->main_reader) != 0)
         return false;
-    return ctx->audio_reader == ctx->main_reader || FLVD_SeekToFirstTag(ctx, ctx->audio_reader) == 0;
+    return !FLVD_HasAudioReader(ctx) || FLVD_SeekToFirstTag(ctx, ctx->audio_reader) == 0;
 }
 
 } // namespace
 
-bool FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info, flvd_site_t* site)
+flvd_site_t FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info)
 {
-    if (!FLVD_ProbeTags(ctx, site))
-        return false;
-    *site = FLVD_SITE_PROBE_EXTENT;
+    const flvd_site_t site = FLVD_ProbeTags(ctx);
+    if (FLVD_IsFailure(site))
+        return site;
     if (!FLVD_MeasureExtent(ctx))
-        return false;
+        return FLVD_SITE_PROBE_EXTENT;
     FLVD_DeriveDuration(ctx);
     FLVD_FillRecords(ctx, info);
-    *site = FLVD_SITE_OPEN_REWIND;
-    return FLVD_Rewind(ctx);
+    return FLVD_Rewind(ctx) ? FLVD_SITE_NONE : FLVD_SITE_OPEN_REWIND;
 }

@@ -3,6 +3,7 @@
 #include "flvdmx/seek/seek.h"
 
 #include "flvdmx/fio/bytes.h"
+#include "flvdmx/instance.h"
 #include "flvdmx/sites.h"
 #include "flvdmx/tag/tag.h"
 
@@ -115,7 +116,7 @@ int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, u
 uint32_t FLVD_EntriesInMemory(const flvd_ctx_t* ctx)
 {
     const flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
-    if (arrays.times_ms == nullptr || arrays.positions == nullptr)
+    if (!FLVD_IsIndexInMemory(ctx))
         return 0;
     return std::min({ctx->keyframe_index.entry_count, arrays.times_count, arrays.positions_count});
 }

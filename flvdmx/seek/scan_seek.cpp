@@ -6,6 +6,7 @@
 #include "flvdmx/seek/seek.h"
 
 #include "flvdmx/fio/fio.h"
+#include "flvdmx/instance.h"
 #include "flvdmx/sites.h"
 #include "flvdmx/tag/tag.h"
 
@@ -269,7 +270,5 @@ int32_t FLVD_RunAudioScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result
     const bool backward = direction == FLVD_DIRECTION_BACKWARD;
     flvd_scan_t scan = {ctx, ctx->audio_reader, FLVD_TAG_AUDIO, target, result, backward, true, {}};
     const FLVD_ReadSizeGuard narrow(scan.file, ctx->scan_read_size, FLVD_WHOLE_CACHE);
-    const bool separate = (ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0;
-    const bool after_video = separate && (ctx->streams & FLVD_STREAM_VIDEO) != 0;
-    return after_video ? FLVD_SeekAfterVideo(&scan) : FLVD_SeekAudioAlone(&scan);
+    return FLVD_HasAudioReader(ctx) && FLVD_HasVideo(ctx) ? FLVD_SeekAfterVideo(&scan) : FLVD_SeekAudioAlone(&scan);
 }

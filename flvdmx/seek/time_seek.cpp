@@ -5,6 +5,7 @@
 
 #include "flvdmx/seek/seek.h"
 
+#include "flvdmx/instance.h"
 #include "flvdmx/sites.h"
 #include "flvdmx/tag/tag.h"
 
@@ -58,21 +59,6 @@ struct flvd_time_seek_t {
     uint32_t direction;
     uint32_t reached; // file timestamp
 };
-
-bool FLVD_HasVideo(const flvd_ctx_t* ctx)
-{
-    return (ctx->streams & FLVD_STREAM_VIDEO) != 0;
-}
-
-bool FLVD_HasAudio(const flvd_ctx_t* ctx)
-{
-    return (ctx->streams & FLVD_STREAM_AUDIO) != 0;
-}
-
-bool FLVD_HasTwoReaders(const flvd_ctx_t* ctx)
-{
-    return (ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0;
-}
 
 bool FLVD_IsByZero(const flvd_time_seek_t& seek)
 {
@@ -131,7 +117,7 @@ void FLVD_RestorePosition(fio_file_t* reader, int64_t* saved)
 void FLVD_RestorePositions(flvd_ctx_t* ctx)
 {
     FLVD_RestorePosition(ctx->main_reader, &ctx->saved_main_pos);
-    if (FLVD_HasTwoReaders(ctx) && FLVD_HasAudio(ctx))
+    if (FLVD_HasAudioReader(ctx) && FLVD_HasAudio(ctx))
         FLVD_RestorePosition(ctx->audio_reader, &ctx->saved_audio_pos);
 }
 
@@ -140,11 +126,11 @@ int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
 {
     flvd_ctx_t* const ctx = seek->ctx;
     FLVD_SavePosition(ctx->main_reader, &ctx->saved_main_pos);
-    if (FLVD_HasTwoReaders(ctx))
+    if (FLVD_HasAudioReader(ctx))
         FLVD_SavePosition(ctx->audio_reader, &ctx->saved_audio_pos);
     if (FLVD_SeekToFirstTag(ctx, ctx->main_reader) != 0)
         return FLVD_Fail(ctx, seek->sites->rewind);
-    if (FLVD_HasTwoReaders(ctx) && FLVD_SeekToFirstTag(ctx, ctx->audio_reader) != 0)
+    if (FLVD_HasAudioReader(ctx) && FLVD_SeekToFirstTag(ctx, ctx->audio_reader) != 0)
         return FLVD_Fail(ctx, seek->sites->rewind);
     ctx->last_video_ts = 0;
     ctx->last_audio_ts = 0;
@@ -239,7 +225,7 @@ int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
 int32_t FLVD_MoveGrowing(flvd_time_seek_t* seek)
 {
     const int32_t result = FLVD_MoveVideo(seek);
-    const bool follows = FLVD_HasTwoReaders(seek->ctx) && FLVD_HasAudio(seek->ctx);
+    const bool follows = FLVD_HasAudioReader(seek->ctx) && FLVD_HasAudio(seek->ctx);
     return result == 0 && follows ? FLVD_FollowVideo(*seek) : result;
 }
 
@@ -269,7 +255,7 @@ int32_t FLVD_MoveReaders(flvd_time_seek_t* seek)
         return FLVD_MISS;
     if (seek->growing)
         return FLVD_MoveGrowing(seek);
-    return FLVD_HasTwoReaders(ctx) ? FLVD_MoveTwoReaders(seek) : FLVD_MoveOneReader(seek);
+    return FLVD_HasAudioReader(ctx) ? FLVD_MoveTwoReaders(seek) : FLVD_MoveOneReader(seek);
 }
 
 // One attempt: moves the readers, or puts them back. 0, FLVD_MISS or another negative value.
@@ -292,7 +278,7 @@ void FLVD_SeekToEnd(const flvd_time_seek_t& seek)
     if ((seek.mode & FLVD_SEEK_TO_END_ON_MISS) == 0)
         return;
     __FLV_DMX__fioSeek64(seek.ctx->main_reader, 0, FIO_SEEK_END);
-    if (FLVD_HasTwoReaders(seek.ctx))
+    if (FLVD_HasAudioReader(seek.ctx))
         __FLV_DMX__fioSeek64(seek.ctx->audio_reader, 0, FIO_SEEK_END);
 }
 

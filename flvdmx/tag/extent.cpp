@@ -5,6 +5,7 @@
 
 #include "flvdmx/fio/bytes.h"
 #include "flvdmx/fio/fio.h"
+#include "flvdmx/instance.h"
 #include "flvdmx/sites.h"
 
 #include <algorithm>
@@ -94,11 +95,6 @@ bool FLVD_IsIndexUsable(const flvd_ctx_t* ctx)
     const flvd_keyframe_index_t& index = ctx->keyframe_index;
     return index.times_offset != 0 && index.positions_offset != 0 && index.times_offset < ctx->file_size &&
            index.positions_offset < ctx->file_size && index.entry_count > 1;
-}
-
-bool FLVD_IsIndexInMemory(const flvd_ctx_t* ctx)
-{
-    return ctx->keyframe_arrays.times_ms != nullptr && ctx->keyframe_arrays.positions != nullptr;
 }
 
 enum class FlvdElement { Number, NotANumber, ShortData };

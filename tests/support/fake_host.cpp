@@ -297,9 +297,9 @@ void FakeHost::log_memory(const char* name, const std::string& arguments, const 
 
 FakeHost::Handle* FakeHost::handle(void* pointer)
 {
-    for (const auto& handle : m_handles)
-        if (handle.get() == pointer && handle->open)
-            return handle.get();
+    for (auto handle = m_handles.rbegin(); handle != m_handles.rend(); ++handle) // the newest are in use
+        if (handle->get() == pointer && (*handle)->open)
+            return handle->get();
     violation("use of a handle that is not open");
     return nullptr;
 }

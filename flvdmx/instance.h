@@ -1,0 +1,38 @@
+// Questions about an instance that several layers ask.
+#ifndef FLVDMX_INSTANCE_H
+#define FLVDMX_INSTANCE_H
+
+#include "flvdmx/flvdmx.h"
+
+inline bool FLVD_IsGrowing(const flvd_ctx_t* ctx)
+{
+    return (ctx->options & FLVD_OPT_PROGRESSIVE) != 0;
+}
+
+inline bool FLVD_HasUserBuffer(const flvd_ctx_t* ctx)
+{
+    return (ctx->options & FLVD_OPT_USER_BUFFER) != 0;
+}
+
+// True when audio is read through a reader of its own.
+inline bool FLVD_HasAudioReader(const flvd_ctx_t* ctx)
+{
+    return ctx->opened_for_info == 0 && (ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0;
+}
+
+inline bool FLVD_HasVideo(const flvd_ctx_t* ctx)
+{
+    return (ctx->streams & FLVD_STREAM_VIDEO) != 0;
+}
+
+inline bool FLVD_HasAudio(const flvd_ctx_t* ctx)
+{
+    return (ctx->streams & FLVD_STREAM_AUDIO) != 0;
+}
+
+inline bool FLVD_IsIndexInMemory(const flvd_ctx_t* ctx)
+{
+    return ctx->keyframe_arrays.times_ms != nullptr && ctx->keyframe_arrays.positions != nullptr;
+}
+
+#endif
