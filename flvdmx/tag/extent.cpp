@@ -169,15 +169,14 @@ int64_t FLVD_TagEnd(fio_file_t* file, const flvd_tag_info_t& tag)
     return start < 0 ? start : start + tag.data_size + FLVD_TAG_OVERHEAD;
 }
 
-// From the tag found at the last keyframe inside the file, walks forward to the end of the last tag.
-int32_t FLVD_WalkToEnd(flvd_ctx_t* ctx, int64_t* end)
+// From this tag, on which the reader stands, walks forward to the end of the last tag.
+int32_t FLVD_WalkToEnd(flvd_ctx_t* ctx, flvd_tag_info_t tag, int64_t* end)
 {
-    flvd_tag_info_t tag;
-    while (FLVD_MoveToNextTag(ctx, ctx->cur_reader, &tag, FLVD_TAG_ANY, nullptr) == 0) {
+    do {
         *end = FLVD_TagEnd(ctx->cur_reader, tag);
         if (*end < 0)
             return FLVD_Fail(ctx, FLVD_SITE_INDEX_FORWARD_POSITION);
-    }
+    } while (FLVD_MoveToNextTag(ctx, ctx->cur_reader, &tag, FLVD_TAG_ANY, nullptr) == 0);
     return 0;
 }
 
@@ -218,10 +217,8 @@ int32_t FLVD_IndexedEnd(flvd_ctx_t* ctx, int64_t* end)
     if (__FLV_DMX__fioSeek64(file, last, FIO_SEEK_SET) != 0)
         return FLVD_Fail(ctx, memory ? FLVD_SITE_INDEX_MEMORY_SEEK : FLVD_SITE_INDEX_FILE_SEEK);
     flvd_tag_info_t tag;
-    if (FLVD_GetCurrTagInfo(ctx, file, &tag, FLVD_TAG_ANY, 1) != 0)
-        return FLVD_StepBackToEnd(ctx, last, end);
-    *end = last;
-    return FLVD_WalkToEnd(ctx, end);
+    const bool found = FLVD_GetCurrTagInfo(ctx, file, &tag, FLVD_TAG_ANY, 1) == 0;
+    return found ? FLVD_WalkToEnd(ctx, tag, end) : FLVD_StepBackToEnd(ctx, last, end);
 }
 
 // Cuts the entries behind the end of the valid data off. The entry that crosses it stays.
