@@ -71,7 +71,7 @@ enum {
 /** Results of a failed QVX_FLV_DMX. FLVD_OP_GET_LAST_ERROR says more. */
 enum {
     FLVD_RET_FAILED = -1,      /**< general failure */
-    FLVD_RET_END = -2,         /**< end of the data, or reading failed; see FLVD_OP_GET_FRAME below */
+    FLVD_RET_END = -2,         /**< end of the data, reading failed, or a seek missed; see QVX_FLV_DMX */
     FLVD_RET_NO_INSTANCE = -3, /**< the handle holds no instance */
     FLVD_RET_CANNOT_OPEN = -4  /**< the file cannot be opened */
 };
@@ -100,11 +100,11 @@ enum {
 /** Mode bits of flvd_seek_request_t::mode. */
 enum {
     FLVD_SEEK_RELATIVE = 0x10,          /**< `time` is an offset from the current position */
-    FLVD_SEEK_DIRECTION_MASK = 0x300,   /**< the two direction bits; 0 and 0x300 leave the choice to the library */
+    FLVD_SEEK_DIRECTION_MASK = 0x300,   /**< direction; 0 and 0x300: forward unless the target is earlier than now */
     FLVD_SEEK_BACKWARD = 0x100,         /**< land on the keyframe at or before the target */
     FLVD_SEEK_FORWARD = 0x200,          /**< land on the keyframe at or after the target */
     FLVD_SEEK_TO_END_ON_MISS = 0x10000, /**< after a miss, put the readers at their end */
-    FLVD_SEEK_RETRY_BACKWARD = 0x20000  /**< after a miss, retry once as an absolute backward seek */
+    FLVD_SEEK_RETRY_BACKWARD = 0x20000  /**< after a miss, retry once as an absolute backward seek to `time` */
 };
 
 /** Tag-kind bits: which tags are wanted, and which kind was found. */
@@ -153,7 +153,7 @@ enum {
     FLVD_ERR_EXTENT = -1005,            /**< the end of the valid data was not found */
     FLVD_ERR_FRAME_SEEK = -2000,        /**< a frame seek failed */
     FLVD_ERR_SEEK_MISS = -2003,         /**< the target is beyond the end, or no keyframe lies in that direction */
-    FLVD_ERR_SEEK_PLACE = -2006,        /**< the tag at the place sought is not the one expected */
+    FLVD_ERR_SEEK_PLACE = -2006,        /**< no tag, or not the one expected, where a seek led */
     FLVD_ERR_INDEX_ELEMENT = -2007,     /**< a keyframe position in the metadata is not a number */
     FLVD_ERR_AVC_CONFIG = -3001,        /**< AVC record: damaged, or not 1 to 128 bytes of parameter sets */
     FLVD_ERR_VIDEO_HEADER = -3002,      /**< a picture header or sequence parameter set was not understood */
@@ -167,7 +167,7 @@ enum {
     FLVD_ERR_INFO_ONLY = -4007,         /**< the instance was opened for information only */
     FLVD_ERR_NO_TAG = -10001,           /**< no valid tag was found */
     FLVD_ERR_SHORT_DATA = -10002,       /**< end of the data, or a short read */
-    FLVD_ERR_NOT_SEEKABLE = -10003      /**< the file has no seek method */
+    FLVD_ERR_NOT_SEEKABLE = -10003      /**< no seek method; growing file: no video, or no index in memory */
 };
 
 /** States of a cached file, fio_file_t::state. */
@@ -356,7 +356,13 @@ typedef struct flvd_frame_t {
     uint32_t reserved[2];  /**< 0 */
 } flvd_frame_t;
 
-/** First argument of operation 3; the second is an int32_t that receives the time reached, in ms. */
+/**
+ * First argument of operation 3; the second is an int32_t that receives the time reached, in ms from the first
+ * timestamp, on success only. The current position is the time of the last video frame, without video of the last audio
+ * frame. A target at or before 0 goes to the first tag, a relative time of 0 only reports. A miss (FLVD_RET_END) is a
+ * target beyond the end, or without a keyframe in its direction; after it and after any failure delivery goes on where
+ * it was.
+ */
 typedef struct flvd_seek_request_t {
     int32_t time;  /**< ms, from the first timestamp; with FLVD_SEEK_RELATIVE from the current position */
     uint32_t mode; /**< FLVD_SEEK_RELATIVE, _BACKWARD, _FORWARD, _TO_END_ON_MISS, _RETRY_BACKWARD */
@@ -418,7 +424,7 @@ typedef struct flvd_ctx_t {
     int64_t last_keyframe_pos;              /**< metadata "lastkeyframelocation" */
     uint32_t last_keyframe_ms;              /**< metadata "lastkeyframetimestamp", or from the index */
     uint32_t file_shorter_than_meta;        /**< 1 when the metadata's "filesize" is larger than the file */
-    int64_t saved_main_pos;                 /**< growing file, seek: where to go back to; 0 when nowhere */
+    int64_t saved_main_pos;                 /**< where to go back to after a failure; 0 when nowhere */
     int64_t saved_audio_pos;                /**< the same for the audio reader */
     flvd_keyframe_arrays_t keyframe_arrays; /**< index in memory */
     int32_t error;                          /**< last error code, FLVD_ERR_* */
@@ -683,15 +689,19 @@ FLVD_API int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length);
 /* -------------------------------------------------------------------------------------- seeking */
 
 /**
- * Puts a reader on the first byte of a tag near a timestamp, by the keyframe index or by scanning.
+ * Puts a reader on the first byte of a tag near a timestamp, by the keyframe index or by scanning: video the main
+ * reader, on a keyframe; audio the audio reader, on any audio tag, starting where the main reader stands when it has a
+ * reader of its own and the file has video.
  *
  * @param ctx       open instance of a complete file
  * @param target    file timestamp in ms (the host's time plus first_ts)
- * @param result    receives the timestamp of the tag reached; written on success, and with last_ts on a forward
- *                  scan's miss
+ * @param result    receives the timestamp of the tag reached; first_ts when the reader was put in front of the first
+ *                  tag, last_ts when audio ends before the target and the reader was put at the end of the data. May be
+ *                  written on failure as well.
  * @param stream    FLVD_STREAM_VIDEO; any other value is audio
  * @param direction 1: the keyframe at or before the target; any other value: at or after it
- * @return 0; FLVD_ERR_END_OF_DATA for a miss; another negative value with error and error_line set
+ * @return 0; FLVD_ERR_END_OF_DATA for a miss; another negative value for a failure, mostly with error and error_line
+ * set. After both the reader may stand anywhere: it is the time seek that puts it back.
  */
 FLVD_API int32_t FLVD_RunFrameSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, uint32_t stream,
                                    uint32_t direction);

@@ -77,12 +77,12 @@ flvd_choice_t FLVD_ChooseEntry(const flvd_times_t& times, uint32_t target, bool 
     for (; i < times.count; ++i) {
         uint32_t time = 0;
         if (!FLVD_NextTime(times, i, &time))
-            break; // the entries before it are all
-        if (time >= target) {
-            if (!backward || (time == target && i != 0))
-                return {FlvdChoice::Entry, i, time};
-            return i != 0 ? flvd_choice_t{FlvdChoice::Entry, i - 1, before} : flvd_choice_t{FlvdChoice::Rewind, 0, 0};
-        }
+            break; // the entries before it are the whole index
+        const bool exact = time == target && i != 0;
+        if (time >= target && (!backward || exact))
+            return {FlvdChoice::Entry, i, time};
+        if (time >= target)
+            break;
         before = time;
     }
     if (!backward)
@@ -96,7 +96,8 @@ int32_t FLVD_RewindByIndex(flvd_ctx_t* ctx, uint32_t* result, flvd_site_t site)
     return FLVD_SeekToFirstTag(ctx, ctx->main_reader) == 0 ? 0 : FLVD_Fail(ctx, site);
 }
 
-// Moves to a keyframe's position and takes its timestamp, which must be near the index's. Its type is not asked.
+// Moves to a keyframe's position and takes its timestamp, which must be near the index's: the only proof that the index
+// belongs to the file.
 int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, uint32_t* result,
                          const flvd_index_sites_t& sites)
 {
@@ -106,7 +107,8 @@ int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, u
     if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_HEADER_SIZE, ctx->main_reader) < FLVD_TAG_HEADER_SIZE)
         return FLVD_Fail(ctx, sites.short_tag);
     const uint32_t timestamp = FLVD_TagTimestamp(bytes);
-    if (FLVD_TimeDistance(timestamp, expected) > FLVD_INDEX_TOLERANCE_MS)
+    const bool in_header = position <= ctx->data_offset; // no tag, whatever its bytes say
+    if (in_header || FLVD_TimeDistance(timestamp, expected) > FLVD_INDEX_TOLERANCE_MS)
         return FLVD_Fail(ctx, sites.tolerance);
     *result = timestamp;
     return 0;

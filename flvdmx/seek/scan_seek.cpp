@@ -30,7 +30,8 @@ struct flvd_scan_t {
 
 int32_t FLVD_SeekBackward(flvd_scan_t* scan);
 
-// The results of seeks made to start a walk are not looked at: a failed one shows at the first step.
+// The results of seeks made to start a walk are not looked at: the walk then starts where the reader is, and answers on
+// the right side of the target all the same.
 void FLVD_StartAt(const flvd_scan_t* scan, int64_t position)
 {
     __FLV_DMX__fioSeek64(scan->file, position, FIO_SEEK_SET);
@@ -61,26 +62,10 @@ bool FLVD_IsPictureless(const flvd_tag_header_t& header)
     return header.IsVideo() && header.IsAvc() && FLVD_IsPicturelessPacket(header.second);
 }
 
-bool FLVD_MayStop(const flvd_scan_t* scan)
-{
-    flvd_tag_header_t header;
-    return scan->audio || !FLVD_PeekTagHeader(scan->file, &header) || !FLVD_IsPictureless(header);
-}
-
 int32_t FLVD_Step(flvd_scan_t* scan, bool forward)
 {
     const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
     return step(scan->ctx, scan->file, &scan->tag, scan->kind, nullptr);
-}
-
-// The single step after a walk.
-int32_t FLVD_StepToFrame(flvd_scan_t* scan, bool forward)
-{
-    int32_t code = 0;
-    do
-        code = FLVD_Step(scan, forward);
-    while (code == 0 && !FLVD_MayStop(scan));
-    return code;
 }
 
 // Walks until the target is reached or passed. 0, or the code of the step that failed.
@@ -93,7 +78,12 @@ int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
         if (code != 0)
             return code;
         const bool reached = forward ? scan->tag.timestamp >= scan->target : scan->tag.timestamp <= scan->target;
-        if (reached && FLVD_MayStop(scan))
+        if (!reached)
+            continue;
+        flvd_tag_header_t header;
+        if (!FLVD_PeekTagHeader(scan->file, &header))
+            return FLVD_ERR_NOT_FOUND;
+        if (!FLVD_IsPictureless(header))
             return 0;
     }
 }
@@ -115,7 +105,7 @@ int32_t FLVD_SeekForward(flvd_scan_t* scan)
     if (code == FLVD_ERR_END_OF_DATA)
         return FLVD_SeekAtEnd(scan);
     if (code == 0 && scan->backward && scan->tag.timestamp != scan->target) {
-        code = FLVD_StepToFrame(scan, false);
+        code = FLVD_Walk(scan, false);
         if (code == FLVD_ERR_AT_FIRST_TAG)
             return FLVD_Rewind(scan);
     }
@@ -141,7 +131,7 @@ int32_t FLVD_SeekBackward(flvd_scan_t* scan)
     if (code == FLVD_ERR_AT_FIRST_TAG)
         return FLVD_SeekAtStart(scan);
     if (code == 0 && !scan->backward && scan->tag.timestamp != scan->target) {
-        code = FLVD_StepToFrame(scan, true);
+        code = FLVD_Walk(scan, true);
         if (code == FLVD_ERR_END_OF_DATA)
             return scan->audio ? FLVD_SeekAtEnd(scan) : FLVD_ERR_END_OF_DATA;
     }
@@ -154,10 +144,12 @@ int32_t FLVD_SeekFromEnd(flvd_scan_t* scan)
     return FLVD_SeekBackward(scan);
 }
 
-// From the tag at the position.
+// From the tag at the position. When it has the target's time without being the answer, the answer may lie on either
+// side of it: the walk starts against the direction, so that coming back passes it.
 int32_t FLVD_SeekFromTag(flvd_scan_t* scan)
 {
-    return scan->target > scan->tag.timestamp ? FLVD_SeekForward(scan) : FLVD_SeekBackward(scan);
+    const bool ahead = scan->target > scan->tag.timestamp || (scan->target == scan->tag.timestamp && scan->backward);
+    return ahead ? FLVD_SeekForward(scan) : FLVD_SeekBackward(scan);
 }
 
 // Which of start, end and a known place in the file is nearest to the target.

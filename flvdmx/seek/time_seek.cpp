@@ -138,12 +138,14 @@ int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
     return 0;
 }
 
-// Saves a reader's position and moves it by a frame seek. The time found ends in seek->reached.
-int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, fio_file_t* reader, int64_t* saved,
-                        const flvd_stream_sites_t& sites)
+// Saves a reader's position and moves it by a frame seek. The time found ends in seek->reached and becomes the
+// stream's current position.
+int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, const flvd_stream_sites_t& sites)
 {
     flvd_ctx_t* const ctx = seek->ctx;
-    if (!FLVD_SavePosition(reader, saved))
+    const bool own_reader = stream == FLVD_STREAM_AUDIO && FLVD_HasAudioReader(ctx);
+    if (!FLVD_SavePosition(own_reader ? ctx->audio_reader : ctx->main_reader,
+                           own_reader ? &ctx->saved_audio_pos : &ctx->saved_main_pos))
         return FLVD_Fail(ctx, sites.position);
     const auto frame_seek = seek->growing ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
     uint32_t found = 0;
@@ -153,6 +155,7 @@ int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, fio_file_t* rea
         return result;
     }
     seek->reached = found;
+    (stream == FLVD_STREAM_VIDEO ? ctx->last_video_ts : ctx->last_audio_ts) = found - ctx->first_ts;
     return 0;
 }
 
@@ -160,32 +163,8 @@ int32_t FLVD_MoveOneReader(flvd_time_seek_t* seek)
 {
     flvd_ctx_t* const ctx = seek->ctx;
     const uint32_t stream = FLVD_HasVideo(ctx) ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
-    const int32_t result = FLVD_MoveStream(seek, stream, ctx->main_reader, &ctx->saved_main_pos, g_flvd_oneReaderSites);
-    if (result < 0)
-        return result;
-    if (FLVD_HasVideo(ctx))
-        ctx->last_video_ts = seek->reached - ctx->first_ts;
-    if (FLVD_HasAudio(ctx))
-        ctx->last_audio_ts = seek->reached - ctx->first_ts;
-    return 0;
-}
-
-int32_t FLVD_MoveVideo(flvd_time_seek_t* seek)
-{
-    flvd_ctx_t* const ctx = seek->ctx;
-    const int32_t result =
-        FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, ctx->main_reader, &ctx->saved_main_pos, seek->sites->main);
-    if (result == 0)
-        ctx->last_video_ts = seek->reached - ctx->first_ts;
-    return result;
-}
-
-int32_t FLVD_MoveAudio(flvd_time_seek_t* seek)
-{
-    flvd_ctx_t* const ctx = seek->ctx;
-    const int32_t result =
-        FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, ctx->audio_reader, &ctx->saved_audio_pos, seek->sites->audio);
-    if (result == 0)
+    const int32_t result = FLVD_MoveStream(seek, stream, g_flvd_oneReaderSites);
+    if (result == 0 && FLVD_HasAudio(ctx))
         ctx->last_audio_ts = seek->reached - ctx->first_ts;
     return result;
 }
@@ -195,14 +174,14 @@ int32_t FLVD_MoveTwoReaders(flvd_time_seek_t* seek)
 {
     const flvd_ctx_t* const ctx = seek->ctx;
     if (!FLVD_HasVideo(ctx))
-        return FLVD_MoveAudio(seek);
-    const int32_t result = FLVD_MoveVideo(seek);
+        return FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, seek->sites->audio);
+    const int32_t result = FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, seek->sites->main);
     if (result < 0 || !FLVD_HasAudio(ctx))
         return result;
     const uint32_t video = seek->reached;
     seek->target = video;
     seek->direction = FLVD_DIRECTION_BACKWARD;
-    const int32_t audio = FLVD_MoveAudio(seek);
+    const int32_t audio = FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, seek->sites->audio);
     seek->reached = video;
     return audio;
 }
@@ -224,7 +203,7 @@ int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
 
 int32_t FLVD_MoveGrowing(flvd_time_seek_t* seek)
 {
-    const int32_t result = FLVD_MoveVideo(seek);
+    const int32_t result = FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, seek->sites->main);
     const bool follows = FLVD_HasAudioReader(seek->ctx) && FLVD_HasAudio(seek->ctx);
     return result == 0 && follows ? FLVD_FollowVideo(*seek) : result;
 }
