@@ -31,6 +31,32 @@ inline void FLVD_FioConsume(fio_file_t* file, uint32_t n)
     file->head = file->count == 0 ? 0 : file->head + n;
 }
 
+// __FLV_DMX__fioShowBytesByPtr, without a call when the bytes are cached: most of the work on a frame is peeks and
+// skips.
+inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
+{
+    if (n > file->count || file->state != FIO_STATE_READ)
+        return __FLV_DMX__fioShowBytesByPtr(bytes, n, file);
+    *bytes = file->cache + file->head;
+    return n;
+}
+
+// __FLV_DMX__fioSkipBytes in the same way. The bit reader's own skips do not come through here.
+inline uint32_t FLVD_FioSkip(uint32_t n, fio_file_t* file)
+{
+    if (n > file->count || file->state != FIO_STATE_READ)
+        return __FLV_DMX__fioSkipBytes(n, file);
+    FLVD_FioDropBits(file);
+    FLVD_FioConsume(file, n);
+    return n;
+}
+
+// __FLV_DMX__fioIsEof in the same way.
+inline bool FLVD_FioAtEnd(fio_file_t* file)
+{
+    return file->count == 0 && __FLV_DMX__fioIsEof(file) != 0;
+}
+
 inline void FLVD_FioEmpty(fio_file_t* file)
 {
     file->head = 0;

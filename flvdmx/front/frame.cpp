@@ -5,6 +5,7 @@
 
 #include "flvdmx/front/front.h"
 
+#include "flvdmx/fio/fio.h"
 #include "flvdmx/fio/tables.h"
 #include "flvdmx/instance.h"
 #include "flvdmx/tag/tag.h"
@@ -113,7 +114,7 @@ FlvdTurn FLVD_GiveUpTag(const flvd_delivery_t& delivery, flvd_site_t rollback)
 // Behind a payload that is not delivered.
 FlvdTurn FLVD_PassPayload(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
 {
-    __FLV_DMX__fioSkipBytes(left, delivery.reader);
+    FLVD_FioSkip(left, delivery.reader);
     if (FLVD_PassBackPointer(delivery.reader, delivery.tag.data_size))
         return FlvdTurn::Next;
     return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
@@ -160,11 +161,11 @@ FlvdTurn FLVD_CopyFrame(const flvd_delivery_t& delivery, uint32_t n, const flvd_
     }
     ctx->last_frame_size = read;
     const uint8_t* back_pointer = nullptr;
-    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&back_pointer, FLVD_BACK_POINTER_SIZE, delivery.reader);
+    const uint32_t available = FLVD_FioPeek(&back_pointer, FLVD_BACK_POINTER_SIZE, delivery.reader);
     if (delivery.growing && available < FLVD_BACK_POINTER_SIZE)
         return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
     FLVD_Report(delivery, frame);
-    __FLV_DMX__fioSkipBytes(FLVD_BACK_POINTER_SIZE, delivery.reader);
+    FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, delivery.reader);
     if (delivery.growing)
         *delivery.saved = 0;
     return FlvdTurn::Delivered;
@@ -175,9 +176,9 @@ FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
 {
     fio_file_t* const reader = delivery.reader;
     const flvd_tag_info_t& tag = delivery.tag;
-    __FLV_DMX__fioSkipBytes(FLVD_TAG_HEADER_SIZE, reader);
+    FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_PAYLOAD_PEEK, reader) < FLVD_PAYLOAD_PEEK) {
+    if (FLVD_FioPeek(&bytes, FLVD_PAYLOAD_PEEK, reader) < FLVD_PAYLOAD_PEEK) {
         const bool video = tag.type == FLVD_TAG_TYPE_VIDEO;
         const flvd_payload_sites_t& sites = video ? g_flvd_videoSites : g_flvd_soundSites; // of AAC alike so far
         FLVD_Record(delivery.ctx, sites.short_peek);
@@ -186,18 +187,18 @@ FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
     const flvd_payload_t payload = FLVD_Classify(tag.type, bytes);
     if (payload.header == 0 || tag.data_size < payload.header)
         return FLVD_PassPayload(delivery, tag.data_size, *payload.sites);
-    __FLV_DMX__fioSkipBytes(payload.header, reader);
+    FLVD_FioSkip(payload.header, reader);
     return FLVD_CopyFrame(delivery, tag.data_size - payload.header, *payload.sites, frame);
 }
 
 // Complete file: describes the next tag, or passes what is there by the size of the last one.
 FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
-    if (__FLV_DMX__fioIsEof(delivery->reader) != 0)
+    if (FLVD_FioAtEnd(delivery->reader))
         return FLVD_FailRequest(*delivery, delivery->sites->end);
     if (FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 1) == 0)
         return FLVD_HandleTag(*delivery, frame);
-    const uint32_t skipped = __FLV_DMX__fioSkipBytes(delivery->tag.data_size + FLVD_TAG_OVERHEAD, delivery->reader);
+    const uint32_t skipped = FLVD_FioSkip(delivery->tag.data_size + FLVD_TAG_OVERHEAD, delivery->reader);
     return skipped != 0 ? FlvdTurn::Next : FLVD_FailRequest(*delivery, delivery->sites->end);
 }
 
@@ -205,7 +206,7 @@ FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 // file may have grown since.
 flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
 {
-    const bool at_end = __FLV_DMX__fioIsEof(delivery.reader) != 0;
+    const bool at_end = FLVD_FioAtEnd(delivery.reader);
     const int64_t position = __FLV_DMX__fioTell64(delivery.reader);
     if (position < 0)
         return FLVD_SITE_FRAME_POSITION;

@@ -14,7 +14,7 @@ namespace {
 int32_t FLVD_PeekBackPointer(fio_file_t* file, int64_t cursor)
 {
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
+    if (FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
         return 0;
     const auto value = static_cast<int32_t>(FLVD_GetBE32(bytes));
     return value > 0 && value < cursor ? value : 0;

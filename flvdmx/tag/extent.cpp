@@ -30,14 +30,14 @@ enum class FlvdProbe { Found, Nothing, SeekFailed };
 FlvdProbe FLVD_ProbeBackPointer(fio_file_t* file, uint32_t max_timestamp, int64_t cursor)
 {
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
+    if (FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
         return FlvdProbe::Nothing;
     const auto back = static_cast<int32_t>(FLVD_GetBE32(bytes));
     if (back <= 0 || back >= cursor)
         return FlvdProbe::Nothing;
     if (__FLV_DMX__fioSeek64(file, -int64_t{back}, FIO_SEEK_CUR) != 0)
         return FlvdProbe::SeekFailed;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_HEADER_SIZE, file) < FLVD_TAG_HEADER_SIZE)
+    if (FLVD_FioPeek(&bytes, FLVD_TAG_HEADER_SIZE, file) < FLVD_TAG_HEADER_SIZE)
         return FlvdProbe::Nothing;
     const uint32_t data_size = FLVD_GetBE24(bytes + FLVD_DATA_SIZE_FIELD);
     const bool agrees = data_size + FLVD_TAG_HEADER_SIZE == static_cast<uint32_t>(back);
@@ -103,14 +103,14 @@ enum class FlvdElement { Number, NotANumber, ShortData };
 FlvdElement FLVD_ReadElement(fio_file_t* file, double* value)
 {
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, 1 + FLVD_AMF_NUMBER_SIZE, file) < 1 + FLVD_AMF_NUMBER_SIZE)
+    if (FLVD_FioPeek(&bytes, 1 + FLVD_AMF_NUMBER_SIZE, file) < 1 + FLVD_AMF_NUMBER_SIZE)
         return FlvdElement::ShortData;
     const uint8_t marker = bytes[0];
     const double number = FLVD_GetDouble(bytes + 1);
-    __FLV_DMX__fioSkipBytes(1, file);
+    FLVD_FioSkip(1, file);
     if (marker != FLVD_AMF_NUMBER)
         return FlvdElement::NotANumber;
-    __FLV_DMX__fioSkipBytes(FLVD_AMF_NUMBER_SIZE, file);
+    FLVD_FioSkip(FLVD_AMF_NUMBER_SIZE, file);
     *value = number;
     return FlvdElement::Number;
 }

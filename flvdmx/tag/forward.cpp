@@ -57,12 +57,12 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
     int64_t scanned = 0;
     do {
         const uint8_t* window = nullptr;
-        const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&window, ctx->cache_size, file);
+        const uint32_t available = FLVD_FioPeek(&window, ctx->cache_size, file);
         if (available < FLVD_TAG_PEEK_SIZE)
             return FLVD_ERR_END_OF_DATA;
         const uint32_t starts = available - (FLVD_TAG_PEEK_SIZE - 1); // the last 12 bytes begin the next window
         const uint32_t found = FLVD_FindCandidate(window, starts, rules);
-        __FLV_DMX__fioSkipBytes(found, file);
+        FLVD_FioSkip(found, file);
         scanned += found;
         if (found < starts)
             return scanned;
@@ -80,7 +80,7 @@ void FLVD_ChargeScan(flvd_search_t* search, int64_t distance, int32_t failed_cos
 // Resynchronisation step: from the byte behind the position to the next candidate. A failed one ends the search.
 void FLVD_Resynchronise(flvd_search_t* search)
 {
-    __FLV_DMX__fioSkipBytes(1, search->file);
+    FLVD_FioSkip(1, search->file);
     const int64_t distance = FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW);
     FLVD_ChargeScan(search, distance, search->budget);
 }
@@ -99,11 +99,11 @@ bool FLVD_TakePosition(flvd_search_t* search)
 // no more is read here than needed.
 bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
 {
-    __FLV_DMX__fioSkipBytes(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
+    FLVD_FioSkip(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
     const uint32_t quantum = __FLV_DMX__fioGetCacheReadSize(file);
     const FLVD_ReadSizeGuard narrow(file, std::min(quantum, FLVD_NARROW_READ), quantum);
     const uint8_t* bytes = nullptr;
-    return __FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
+    return FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
            FLVD_IsBackPointer(bytes, tag.data_size);
 }
 
@@ -122,7 +122,7 @@ flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_i
     const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size <= file->capacity && file->read_size == file->capacity) {
         const uint8_t* bytes = nullptr;
-        if (__FLV_DMX__fioShowBytesByPtr(&bytes, size, file) == size)
+        if (FLVD_FioPeek(&bytes, size, file) == size)
             return {FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, tag.data_size) || exempt, true};
     }
     return {FLVD_CheckBehind(file, tag) || exempt, false};
@@ -134,7 +134,7 @@ bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
 {
     const int64_t next = search->position + 1;
     if (in_place)
-        __FLV_DMX__fioSkipBytes(1, search->file);
+        FLVD_FioSkip(1, search->file);
     else if (__FLV_DMX__fioSeek64(search->file, next, FIO_SEEK_SET) != 0)
         return false;
     FLVD_ChargeScan(search, FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW), 0);
@@ -147,7 +147,7 @@ bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
 bool FLVD_PassGoodTag(flvd_search_t* search, bool in_place, const flvd_tag_info_t& tag)
 {
     const int64_t start = search->position;
-    __FLV_DMX__fioSkipBytes(in_place ? tag.data_size + FLVD_TAG_OVERHEAD : FLVD_BACK_POINTER_SIZE, search->file);
+    FLVD_FioSkip(in_place ? tag.data_size + FLVD_TAG_OVERHEAD : FLVD_BACK_POINTER_SIZE, search->file);
     search->budget = FLVD_RESYNC_WINDOW;
     return FLVD_TakePosition(search) && search->position > start;
 }
@@ -176,7 +176,7 @@ int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& heade
     if (FLVD_IsWantedTag(header, search->wanted))
         return 0;
     const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
-    const bool moved = header.IsAudio() ? __FLV_DMX__fioSkipBytes(size, search->file) == size
+    const bool moved = header.IsAudio() ? FLVD_FioSkip(size, search->file) == size
                                         : __FLV_DMX__fioSeek64(search->file, size, FIO_SEEK_CUR) == 0;
     return moved ? FLVD_SEARCH_ON : FLVD_ERR_END_OF_DATA;
 }
@@ -185,7 +185,7 @@ int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& heade
 int32_t FLVD_SearchTag(flvd_search_t* search, flvd_tag_header_t* header)
 {
     for (;;) {
-        if (__FLV_DMX__fioIsEof(search->file) != 0)
+        if (FLVD_FioAtEnd(search->file))
             return FLVD_ERR_END_OF_DATA;
         if (search->budget <= 0)
             return FLVD_BUDGET_SPENT;
@@ -235,7 +235,7 @@ uint32_t FLVD_ForwardKind(const flvd_tag_header_t& header, uint32_t wanted)
 int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 {
     if (search->position == search->ctx->data_offset) { // PreviousTagSize0: the first tag itself comes next
-        __FLV_DMX__fioSkipBytes(FLVD_BACK_POINTER_SIZE, search->file);
+        FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, search->file);
         return FLVD_TakePosition(search) ? 0 : FLVD_ERR_NOT_FOUND;
     }
     flvd_tag_header_t header;
@@ -260,7 +260,7 @@ int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* 
         return FLVD_ERR_NOT_FOUND;
     flvd_search_t search = FLVD_Search(ctx, file, wanted, verify != 0, position);
     if (position == ctx->data_offset)
-        __FLV_DMX__fioSkipBytes(FLVD_BACK_POINTER_SIZE, file);
+        FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
     flvd_tag_header_t header;
     const int32_t result = FLVD_SearchTag(&search, &header);
     if (result == FLVD_BUDGET_SPENT)

@@ -3,6 +3,7 @@
 #include "flvdmx/tag/tag.h"
 
 #include "flvdmx/fio/bytes.h"
+#include "flvdmx/fio/fio.h"
 
 namespace {
 
@@ -51,7 +52,7 @@ flvd_tag_header_t FLVD_ReadTagHeader(const uint8_t* bytes)
 bool FLVD_PeekTagHeader(fio_file_t* file, flvd_tag_header_t* header)
 {
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_PEEK_SIZE, file) < FLVD_TAG_PEEK_SIZE)
+    if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, file) < FLVD_TAG_PEEK_SIZE)
         return false;
     *header = FLVD_ReadTagHeader(bytes);
     return true;
@@ -101,10 +102,10 @@ bool FLVD_IsBackPointer(const uint8_t* bytes, uint32_t data_size)
 bool FLVD_PassBackPointer(fio_file_t* file, uint32_t data_size)
 {
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
+    if (FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
         return false;
     if (FLVD_IsBackPointer(bytes, data_size))
-        __FLV_DMX__fioSkipBytes(FLVD_BACK_POINTER_SIZE, file);
+        FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
     return true;
 }
 
