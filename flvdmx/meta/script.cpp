@@ -357,9 +357,10 @@ void* FLVD_AllocateArray(const flvd_script_state_t* state, uint32_t count, uint3
 {
     if (count > UINT32_MAX / element || count > FLVD_ScriptLeft(state))
         return nullptr;
-    void* const array = g_flvd_pfnMetaAlloc(count * element);
+    const uint32_t size = count * element;
+    void* const array = g_flvd_pfnMetaAlloc(size);
     if (array != nullptr)
-        std::memset(array, 0, count * element);
+        std::memset(array, 0, size);
     return array;
 }
 
