@@ -1,0 +1,313 @@
+// The sample files whole, growing, cut short, damaged, and on a host that fails. What is delivered is what an
+// independent prober found in them; whatever happens, all that was taken from the host is given back, which the fake
+// host itself watches over.
+
+#include "support/expected.h"
+#include "support/report.h"
+#include "support/session.h"
+
+#include <algorithm>
+#include <array>
+#include <optional>
+#include <set>
+
+using namespace flvd_test;
+
+namespace {
+
+constexpr uint32_t SEPARATE = FLVD_OPT_SEPARATE_AUDIO_READER;
+constexpr uint32_t USER = FLVD_OPT_USER_BUFFER;
+constexpr uint32_t GROWING = FLVD_OPT_PROGRESSIVE;
+constexpr uint32_t INDEX = FLVD_OPT_INDEX_IN_MEMORY;
+constexpr uint32_t BOTH = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO;
+constexpr uint32_t USER_BYTES = 8192; // above every frame of the samples
+
+OpenOptions WithBuffer(uint32_t options, bool for_info = false, uint32_t cache_size = 0)
+{
+    return {options | USER, for_info, cache_size, 0, FakeHost::DEFAULT_FILE, USER_BYTES};
+}
+
+// All samples begin at 0 ms, so times from the first timestamp are the tags' own.
+struct Packet {
+    Frame frame;
+    int64_t end; // of its tag
+};
+
+struct Sample {
+    std::string name;
+    Bytes bytes;
+    Expected expected;
+    std::vector<Packet> packets;
+
+    // The frames of some streams.
+    Frames frames(uint32_t streams) const
+    {
+        Frames out;
+        for (const Packet& packet : packets)
+            if ((packet.frame.stream & streams) != 0)
+                out.push_back(packet.frame);
+        return out;
+    }
+};
+
+Sample Load(const std::string& name)
+{
+    Sample sample{name, ReadSample(name + ".flv"), ReadExpected(name), {}};
+    for (const ExpectedPacket& packet : sample.expected.packets) {
+        const uint8_t* const tag = sample.bytes.data() + packet.pos;
+        const uint8_t* const end = tag + 11 + (tag[1] << 16 | tag[2] << 8 | tag[3]);
+        const Frame frame{packet.stream, packet.timestamp, Bytes(end - packet.size, end)};
+        EXPECT_TRUE(SameFrame(packet, frame)) << name << " at " << packet.pos;
+        sample.packets.push_back({frame, end + 4 - sample.bytes.data()});
+    }
+    return sample;
+}
+
+const std::vector<Sample>& Samples()
+{
+    static const std::vector<Sample> samples = [] {
+        std::vector<Sample> all;
+        for (const char* const name :
+             {"aac_only", "avc_aac", "avc_aac_index", "avc_bframes_aac", "avc_only", "h263_mp3", "mp3_only", "pcm_only",
+              "screen", "speex_only", "truncated", "damaged"})
+            all.push_back(Load(name));
+        return all;
+    }();
+    return samples;
+}
+
+// Where a failed open or request may say that it failed.
+const std::set<std::pair<int32_t, int32_t>> g_openSites = {{-4, 2335},    {-5, 2386},    {-6, 2396},     {-7, 2413},
+                                                           {-1004, 2423}, {-1002, 2434}, {-10002, 2440}, {-1002, 2458},
+                                                           {-1005, 2465}, {-2, 2496}};
+const std::set<std::pair<int32_t, int32_t>> g_frameSites = {
+    {-4007, 2638}, {-4002, 2651}, {-4003, 2661}, {-4004, 2667}, {-10002, 2737}, {-4007, 2767},
+    {-4002, 2783}, {-4003, 2796}, {-4004, 2802}, {-2, 2830},    {-1, 2840},     {-2, 2859},
+    {-2, 2881},    {-2, 2899},    {-2, 2921},    {-2, 2933},    {-2, 2945},     {-10002, 2957}};
+
+void ExpectListed(Session& session, int32_t rc)
+{
+    const int32_t code = session.last_error();
+    const auto& sites = session.opened() ? g_frameSites : g_openSites;
+    EXPECT_EQ(sites.count({code, session.error_line()}), 1u) << code << " / " << session.error_line();
+    EXPECT_EQ(rc, code == -10002 ? -2 : code == -5 || code == -6 ? -4 : -1) << code;
+}
+
+// The streams to ask for, one after the other.
+const std::vector<uint32_t>& Streams(uint32_t options)
+{
+    static const std::vector<uint32_t> each = {FLVD_STREAM_VIDEO, FLVD_STREAM_AUDIO};
+    static const std::vector<uint32_t> together = {BOTH};
+    return (options & SEPARATE) != 0 ? each : together;
+}
+
+// Plays what was opened to its end, which has to come in time. `exact`: the frames whose tags lie whole in what the
+// host shows have to come, and no others.
+void PlayOut(const FakeHost& host, Session& session, const OpenOptions& open, const Sample& sample, bool exact)
+{
+    const int64_t size = host.visible();
+    for (const uint32_t stream : Streams(open.options)) {
+        auto next = sample.packets.begin();
+        const auto wanted = [&next, &sample, stream, size] {
+            while (next != sample.packets.end() && ((next->frame.stream & stream) == 0 || next->end > size))
+                ++next;
+            return next != sample.packets.end();
+        };
+        int64_t frames = 0;
+        FrameResult result = session.frame(stream);
+        for (; result.rc == 0 && frames <= size / 15; ++frames, result = session.frame(stream))
+            ASSERT_TRUE(!exact || (wanted() && next++->frame == result.frame)) << "frame " << frames;
+        ASSERT_TRUE(!exact || open.for_info || !wanted()) << "frame " << frames << " is missing";
+        ExpectListed(session, result.rc);
+    }
+    EXPECT_LE(host.io_calls(), 16 * static_cast<uint64_t>(size) + 10000);
+}
+
+void ExpectStreams(const flvd_open_info_t& info, const Expected& expected)
+{
+    const ExpectedStream* const video = expected.find(FLVD_STREAM_VIDEO);
+    const ExpectedStream* const audio = expected.find(FLVD_STREAM_AUDIO);
+    ASSERT_EQ(info.has_video != 0, video != nullptr);
+    ASSERT_EQ(info.has_audio != 0, audio != nullptr);
+    if (video != nullptr) {
+        EXPECT_EQ(Bytes(info.video_info->config, info.video_info->config + info.video_info->config_size),
+                  video->extradata);
+        EXPECT_EQ(info.video_info->width, video->width);
+        EXPECT_EQ(info.video_info->height, video->height);
+    }
+    if (audio != nullptr) {
+        EXPECT_EQ(Bytes(info.audio_info->config, info.audio_info->config + info.audio_info->config_size),
+                  audio->extradata);
+        EXPECT_EQ(info.audio_info->channels, audio->channels);
+        EXPECT_TRUE(audio->codec == "speex" || info.audio_info->sample_rate == audio->sample_rate);
+    }
+}
+
+TEST(Samples, DeliverWhatTheProberFound)
+{
+    const OpenOptions modes[] = {{},
+                                 {0, false, 1024},
+                                 {0, false, 1031},
+                                 {0, false, 1 << 20},
+                                 {SEPARATE},
+                                 {SEPARATE, false, 1024},
+                                 WithBuffer(0),
+                                 {INDEX},
+                                 {GROWING},
+                                 {GROWING | SEPARATE, false, 1024}};
+    for (const Sample& sample : Samples()) {
+        for (const OpenOptions& mode : modes) {
+            for (const bool only_32 : {false, true}) {
+                SCOPED_TRACE(sample.name + " with mode " + std::to_string(&mode - modes));
+                FakeHost host(sample.bytes);
+                if (only_32)
+                    host.use_32_bit_only();
+                Session session(host, mode);
+                ASSERT_TRUE(session.opened());
+                ExpectStreams(session.info(), sample.expected);
+                PlayOut(host, session, mode, sample, sample.name != "damaged" || (mode.options & GROWING) == 0);
+            }
+        }
+    }
+}
+
+// The file grows by one byte at a time: until it can be opened, with two readers until both streams can be seen, and
+// then between requests.
+std::array<Frames, BOTH + 1> PlayGrowing(const Sample& sample, uint32_t options)
+{
+    FakeHost host(sample.bytes);
+    host.set_visible(0);
+    const size_t streams = (options & SEPARATE) != 0 ? sample.expected.streams.size() : 1;
+    std::optional<Session> session;
+    do
+        session.emplace(host, OpenOptions{options});
+    while ((!session->opened() || session->info().has_video + session->info().has_audio < streams) && host.grow(1));
+    std::array<Frames, BOTH + 1> delivered;
+    for (bool more = true; more;) {
+        more = host.grow(1);
+        for (const uint32_t stream : Streams(options)) {
+            FrameResult result = session->frame(stream);
+            if (result.rc != 0)
+                continue;
+            more = true;
+            delivered[stream].push_back(std::move(result.frame));
+        }
+    }
+    return delivered;
+}
+
+TEST(Samples, GrowByOneByteBetweenRequests)
+{
+    for (const Sample& sample : Samples()) {
+        for (const uint32_t options : {GROWING, GROWING | SEPARATE}) {
+            if (sample.name == "damaged") // nothing can tell damage from what has not been written yet
+                continue;
+            const auto delivered = PlayGrowing(sample, options);
+            for (const uint32_t stream : Streams(options))
+                EXPECT_EQ(delivered[stream], sample.frames(stream)) << sample.name << " stream " << stream;
+        }
+    }
+}
+
+// Taken in turn. The last one takes the longest: the library's own frame buffer is large.
+const OpenOptions g_variants[] = {WithBuffer(0),
+                                  WithBuffer(GROWING | SEPARATE),
+                                  WithBuffer(SEPARATE | INDEX, false, 1024),
+                                  WithBuffer(GROWING),
+                                  WithBuffer(0, true),
+                                  {SEPARATE}};
+constexpr size_t VARIANTS = std::size(g_variants);
+
+// One host serves all changes of a sample.
+void OpenAndPlay(FakeHost& host, const OpenOptions& open, const Sample& sample, bool exact)
+{
+    host.reset_calls();
+    {
+        Session session(host, open);
+        if (session.opened())
+            PlayOut(host, session, open, sample, exact);
+        else
+            ExpectListed(session, session.open_rc());
+        const bool must_open = exact && (open.options & GROWING) == 0;
+        EXPECT_TRUE(session.opened() || !must_open || sample.packets.front().end > host.visible());
+    }
+    EXPECT_EQ(host.live_blocks(), 0u);
+    EXPECT_EQ(host.calls(HostFn::Open), host.calls(HostFn::Close));
+}
+
+TEST(Samples, CutAtEveryByteDeliverTheWholeTags)
+{
+    constexpr int64_t FAR = 10000; // in front of the damage; behind two keyframes of the longest sample
+    for (const Sample& sample : Samples()) {
+        if (sample.name == "truncated") // a cut of a sample that is cut here
+            continue;
+        const bool damaged = sample.name == "damaged";               // the rest of it is that other sample again
+        const int64_t step = sample.name == "avc_aac_index" ? 7 : 1; // far inside: for the sake of the time
+        const int64_t end = damaged ? FAR + 3000 : sample.expected.file_size;
+        FakeHost host(sample.bytes);
+        for (int64_t cut = damaged ? FAR : 0; cut < end; cut += cut < FAR ? 1 : step) {
+            SCOPED_TRACE(sample.name + " cut at " + std::to_string(cut));
+            host.set_visible(cut);
+            OpenAndPlay(host, g_variants[static_cast<size_t>(cut) % (VARIANTS - 1)], sample, !damaged);
+        }
+    }
+}
+
+TEST(Samples, SurviveEveryChangedByte)
+{
+    uint32_t random = 1;
+    for (const Sample& sample : Samples()) {
+        FakeHost host;
+        for (size_t at = 0; at < std::min<size_t>(sample.bytes.size(), 2000); ++at) {
+            random = random * 1664525u + 1013904223u;
+            size_t variant = at;
+            for (const uint8_t value : {uint8_t{0}, uint8_t{0xFF}, static_cast<uint8_t>(random >> 24)}) {
+                SCOPED_TRACE(sample.name + " with " + std::to_string(value) + " at " + std::to_string(at));
+                Bytes changed = sample.bytes;
+                changed[at] = value;
+                host.add_file(FakeHost::DEFAULT_FILE, std::move(changed));
+                OpenAndPlay(host, g_variants[++variant % VARIANTS], sample, false);
+            }
+        }
+    }
+}
+
+// Opens, plays 30 frames and closes. The nth host call fails, or it and all later ones; a request that fails does not
+// end it: the next ones meet what it left. Returns the number of calls that can fail.
+uint64_t PlayThirty(const Sample& sample, const OpenOptions& open, uint64_t n, bool all_later)
+{
+    FakeHost host(sample.bytes);
+    host.fail_nth_call(n);
+    if (all_later)
+        host.on_call = [&host, n](HostFn fn) {
+            if (host.failable_calls() + 1 >= n)
+                host.fail_from(fn, 1);
+        };
+    Session session(host, open);
+    if (!session.opened())
+        ExpectListed(session, session.open_rc());
+    for (uint32_t request = 0; session.opened() && request < 30; ++request) {
+        const FrameResult result = session.frame(1 + request % 2);
+        if (result.rc != 0)
+            ExpectListed(session, result.rc);
+    }
+    return host.failable_calls();
+}
+
+TEST(Samples, SurviveEveryFailingHostCall)
+{
+    const OpenOptions modes[] = {
+        {}, {SEPARATE | INDEX, false, 1024}, {GROWING | SEPARATE}, WithBuffer(GROWING), {0, true}};
+    for (const Sample& sample : Samples()) {
+        for (const OpenOptions& mode : modes) {
+            const uint64_t calls = PlayThirty(sample, mode, 0, false);
+            for (uint64_t n = 1; n <= calls; ++n) {
+                SCOPED_TRACE(sample.name + " with call " + std::to_string(n));
+                PlayThirty(sample, mode, n, false);
+                PlayThirty(sample, mode, n, true);
+            }
+        }
+    }
+}
+
+} // namespace
