@@ -133,7 +133,7 @@ int32_t FLVD_SeekBackward(flvd_scan_t* scan)
     if (code == 0 && !scan->backward && scan->tag.timestamp != scan->target) {
         code = FLVD_Walk(scan, true);
         if (code == FLVD_ERR_END_OF_DATA)
-            return scan->audio ? FLVD_SeekAtEnd(scan) : FLVD_ERR_END_OF_DATA;
+            return FLVD_SeekAtEnd(scan);
     }
     return code == 0 ? FLVD_Answer(scan) : FLVD_FailWalk(scan, code);
 }
