@@ -7,8 +7,7 @@
  * video frame a call. It decodes nothing.
  *
  * Usable alone from C11 and from C++17. All sizes are bytes and all times milliseconds unless said
- * otherwise. Multi-byte fields of an FLV file are big-endian ("Adobe Flash Video File Format
- * Specification", version 10.1, annex E).
+ * otherwise. Multi-byte fields of an FLV file are big-endian (FLV file format, version 10.1, annex E).
  *
  * THE HOST'S TABLES
  *

@@ -1,4 +1,4 @@
-// Numbers of the FLV format that several layers read ("Adobe Flash Video File Format Specification", annex E).
+// Numbers of the FLV format that several layers read (FLV file format, version 10.1, annex E).
 #ifndef FLVDMX_FORMAT_H
 #define FLVDMX_FORMAT_H
 

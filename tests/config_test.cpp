@@ -55,10 +55,11 @@ TEST(AudioConfig, OfAac)
     ExpectAac({0x12}, 44100, 0);
     const uint32_t rates[] = {96000, 88200, 64000, 48000, 44100, 32000, 24000, 22050,
                               16000, 12000, 11025, 8000,  7350,  0,     0,     44100};
-    const uint32_t counts[] = {0, 1, 2, 3, 4, 5, 6, 8, 0, 0, 0, 0, 0, 0, 0, 0};
+    const uint32_t counts[] = {48, 1, 2, 3, 4, 5, 6, 8, 0, 0, 0, 0, 0, 0, 0, 0};
     for (uint32_t i = 0; i < 16; ++i) {
         const std::string index = std::to_string(i);
-        ExpectAac(Bits("2/5 " + index + "/4 " + (i < 15 ? "" : "44100/24 ") + index + "/4"), rates[i], counts[i]);
+        ExpectAac(Bits("2/5 " + index + "/4 " + (i < 15 ? "" : "44100/24 ") + index + "/4 0/3 4294967295/32"), rates[i],
+                  counts[i]);
     }
     // Channel configuration 0: a general type counts the elements of its program, here 2 + 4 + 1 + 1.
     const std::set<uint32_t> general{1, 2, 3, 4, 6, 7, 17, 19, 20, 21, 22, 23};
@@ -109,7 +110,7 @@ TEST(AudioConfig, OfMpegAudio)
     }
     const Bytes good = header(3, 1, 9, 0, 1).bytes();
     for (const BitWriter& before :
-         {header(3, 1, 9, 3, 1), header(1, 1, 9, 0, 1), header(3, 0, 9, 0, 1), BitWriter().u(16, 0xFFDF)})
+         {header(3, 1, 9, 3, 1), header(1, 1, 9, 0, 1), header(3, 0, 9, 0, 1), BitWriter().u(32, 0xFF1BA064)})
         EXPECT_EQ(ParseAudio(14, Concat({before.bytes(), good})), Audio(0, 44100, 2, 0x55, 128, 16));
     EXPECT_EQ(ParseAudio(2, Bytes(good.begin(), good.end() - 1)), NO_AUDIO);
     for (const int32_t format : {0, 1, 3, 6, 11, 15, -1})
@@ -239,8 +240,10 @@ std::string Probe(const std::vector<Tag>& tags)
     for (const Tag& tag : tags)
         builder.add(tag);
     FakeHost host(builder.build().bytes);
+    host.start_log(true);
     const Session session(host);
     EXPECT_TRUE(session.opened());
+    EXPECT_EQ(host.take_log().find("alloc(42949"), std::string::npos); // no negative size
     std::ostringstream out;
     if (const auto& info = session.ctx()->video_info; video)
         out << std::string(info.fourcc, 4).c_str() << ' ' << info.width << 'x' << info.height << ' '
@@ -257,6 +260,11 @@ TEST(StreamProbe, DescribesTheFirstTag)
     const auto picture = [](uint8_t codec, const Bytes& payload) { return Tag{9, 0, VideoData(1, codec, payload)}; };
     const auto avc = [](const Bytes& config) { return Tag{9, 0, AvcConfig(config)}; };
     const auto sound = [](const Bytes& data) { return Tag{8, 0, data}; };
+    const auto parameters = [&avc](uint8_t size) { // in start-code form
+        return avc(AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {Noise(size_t{size} - 16)}));
+    };
+    EXPECT_EQ(Probe({parameters(128)}), "H264 320x240 131");
+    EXPECT_EQ(Probe({parameters(129)}), " 0x0 132");
     EXPECT_EQ(Probe({picture(0, noise)}), " 0x0 0");
     EXPECT_EQ(Probe({picture(1, noise)}), "JPEG 0x0 0");
     EXPECT_EQ(Probe({picture(2, H263Picture(3))}), "FLV1 176x144 0");
@@ -452,11 +460,11 @@ TEST(ScriptValue, IsConsumedByItsType)
 
 TEST(ScriptValue, NestsToADepthOf64)
 {
-    const auto nested = [](size_t containers) {
-        return std::string(containers - 1, '[') + "<width:320>" + std::string(containers - 1, ']');
+    const auto nested = [](size_t containers, const std::string& value) {
+        return std::string(containers, '[') + value + std::string(containers, ']');
     };
-    EXPECT_EQ(Read(nested(64) + nested(64)), "0 width 320");
-    EXPECT_EQ(Read(nested(65)), "-1");
+    EXPECT_EQ(Read(nested(63, "<width:320>") + nested(63, "<height:240>")), "0 width 320 height 240");
+    EXPECT_EQ(Read(nested(64, "<width:320>")), "-1");
 }
 
 TEST(ScriptValue, MayBeCutAnywhere)
@@ -476,6 +484,18 @@ TEST(ScriptValue, MayBeCutAnywhere)
         EXPECT_LE(read(size, [cut](FakeHost& host) { host.limit_reads(cut); }), 0);
     }
     EXPECT_EQ(Script(all).read(0), -1);
+    for (const uint32_t length : {12u, 13u}) { // a value begins inside or not at all
+        Script script(Amf("<width:320>"));
+        EXPECT_EQ(script.read(length), length < 13 ? -1 : 0);
+        EXPECT_EQ(script.ctx.video_info.width, length < 13 ? 0u : 320u);
+    }
+    EXPECT_EQ(Script(Amf("{a:%5} 1")).read(16), 0); // more consumed than counted
+    for (const Bytes& head :
+         {Bytes{8, 0, 0, 0, 0}, {3}}) { // an array of two ends with a failed ECMA array, not with an object
+        Script script(Concat({{10, 0, 0, 0, 2}, head, {0, 1, 'a'}, Amf("!<width:320>")}));
+        EXPECT_EQ(script.read(), head.size() == 1 ? 0 : -1);
+        EXPECT_EQ(script.ctx.video_info.width, head.size() == 1 ? 320u : 0u);
+    }
     const auto fail = [](const char* text, HostFn fn) {
         Script script(Amf(text));
         script.rewind();
@@ -533,7 +553,8 @@ TEST(ScriptKey, TakesWhatTheSlotHolds)
     EXPECT_EQ(key_at("?5"), "0 height 9 key at 4503599627370501");
     EXPECT_EQ(key_at("&258"), "0 height 9 key at 4503599627370754");
     EXPECT_EQ(key_at("[4503599627370497 3]"), "0 height 9 key at 3");
-    EXPECT_EQ(key_at("{*:4}"), "0 height 9 key at 4");    // a key of that length is not looked up
+    EXPECT_EQ(key_at("{*:4}"), "0 height 9 key at 4"); // a key of that length is not looked up
+    EXPECT_EQ(key_at("{" + std::string(255, 'k') + ":4}"), same);
     EXPECT_EQ(key_at("{width:4}"), "0 width 4 height 9"); // the inner key takes the place of the outer one
     EXPECT_EQ(Read("<duration:12.5 width:'abc'>"), "0 width 12");
 }
@@ -546,7 +567,7 @@ TEST(KeyframeIndex, CountsWhatBothArraysHave)
     EXPECT_EQ(Read("{KeyFrames:{Times:[1 2 3 4]}}"), "0 entries 4 T 55");
     EXPECT_EQ(Read("{times:[1 2 3] filepositions:[5 6 7 8]}"), "0");
     EXPECT_EQ(Read("{keyframes:1}"), "0 entries 4294967295");
-    EXPECT_EQ(Read("{keyframes:{times:1 filepositions:[5]}}"), "0 T 55 P 79");
+    EXPECT_EQ(Read("{a:[1 2] keyframes:{times:1 filepositions:[5]}}"), "0 T 81 P 105");
     EXPECT_EQ(Read("{keyframes:{times:[1 2] filepositions:[5 6]} times:[1]}"),
               "0 entries 1 T 55 P 93"); // no offset any more
     Script script(Amf("{keyframes:{times:[1 2] filepositions:[5 6]}}"));
@@ -565,6 +586,7 @@ TEST(KeyframeArray, HoldsWhatCanBeStored)
     EXPECT_EQ(arrays("[0 2.5 5]", "[13 5000 9000]", FLVD_OPT_PROGRESSIVE), "times 0,2500,5000 positions 13,5000,9000");
     EXPECT_EQ(arrays("[1.001 -5 n 1e300]", "[-5.9 n 1e300 -1e300]"),
               "times 1000,0,0,4294967295 positions -5,0,9223372036854775807,-9223372036854775808");
+    EXPECT_EQ(Read("[1 2]", IN_MEMORY), "0");
     EXPECT_EQ(arrays("[1 'x' %5 2]", "1"), "times 1000,1000,1000,2000");
     EXPECT_EQ(arrays("[1 1 ! 1]", "1"), "times 1000,1000,0,0"); // cut short
     EXPECT_EQ(arrays("[1]", "[1 ! 1]"), "times 1000 positions 1,0,0");

@@ -408,35 +408,35 @@ TEST(Probing, FindsStreamsAndTimes)
 {
     struct Case {
         const char* what;
-        Bytes file;
+        Flv file;
         uint32_t options;
         uint32_t streams, first_ts, duration, method;
     };
     const Tag bad_avc = Video(0, AvcConfig(Bytes(9, 0xFF)));
     const Case cases[] = {
-        {"AVC configuration", File({g_avc, Nalu(40), Nalu(90)}, 1).bytes, 0, 1, 40, 50, 2},
-        {"AAC configuration", File({g_aac, Raw(23), Raw(46)}, 4).bytes, 0, 2, 23, 23, 2},
-        {"every sound", File({Pcm(10), Pcm(30)}, 4).bytes, 0, 2, 10, 20, 2},
-        {"no picture but AVC", File({Screen(10), Pcm(50), Screen(60)}).bytes, 0, 3, 50, 10, 2},
-        {"pictures alone", File({Screen(10), Screen(60)}, 1).bytes, 0, 1, 0, 60, 2},
-        {"smallest", File({g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)}).bytes, 0, 3, 40, 50, 2},
-        {"first when all is found", File({g_meta, g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)}).bytes, 0, 3, 50, 40, 2},
-        {"no stream announced", File({g_meta, g_avc, g_aac, Raw(50), Nalu(60)}, 0).bytes, 0, 3, 50, 10, 2},
-        {"one announced", File({g_avc, g_aac, Raw(20), Nalu(30)}, 4).bytes, 0, 3, 20, 10, 2},
-        {"one missing", File({Pcm(0), Pcm(9)}).bytes, 0, 2, 0, 9, 2},
-        {"within the budget", Repeat(BUDGET - 1, Pcm(0), {Screen(0), Pcm(5)}).bytes, 0, 3, 0, 5, 2},
-        {"beyond the budget", Repeat(BUDGET, Pcm(0), {Screen(0), Pcm(5)}).bytes, 0, 2, 0, 5, 2},
-        {"behind scripts", Repeat(BUDGET - 1, g_meta, {Pcm(3), Pcm(9)}).bytes, 0, 2, 3, 6, 2},
-        {"last below first", File({g_meta, Pcm(5000), Pcm(100)}, 4).bytes, 0, 2, 0, 0, 0},
-        {"second configuration", File({bad_avc, g_avc, Nalu(40), Nalu(90)}, 1).bytes, 0, 1, 40, 50, 2},
-        {"growing", File({g_avc, Nalu(40), Nalu(90)}, 1).bytes, GROWING, 1, 0, 0, 0},
-        {"index", g_indexed.bytes, 0, 3, 0, 782, 1},
-        {"growing with index", g_indexed.bytes, GROWING, 3, 0, 0, 1},
-        {"one entry", Indexed(100).bytes, 0, 3, 0, 782, 0},
+        {"AVC configuration", File({g_avc, Nalu(40), Nalu(90)}, 1), 0, 1, 40, 50, 2},
+        {"AAC configuration", File({g_aac, Raw(23), Raw(46)}, 4), 0, 2, 23, 23, 2},
+        {"every sound", File({Pcm(10), Pcm(30)}, 4), 0, 2, 10, 20, 2},
+        {"no picture but AVC", File({Screen(10), Pcm(50), Screen(60)}), 0, 3, 50, 10, 2},
+        {"pictures alone", File({Screen(10), Screen(60)}, 1), 0, 1, 0, 60, 2},
+        {"smallest", File({g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)}), 0, 3, 40, 50, 2},
+        {"first when all is found", File({g_meta, g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)}), 0, 3, 50, 40, 2},
+        {"no stream announced", File({g_meta, g_avc, g_aac, Raw(50), Nalu(60)}, 0), 0, 3, 50, 10, 2},
+        {"one announced", File({g_avc, g_aac, Raw(20), Nalu(30)}, 4), 0, 3, 20, 10, 2},
+        {"one missing", File({Pcm(0), Pcm(9)}), 0, 2, 0, 9, 2},
+        {"within the budget", Repeat(BUDGET - 1, Pcm(0), {Screen(0), Pcm(5)}), 0, 3, 0, 5, 2},
+        {"beyond the budget", Repeat(BUDGET, Pcm(0), {Screen(0), Pcm(5)}), 0, 2, 0, 5, 2},
+        {"behind scripts", Repeat(BUDGET - 1, g_meta, {Pcm(3), Pcm(9)}), 0, 2, 3, 6, 2},
+        {"last below first", File({g_meta, Pcm(5000), Pcm(100)}, 4), 0, 2, 0, 0, 0},
+        {"second configuration", File({bad_avc, g_avc, Nalu(40), Nalu(90)}, 1), 0, 1, 40, 50, 2},
+        {"growing", File({g_avc, Nalu(40), Nalu(90)}, 1), GROWING, 1, 0, 0, 0},
+        {"index", g_indexed, 0, 3, 0, 782, 1},
+        {"growing with index", g_indexed, GROWING, 3, 0, 0, 1},
+        {"one entry", Indexed(100), 0, 3, 0, 782, 0},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.what);
-        FakeHost host(c.file);
+        FakeHost host(c.file.bytes);
         Session session(host, {c.options});
         ASSERT_TRUE(session.opened());
         const flvd_open_info_t& info = session.info();
@@ -453,6 +453,12 @@ TEST(Probing, FindsStreamsAndTimes)
         EXPECT_STREQ(file.file_name, "a.flv");
         const Bytes record(ctx->video_info.config, ctx->video_info.config + ctx->video_info.config_size);
         EXPECT_EQ(record, ctx->video_info.config != nullptr ? SmallAvcRecord() : Bytes{});
+        const Frames frames = c.file.frames(FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO, c.first_ts);
+        EXPECT_EQ(play(session), frames);
+        uint32_t last[3] = {};
+        for (const Frame& frame : frames)
+            last[frame.stream] = frame.timestamp;
+        EXPECT_EQ(std::tie(ctx->last_video_ts, ctx->last_audio_ts), std::tie(last[1], last[2]));
     }
 }
 
@@ -545,9 +551,10 @@ TEST(Delivery, TakesATagBackUntilItIsWhole)
             Session session(host, {GROWING});
             EXPECT_EQ(session.frame().rc, 0);
             for (int i = 0; i < requests; ++i) {
-                EXPECT_EQ(session.frame().rc, -2);
-                EXPECT_EQ(session.error_line(), 2957);
-                EXPECT_EQ(session.ctx()->saved_main_pos, 0);
+                const FrameResult result = session.frame();
+                EXPECT_EQ(std::tuple(result.rc, session.error_line(), session.ctx()->saved_main_pos),
+                          std::tuple(-2, 2957, 0));
+                EXPECT_EQ(result.frame, Frame{}); // cleared by every request
             }
             host.set_visible(INT64_MAX);
             Frames rest = play(session);
@@ -560,20 +567,25 @@ TEST(Delivery, TakesATagBackUntilItIsWhole)
 
 TEST(Delivery, TriesAFailedRollBackAgain)
 {
-    const Flv flv = File({g_avc, Nalu(0), Nalu(40)}, 1);
-    FakeHost host(flv.bytes);
-    host.set_visible(flv.tags[2].end() - 1);
-    Session session(host, {GROWING});
-    EXPECT_EQ(session.frame().rc, 0);
-    host.fail_from(HostFn::Seek, 1);
-    for (const int32_t line : {2859, 2830, 2830}) {
-        EXPECT_EQ(session.frame().rc, -1);
-        EXPECT_EQ(session.error_line(), line);
-        EXPECT_EQ(session.ctx()->saved_main_pos, flv.tags[2].offset);
+    const Flv flv = File({g_avc, g_aac, Nalu(0), Raw(0)});
+    for (const uint32_t options : {GROWING, GROWING | SEPARATE}) {
+        FakeHost host(flv.bytes);
+        host.set_visible(flv.tags[3].end() - 1);
+        Session session(host, {options});
+        EXPECT_EQ(session.frame(FLVD_STREAM_VIDEO).rc, 0);
+        const flvd_ctx_t* const ctx = session.ctx();
+        const int64_t& saved = options != GROWING ? ctx->saved_audio_pos : ctx->saved_main_pos;
+        host.fail_from(HostFn::Seek, 1);
+        for (const int32_t line : {2899, 2830, 2830}) {
+            EXPECT_EQ(session.frame(FLVD_STREAM_AUDIO).rc, -1);
+            EXPECT_EQ(session.error_line(), line);
+            EXPECT_GT(saved, 0);
+            EXPECT_EQ(ctx->saved_audio_pos + ctx->saved_main_pos, saved);
+        }
+        host.fail_nothing();
+        host.set_visible(INT64_MAX);
+        EXPECT_EQ(play(session, FLVD_STREAM_AUDIO), flv.frames(FLVD_STREAM_AUDIO));
     }
-    host.fail_nothing();
-    host.set_visible(INT64_MAX);
-    EXPECT_EQ(play(session), Frames{flv.frames().back()});
 }
 
 } // namespace

@@ -353,9 +353,9 @@ TEST(HostCalls, ThatFailEndTheSearch)
         const int32_t rc = std::get<0>((r.*step)(wanted));
         return std::tuple(rc, r.host.calls(HostFn::Tell), r.host.calls(HostFn::Seek));
     };
-    const Bytes bytes = Concat({Zeros(10), Bad(1) + Sound() + Sound(5000) + Picture(6000)});
+    const Bytes chain = Bad(1) + Sound() + Sound(5000) + Picture(6000), behind = Concat({Zeros(10), chain});
     for (const Step step : {&Reader::verify, &Reader::next}) {
-        for (const int32_t offset : {9, 100}) {
+        for (const auto& [bytes, offset] : {std::pair(chain, 9), std::pair(behind, 9), std::pair(behind, 100)}) {
             const auto [rc, tells, seeks] = run(bytes, step, VIDEO, HostFn::Tell, 0, offset);
             EXPECT_EQ(rc, 0);
             for (uint64_t call = 1; call < tells; ++call)
@@ -365,8 +365,8 @@ TEST(HostCalls, ThatFailEndTheSearch)
         const Bytes bad = Bytes() + Picture(5000, 7) + Sound();
         EXPECT_EQ(std::get<0>(run(bad, step, AUDIO, HostFn::Seek, 2)), NOT_FOUND); // to the byte behind its start
     }
-    EXPECT_EQ(std::get<0>(run(bytes, &Reader::prev, ANY, HostFn::Tell, 1)), NOT_FOUND);
-    EXPECT_EQ(std::get<1>(run(bytes, &Reader::trust, VIDEO, HostFn::Tell, 0)), 2u);
+    EXPECT_EQ(std::get<0>(run(chain, &Reader::prev, ANY, HostFn::Tell, 1)), NOT_FOUND);
+    EXPECT_EQ(std::get<1>(run(behind, &Reader::trust, VIDEO, HostFn::Tell, 0)), 2u);
     for (const Tag& unwanted : {Sound(5000), Picture(5000)}) {
         const Bytes script = Bytes() + unwanted + Tag{18, 0, amf::Number(1)};
         EXPECT_EQ(std::get<0>(run(script, &Reader::trust, SCRIPT, HostFn::Seek, 1)), ENDED);
@@ -468,6 +468,7 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
         return Indexed([position](auto&, auto& positions) { positions[3] = position, positions[4] = 1e12; });
     };
     const Bytes no_step = Concat({Behind(astray(static_cast<double>(size + 24)), 20), {0, 0, 0, 7, 0xEE}});
+    const Bytes last = Indexed([](auto&, auto& positions) { positions.back() = -5; }).bytes;
     for (const uint32_t options : {MEMORY, FROM_FILE}) {
         const auto extent = [options](const Bytes& file) { return Probe(file, {options}); };
         EXPECT_EQ(extent(flv.bytes), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720));
@@ -476,6 +477,7 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
         EXPECT_EQ(extent(cut_key), Extent(cut_key.size() - 20, 391, FLVD_SEEK_BY_INDEX, 6, 400));
         EXPECT_EQ(extent(one), Extent(one.size(), 782, FLVD_SEEK_NONE, 1, 0));
         EXPECT_EQ(extent(astray(std::nan("")).bytes), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720));
+        EXPECT_EQ(extent(last), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720)); // no matter: all entries are inside
         EXPECT_EQ(extent(no_step), Extent(size, 782, FLVD_SEEK_BY_INDEX, 4, 240));
     }
 }

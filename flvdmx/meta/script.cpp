@@ -1,4 +1,4 @@
-// Script data: parses AMF0 values (Adobe "Action Message Format, AMF 0") and takes sixteen known properties, at any
+// Script data: parses AMF0 values ("Action Message Format, AMF 0") and takes sixteen known properties, at any
 // depth and whatever the script object is called, into the instance and its stream descriptions.
 //
 // Sizes are claims of the file: a value may not begin behind the payload, containers nest to a bound, and every loop
