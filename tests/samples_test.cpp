@@ -237,18 +237,12 @@ void OpenAndPlay(FakeHost& host, const OpenOptions& open, const Sample& sample, 
 
 TEST(Samples, CutAtEveryByteDeliverTheWholeTags)
 {
-    constexpr int64_t FAR = 10000; // in front of the damage; behind two keyframes of the longest sample
     for (const Sample& sample : Samples()) {
-        if (sample.name == "truncated") // a cut of a sample that is cut here
-            continue;
-        const bool damaged = sample.name == "damaged";               // the rest of it is that other sample again
-        const int64_t step = sample.name == "avc_aac_index" ? 7 : 1; // far inside: for the sake of the time
-        const int64_t end = damaged ? FAR + 3000 : sample.expected.file_size;
         FakeHost host(sample.bytes);
-        for (int64_t cut = damaged ? FAR : 0; cut < end; cut += cut < FAR ? 1 : step) {
+        for (int64_t cut = 0; cut < sample.expected.file_size; ++cut) {
             SCOPED_TRACE(sample.name + " cut at " + std::to_string(cut));
             host.set_visible(cut);
-            OpenAndPlay(host, g_variants[static_cast<size_t>(cut) % (VARIANTS - 1)], sample, !damaged);
+            OpenAndPlay(host, g_variants[static_cast<size_t>(cut) % (VARIANTS - 1)], sample, sample.name != "damaged");
         }
     }
 }
