@@ -549,6 +549,7 @@ TEST(KeyframeArray, HoldsWhatCanBeStored)
     EXPECT_EQ(arrays("[1]", "[1 ! 1]"), "times 1000 positions 1,0,0");
     EXPECT_EQ(arrays("[1 {times:[7]} 1 1]", "1"), "times 7000"); // replaced by its own element
     EXPECT_EQ(arrays("[1 {times:[7 8 9 9]} 5]", "1"), "times 7000,9000,5000,9000");
+    EXPECT_EQ(arrays("[1]", "[1 {filepositions:[7]} 2 3]"), "times 1000 positions 7");
 }
 
 TEST(KeyframeArray, IsNotAllocatedForACountThatLies)
