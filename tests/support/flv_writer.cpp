@@ -81,21 +81,11 @@ static Bytes Text(uint8_t marker, int length_bytes, const std::string& text)
     return out;
 }
 
-static Bytes Double(uint8_t marker, double value)
+Bytes Number(double value)
 {
     uint64_t bits = 0;
     std::memcpy(&bits, &value, sizeof(bits));
-    return Marked(marker, bits, 8);
-}
-
-Bytes Number(double value)
-{
-    return Double(0, value);
-}
-
-Bytes Boolean(uint8_t value)
-{
-    return {1, value};
+    return Marked(0, bits, 8);
 }
 
 Bytes String(const std::string& text)
@@ -108,29 +98,8 @@ Bytes LongString(const std::string& text)
     return Text(12, 4, text);
 }
 
-Bytes Null()
-{
-    return {5};
-}
-
-Bytes Undefined()
-{
-    return {6};
-}
-
-Bytes Reference(uint16_t index)
-{
-    return Marked(7, index, 2);
-}
-
-Bytes Date(double milliseconds, int16_t zone)
-{
-    Bytes out = Double(11, milliseconds);
-    Put(out, static_cast<uint16_t>(zone), 2);
-    return out;
-}
-
-Bytes Properties(const std::vector<Property>& properties)
+// With their end marker, without type marker.
+static Bytes Properties(const std::vector<Property>& properties)
 {
     Bytes out;
     for (const auto& [name, value] : properties) {
@@ -330,12 +299,6 @@ FlvBuilder& FlvBuilder::indexed_metadata(std::vector<amf::Property> properties, 
     return script({});
 }
 
-FlvBuilder& FlvBuilder::garbage(Bytes bytes)
-{
-    m_garbage.emplace_back(m_tags.size(), std::move(bytes));
-    return *this;
-}
-
 FlvBuilder& FlvBuilder::prefix(Bytes bytes)
 {
     m_prefix = std::move(bytes);
@@ -381,13 +344,8 @@ Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
     if (flv.bytes.size() < m_data_offset && m_data_offset < 0x10000)
         flv.bytes.resize(m_data_offset);
     Put(flv.bytes, 0, 4);
-    for (size_t i = 0; i <= tags.size(); ++i) {
-        for (const auto& [before, bytes] : m_garbage)
-            if (before == i)
-                Append(flv.bytes, bytes);
-        if (i < tags.size())
-            PutTag(flv.bytes, tags[i]);
-    }
+    for (Tag& tag : tags)
+        PutTag(flv.bytes, tag);
     flv.tags = std::move(tags);
     return flv;
 }
@@ -424,11 +382,9 @@ Flv MakeChain(const ChainOptions& options)
     for (uint32_t picture = 0; picture < options.pictures; ++picture) {
         const bool key = picture % options.gop == 0;
         if (options.video)
-            builder.video(options.first_ts + picture * 40,
-                          AvcNalu(key, Noise(options.video_bytes + picture * 37 % 101, picture)));
+            builder.video(options.first_ts + picture * 40, AvcNalu(key, Noise(300 + picture * 37 % 101, picture)));
         for (; options.audio && sounds * 23 < (picture + 1) * 40; ++sounds)
-            builder.audio(options.first_ts + sounds * 23,
-                          AacRaw(Noise(options.audio_bytes + sounds * 13 % 29, 1000 + sounds)));
+            builder.audio(options.first_ts + sounds * 23, AacRaw(Noise(80 + sounds * 13 % 29, 1000 + sounds)));
     }
     return builder.build();
 }

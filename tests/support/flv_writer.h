@@ -43,15 +43,8 @@ namespace amf {
 using Property = std::pair<std::string, Bytes>;
 
 Bytes Number(double value);
-Bytes Boolean(uint8_t value);
 Bytes String(const std::string& text);
 Bytes LongString(const std::string& text);
-Bytes Null();
-Bytes Undefined();
-Bytes Reference(uint16_t index);
-Bytes Date(double milliseconds, int16_t zone = 0);
-/** Properties with their end marker, without type marker. */
-Bytes Properties(const std::vector<Property>& properties);
 Bytes Object(const std::vector<Property>& properties);
 /** `count` defaults to the number of properties. */
 Bytes EcmaArray(const std::vector<Property>& properties, std::optional<uint32_t> count = {});
@@ -153,8 +146,6 @@ public:
     FlvBuilder& metadata(const std::vector<amf::Property>& properties) { return script(amf::OnMetaData(properties)); }
     /** onMetaData with "keyframes" behind the given properties: every keyframe of the file, at its real place. */
     FlvBuilder& indexed_metadata(std::vector<amf::Property> properties, IndexHook hook = {});
-    /** Bytes between the last tag and the next one, outside the tag chain. */
-    FlvBuilder& garbage(Bytes bytes);
     /** Bytes in front of the file header. */
     FlvBuilder& prefix(Bytes bytes);
 
@@ -168,13 +159,15 @@ private:
     uint32_t m_data_offset;
     Bytes m_prefix;
     std::vector<Tag> m_tags;
-    std::vector<std::pair<size_t, Bytes>> m_garbage; // in front of the tag of this number
     std::optional<size_t> m_index_tag;
     std::vector<amf::Property> m_index_properties;
     IndexHook m_index_hook;
 };
 
-/** An ordinary file: AVC and AAC, one keyframe every `gop` pictures, pictures and sound interleaved by time. */
+/**
+ * An ordinary file: AVC and AAC, one keyframe every `gop` pictures, pictures and sound interleaved by time. Pictures
+ * have 300 to 400 bytes, sound frames, one every 23 ms, about 90.
+ */
 struct ChainOptions {
     bool video = true;
     bool audio = true;
@@ -182,9 +175,7 @@ struct ChainOptions {
     bool index = false;
     uint32_t pictures = 20; /**< 40 ms each */
     uint32_t gop = 5;
-    uint32_t first_ts = 0;    /**< of configuration packets and the first frames */
-    size_t video_bytes = 300; /**< about, varying */
-    size_t audio_bytes = 80;  /**< about, varying; a sound frame every 23 ms */
+    uint32_t first_ts = 0; /**< of configuration packets and the first frames */
 };
 Flv MakeChain(const ChainOptions& options = {});
 
