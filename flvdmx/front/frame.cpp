@@ -13,7 +13,6 @@
 namespace {
 
 constexpr uint32_t FLVD_FRAME_BUFFER_STEP = 16384; // the frame buffer grows to multiples of it
-constexpr uint32_t FLVD_PAYLOAD_PEEK = 2;          // codec byte and packet type
 
 // Failures that the two variants record at lines of their own.
 struct flvd_frame_sites_t {
@@ -176,15 +175,16 @@ FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
 {
     fio_file_t* const reader = delivery.reader;
     const flvd_tag_info_t& tag = delivery.tag;
-    FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
     const uint8_t* bytes = nullptr;
-    if (FLVD_FioPeek(&bytes, FLVD_PAYLOAD_PEEK, reader) < FLVD_PAYLOAD_PEEK) {
+    if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, reader) < FLVD_TAG_PEEK_SIZE) {
         const bool video = tag.type == FLVD_TAG_TYPE_VIDEO;
         const flvd_payload_sites_t& sites = video ? g_flvd_videoSites : g_flvd_soundSites; // of AAC alike so far
+        FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
         FLVD_Record(delivery.ctx, sites.short_peek);
         return FLVD_GiveUpTag(delivery, sites.rollback_payload);
     }
-    const flvd_payload_t payload = FLVD_Classify(tag.type, bytes);
+    const flvd_payload_t payload = FLVD_Classify(tag.type, bytes + FLVD_CODEC_BYTE);
+    FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader); // cached by the peek: no host seek that could fail
     if (payload.header == 0 || tag.data_size < payload.header)
         return FLVD_PassPayload(delivery, tag.data_size, *payload.sites);
     FLVD_FioSkip(payload.header, reader);

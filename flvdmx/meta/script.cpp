@@ -123,6 +123,7 @@ struct flvd_script_state_t {
     uint32_t length;               // of the payload
     uint64_t consumed;             // bytes of it, and of what lies behind it when a value runs over
     uint32_t containers;           // open at present
+    uint64_t kept_elements;        // of all keyframe arrays asked for so far
     uint8_t scratch[FLVD_META_SCRATCH];
 };
 
@@ -352,10 +353,14 @@ int32_t FLVD_ParseDate(flvd_ctx_t* ctx, flvd_script_state_t* state)
     return FLVD_ScriptSkip(ctx, state, FLVD_META_DATE_SIZE) ? static_cast<int32_t>(1 + FLVD_META_DATE_SIZE) : -1;
 }
 
-// Memory for a keyframe array, zeroed; null also when so many elements cannot be in the payload.
-void* FLVD_AllocateArray(const flvd_script_state_t* state, uint32_t count, uint32_t element)
+// Memory for a keyframe array, zeroed; null also when so many elements cannot be in the payload. All arrays together
+// are bounded too: a payload full of arrays that each claim the rest of it would cost the square of its size.
+void* FLVD_AllocateArray(flvd_script_state_t* state, uint32_t count, uint32_t element)
 {
     if (count > UINT32_MAX / element || count > FLVD_ScriptLeft(state))
+        return nullptr;
+    state->kept_elements += count;
+    if (state->kept_elements > uint64_t{2} * state->length)
         return nullptr;
     const uint32_t size = count * element;
     void* const array = g_flvd_pfnMetaAlloc(size);
@@ -366,7 +371,7 @@ void* FLVD_AllocateArray(const flvd_script_state_t* state, uint32_t count, uint3
 
 // Replaces a keyframe array of the instance by an empty one of `count` elements, or by none.
 template <typename Element>
-void FLVD_ReplaceArray(const flvd_script_state_t* state, uint32_t count, uint32_t* array_count, Element** array)
+void FLVD_ReplaceArray(flvd_script_state_t* state, uint32_t count, uint32_t* array_count, Element** array)
 {
     if (*array != nullptr)
         g_flvd_pfnMetaFree(*array);
@@ -387,7 +392,7 @@ void FLVD_StoreElement(flvd_ctx_t* ctx, const flvd_script_state_t* state, uint32
 }
 
 // Begins the keyframe array that the pending property asks for. Returns its key, or none when nothing is to be kept.
-uint32_t FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, const flvd_script_state_t* state, uint32_t count)
+uint32_t FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t count)
 {
     flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
     if (!FLVD_KeepsIndex(ctx))
