@@ -595,4 +595,18 @@ TEST(Delivery, TriesAFailedRollBackAgain)
     }
 }
 
+TEST(Delivery, GivesNothingButPayloadsWhenASeekFails)
+{
+    const Flv flv = File({Screen(0, 5000), Screen(40, 5000), Screen(80, 5000)}, 1);
+    const Frames whole = flv.frames(FLVD_STREAM_VIDEO, 0);
+    for (uint64_t n = 1; n <= 12; ++n) {
+        FakeHost host(flv.bytes);
+        Session session(host);
+        host.reset_calls();
+        host.fail_nth(HostFn::Seek, n);
+        for (const Frame& frame : play(session))
+            EXPECT_NE(std::find(whole.begin(), whole.end(), frame), whole.end()) << n;
+    }
+}
+
 } // namespace
