@@ -127,7 +127,7 @@ private:
     static constexpr size_t FN_COUNT = static_cast<size_t>(HostFn::Count);
     static size_t index(HostFn fn) { return static_cast<size_t>(fn); }
 
-    void violation(const std::string& what);
+    static void violation(const std::string& what);
     bool begin(HostFn fn);
     uint32_t limited(HostFn fn, uint32_t count) const;
     template <class... Args> void log(const char* name, int64_t result, const Args&... args);
