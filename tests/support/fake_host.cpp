@@ -24,11 +24,11 @@ struct FakeHost::Functions {
         host.begin(HostFn::Copy);
         host.log_memory("copy", std::to_string(count), "");
         if (count == 0)
-            host.violation("copy of 0 bytes");
+            violation("copy of 0 bytes");
         const auto to = reinterpret_cast<uintptr_t>(destination);
         const auto from = reinterpret_cast<uintptr_t>(source);
         if (to < from ? from - to < count : to - from < count)
-            host.violation("copy between overlapping ranges");
+            violation("copy between overlapping ranges");
         host.check_range("copy to", destination, count);
         host.check_range("copy from", source, count);
         return std::memcpy(destination, source, count);
@@ -43,7 +43,7 @@ struct FakeHost::Functions {
     }
     template <int slot> static void Carried()
     {
-        current().violation("carried memory function " + std::to_string(slot) + " was called");
+        violation("carried memory function " + std::to_string(slot) + " was called");
     }
     static void* Open(const char* path, const char* mode) { return current().open(path, mode); }
     static int32_t Close(void* pointer) { return current().close(pointer); }
