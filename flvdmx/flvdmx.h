@@ -558,7 +558,7 @@ FLVD_API void __FLV_DMX__fiodbgReset(void);
 
 /* Reads a cached file bit by bit, most significant bit first. The byte position stays in step: a byte of which
  * one bit was consumed counts as consumed. After any byte-level access but a peek it must be started again;
- * until then bits read as 0. Bits behind the end of the file read as 0. */
+ * until then bits read as 0. Bits behind the end of the file read as 0. The cache must hold 8 bytes. */
 
 /** Starts at the current byte position, consuming nothing. @return 1 */
 FLVD_API int32_t __FLV_DMX__bitInit(fio_file_t* file);

@@ -113,8 +113,7 @@ FlvdTurn FLVD_GiveUpTag(const flvd_delivery_t& delivery, flvd_site_t rollback)
 // Behind a payload that is not delivered.
 FlvdTurn FLVD_PassPayload(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
 {
-    FLVD_FioSkip(left, delivery.reader);
-    if (FLVD_PassBackPointer(delivery.reader, delivery.tag.data_size))
+    if (FLVD_FioSkip(left, delivery.reader) == left && FLVD_PassBackPointer(delivery.reader, delivery.tag.data_size))
         return FlvdTurn::Next;
     return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
 }

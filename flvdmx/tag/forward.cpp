@@ -12,6 +12,10 @@ namespace {
 // file made of such headers would cost two seeks and two reads for each of its bytes.
 constexpr int32_t FLVD_BAD_TAG_COST = 64;
 
+// Trusting mode takes a position only once in so many tags passed: it has no budget for them, and a host whose seek
+// does not move could send it round for ever.
+constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x10000;
+
 // Results inside a search, beside those of the navigation functions.
 constexpr int32_t FLVD_SEARCH_ON = 1;    // go on behind this tag
 constexpr int32_t FLVD_BUDGET_SPENT = 2; // no tag within the budget
@@ -26,11 +30,12 @@ struct flvd_search_t {
     int32_t budget;   // bytes that resynchronisation may still cross
     int64_t position; // the last position taken
     bool data_ended;  // the last resynchronisation ran out of data, not out of budget
+    uint32_t passed;  // trusting mode: unwanted tags
 };
 
 flvd_search_t FLVD_Search(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted, bool verify, int64_t position)
 {
-    return {ctx, file, FLVD_TagRules(ctx), wanted, verify, FLVD_RESYNC_WINDOW, position, false};
+    return {ctx, file, FLVD_TagRules(ctx), wanted, verify, FLVD_RESYNC_WINDOW, position, false, 0};
 }
 
 // Index of the first candidate among the starts of a window, or `starts` when there is none.
@@ -52,21 +57,30 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
     const FLVD_ReadSizeGuard whole(file, FLVD_WHOLE_CACHE, __FLV_DMX__fioGetCacheReadSize(file));
     if (limit == 0)
         return FLVD_ERR_NOT_FOUND;
+    if (ctx->cache_size < FLVD_TAG_PEEK_SIZE)
+        return FLVD_ERR_END_OF_DATA;
     flvd_tag_rules_t rules = FLVD_TagRules(ctx);
     --rules.max_timestamp; // here alone the ceiling itself is out of reach; it is never 0
+    const uint32_t step = ctx->cache_size - (FLVD_TAG_PEEK_SIZE - 1); // the last 12 bytes begin the next window
+    const int64_t stop = int64_t{(limit - 1) / step} * step + step;   // the limit, in whole windows
+    // What is cached comes first: behind a false header that is nearly a window, and filling it up would cost a host
+    // call for each of many.
+    uint32_t size = file->count < FLVD_TAG_PEEK_SIZE ? ctx->cache_size : std::min(file->count, ctx->cache_size);
     int64_t scanned = 0;
-    do {
+    while (scanned < stop) {
         const uint8_t* window = nullptr;
-        const uint32_t available = FLVD_FioPeek(&window, ctx->cache_size, file);
+        const uint32_t available = FLVD_FioPeek(&window, size, file);
         if (available < FLVD_TAG_PEEK_SIZE)
             return FLVD_ERR_END_OF_DATA;
-        const uint32_t starts = available - (FLVD_TAG_PEEK_SIZE - 1); // the last 12 bytes begin the next window
+        const auto starts =
+            static_cast<uint32_t>(std::min<int64_t>(available - (FLVD_TAG_PEEK_SIZE - 1), stop - scanned));
         const uint32_t found = FLVD_FindCandidate(window, starts, rules);
         FLVD_FioSkip(found, file);
         scanned += found;
         if (found < starts)
             return scanned;
-    } while (scanned < limit);
+        size = ctx->cache_size;
+    }
     return FLVD_ERR_NOT_FOUND;
 }
 
@@ -93,6 +107,13 @@ bool FLVD_TakePosition(flvd_search_t* search)
     const bool taken = position >= search->position;
     search->position = position;
     return taken;
+}
+
+// The same behind a tag: it must have moved.
+bool FLVD_TakeLaterPosition(flvd_search_t* search)
+{
+    const int64_t before = search->position;
+    return FLVD_TakePosition(search) && search->position > before;
 }
 
 // Moves behind a tag's data and looks at its back-pointer. The tag is mostly gone back to, which empties the cache, so
@@ -146,10 +167,9 @@ bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
 // Behind a sound tag: the next one, with the whole budget.
 bool FLVD_PassGoodTag(flvd_search_t* search, bool in_place, const flvd_tag_info_t& tag)
 {
-    const int64_t start = search->position;
     FLVD_FioSkip(in_place ? tag.data_size + FLVD_TAG_OVERHEAD : FLVD_BACK_POINTER_SIZE, search->file);
     search->budget = FLVD_RESYNC_WINDOW;
-    return FLVD_TakePosition(search) && search->position > start;
+    return FLVD_TakeLaterPosition(search);
 }
 
 // Steps over the checked tag, whatever its kind. False: -1.
@@ -178,7 +198,10 @@ int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& heade
     const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
     const bool moved = header.IsAudio() ? FLVD_FioSkip(size, search->file) == size
                                         : __FLV_DMX__fioSeek64(search->file, size, FIO_SEEK_CUR) == 0;
-    return moved ? FLVD_SEARCH_ON : FLVD_ERR_END_OF_DATA;
+    if (!moved)
+        return FLVD_ERR_END_OF_DATA;
+    const bool goes_on = ++search->passed % FLVD_TAGS_PER_POSITION != 0 || FLVD_TakeLaterPosition(search);
+    return goes_on ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
 }
 
 // The search from the position on: 0 with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
