@@ -75,16 +75,13 @@ fio_file_t* FLVD_FioAllocate(uint32_t cache_size, uint32_t extra, void* handle)
     return nullptr;
 }
 
-// Logical position from the host's. A failed query stays negative whatever is pending, and a position that no file can
-// have is a failed query: adding sizes to positions never overflows.
+// Logical position from the host's; -1 when the query failed. A position that no file can have is a failed query:
+// adding sizes to positions never overflows.
 int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
 {
-    if (host > FIO_POSITION_MAX)
+    if (static_cast<uint64_t>(host) > uint64_t{FIO_POSITION_MAX})
         return -1;
-    const uint64_t count = file->count;
-    const uint64_t moved = static_cast<uint64_t>(host) + (file->state == FIO_STATE_READ ? 0 - count : count);
-    const auto position = static_cast<int64_t>(moved);
-    return host < 0 && position >= 0 ? host : position;
+    return file->state == FIO_STATE_READ ? host - file->count : host + file->count;
 }
 
 enum class FioWidth { Bits32, Bits64 };

@@ -33,23 +33,18 @@ int32_t FLVD_Open(flvd_ctx_t** handle, const void* init, void* info, bool for_in
     return *handle != nullptr ? 0 : FLVD_TranslateError(-1, g_flvd_lLastError);
 }
 
-int32_t FLVD_RefuseReserved(flvd_ctx_t* ctx)
+// Operations that need an instance, without one.
+int32_t FLVD_OperateOnNothing(uint32_t operation)
 {
-    if (ctx != nullptr)
-        FLVD_Record(ctx, FLVD_SITE_RESERVED_OP);
-    return FLVD_RET_FAILED;
-}
-
-int32_t FLVD_RefuseMissing()
-{
-    FLVD_RecordGlobal(FLVD_SITE_NO_INSTANCE);
-    return FLVD_RET_NO_INSTANCE;
-}
-
-int32_t FLVD_Close(flvd_ctx_t* ctx)
-{
-    FLVD_ReleaseInstance(ctx);
-    return 0;
+    switch (operation) {
+    case FLVD_OP_RESERVED:
+        return FLVD_RET_FAILED;
+    case FLVD_OP_GET_LAST_ERROR:
+        return g_flvd_lLastError;
+    default:
+        FLVD_RecordGlobal(FLVD_SITE_NO_INSTANCE);
+        return FLVD_RET_NO_INSTANCE;
+    }
 }
 
 int32_t FLVD_Deliver(flvd_ctx_t* ctx, const void* request, void* frame)
@@ -71,6 +66,27 @@ int32_t FLVD_Seek(flvd_ctx_t* ctx, const void* arguments, void* reached)
     return result >= 0 ? result : FLVD_TranslateError(result, ctx->error);
 }
 
+// Operations on an instance.
+int32_t FLVD_Operate(uint32_t operation, flvd_ctx_t* ctx, const void* arg1, void* arg2)
+{
+    if (ctx == nullptr)
+        return FLVD_OperateOnNothing(operation);
+    switch (operation) {
+    case FLVD_OP_GET_FRAME:
+        return FLVD_Deliver(ctx, arg1, arg2);
+    case FLVD_OP_SEEK:
+        return FLVD_Seek(ctx, arg1, arg2);
+    case FLVD_OP_CLOSE:
+        FLVD_ReleaseInstance(ctx);
+        return 0;
+    case FLVD_OP_GET_LAST_ERROR:
+        return ctx->error;
+    default:
+        FLVD_Record(ctx, FLVD_SITE_RESERVED_OP);
+        return FLVD_RET_FAILED;
+    }
+}
+
 } // namespace
 
 void FLVD_RecordGlobal(flvd_site_t site)
@@ -81,24 +97,9 @@ void FLVD_RecordGlobal(flvd_site_t site)
 
 int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2)
 {
-    // Opening only writes the word.
-    const bool reads_handle = operation >= FLVD_OP_CLOSE && operation <= FLVD_OP_GET_LAST_ERROR;
-    flvd_ctx_t* const ctx = reads_handle && handle != nullptr ? *handle : nullptr;
-    switch (operation) {
-    case FLVD_OP_OPEN:
-    case FLVD_OP_OPEN_INFO:
+    if (operation >= FLVD_OP_CLOSE && operation <= FLVD_OP_GET_LAST_ERROR)
+        return FLVD_Operate(operation, handle != nullptr ? *handle : nullptr, arg1, arg2);
+    if (operation == FLVD_OP_OPEN || operation == FLVD_OP_OPEN_INFO)
         return FLVD_Open(handle, arg1, arg2, operation == FLVD_OP_OPEN_INFO);
-    case FLVD_OP_CLOSE:
-        return ctx != nullptr ? FLVD_Close(ctx) : FLVD_RefuseMissing();
-    case FLVD_OP_GET_FRAME:
-        return ctx != nullptr ? FLVD_Deliver(ctx, arg1, arg2) : FLVD_RefuseMissing();
-    case FLVD_OP_SEEK:
-        return ctx != nullptr ? FLVD_Seek(ctx, arg1, arg2) : FLVD_RefuseMissing();
-    case FLVD_OP_RESERVED:
-        return FLVD_RefuseReserved(ctx);
-    case FLVD_OP_GET_LAST_ERROR:
-        return ctx != nullptr ? ctx->error : g_flvd_lLastError;
-    default:
-        return FLVD_RET_FAILED;
-    }
+    return FLVD_RET_FAILED;
 }

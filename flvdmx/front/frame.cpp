@@ -59,32 +59,38 @@ struct flvd_delivery_t {
     flvd_ctx_t* ctx;
     fio_file_t* reader;
     int64_t* saved; // growing file: position in front of the tag being delivered
-    const flvd_frame_sites_t* sites;
     uint32_t wanted;
     bool growing;
     flvd_tag_info_t tag; // the last tag described
 };
 
+const flvd_frame_sites_t& FLVD_FrameSites(const flvd_delivery_t& delivery)
+{
+    return delivery.growing ? g_flvd_growingSites : g_flvd_completeSites;
+}
+
 // What a tag led to: go on with the next, return 0, or return -1 as recorded.
 enum class FlvdTurn { Next, Delivered, Failed };
 
-// How a payload is laid out; header is 0 for a configuration packet, which is no frame.
-struct flvd_payload_t {
-    const flvd_payload_sites_t* sites;
-    uint32_t header;
-};
+const flvd_payload_sites_t& FLVD_PayloadSites(uint32_t tag_type, uint8_t codec_byte)
+{
+    if (tag_type == FLVD_TAG_TYPE_VIDEO)
+        return g_flvd_videoSites;
+    return uint32_t{codec_byte} >> FLVD_SOUND_FORMAT_SHIFT == FLVD_SOUND_AAC ? g_flvd_aacSites : g_flvd_soundSites;
+}
 
-flvd_payload_t FLVD_Classify(uint32_t tag_type, const uint8_t* payload)
+// Codec header bytes in front of a frame, 0 for a configuration packet, which is no frame.
+inline uint32_t FLVD_CodecHeaderSize(uint32_t tag_type, const uint8_t* payload)
 {
     const uint8_t packet_type = payload[1];
     if (tag_type == FLVD_TAG_TYPE_VIDEO) {
         if ((payload[0] & FLVD_CODEC_ID_MASK) != FLVD_CODEC_AVC)
-            return {&g_flvd_videoSites, FLVD_CODEC_HEADER_SIZE};
-        return {&g_flvd_videoSites, FLVD_IsPicturelessPacket(packet_type) ? 0 : FLVD_AVC_HEADER_SIZE};
+            return FLVD_CODEC_HEADER_SIZE;
+        return FLVD_IsPicturelessPacket(packet_type) ? 0 : FLVD_AVC_HEADER_SIZE;
     }
     if (uint32_t{payload[0]} >> FLVD_SOUND_FORMAT_SHIFT != FLVD_SOUND_AAC)
-        return {&g_flvd_soundSites, FLVD_CODEC_HEADER_SIZE};
-    return {&g_flvd_aacSites, packet_type == FLVD_PACKET_SEQUENCE_HEADER ? 0 : FLVD_AAC_HEADER_SIZE};
+        return FLVD_CODEC_HEADER_SIZE;
+    return packet_type == FLVD_PACKET_SEQUENCE_HEADER ? 0 : FLVD_AAC_HEADER_SIZE;
 }
 
 FlvdTurn FLVD_FailRequest(const flvd_delivery_t& delivery, flvd_site_t site)
@@ -107,11 +113,18 @@ FlvdTurn FLVD_GiveUpTag(const flvd_delivery_t& delivery, flvd_site_t rollback)
 {
     if (!delivery.growing)
         return FlvdTurn::Next;
-    return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? delivery.sites->end : rollback);
+    return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? FLVD_FrameSites(delivery).end : rollback);
 }
 
-// Behind a payload that is not delivered.
-FlvdTurn FLVD_PassPayload(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
+// A tag whose bytes are not there, although its header was.
+FlvdTurn FLVD_LoseTag(const flvd_delivery_t& delivery, flvd_site_t site, flvd_site_t rollback)
+{
+    FLVD_Record(delivery.ctx, site);
+    return FLVD_GiveUpTag(delivery, rollback);
+}
+
+// Passes the bytes that are left of a tag that is not delivered.
+FlvdTurn FLVD_PassBytes(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
 {
     if (FLVD_FioSkip(left, delivery.reader) == left && FLVD_PassBackPointer(delivery.reader, delivery.tag.data_size))
         return FlvdTurn::Next;
@@ -132,73 +145,99 @@ bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
     return ctx->frame_buffer != nullptr;
 }
 
-void FLVD_Report(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+// Reports a frame of n bytes, now or in a moment in the frame buffer.
+void FLVD_Report(const flvd_delivery_t& delivery, uint32_t n, flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.ctx;
     const bool video = delivery.tag.type == FLVD_TAG_TYPE_VIDEO;
     frame->data = ctx->frame_buffer;
-    frame->size = ctx->last_frame_size;
+    frame->size = n;
     frame->stream = video ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
     frame->timestamp_ms = delivery.tag.timestamp - ctx->first_ts;
     (video ? ctx->last_video_ts : ctx->last_audio_ts) = frame->timestamp_ms;
+    if (delivery.growing)
+        *delivery.saved = 0;
 }
 
-// Copies a frame of n bytes, at which the reader stands.
-FlvdTurn FLVD_CopyFrame(const flvd_delivery_t& delivery, uint32_t n, const flvd_payload_sites_t& sites,
-                        flvd_frame_t* frame)
+// Delivers a frame that lies in the cache with its headers and back-pointer and fits the buffer, as most do. False when
+// this is none: nothing is done then.
+bool FLVD_DeliverCached(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+{
+    flvd_ctx_t* const ctx = delivery.ctx;
+    fio_file_t* const reader = delivery.reader;
+    const uint32_t size = delivery.tag.data_size + FLVD_TAG_OVERHEAD;
+    if (size > reader->count || reader->state != FIO_STATE_READ)
+        return false;
+    const uint8_t* const bytes = reader->cache + reader->head;
+    const uint32_t header = FLVD_CodecHeaderSize(delivery.tag.type, bytes + FLVD_CODEC_BYTE);
+    const uint32_t n = delivery.tag.data_size - header;
+    if (header == 0 || delivery.tag.data_size <= header || n > ctx->frame_buffer_size)
+        return false;
+    ctx->last_frame_size = n;
+    FLVD_FioDropBits(reader);
+    FLVD_FioConsume(reader, size); // the bytes stay where they are
+    FLVD_Report(delivery, n, frame);
+    g_flvd_fioFuncs.mem_copy(ctx->frame_buffer, bytes + FLVD_CODEC_BYTE + header, n);
+    return true;
+}
+
+// Delivers the n bytes at which the reader stands.
+FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, uint32_t n, const flvd_payload_sites_t& sites,
+                             flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.ctx;
     if (!FLVD_MakeRoom(ctx, n)) {
         FLVD_Record(ctx, sites.no_room);
-        return FLVD_PassPayload(delivery, n, sites);
+        return FLVD_PassBytes(delivery, n, sites);
     }
-    const uint32_t read = __FLV_DMX__fioRead(ctx->frame_buffer, 1, n, delivery.reader);
-    if (read < n) {
-        FLVD_Record(ctx, sites.short_read);
-        return FLVD_GiveUpTag(delivery, sites.rollback_payload);
-    }
-    ctx->last_frame_size = read;
+    if (__FLV_DMX__fioRead(ctx->frame_buffer, 1, n, delivery.reader) < n)
+        return FLVD_LoseTag(delivery, sites.short_read, sites.rollback_payload);
+    ctx->last_frame_size = n;
     const uint8_t* back_pointer = nullptr;
     const uint32_t available = FLVD_FioPeek(&back_pointer, FLVD_BACK_POINTER_SIZE, delivery.reader);
     if (delivery.growing && available < FLVD_BACK_POINTER_SIZE)
         return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
-    FLVD_Report(delivery, frame);
     FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, delivery.reader);
-    if (delivery.growing)
-        *delivery.saved = 0;
+    FLVD_Report(delivery, n, frame);
     return FlvdTurn::Delivered;
 }
 
-// Handles the media tag whose header the reader stands on.
-FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+// Handles a tag that is not delivered from the cache.
+[[gnu::noinline]] FlvdTurn FLVD_DeliverTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
 {
     fio_file_t* const reader = delivery.reader;
     const flvd_tag_info_t& tag = delivery.tag;
     const uint8_t* bytes = nullptr;
     if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, reader) < FLVD_TAG_PEEK_SIZE) {
-        const bool video = tag.type == FLVD_TAG_TYPE_VIDEO;
-        const flvd_payload_sites_t& sites = video ? g_flvd_videoSites : g_flvd_soundSites; // of AAC alike so far
+        const flvd_payload_sites_t& sites = FLVD_PayloadSites(tag.type, 0); // those of AAC are alike so far
         FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
-        FLVD_Record(delivery.ctx, sites.short_peek);
-        return FLVD_GiveUpTag(delivery, sites.rollback_payload);
+        return FLVD_LoseTag(delivery, sites.short_peek, sites.rollback_payload);
     }
-    const flvd_payload_t payload = FLVD_Classify(tag.type, bytes + FLVD_CODEC_BYTE);
-    FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader); // cached by the peek: no host seek that could fail
-    if (payload.header == 0 || tag.data_size < payload.header)
-        return FLVD_PassPayload(delivery, tag.data_size, *payload.sites);
-    FLVD_FioSkip(payload.header, reader);
-    return FLVD_CopyFrame(delivery, tag.data_size - payload.header, *payload.sites, frame);
+    const flvd_payload_sites_t& sites = FLVD_PayloadSites(tag.type, bytes[FLVD_CODEC_BYTE]);
+    const uint32_t header = FLVD_CodecHeaderSize(tag.type, bytes + FLVD_CODEC_BYTE);
+    if (header == 0 || tag.data_size < header)
+        return FLVD_PassBytes(delivery, FLVD_TAG_HEADER_SIZE + tag.data_size, sites);
+    const uint32_t headers = FLVD_TAG_HEADER_SIZE + header;
+    if (FLVD_FioSkip(headers, reader) != headers) // not all of them need be cached
+        return FLVD_LoseTag(delivery, sites.short_peek, sites.rollback_payload);
+    return FLVD_DeliverPayload(delivery, tag.data_size - header, sites, frame);
+}
+
+// Handles the media tag whose header the reader stands on.
+FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+{
+    return FLVD_DeliverCached(delivery, frame) ? FlvdTurn::Delivered : FLVD_DeliverTag(delivery, frame);
 }
 
 // Complete file: describes the next tag, or passes what is there by the size of the last one.
 FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
     if (FLVD_FioAtEnd(delivery->reader))
-        return FLVD_FailRequest(*delivery, delivery->sites->end);
+        return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
     if (FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 1) == 0)
         return FLVD_HandleTag(*delivery, frame);
     const uint32_t skipped = FLVD_FioSkip(delivery->tag.data_size + FLVD_TAG_OVERHEAD, delivery->reader);
-    return skipped != 0 ? FlvdTurn::Next : FLVD_FailRequest(*delivery, delivery->sites->end);
+    return skipped != 0 ? FlvdTurn::Next : FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
 }
 
 // Saves the position in front of the next tag. At the end of what was there the seek clears the host's end flag: the
@@ -214,7 +253,7 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
     return resumed ? FLVD_SITE_NONE : FLVD_SITE_FRAME_RESUME;
 }
 
-FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
+[[gnu::noinline]] FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
     const flvd_site_t site = FLVD_SavePosition(*delivery);
     if (FLVD_IsFailure(site))
@@ -239,14 +278,14 @@ flvd_site_t FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
     switch (stream) {
     case FLVD_STREAM_VIDEO:
         delivery->wanted = FLVD_TAG_VIDEO;
-        return FLVD_HasVideo(ctx) ? FLVD_SITE_NONE : delivery->sites->no_video;
+        return FLVD_HasVideo(ctx) ? FLVD_SITE_NONE : FLVD_FrameSites(*delivery).no_video;
     case FLVD_STREAM_AUDIO:
         delivery->wanted = FLVD_TAG_AUDIO;
         delivery->reader = ctx->audio_reader;
         delivery->saved = &ctx->saved_audio_pos;
-        return FLVD_HasAudio(ctx) ? FLVD_SITE_NONE : delivery->sites->no_audio;
+        return FLVD_HasAudio(ctx) ? FLVD_SITE_NONE : FLVD_FrameSites(*delivery).no_audio;
     default:
-        return delivery->sites->bad_stream;
+        return FLVD_FrameSites(*delivery).bad_stream;
     }
 }
 
@@ -267,24 +306,22 @@ FlvdTurn FLVD_Deliver(flvd_delivery_t* delivery, flvd_frame_t* frame)
         if (turn != FlvdTurn::Next)
             return turn;
     }
-    return FLVD_FailRequest(*delivery, delivery->sites->end);
+    return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
 }
 
 } // namespace
 
 int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd_frame_t* frame)
 {
-    const bool growing = FLVD_IsGrowing(ctx);
-    const flvd_frame_sites_t& sites = growing ? g_flvd_growingSites : g_flvd_completeSites;
-    flvd_delivery_t delivery = {ctx, ctx->main_reader, &ctx->saved_main_pos, &sites, FLVD_TAG_MEDIA, growing, {}};
+    flvd_delivery_t delivery = {ctx, ctx->main_reader, &ctx->saved_main_pos, FLVD_TAG_MEDIA, FLVD_IsGrowing(ctx), {}};
     if (ctx->opened_for_info != 0)
-        return FLVD_Fail(ctx, sites.info_only);
+        return FLVD_Fail(ctx, FLVD_FrameSites(delivery).info_only);
     const flvd_site_t refused = FLVD_ChooseStream(&delivery, request->stream);
     if (FLVD_IsFailure(refused))
         return FLVD_Fail(ctx, refused);
     FLVD_TakeUserBuffer(ctx, request);
     *frame = {};
-    if (growing && *delivery.saved != 0 && !FLVD_GoBack(delivery))
+    if (delivery.growing && *delivery.saved != 0 && !FLVD_GoBack(delivery))
         return FLVD_Fail(ctx, FLVD_SITE_FRAME_RESUME);
     return FLVD_Deliver(&delivery, frame) == FlvdTurn::Delivered ? 0 : -1;
 }

@@ -4,10 +4,14 @@
 #ifndef FLVDMX_TAG_TAG_H
 #define FLVDMX_TAG_TAG_H
 
+#include "flvdmx/fio/bytes.h"
+#include "flvdmx/fio/fio.h"
 #include "flvdmx/flvdmx.h"
 #include "flvdmx/format.h"
 
 constexpr uint32_t FLVD_TAG_PEEK_SIZE = FLVD_TAG_HEADER_SIZE + 2; // header, codec byte and packet type
+
+constexpr uint32_t FLVD_VIDEO_BYTE_MAX = 0x5F; // FrameType 1 to 5, any CodecID
 
 constexpr uint32_t FLVD_ANY_CODEC = 0xFFFF; // filter value: no tag of that kind has been probed
 
@@ -47,28 +51,91 @@ struct flvd_tag_rules_t {
     uint32_t audio_filter;
 };
 
-flvd_tag_rules_t FLVD_TagRules(const flvd_ctx_t* ctx);
+inline flvd_tag_rules_t FLVD_TagRules(const flvd_ctx_t* ctx)
+{
+    return {
+        ctx->data_end,
+        int64_t{ctx->data_offset} + FLVD_BACK_POINTER_SIZE,
+        ctx->last_ts != 0 ? ctx->last_ts : UINT32_MAX,
+        ctx->video_codec_filter,
+        ctx->audio_format_filter,
+    };
+}
 
-// Timestamp of the tag header at `bytes`, 11 bytes long, TimestampExtended being the top byte.
-uint32_t FLVD_TagTimestamp(const uint8_t* bytes);
+// Timestamp of the tag header at `bytes`, 11 bytes long: TimestampExtended, the top byte, stands behind the other
+// three.
+constexpr uint32_t FLVD_TagTimestamp(const uint8_t* bytes)
+{
+    const uint32_t field = FLVD_GetBE32(bytes + FLVD_TIMESTAMP_FIELD);
+    return field >> 8 | field << 24;
+}
 
 // Reads the header from 13 bytes.
-flvd_tag_header_t FLVD_ReadTagHeader(const uint8_t* bytes);
+inline flvd_tag_header_t FLVD_ReadTagHeader(const uint8_t* bytes)
+{
+    const uint32_t type_and_size = FLVD_GetBE32(bytes);
+    return {
+        {type_and_size >> 24, type_and_size & 0xFFFFFF, FLVD_TagTimestamp(bytes),
+         FLVD_GetBE32(bytes + FLVD_STREAM_ID_FIELD) >> 8},
+        bytes[FLVD_CODEC_BYTE],
+        bytes[FLVD_PACKET_TYPE],
+    };
+}
 
 // Peeks a header at the position. False when fewer than 13 bytes are left.
-bool FLVD_PeekTagHeader(fio_file_t* file, flvd_tag_header_t* header);
+inline bool FLVD_PeekTagHeader(fio_file_t* file, flvd_tag_header_t* header)
+{
+    const uint8_t* bytes = nullptr;
+    if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, file) < FLVD_TAG_PEEK_SIZE)
+        return false;
+    *header = FLVD_ReadTagHeader(bytes);
+    return true;
+}
 
 // Header test without the size: type, timestamp ceiling and stream filters.
-bool FLVD_IsStreamTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header);
+inline bool FLVD_IsStreamTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header)
+{
+    if (header.info.timestamp > rules.max_timestamp)
+        return false;
+    if (header.IsVideo()) {
+        if (rules.video_filter == FLVD_ANY_CODEC)
+            return true;
+        return header.CodecId() == (rules.video_filter & FLVD_CODEC_ID_MASK) && header.first <= FLVD_VIDEO_BYTE_MAX;
+    }
+    if (header.IsAudio())
+        return rules.audio_filter == FLVD_ANY_CODEC || header.first == rules.audio_filter;
+    return header.info.type == FLVD_TAG_TYPE_SCRIPT;
+}
 
 // Header test: plausible for this file.
-bool FLVD_IsPlausibleTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header);
-
-// Wanted-kind filter.
-bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted);
+inline bool FLVD_IsPlausibleTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header)
+{
+    return int64_t{header.info.data_size} < rules.data_end && FLVD_IsStreamTag(rules, header);
+}
 
 // True when the four bytes of a back-pointer belong to a tag of so much data.
-bool FLVD_IsBackPointer(const uint8_t* bytes, uint32_t data_size);
+constexpr bool FLVD_IsBackPointer(const uint8_t* bytes, uint32_t data_size)
+{
+    return FLVD_GetBE32(bytes) == data_size + FLVD_TAG_HEADER_SIZE;
+}
+
+// Wanted-kind filter.
+inline bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted)
+{
+    if (header.IsVideo()) {
+        if ((wanted & FLVD_TAG_VIDEO) == 0)
+            return false;
+        if ((wanted & FLVD_TAG_KEYFRAME) != 0)
+            return header.IsKeyframe();
+        return (wanted & FLVD_TAG_CONFIG) == 0 || !header.IsAvc() || header.second == FLVD_PACKET_SEQUENCE_HEADER;
+    }
+    if (header.IsAudio()) {
+        if ((wanted & FLVD_TAG_AUDIO) == 0)
+            return false;
+        return (wanted & FLVD_TAG_CONFIG) == 0 || !header.IsAac() || header.second == FLVD_PACKET_SEQUENCE_HEADER;
+    }
+    return (wanted & FLVD_TAG_SCRIPT) != 0;
+}
 
 // Passes the four bytes behind a tag's data when they are its back-pointer; anything else stays, for the next search
 // to cross. A back-pointer left standing could be taken for a tag: its low byte may be 8, 9 or 18.
