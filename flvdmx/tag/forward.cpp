@@ -143,8 +143,12 @@ flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_i
     const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size <= file->capacity && file->read_size == file->capacity) {
         const uint8_t* bytes = nullptr;
-        if (FLVD_FioPeek(&bytes, size, file) == size)
+        const uint32_t first = FLVD_FioPeek(&bytes, size, file);
+        if (first == size)
             return {FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, tag.data_size) || exempt, true};
+        // Where the data ends no more comes. Looking behind would cost a whole cache for each false header there.
+        if (FLVD_FioPeek(&bytes, size, file) == first)
+            return {exempt, true};
     }
     return {FLVD_CheckBehind(file, tag) || exempt, false};
 }
