@@ -1,4 +1,4 @@
-// Forward navigation: describing the tag at the position, resynchronising after damage, stepping to the next tag.
+// Forward navigation: the search for a tag, resynchronising after damage, stepping to the next tag.
 
 #include "flvdmx/tag/tag.h"
 
@@ -278,23 +278,10 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
     return FLVD_StepOver(search, check, header.info) ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
-// True when the tag at the position is sound, wanted and in the cache whole, so that nothing need be read or moved to
-// take it: most tags of a file that is played.
-bool FLVD_IsCachedAndSound(const flvd_ctx_t* ctx, const fio_file_t* file, uint32_t wanted, flvd_tag_header_t* header)
-{
-    if (file->count < FLVD_TAG_PEEK_SIZE || file->state != FIO_STATE_READ || file->read_size != file->capacity)
-        return false;
-    const uint8_t* const bytes = file->cache + file->head;
-    *header = FLVD_ReadTagHeader(bytes);
-    const uint32_t size = header->info.data_size + FLVD_TAG_OVERHEAD;
-    return size <= file->count && FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, header->info.data_size) &&
-           FLVD_IsPlausibleTag(FLVD_TagRules(ctx), *header) && FLVD_IsWantedTag(*header, wanted);
-}
+} // namespace
 
-// Finds the tag that FLVD_GetCurrTagInfo describes, from a position that was taken. Apart, so that the tag that needs
-// no search does not pay for its frame.
-[[gnu::noinline]] int32_t FLVD_FindTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
-                                       bool verify, int64_t position)
+int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, bool verify,
+                        int64_t position)
 {
     flvd_search_t search = FLVD_Search(ctx, file, wanted, verify, position);
     flvd_tag_header_t header;
@@ -304,24 +291,6 @@ bool FLVD_IsCachedAndSound(const flvd_ctx_t* ctx, const fio_file_t* file, uint32
     if (result == 0)
         *info = header.info;
     return result;
-}
-
-} // namespace
-
-int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
-{
-    const int64_t position = __FLV_DMX__fioTell64(file);
-    if (position < 0)
-        return FLVD_ERR_NOT_FOUND;
-    if (position == ctx->data_offset)
-        FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
-    flvd_tag_header_t header;
-    if (verify == 0 || !FLVD_IsCachedAndSound(ctx, file, wanted, &header))
-        return FLVD_FindTag(ctx, file, info, wanted, verify != 0, position);
-    if (__FLV_DMX__fioTell64(file) < position)
-        return FLVD_ERR_NOT_FOUND;
-    *info = header.info;
-    return 0;
 }
 
 int32_t FLVD_FindNextTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)

@@ -142,6 +142,10 @@ inline bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted)
 // False when fewer than 4 bytes are there.
 bool FLVD_PassBackPointer(fio_file_t* file, uint32_t data_size);
 
+// The search of FLVD_GetCurrTagInfo from a position that was taken; its results.
+int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, bool verify,
+                        int64_t position);
+
 // Puts a reader in front of the first tag, on PreviousTagSize0. Returns the host's seek result.
 int32_t FLVD_SeekToFirstTag(const flvd_ctx_t* ctx, fio_file_t* file);
 
