@@ -2,6 +2,7 @@
 
 find_program(CLANG_FORMAT clang-format REQUIRED)
 find_program(CLANG_TIDY clang-tidy REQUIRED)
+find_program(CPPCHECK cppcheck REQUIRED)
 find_program(VALGRIND valgrind REQUIRED)
 
 foreach(folder IN ITEMS flvdmx host tools tests bench fuzz)
@@ -28,6 +29,17 @@ foreach(source IN LISTS sources)
         WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
     set_tests_properties(tidy/${source} PROPERTIES LABELS tidy)
 endforeach()
+
+# Over the library alone: the two see what clang's analyzer may miss, and take seconds.
+file(GLOB library CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/flvdmx/*/*.cpp)
+add_test(NAME cppcheck COMMAND ${CPPCHECK} --quiet --error-exitcode=1 --enable=warning,performance,portability
+    --std=c++17 --language=c++ -I . ${library} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
+if(CMAKE_CXX_COMPILER_ID STREQUAL "GNU")
+    foreach(source IN LISTS library)
+        add_test(NAME analyzer/${source} COMMAND ${CMAKE_CXX_COMPILER} -std=c++17 -O1 -fno-exceptions -fno-rtti
+            -fanalyzer -Werror -I . -S -o /dev/null ${source} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
+    endforeach()
+endif()
 
 file(GLOB samples CONFIGURE_DEPENDS ${PROJECT_SOURCE_DIR}/tests/data/*.flv)
 foreach(sample IN LISTS samples)

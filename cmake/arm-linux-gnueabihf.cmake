@@ -1,4 +1,4 @@
-# 32-bit ARM Linux, hard float: Debian's g++-arm-linux-gnueabihf.
+# 32-bit ARM Linux, hard float: Debian's g++-arm-linux-gnueabihf; what is built runs in qemu-user-static.
 set(CMAKE_SYSTEM_NAME Linux)
 set(CMAKE_SYSTEM_PROCESSOR arm)
 set(CMAKE_C_COMPILER arm-linux-gnueabihf-gcc)
@@ -8,3 +8,4 @@ set(CMAKE_FIND_ROOT_PATH_MODE_PROGRAM NEVER)
 set(CMAKE_FIND_ROOT_PATH_MODE_LIBRARY ONLY)
 set(CMAKE_FIND_ROOT_PATH_MODE_INCLUDE ONLY)
 set(CMAKE_FIND_ROOT_PATH_MODE_PACKAGE ONLY)
+set(CMAKE_CROSSCOMPILING_EMULATOR qemu-arm-static -L ${CMAKE_FIND_ROOT_PATH})
