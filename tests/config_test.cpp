@@ -574,6 +574,19 @@ TEST(KeyframeArray, IsNotAllocatedForACountThatLies)
         EXPECT_EQ(kept(key, most, endless), Kept(0, 1));
         EXPECT_EQ(kept(key, most + 1, endless), Kept(0, 0));
     }
+    // Arrays one inside the other, each claiming the rest: two and a half payloads of elements are too many.
+    const auto allocations = [](uint32_t arrays) {
+        Bytes payload;
+        for (uint32_t left = 200 + 13 * arrays; left > 200;) {
+            Append(payload, {3, 0, 5, 't', 'i', 'm', 'e', 's', 10});
+            Put(payload, left -= 13, 4);
+        }
+        payload.resize(payload.size() + 200, 5);
+        Script script(payload, IN_MEMORY);
+        script.read();
+        return script.host.calls(HostFn::Alloc);
+    };
+    EXPECT_EQ(std::tuple(allocations(1), allocations(2), allocations(3)), std::tuple(1u, 2u, 2u));
 }
 
 TEST(KeyframeArray, IsReplacedByTheNext)

@@ -11,7 +11,8 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t VIDEO = FLVD_TAG_VIDEO, AUDIO = FLVD_TAG_AUDIO, SCRIPT = FLVD_TAG_SCRIPT, CONFIG = FLVD_TAG_CONFIG;
+static_assert(VIDEO == FLVD_TAG_VIDEO && AUDIO == FLVD_TAG_AUDIO);
+constexpr uint32_t SCRIPT = FLVD_TAG_SCRIPT, CONFIG = FLVD_TAG_CONFIG;
 constexpr uint32_t KEY = VIDEO | FLVD_TAG_KEYFRAME, ANY = VIDEO | AUDIO | SCRIPT;
 constexpr int32_t NOT_FOUND = FLVD_ERR_NOT_FOUND, AT_FIRST = FLVD_ERR_AT_FIRST_TAG, ENDED = FLVD_ERR_END_OF_DATA;
 constexpr int64_t DATA_OFFSET = 9, FIRST_TAG = 13;
@@ -338,36 +339,6 @@ TEST(HostCalls, OfTheBackPointerCheck)
     check(Sound(5000), 0, whole + " seek64(915,1)=0 read(16)=16 seek64(13,0)=0");
     check(Sound(), 16, "tell64()=13 eof()=0 read(16)=16 tell64()=29 seek64(95,1)=0 read(16)=16 seek64(13,0)=0");
     check(Sound(), 5, "tell64()=13 eof()=0 read(13)=13 tell64()=26 seek64(98,1)=0 read(5)=5 seek64(13,0)=0");
-}
-
-TEST(HostCalls, ThatFailEndTheSearch)
-{
-    // Result, position queries and seeks of a step from place 100 on; the last query of a success is the test's own.
-    const auto run = [](const Bytes& bytes, Step step, uint32_t wanted, HostFn fn, uint64_t failed, int offset = 9) {
-        Reader r(Concat({Zeros(100), bytes}));
-        r.ctx.data_offset = offset;
-        r.at(100).host.fail_nth(fn, failed);
-        const int32_t rc = std::get<0>((r.*step)(wanted));
-        return std::tuple(rc, r.host.calls(HostFn::Tell), r.host.calls(HostFn::Seek));
-    };
-    const Bytes chain = Bad(1) + Sound() + Sound(5000) + Picture(6000), behind = Concat({Zeros(10), chain});
-    for (const Step step : {&Reader::verify, &Reader::next}) {
-        for (const auto& [bytes, offset] : {std::pair(chain, 9), std::pair(behind, 9), std::pair(behind, 100)}) {
-            const auto [rc, tells, seeks] = run(bytes, step, VIDEO, HostFn::Tell, 0, offset);
-            EXPECT_EQ(rc, 0);
-            for (uint64_t call = 1; call < tells; ++call)
-                EXPECT_EQ(std::get<0>(run(bytes, step, VIDEO, HostFn::Tell, call, offset)), NOT_FOUND) << call;
-            EXPECT_EQ(std::get<0>(run(bytes, step, VIDEO, HostFn::Seek, seeks, offset)), NOT_FOUND); // back to the tag
-        }
-        const Bytes bad = Bytes() + Picture(5000, 7) + Sound();
-        EXPECT_EQ(std::get<0>(run(bad, step, AUDIO, HostFn::Seek, 2)), NOT_FOUND); // to the byte behind its start
-    }
-    EXPECT_EQ(std::get<0>(run(chain, &Reader::prev, ANY, HostFn::Tell, 1)), NOT_FOUND);
-    EXPECT_EQ(std::get<1>(run(behind, &Reader::trust, VIDEO, HostFn::Tell, 0)), 2u);
-    for (const Tag& unwanted : {Sound(5000), Picture(5000)}) {
-        const Bytes script = Bytes() + unwanted + Tag{18, 0, amf::Number(1)};
-        EXPECT_EQ(std::get<0>(run(script, &Reader::trust, SCRIPT, HostFn::Seek, 1)), ENDED);
-    }
 }
 
 // What opening finds out: end of the valid data, last timestamp, seek method, index entries, time of the last keyframe.

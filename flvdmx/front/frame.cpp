@@ -263,6 +263,9 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
         return FLVD_HandleTag(*delivery, frame);
     if (result == FLVD_ERR_END_OF_DATA)
         return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_END);
+    // A budget that is spent has moved the reader. Else a position query failed: going on would lead into the tag.
+    if (__FLV_DMX__fioTell64(delivery->reader) <= *delivery->saved)
+        return FLVD_FailRequest(*delivery, FLVD_GoBack(*delivery) ? FLVD_SITE_FRAME_POSITION : FLVD_SITE_ROLLBACK_SKIP);
     const int64_t size = int64_t{delivery->tag.data_size} + FLVD_TAG_OVERHEAD;
     if (__FLV_DMX__fioSeek64(delivery->reader, size, FIO_SEEK_CUR) != 0)
         return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_SKIP);

@@ -14,7 +14,7 @@ constexpr int32_t FLVD_BAD_TAG_COST = 64;
 
 // Trusting mode takes a position only once in so many tags passed: it has no budget for them, and a host whose seek
 // does not move could send it round for ever.
-constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x10000;
+constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x1000;
 
 // Results inside a search, beside those of the navigation functions.
 constexpr int32_t FLVD_SEARCH_ON = 1;    // go on behind this tag

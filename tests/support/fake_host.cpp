@@ -4,6 +4,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <tuple>
 
 namespace flvd_test {
 
@@ -13,75 +14,6 @@ static constexpr uint8_t RELEASED_MEMORY = 0xDD;
 
 static FakeHost* g_current = nullptr;
 static FakeHost::ViolationHandler g_handler = nullptr;
-
-// The tables' functions pass on to the current host. The carried slots are functions that must never run.
-struct FakeHost::Functions {
-    static void* Alloc(uint32_t size) { return current().alloc(size); }
-    static void Free(void* memory) { current().release(memory); }
-    static void* Copy(void* destination, const void* source, uint32_t count)
-    {
-        FakeHost& host = current();
-        host.begin(HostFn::Copy);
-        host.log_memory("copy", std::to_string(count), "");
-        if (count == 0)
-            violation("copy of 0 bytes");
-        const auto to = reinterpret_cast<uintptr_t>(destination);
-        const auto from = reinterpret_cast<uintptr_t>(source);
-        if (to < from ? from - to < count : to - from < count)
-            violation("copy between overlapping ranges");
-        host.check_range("copy to", destination, count);
-        host.check_range("copy from", source, count);
-        return std::memcpy(destination, source, count);
-    }
-    static void* Set(void* destination, int value, uint32_t count)
-    {
-        FakeHost& host = current();
-        host.begin(HostFn::Set);
-        host.log_memory("set", std::to_string(value) + "," + std::to_string(count), "");
-        host.check_range("fill of", destination, count);
-        return std::memset(destination, value, count);
-    }
-    template <int slot> static void Carried()
-    {
-        violation("carried memory function " + std::to_string(slot) + " was called");
-    }
-    static void* Open(const char* path, const char* mode) { return current().open(path, mode); }
-    static int32_t Close(void* pointer) { return current().close(pointer); }
-    static uint32_t Read(void* buffer, uint32_t size, uint32_t count, void* pointer)
-    {
-        return current().read(buffer, size, count, pointer);
-    }
-    static uint32_t Write(const void* buffer, uint32_t size, uint32_t count, void* pointer)
-    {
-        return current().write(buffer, size, count, pointer);
-    }
-    static int32_t Seek(void* pointer, int32_t offset, int32_t whence)
-    {
-        return current().seek(pointer, offset, whence, false);
-    }
-    static int32_t Seek64(void* pointer, int64_t offset, int32_t whence)
-    {
-        return current().seek(pointer, offset, whence, true);
-    }
-    static int32_t Tell(void* pointer) { return static_cast<int32_t>(current().tell(pointer, false)); }
-    static int64_t Tell64(void* pointer) { return current().tell(pointer, true); }
-    static int32_t Eof(void* pointer)
-    {
-        FakeHost& host = current();
-        host.begin(HostFn::Eof);
-        const Handle* const handle = host.handle(pointer);
-        const int32_t result = handle != nullptr && handle->eof ? 1 : 0;
-        host.log("eof", result);
-        return result;
-    }
-    static int32_t Flush(void* pointer)
-    {
-        FakeHost& host = current();
-        const int32_t result = host.begin(HostFn::Flush) && host.handle(pointer) != nullptr ? 0 : -1;
-        host.log("flush", result);
-        return result;
-    }
-};
 
 FakeHost::FakeHost() : m_previous(g_current)
 {
@@ -128,18 +60,13 @@ void FakeHost::violation(const std::string& what)
 
 void FakeHost::add_file(const std::string& path, Bytes contents)
 {
-    auto file = std::make_shared<File>();
-    file->size = file->visible = static_cast<int64_t>(contents.size());
-    file->data = std::move(contents);
-    m_files[path] = std::move(file);
+    const auto size = static_cast<int64_t>(contents.size());
+    add_sparse_file(path, size, {{0, std::move(contents)}});
 }
 
 void FakeHost::add_sparse_file(const std::string& path, int64_t size, std::map<int64_t, Bytes> extents)
 {
-    auto file = std::make_shared<File>();
-    file->size = file->visible = size;
-    file->extents = std::move(extents);
-    m_files[path] = std::move(file);
+    m_files[path] = std::make_shared<File>(File{std::move(extents), size, size});
 }
 
 void FakeHost::set_visible(int64_t size, const std::string& path)
@@ -157,53 +84,42 @@ bool FakeHost::grow(int64_t n, const std::string& path)
 
 flvd_init_t FakeHost::init(uint32_t options, uint32_t cache_size, uint32_t scan_read_size, const char* path) const
 {
+    const fio_funcs_t t = funcs();
     flvd_init_t init;
     std::memset(static_cast<void*>(&init), 0x5A, sizeof(init));
-    const fio_funcs_t table = funcs();
-    init.mem_alloc = table.mem_alloc;
-    init.mem_free = table.mem_free;
-    init.mem_slot3 = table.mem_slot3;
-    init.mem_copy = table.mem_copy;
-    init.mem_slot5 = table.mem_slot5;
-    init.mem_set = reinterpret_cast<flvd_mem_set_fn>(table.mem_set);
-    init.mem_slot1 = table.mem_slot1;
-    init.file_open = table.file_open;
-    init.file_read = table.file_read;
-    init.file_seek = table.file_seek;
-    init.file_tell = table.file_tell;
-    init.file_close = table.file_close;
-    init.file_eof = table.file_eof;
-    init.file_flush = table.file_flush;
-    init.file_write = table.file_write;
-    init.file_seek64 = table.file_seek64;
-    init.file_tell64 = table.file_tell64;
-    init.file_name = path;
-    init.options = options;
-    init.cache_size = cache_size;
-    init.scan_read_size = scan_read_size;
+    std::tie(init.mem_alloc, init.mem_free, init.mem_copy, init.mem_set, init.file_open, init.file_close) =
+        std::tie(t.mem_alloc, t.mem_free, t.mem_copy, t.mem_set, t.file_open, t.file_close);
+    std::tie(init.file_read, init.file_write, init.file_seek, init.file_tell, init.file_eof, init.file_flush) =
+        std::tie(t.file_read, t.file_write, t.file_seek, t.file_tell, t.file_eof, t.file_flush);
+    std::tie(init.mem_slot1, init.mem_slot3, init.mem_slot5, init.file_seek64, init.file_tell64) =
+        std::tie(t.mem_slot1, t.mem_slot3, t.mem_slot5, t.file_seek64, t.file_tell64);
+    std::tie(init.file_name, init.options, init.cache_size, init.scan_read_size) =
+        std::tie(path, options, cache_size, scan_read_size);
     return init;
 }
 
+// The functions pass on to the current host. The carried slots are functions that must never run.
 fio_funcs_t FakeHost::funcs() const
 {
+    const flvd_mem_slot_fn carried = [] { violation("a carried memory function was called"); };
     fio_funcs_t table{};
-    table.mem_alloc = Functions::Alloc;
-    table.mem_slot1 = Functions::Carried<1>;
-    table.mem_free = Functions::Free;
-    table.mem_slot3 = Functions::Carried<3>;
-    table.mem_copy = Functions::Copy;
-    table.mem_slot5 = Functions::Carried<5>;
-    table.mem_set = Functions::Set;
-    table.file_open = Functions::Open;
-    table.file_close = Functions::Close;
-    table.file_read = Functions::Read;
-    table.file_write = Functions::Write;
-    table.file_seek = Functions::Seek;
-    table.file_tell = Functions::Tell;
-    table.file_eof = Functions::Eof;
-    table.file_flush = Functions::Flush;
-    table.file_seek64 = m_only_32 ? nullptr : Functions::Seek64;
-    table.file_tell64 = m_only_32 ? nullptr : Functions::Tell64;
+    table.mem_slot1 = table.mem_slot3 = table.mem_slot5 = carried;
+    table.mem_alloc = [](auto... args) { return current().alloc(args...); };
+    table.mem_free = [](auto... args) { return current().release(args...); };
+    table.mem_copy = [](auto... args) { return current().copy(args...); };
+    table.mem_set = [](auto... args) { return current().set(args...); };
+    table.file_open = [](auto... args) { return current().open(args...); };
+    table.file_close = [](auto... args) { return current().close(args...); };
+    table.file_read = [](auto... args) { return current().read(args...); };
+    table.file_write = [](auto... args) { return current().write(args...); };
+    table.file_eof = [](auto... args) { return current().eof(args...); };
+    table.file_flush = [](auto... args) { return current().flush(args...); };
+    table.file_seek = [](auto... args) { return current().seek(args..., false); };
+    table.file_tell = [](auto... args) { return static_cast<int32_t>(current().tell(args..., false)); };
+    if (m_only_32)
+        return table;
+    table.file_seek64 = [](auto... args) { return current().seek(args..., true); };
+    table.file_tell64 = [](auto... args) { return current().tell(args..., true); };
     return table;
 }
 
@@ -267,30 +183,20 @@ bool FakeHost::begin(HostFn fn)
     const uint64_t number = ++m_calls[index(fn)];
     if (!CanFail(fn))
         return true;
-    const Range& fault = m_faults[index(fn)];
-    return ++m_failable_calls != m_fail_call && (fault.first == 0 || number < fault.first || number > fault.last);
+    const auto& [first, last] = m_faults[index(fn)];
+    return ++m_failable_calls != m_fail_call && (number < first || number > last);
 }
 
 uint32_t FakeHost::limited(HostFn fn, uint32_t count) const
 {
-    const Shortened& shortened = m_shortened[index(fn)];
-    if (shortened.nth == m_calls[index(fn)])
-        count = std::min(count, shortened.bytes);
-    return fn == HostFn::Read ? std::min(count, m_read_limit) : count;
+    const auto& [nth, bytes] = m_shortened[index(fn)];
+    const uint32_t most = nth == m_calls[index(fn)] ? bytes : UINT32_MAX;
+    return std::min({count, most, fn == HostFn::Read ? m_read_limit : UINT32_MAX});
 }
 
-template <class... Args> void FakeHost::log(const char* name, int64_t result, const Args&... args)
+void FakeHost::log(bool wanted, const char* name, const std::string& arguments, const std::string& result)
 {
-    if (!m_logging)
-        return;
-    std::string list;
-    ((list += (list.empty() ? "" : ",") + args), ...);
-    m_log += (m_log.empty() ? "" : " ") + std::string(name) + "(" + list + ")=" + std::to_string(result);
-}
-
-void FakeHost::log_memory(const char* name, const std::string& arguments, const std::string& result)
-{
-    if (m_log_memory)
+    if (wanted)
         m_log += (m_log.empty() ? "" : " ") + std::string(name) + "(" + arguments + ")=" + result;
 }
 
@@ -321,7 +227,7 @@ void* FakeHost::alloc(uint32_t size)
 {
     const bool allowed = begin(HostFn::Alloc) && size <= HUGE_BLOCK;
     void* const memory = allowed ? std::malloc(size != 0 ? size : 1) : nullptr;
-    log_memory("alloc", std::to_string(size), memory != nullptr ? "1" : "0");
+    log(m_log_memory, "alloc", std::to_string(size), memory != nullptr ? "1" : "0");
     if (memory == nullptr)
         return nullptr;
     std::memset(memory, FRESH_MEMORY, size);
@@ -332,7 +238,7 @@ void* FakeHost::alloc(uint32_t size)
 void FakeHost::release(void* memory)
 {
     begin(HostFn::Free);
-    log_memory("free", memory != nullptr ? "1" : "0", "");
+    log(m_log_memory, "free", memory != nullptr ? "1" : "0", "");
     if (memory == nullptr)
         return;
     const auto block = m_blocks.find(static_cast<uint8_t*>(memory));
@@ -347,6 +253,28 @@ void FakeHost::release(void* memory)
     std::free(memory);
 }
 
+void* FakeHost::copy(void* destination, const void* source, uint32_t count)
+{
+    begin(HostFn::Copy);
+    log(m_log_memory, "copy", std::to_string(count), "");
+    if (count == 0)
+        violation("copy of 0 bytes");
+    const auto to = reinterpret_cast<uintptr_t>(destination), from = reinterpret_cast<uintptr_t>(source);
+    if (to < from ? from - to < count : to - from < count)
+        violation("copy between overlapping ranges");
+    check_range("copy to", destination, count);
+    check_range("copy from", source, count);
+    return std::memcpy(destination, source, count);
+}
+
+void* FakeHost::set(void* destination, int value, uint32_t count)
+{
+    begin(HostFn::Set);
+    log(m_log_memory, "set", std::to_string(value) + "," + std::to_string(count), "");
+    check_range("fill of", destination, count);
+    return std::memset(destination, value, count);
+}
+
 void* FakeHost::open(const char* path, const char* mode)
 {
     m_open_modes.emplace_back(mode);
@@ -355,7 +283,7 @@ void* FakeHost::open(const char* path, const char* mode)
         add_file(path, {});
     const auto file = m_files.find(path);
     const bool opened = allowed && file != m_files.end();
-    log("open", opened ? 1 : 0, std::string(path), std::string(mode));
+    log(m_logging, "open", std::string(path) + "," + mode, opened ? "1" : "0");
     if (!opened)
         return nullptr;
     m_handles.push_back(std::make_unique<Handle>(Handle{file->second}));
@@ -368,22 +296,34 @@ int32_t FakeHost::close(void* pointer)
     Handle* const closing = handle(pointer);
     if (closing != nullptr)
         closing->open = false;
-    log("close", closing != nullptr ? 0 : -1);
+    log(m_logging, "close", "", closing != nullptr ? "0" : "-1");
     return closing != nullptr ? 0 : -1;
+}
+
+int32_t FakeHost::eof(void* pointer)
+{
+    begin(HostFn::Eof);
+    const Handle* const handle = this->handle(pointer);
+    const int32_t result = handle != nullptr && handle->eof ? 1 : 0;
+    log(m_logging, "eof", "", std::to_string(result));
+    return result;
+}
+
+int32_t FakeHost::flush(void* pointer)
+{
+    const int32_t result = begin(HostFn::Flush) && handle(pointer) != nullptr ? 0 : -1;
+    log(m_logging, "flush", "", std::to_string(result));
+    return result;
 }
 
 void FakeHost::fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count)
 {
-    if (file.extents.empty()) {
-        std::copy_n(file.data.begin() + static_cast<std::ptrdiff_t>(pos), count, out);
-        return;
-    }
     std::fill_n(out, count, uint8_t{0});
     for (const auto& [offset, bytes] : file.extents) {
         const int64_t from = std::max(pos, offset);
         const int64_t to = std::min(pos + count, offset + static_cast<int64_t>(bytes.size()));
-        for (int64_t i = from; i < to; ++i)
-            out[i - pos] = bytes[static_cast<size_t>(i - offset)];
+        if (from < to)
+            std::copy(bytes.data() + (from - offset), bytes.data() + (to - offset), out + (from - pos));
     }
 }
 
@@ -405,7 +345,7 @@ uint32_t FakeHost::read(void* buffer, uint32_t size, uint32_t count, void* point
         from->eof = from->eof && got == left;
     }
     m_bytes_read += got;
-    log("read", got, std::to_string(count));
+    log(m_logging, "read", std::to_string(count), std::to_string(got));
     return got;
 }
 
@@ -419,14 +359,14 @@ uint32_t FakeHost::write(const void* buffer, uint32_t size, uint32_t count, void
     uint32_t done = 0;
     if (allowed && to != nullptr) {
         File& file = *to->file;
+        Bytes& data = file.extents.at(0);
         done = limited(HostFn::Write, count);
-        file.data.resize(std::max(file.data.size(), static_cast<size_t>(to->pos) + done));
-        std::copy_n(static_cast<const uint8_t*>(buffer), done,
-                    file.data.begin() + static_cast<std::ptrdiff_t>(to->pos));
+        data.resize(std::max(data.size(), static_cast<size_t>(to->pos) + done));
+        std::copy_n(static_cast<const uint8_t*>(buffer), done, data.begin() + static_cast<std::ptrdiff_t>(to->pos));
         to->pos += done;
-        file.size = file.visible = static_cast<int64_t>(file.data.size());
+        file.size = file.visible = static_cast<int64_t>(data.size());
     }
-    log("write", done, std::to_string(count));
+    log(m_logging, "write", std::to_string(count), std::to_string(done));
     return done;
 }
 
@@ -445,7 +385,8 @@ int32_t FakeHost::seek(void* pointer, int64_t offset, int32_t whence, bool wide)
             result = 0;
         }
     }
-    log(wide ? "seek64" : "seek", result, std::to_string(offset), std::to_string(whence));
+    const std::string arguments = std::to_string(offset) + "," + std::to_string(whence);
+    log(m_logging, wide ? "seek64" : "seek", arguments, std::to_string(result));
     return result;
 }
 
@@ -455,7 +396,7 @@ int64_t FakeHost::tell(void* pointer, bool wide)
     const Handle* const asked = handle(pointer);
     const bool works = allowed && asked != nullptr && (wide || asked->pos <= INT32_MAX);
     const int64_t result = works ? asked->pos : -1;
-    log(wide ? "tell64" : "tell", result);
+    log(m_logging, wide ? "tell64" : "tell", "", std::to_string(result));
     return result;
 }
 

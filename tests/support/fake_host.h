@@ -49,7 +49,7 @@ public:
     bool grow(int64_t n, const std::string& path = DEFAULT_FILE);
     int64_t visible(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->visible; }
     /** Contents of a file that is not sparse. */
-    const Bytes& contents(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->data; }
+    const Bytes& contents(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->extents.at(0); }
 
     /* -- tables for the library */
 
@@ -96,6 +96,12 @@ public:
      */
     std::string take_log();
 
+    /** Size of a block that is held, 0 for any other pointer. */
+    size_t size_of(const void* block) const
+    {
+        const auto held = m_blocks.find(static_cast<const uint8_t*>(block));
+        return held != m_blocks.end() ? held->second : 0;
+    }
     size_t live_blocks() const { return m_blocks.size(); }
     size_t live_bytes() const;
     size_t open_handles() const;
@@ -104,7 +110,6 @@ public:
 
 private:
     struct File {
-        Bytes data;
         std::map<int64_t, Bytes> extents;
         int64_t size = 0;
         int64_t visible = 0;
@@ -115,30 +120,24 @@ private:
         bool eof = false;
         bool open = true;
     };
-    struct Range {
-        uint64_t first = 0;
-        uint64_t last = 0;
-    };
-    struct Shortened {
-        uint64_t nth = 0;
-        uint32_t bytes = 0;
-    };
-    struct Functions; // the C functions behind the tables
     static constexpr size_t FN_COUNT = static_cast<size_t>(HostFn::Count);
     static size_t index(HostFn fn) { return static_cast<size_t>(fn); }
 
     static void violation(const std::string& what);
     bool begin(HostFn fn);
     uint32_t limited(HostFn fn, uint32_t count) const;
-    template <class... Args> void log(const char* name, int64_t result, const Args&... args);
-    void log_memory(const char* name, const std::string& arguments, const std::string& result);
+    void log(bool wanted, const char* name, const std::string& arguments, const std::string& result);
     Handle* handle(void* pointer);
     void check_range(const char* what, const void* pointer, uint32_t count);
 
     void* alloc(uint32_t size);
     void release(void* memory);
+    void* copy(void* destination, const void* source, uint32_t count);
+    void* set(void* destination, int value, uint32_t count);
     void* open(const char* path, const char* mode);
     int32_t close(void* pointer);
+    int32_t eof(void* pointer);
+    int32_t flush(void* pointer);
     uint32_t read(void* buffer, uint32_t size, uint32_t count, void* pointer);
     uint32_t write(const void* buffer, uint32_t size, uint32_t count, void* pointer);
     int32_t seek(void* pointer, int64_t offset, int32_t whence, bool wide);
@@ -150,8 +149,8 @@ private:
     std::vector<std::unique_ptr<Handle>> m_handles;
     std::map<const uint8_t*, uint32_t> m_blocks;
     std::array<uint64_t, FN_COUNT> m_calls{};
-    std::array<Range, FN_COUNT> m_faults{};
-    std::array<Shortened, FN_COUNT> m_shortened{};
+    std::array<std::pair<uint64_t, uint64_t>, FN_COUNT> m_faults{}; // first and last call that fails
+    std::array<std::pair<uint64_t, uint32_t>, FN_COUNT> m_shortened{};
     std::vector<std::string> m_open_modes;
     uint64_t m_failable_calls = 0;
     uint64_t m_fail_call = 0;

@@ -131,10 +131,8 @@ Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> co
 
 Bytes NumberArray(const std::vector<double>& numbers)
 {
-    std::vector<Bytes> elements;
-    elements.reserve(numbers.size());
-    for (const double number : numbers)
-        elements.push_back(Number(number));
+    std::vector<Bytes> elements(numbers.size());
+    std::transform(numbers.begin(), numbers.end(), elements.begin(), Number);
     return StrictArray(elements);
 }
 
@@ -145,42 +143,12 @@ Bytes OnMetaData(const std::vector<Property>& properties)
 
 } // namespace amf
 
-Bytes VideoData(uint8_t frame_type, uint8_t codec, const Bytes& payload)
-{
-    return Concat({{static_cast<uint8_t>(frame_type << 4 | codec)}, payload});
-}
-
-Bytes AudioData(uint8_t header, const Bytes& payload)
-{
-    return Concat({{header}, payload});
-}
-
-Bytes AvcConfig(const Bytes& record)
-{
-    return Concat({{0x17, 0, 0, 0, 0}, record});
-}
-
 Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms, uint8_t packet_type)
 {
     Bytes out{static_cast<uint8_t>(key ? 0x17 : 0x27), packet_type};
     Put(out, static_cast<uint32_t>(composition_ms), 3);
     Append(out, payload);
     return out;
-}
-
-Bytes AvcEnd()
-{
-    return {0x17, 2, 0, 0, 0};
-}
-
-Bytes AacConfig(const Bytes& config, uint8_t header)
-{
-    return Concat({{header, 0}, config});
-}
-
-Bytes AacRaw(const Bytes& payload, uint8_t header)
-{
-    return Concat({{header, 1}, payload});
 }
 
 static void PutParameterSets(Bytes& out, const std::vector<Bytes>& sets)
@@ -360,6 +328,15 @@ Flv FlvBuilder::build() const
         tags[*m_index_tag].data = index_data(tags);
     }
     return lay_out(std::move(tags));
+}
+
+Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
+{
+    FlvBuilder builder(flags, static_cast<uint32_t>(prefix.size()) + header);
+    builder.prefix(prefix);
+    for (const Tag& tag : tags)
+        builder.add(tag);
+    return builder.build();
 }
 
 static void AddConfigurations(FlvBuilder& builder, const ChainOptions& options)

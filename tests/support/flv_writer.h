@@ -56,14 +56,16 @@ Bytes OnMetaData(const std::vector<Property>& properties);
 
 /* Tag data (what follows the 11-byte tag header), codec header bytes included. */
 
-Bytes VideoData(uint8_t frame_type, uint8_t codec, const Bytes& payload);
-Bytes AudioData(uint8_t header, const Bytes& payload);
-Bytes AvcConfig(const Bytes& record);
+inline const auto VideoData = [](uint8_t frame_type, uint8_t codec, const Bytes& payload) {
+    return Concat({{static_cast<uint8_t>(frame_type << 4 | codec)}, payload});
+};
+inline const auto AudioData = [](uint8_t header, const Bytes& payload) { return Concat({{header}, payload}); };
+inline const auto AvcConfig = [](const Bytes& record) { return Concat({{0x17, 0, 0, 0, 0}, record}); };
+inline const auto AvcEnd = [] { return Bytes{0x17, 2, 0, 0, 0}; };
 Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms = 0, uint8_t packet_type = 1);
-Bytes AvcEnd();
-/** header: SoundFormat 10 with rate, size and type bits; 0xAF in every usual file. */
-Bytes AacConfig(const Bytes& config, uint8_t header = 0xAF);
-Bytes AacRaw(const Bytes& payload, uint8_t header = 0xAF);
+/* header: SoundFormat 10 with rate, size and type bits; 0xAF in every usual file. */
+inline const auto AacConfig = [](const Bytes& config, uint8_t header = 0xAF) { return Concat({{header, 0}, config}); };
+inline const auto AacRaw = [](const Bytes& payload, uint8_t header = 0xAF) { return Concat({{header, 1}, payload}); };
 
 /* Codec payloads, behind the codec header bytes. */
 
@@ -117,6 +119,19 @@ struct Tag {
     uint32_t stream() const { return type == 9 ? 1u : 2u; }
 };
 
+/* Tags of noise, and the configurations in front of them. */
+
+inline const auto Screen = [](uint32_t ts, size_t size = 60) {
+    return Tag{9, ts, VideoData(1, CODEC_SCREEN, Noise(size))};
+};
+inline const auto Nalu = [](uint32_t ts, size_t size = 60) { return Tag{9, ts, AvcNalu(true, Noise(size))}; };
+inline const auto Pcm = [](uint32_t ts, size_t size = 60) { return Tag{8, ts, AudioData(SOUND_PCM, Noise(size))}; };
+inline const auto Raw = [](uint32_t ts, size_t size = 60) { return Tag{8, ts, AacRaw(Noise(size))}; };
+inline const Tag g_avc = {9, 0, AvcConfig(SmallAvcRecord())};
+/** Its back-pointer passes for a script tag. */
+inline const Tag g_aac = {8, 0, AacConfig({0x12, 0x10, 0x56, 0xE5, 0x00})};
+inline const Tag g_meta = {18, 0, amf::OnMetaData({{"width", amf::Number(320)}})};
+
 /** A file as built. */
 struct Flv {
     Bytes bytes;
@@ -163,6 +178,9 @@ private:
     std::vector<amf::Property> m_index_properties;
     IndexHook m_index_hook;
 };
+
+/** A file of these tags; DataOffset leaves room for a file header of `header` bytes behind the prefix. */
+Flv File(const std::vector<Tag>& tags, uint8_t flags = 5, const Bytes& prefix = {}, uint32_t header = 9);
 
 /**
  * An ordinary file: AVC and AAC, one keyframe every `gop` pictures, pictures and sound interleaved by time. Pictures

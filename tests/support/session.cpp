@@ -1,8 +1,81 @@
 #include "session.h"
 
+#include <algorithm>
+#include <sstream>
+#include <tuple>
+
 namespace flvd_test {
 
 static constexpr uint32_t POISON = 0x5A5A5A5A;
+
+// Of one operation, result and code: the lines, each with the initials of the host functions that lead there.
+struct Lines {
+    Op op;
+    int32_t rc, code;
+    const char* text;
+};
+static constexpr Lines LINES[] = {{Op::Open, -1, -4, "2335a"},
+                                  {Op::Open, -4, -5, "2386oa"},
+                                  {Op::Open, -4, -6, "2396oa"},
+                                  {Op::Open, -1, -7, "2413a"},
+                                  {Op::Open, -1, -1004, "2423st"},
+                                  {Op::Open, -1, -1002, "2434s 2458s"},
+                                  {Op::Open, -2, -10002, "2440s"},
+                                  {Op::Open, -1, -1005, "2465st"},
+                                  {Op::Open, -1, -2, "2496s"},
+                                  {Op::Inside, 0, -1, "226t 347t 364t 375t 479t"}, // the extent of a file
+                                  {Op::Inside, 0, -2, "241s 308s 338s 357s 405s 449s 503s"},
+                                  {Op::Inside, 0, -10001, "248t 486s 510t"},
+                                  {Op::Inside, 0, -10002, "659r 694r 741 781 818r 841 863 881 913"}, // codecs
+                                  {Op::Inside, 0, -3, "752a 924a"},
+                                  {Op::Inside, 0, -3001, "932"},
+                                  {Op::Inside, 0, -3002, "847 869 887 938"},
+                                  {Op::Inside, 0, -3003, "700 787"},
+                                  {Op::Inside, 0, -3004, "946"},
+                                  {Op::Inside, 0, 0, "2536a 2550a 2602a"}, // frames passed over
+                                  {Op::Inside, 0, -10002, "2521r 2540r 2554r 2579r 2606r"},
+                                  {Op::Frame, -1, -4007, "2638 2767"},
+                                  {Op::Frame, -1, -4002, "2651 2783"},
+                                  {Op::Frame, -1, -4003, "2661 2796"},
+                                  {Op::Frame, -1, -4004, "2667 2802"},
+                                  {Op::Frame, -2, -10002, "2737 2957"},
+                                  {Op::Frame, -1, -1, "2840t"},
+                                  {Op::Frame, -1, -2, "2830s 2859s 2881s 2899s 2921s 2933s 2945t"},
+                                  {Op::Seek, -1, -4007, "2982 3190"},
+                                  {Op::Seek, -1, -10003, "2987 3195"},
+                                  {Op::Seek, -1, -1, "3065t 3088t 3111t 3269t 3288t 3295t"},
+                                  {Op::Seek, -1, -2, "3045s 3252s 3299s"},
+                                  {Op::Seek, -1, -2000, "3072s 3095t 3118s 3276s"},
+                                  {Op::Seek, -2, -2003, "3161 3338"},
+                                  {Op::FrameSeek, -1, -1, "134t"},
+                                  {Op::FrameSeek, -1, -2, "140s 263s 290s 316s 335s 404s 432s 747s"},
+                                  {Op::FrameSeek, -1, -2006, "171t 231t 355 452 778t 817t"},
+                                  {Op::FrameSeek, -1, -2007, "325"},
+                                  {Op::FrameSeek, -1, -10002, "342 439"},
+                                  {Op::FrameSeek, -1, -10003, "844"}};
+
+const std::vector<Place>& Places()
+{
+    static const std::vector<Place> places = [] {
+        std::vector<Place> all;
+        for (const Lines& lines : LINES) {
+            std::istringstream in(lines.text);
+            for (std::string word; in >> word;)
+                all.push_back({lines.op, lines.rc, lines.code, std::stoi(word),
+                               word.substr(word.find_last_of("0123456789") + 1)});
+        }
+        return all;
+    }();
+    return places;
+}
+
+bool IsListed(Op op, int32_t rc, int32_t code, int32_t line)
+{
+    const auto same = [&](const Place& place) {
+        return std::tie(place.op, place.rc, place.code, place.line) == std::tie(op, rc, code, line);
+    };
+    return std::any_of(Places().begin(), Places().end(), same);
+}
 
 Session::Session(FakeHost& host, const OpenOptions& options)
 {

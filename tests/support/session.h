@@ -5,6 +5,23 @@
 
 namespace flvd_test {
 
+constexpr uint32_t SEPARATE = FLVD_OPT_SEPARATE_AUDIO_READER, USER = FLVD_OPT_USER_BUFFER;
+constexpr uint32_t GROWING = FLVD_OPT_PROGRESSIVE, INDEX = FLVD_OPT_INDEX_IN_MEMORY;
+constexpr uint32_t VIDEO = FLVD_STREAM_VIDEO, AUDIO = FLVD_STREAM_AUDIO, BOTH = VIDEO | AUDIO;
+
+/** What may fail: opening, a frame, a time seek, a frame seek; and what opening or a frame records besides. */
+enum class Op { Open, Frame, Seek, FrameSeek, Inside };
+
+/** A place of failure. */
+struct Place {
+    Op op;
+    int32_t rc, code, line; /**< result, error code and line; rc is 0 for what is recorded besides */
+    std::string by;         /**< of alloc, open, read, seek, tell the initials of those whose failure leads there */
+};
+/** All of them. */
+const std::vector<Place>& Places();
+bool IsListed(Op op, int32_t rc, int32_t code, int32_t line);
+
 struct OpenOptions {
     uint32_t options = 0; /**< FLVD_OPT_* */
     bool for_info = false;
@@ -40,6 +57,8 @@ public:
     int32_t last_error();
     /** Line of the last failure: the instance's, or the global one after a failed open. */
     int32_t error_line() const { return m_ctx != nullptr ? m_ctx->error_line : g_flvd_lErrorLine; }
+    /** The last failure is one that such an operation may have. */
+    bool failed_as_listed(Op op, int32_t rc) { return IsListed(op, rc, last_error(), error_line()); }
     /** Also done at the end. */
     int32_t close();
 

@@ -1,0 +1,101 @@
+// Codec headers against a second reading of them: audio headers, AVC records, picture headers.
+
+#include "judge.h"
+
+#include <cstring>
+
+namespace flvd_fuzz {
+namespace {
+
+// The first MPEG audio frame header, or 0.
+uint32_t find_mpeg(const Bytes& data)
+{
+    for (size_t at = 0; at + 4 <= data.size(); ++at) {
+        const uint32_t header = read_be(data, at, 4);
+        const bool reserved = (header >> 19u & 3u) == 1 || (header >> 17u & 3u) == 0 || (header >> 10u & 3u) == 3;
+        if (header >> 21u == 0x7FF && !reserved)
+            return header;
+    }
+    return 0;
+}
+
+// The control byte is the SoundFormat.
+void run_audio(Input& input)
+{
+    const Bytes& data = input.payload();
+    const int32_t format = input.byte();
+    const uint32_t header = format == 2 || format == 14 ? find_mpeg(data) : 0;
+    flvd_audio_info_t info{};
+    const int32_t rc = FLVD_ParseAudioHeader(format, data.data(), static_cast<int32_t>(data.size()), &info);
+    require(rc == (format == 10 || header != 0 ? 0 : -1), "another result");
+    require(header == 0 || info.channels == ((header >> 6u & 3u) == 3 ? 1u : 2u), "another number of channels");
+    require(header == 0 || info.data_rate <= 448, "an impossible rate");
+    if (rc == 0)
+        info.sample_rate = info.channels = 0;
+    if (header != 0)
+        info.sample_size = info.format_tag = info.data_rate = 0;
+    const flvd_audio_info_t untouched{};
+    require(same_bytes(info, untouched), "an audio header that changed something else");
+}
+
+// Appends parameter sets with start codes. False when the record ends before them.
+bool append_sets(const Bytes& record, uint32_t count, size_t* at, Bytes* sets)
+{
+    for (; count != 0; --count) {
+        const size_t left = record.size() - *at;
+        const size_t length = left >= 2 ? read_be(record, *at, 2) : left;
+        if (length + 2 > left)
+            return false;
+        const auto begin = record.begin() + static_cast<std::ptrdiff_t>(*at + 2);
+        sets->insert(sets->end(), {0, 0, 0, 1});
+        sets->insert(sets->end(), begin, begin + static_cast<std::ptrdiff_t>(length));
+        *at += 2 + length;
+    }
+    return true;
+}
+
+Bytes parameter_sets(const Bytes& record)
+{
+    Bytes sets;
+    size_t at = 6;
+    if (record.size() < 7 || record[0] != 1 || !append_sets(record, record[5] & 0x1Fu, &at, &sets))
+        return {};
+    const uint32_t pictures = at < record.size() ? record[at++] : UINT32_MAX;
+    return pictures != UINT32_MAX && append_sets(record, pictures, &at, &sets) ? sets : Bytes{};
+}
+
+void judge_picture(int32_t codec, const Bytes& data)
+{
+    flvd_video_info_t info{};
+    const int32_t rc = FLVD_ParseVideoHeader(codec, data.data(), static_cast<int32_t>(data.size()), &info);
+    const bool known = codec == 2 || codec == 4 || codec == 5 || codec == 7;
+    require(rc == -1 || (rc == 0 && known && data.size() >= 8), "a picture header where there can be none");
+    if (rc == 0)
+        info.width = info.height = 0;
+    if (rc == 0 && codec == 7)
+        std::memset(info.fourcc, 0, sizeof info.fourcc);
+    const flvd_video_info_t untouched{};
+    require(same_bytes(info, untouched), "a picture header that changed something else");
+}
+
+// The control bytes are the codec of a picture header and the room for the parameter sets.
+void run_avc(Input& input)
+{
+    const Bytes& record = input.payload();
+    const int32_t codec = input.byte();
+    Bytes out(size_t{input.byte()} * 4);
+    const Bytes expected = parameter_sets(record);
+    const int32_t written = FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()), out.data(),
+                                                         static_cast<int32_t>(out.size()));
+    require(static_cast<size_t>(written) == (expected.size() <= out.size() ? expected.size() : 0), "another size");
+    out.resize(static_cast<size_t>(written));
+    require(written == 0 || out == expected, "other parameter sets");
+    judge_picture(codec, record);
+    judge_picture(7, out);
+}
+
+const Target g_audio("audio", run_audio);
+const Target g_avc("avc", run_avc);
+
+} // namespace
+} // namespace flvd_fuzz

@@ -1,0 +1,107 @@
+/*
+ * What the fuzz targets share: the input, the list of targets, a host that lies, and the judgement itself: one that
+ * does not hold ends the process.
+ */
+#pragma once
+
+#include "support/fake_host.h"
+
+#include <algorithm>
+#include <array>
+
+namespace flvd_fuzz {
+
+using namespace flvd_test;
+
+void require(bool holds, const char* what);
+
+/**
+ * What the fuzzer gave: a payload, control bytes, and in the last byte their number. The payload stands in front so
+ * that its offsets stay when commands are added.
+ */
+class Input {
+public:
+    Input(const uint8_t* data, size_t size);
+    const Bytes& payload() const { return m_payload; }
+    bool empty() const { return m_next == m_control.size(); }
+    /** The next control byte; 0 when there are no more. */
+    uint8_t byte() { return empty() ? uint8_t{0} : m_control[m_next++]; }
+    uint16_t word()
+    {
+        const uint8_t high = byte();
+        return static_cast<uint16_t>(high << 8 | byte());
+    }
+
+private:
+    Bytes m_payload, m_control;
+    size_t m_next = 0;
+};
+
+/** A fuzz target. Each is a static object; the programs find it in the list. */
+struct Target {
+    Target(const char* its_name, void (*its_run)(Input&)) : name(its_name), run(its_run), next(first) { first = this; }
+    static inline const Target* first = nullptr;
+    const char* const name;
+    void (*const run)(Input&);
+    const Target* const next;
+};
+
+enum class Lie : uint8_t {
+    ReadClaimsMore,   /**< more bytes than were asked for */
+    ReadStands,       /**< the position does not follow */
+    TellGoesBack,     /**< every other position is too low */
+    TellStands,       /**< always the same position */
+    TellHuge,         /**< a position that no file has */
+    SeekForgetsWhere, /**< every offset counts from the start */
+    SeekStands,       /**< success without moving */
+    NeverAtEnd,
+    AlwaysAtEnd,
+    Count
+};
+
+/** The fake host with lies, and with a limit to its calls. One at a time. */
+class Host : public FakeHost {
+public:
+    explicit Host(Bytes file);
+    flvd_init_t init(uint32_t options, uint32_t cache_size, uint32_t scan_read_size) const;
+    /** The library's file layer gets this host's functions and opens the file. */
+    fio_file_t* open_reader(uint32_t cache_size, uint32_t overread_extra = 0) const;
+    /** Tells these lies (bits 1 << Lie) from now on, until `patience` calls or KiB read are used up; then it refuses.
+     */
+    void lie(uint32_t lies, uint64_t patience);
+    /** The next operation may cost so many calls. */
+    void begin(uint64_t calls) { m_calls_left = calls; }
+    /** Where a reader really stands. */
+    int64_t position(const fio_file_t* reader) const;
+    void require_clean() const;
+
+private:
+    struct Functions;
+    template <class Table> static void install(Table* table);
+    bool refuses(uint64_t effort);
+
+    const fio_funcs_t m_honest;
+    uint32_t m_lies = 0;
+    uint64_t m_patience = UINT64_MAX;
+    uint64_t m_calls_left = UINT64_MAX;
+    bool m_frame_buffer_held = false;
+};
+
+/** Whether two records hold the same bytes. */
+template <class Record> bool same_bytes(const Record& a, const Record& b)
+{
+    const auto* const first = reinterpret_cast<const uint8_t*>(&a);
+    return std::equal(first, first + sizeof a, reinterpret_cast<const uint8_t*>(&b));
+}
+
+/** A tag as it stands in a file, read anew from the bytes. */
+struct FileTag {
+    uint32_t type, size, timestamp, stream_id, first, second; /**< first, second: data bytes */
+    bool video() const { return type == FLVD_TAG_TYPE_VIDEO; }
+    bool keyframe() const { return first / 16 == 1 || first / 16 == 4; }
+};
+uint32_t read_be(const Bytes& bytes, size_t position, size_t count);
+/** False when fewer than 13 bytes are there. */
+bool read_tag(const Bytes& file, int64_t position, FileTag* tag);
+
+} // namespace flvd_fuzz

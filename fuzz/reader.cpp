@@ -1,0 +1,137 @@
+// The cached file and its bit reader against a plain array and a bit position: whatever the cache, the quantum and the
+// order of calls, they must be the same.
+
+#include "judge.h"
+
+namespace flvd_fuzz {
+namespace {
+
+constexpr uint32_t MAX_CALLS = 120;
+constexpr uint32_t BIT_READER_CACHE = 8; // a smaller cache does not hold what the bit reader looks at
+
+class Reader {
+public:
+    explicit Reader(Input& input) : m_host(input.payload()), m_data(m_host.contents())
+    {
+        const uint32_t extra = input.byte() % 32u;
+        m_file = m_host.open_reader(1u + input.byte() % 64u, extra);
+        m_room = m_file->capacity + extra;
+    }
+
+    void call(uint8_t code, uint32_t n)
+    {
+        m_host.begin(1200); // over-reading by a quantum of one byte costs a call for each
+        apply(code, n);
+        require(__FLV_DMX__fioTell64(m_file) == m_position, "another position");
+        require(uint64_t{m_file->head} + m_file->count <= m_room, "more cached than there is room for");
+    }
+    void close()
+    {
+        __FLV_DMX__fioClose(m_file);
+        m_host.require_clean();
+    }
+
+private:
+    uint32_t left(uint32_t n) const
+    {
+        return static_cast<uint32_t>(std::clamp<int64_t>(m_host.visible() - m_position, 0, n));
+    }
+    bool holds(const uint8_t* bytes, uint32_t n) const
+    {
+        return n == 0 || std::equal(bytes, bytes + n, m_data.begin() + static_cast<std::ptrdiff_t>(m_position));
+    }
+    void move_to(int64_t position)
+    {
+        m_position = position;
+        m_bits_valid = false;
+    }
+
+    void apply(uint8_t code, uint32_t n)
+    {
+        const uint8_t* bytes = nullptr;
+        switch (code % 8) {
+        case 0: {
+            const uint32_t got = __FLV_DMX__fioShowBytesByPtr(&bytes, n, m_file);
+            return require(got == std::min(left(n), m_room) && holds(bytes, got), "peeked bytes");
+        }
+        case 1: {
+            const uint32_t element = 1 + code / 64u;
+            Bytes copy(size_t{n} * element);
+            const uint32_t expected = left(n * element);
+            const uint32_t got = __FLV_DMX__fioRead(copy.data(), element, n, m_file);
+            require(got == expected / element && holds(copy.data(), expected), "read bytes");
+            return move_to(m_position + expected);
+        }
+        case 2:
+            require(__FLV_DMX__fioSkipBytes(n, m_file) == n, "a skip");
+            return move_to(m_position + n);
+        case 3:
+            return seek(code / 8 % 3, n);
+        case 4:
+            return require((__FLV_DMX__fioSetCacheReadSize(m_file, n % 80) == 1) == (n % 80 <= m_file->capacity),
+                           "quantum");
+        case 5:
+            __FLV_DMX__bitInit(m_file);
+            m_bits_valid = m_room >= BIT_READER_CACHE;
+            m_bit = m_position * 8;
+            return;
+        default:
+            if (m_bits_valid)
+                bits(code, n);
+        }
+    }
+    void seek(int32_t whence, uint32_t n)
+    {
+        const int64_t offset = whence == FIO_SEEK_SET ? int64_t{n} * 3 : int64_t{n} - 128;
+        const int64_t base = whence == FIO_SEEK_SET ? 0 : whence == FIO_SEEK_CUR ? m_position : m_host.visible();
+        if (base + offset < 0)
+            return;
+        require(__FLV_DMX__fioSeek64(m_file, offset, whence) == 0, "a seek");
+        move_to(base + offset);
+    }
+    uint32_t bit_field(uint32_t n) const
+    {
+        uint32_t value = 0;
+        for (int64_t bit = m_bit; bit < m_bit + n; ++bit) {
+            const uint32_t byte = bit / 8 < m_host.visible() ? m_data[static_cast<size_t>(bit / 8)] : 0u;
+            value = value << 1u | (byte >> (7 - bit % 8) & 1u);
+        }
+        return value;
+    }
+    void bits(uint8_t code, uint32_t n)
+    {
+        const uint32_t length = code >= 192 ? n : n % 33;
+        if (code >= 192)
+            __FLV_DMX__bitSkipBitsLong(m_file, length);
+        else if (code >= 128)
+            __FLV_DMX__bitSkipBits(m_file, length);
+        else if (code >= 64)
+            return require(__FLV_DMX__bitShowUBits(m_file, length) == bit_field(length), "bits shown");
+        else
+            require(__FLV_DMX__bitGetUBits(m_file, length) == bit_field(length), "bits taken");
+        m_bit += length;
+        m_position = (m_bit + 7) / 8;
+    }
+
+    Host m_host;
+    const Bytes& m_data;
+    fio_file_t* m_file = nullptr;
+    uint32_t m_room = 0;
+    bool m_bits_valid = false;
+    int64_t m_position = 0, m_bit = 0;
+};
+
+void run(Input& input)
+{
+    Reader reader(input);
+    for (uint32_t i = 0; i < MAX_CALLS && !input.empty(); ++i) {
+        const uint8_t code = input.byte();
+        reader.call(code, input.byte());
+    }
+    reader.close();
+}
+
+const Target g_target("reader", run);
+
+} // namespace
+} // namespace flvd_fuzz

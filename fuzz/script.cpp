@@ -1,0 +1,77 @@
+// Script data: the payload is one, in the middle of a file. It is read twice, by readers of different caches: where the
+// cache ends must not matter.
+
+#include "judge.h"
+
+namespace flvd_fuzz {
+namespace {
+
+constexpr size_t START = 24; // of the payload in the file
+
+// What a payload sets in an instance as the probing has it when it meets the script tag.
+std::vector<int64_t> outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length)
+{
+    const flvd_init_t init = host.init(options, 0, 0);
+    flvd_ctx_t ctx{};
+    ctx.options = options;
+    ctx.file_size = host.visible();
+    ctx.cur_reader = host.open_reader(cache_size);
+    FLVD_SetCallbackforMeta(&init);
+    __FLV_DMX__fioSeek64(ctx.cur_reader, START, FIO_SEEK_SET);
+    host.begin(2000 + 30 * host.contents().size());
+    const int32_t rc = FLVD_ReadMetadata(&ctx, length);
+    require(rc == 0 || rc == -1, "a result that reading of metadata has not");
+    require(host.position(ctx.cur_reader) == int64_t{START} + length, "the reader is not behind the payload");
+
+    const auto& [video, audio] = std::tie(ctx.video_info, ctx.audio_info);
+    const auto& [index, arrays] = std::tie(ctx.keyframe_index, ctx.keyframe_arrays);
+    const auto end = host.visible() + 5; // a key in the last bytes announces an array behind them
+    require(index.times_offset <= end && index.positions_offset <= end, "an index outside the file");
+    require(arrays.times_count <= length && arrays.positions_count <= length, "an array larger than the payload");
+    const bool kept = (options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
+    require(kept || arrays.times_ms == nullptr, "an index in memory that was not asked for");
+    std::vector<int64_t> values = {rc,
+                                   video.width,
+                                   video.height,
+                                   video.frame_rate,
+                                   video.last_key_time_ms,
+                                   audio.sample_rate,
+                                   audio.sample_size,
+                                   audio.data_rate,
+                                   ctx.file_size,
+                                   ctx.audio_delay_ms,
+                                   ctx.last_keyframe_ms,
+                                   ctx.last_keyframe_pos,
+                                   index.times_offset,
+                                   index.entry_count,
+                                   ctx.file_shorter_than_meta,
+                                   arrays.times_count,
+                                   arrays.positions_count,
+                                   index.positions_offset};
+    values.insert(values.end(), arrays.times_ms, arrays.times_ms + arrays.times_count);
+    values.insert(values.end(), arrays.positions, arrays.positions + arrays.positions_count);
+    init.mem_free(arrays.times_ms);
+    init.mem_free(arrays.positions);
+    __FLV_DMX__fioClose(ctx.cur_reader);
+    host.require_clean();
+    return values;
+}
+
+void run(Input& input)
+{
+    Bytes file(START, 0x11);
+    Append(file, input.payload());
+    const uint32_t options = input.byte() & 0x0Fu;
+    const uint32_t behind = input.byte(); // bytes of the file that are not the payload's
+    const uint32_t cache_size = 256u + 16u * input.byte();
+    const auto size = static_cast<uint32_t>(input.payload().size());
+    const uint32_t length = behind < size ? size - behind : size + behind + 1;
+    Host host(std::move(file));
+    require(outcome(host, options, 4096, length) == outcome(host, options, cache_size, length),
+            "values that depend on the cache");
+}
+
+const Target g_target("script", run);
+
+} // namespace
+} // namespace flvd_fuzz

@@ -1,0 +1,267 @@
+// Whole sessions: the control bytes are commands to the library and to its host, the payload is the file.
+//
+// Each result is judged: its code, the record, the bytes of a frame, where the readers stand, how many host calls it
+// took. While calls fail, the places are not judged; once the host has lied, only codes, memory and work are, until the
+// file is closed.
+
+#include "support/session.h"
+#include "judge.h"
+
+#include <cstring>
+#include <functional>
+#include <numeric>
+
+namespace flvd_fuzz {
+namespace {
+
+constexpr uint32_t MAX_COMMANDS = 64;
+constexpr uint32_t MAX_PLAYED = 24; // frames asked for behind the commands
+constexpr uint64_t PATIENCE = 2000; // of most hosts that lie: they may lead through whole budgets, which takes long
+constexpr uint64_t BUDGETS = 30'000'000; // calls that a patient one may cost
+constexpr uint8_t POISON = 0x5A;
+constexpr std::array<uint32_t, 8> CACHES = {0, 1024, 1, 1500, 65536, 4096, 16000, 0xFFFFFFFF};
+
+bool is_filled(const flvd_frame_t& frame, uint8_t value)
+{
+    flvd_frame_t filled;
+    std::memset(&filled, value, sizeof filled);
+    return same_bytes(frame, filled);
+}
+
+// Reads it all, so that a sanitizer sees what is not there.
+template <class Element> void touch(const Element* begin, size_t count)
+{
+    const volatile Element sum = std::accumulate(begin, begin + count, Element{0}, std::bit_xor<>());
+    static_cast<void>(sum);
+}
+
+class Run {
+public:
+    explicit Run(const Bytes& file) : m_host(file) {}
+    bool was_opened() const { return m_was_opened; }
+
+    void command(Input& input)
+    {
+        const uint8_t code = input.byte();
+        const uint32_t argument = code >> 4u;
+        const auto fn = static_cast<HostFn>(argument % static_cast<uint32_t>(HostFn::Eof));
+        m_faulty = (code % 16 >= 4 && code % 16 <= 7) || m_faulty;
+        switch (code % 16) {
+        case 0:
+            return open(input);
+        case 1:
+            return close();
+        case 2:
+            return seek((input.word() - 2000) * (argument > 13 ? 32768 : 1), input.byte());
+        case 3: // an open file only grows
+            return m_ctx == nullptr ? m_host.set_visible(input.word())
+                                    : static_cast<void>(m_host.grow(1 + input.word()));
+        case 4:
+            return m_host.fail_nth_call(m_host.failable_calls() + 1 + input.byte());
+        case 5:
+            return m_host.fail_nth(fn, m_host.calls(fn) + 1 + input.byte());
+        case 6:
+            return m_host.fail_from(fn, m_host.calls(fn) + 1 + input.byte());
+        case 7:
+            return m_host.limit_reads(input.byte());
+        case 8:
+            m_lies ^= 1u << argument % static_cast<uint32_t>(Lie::Count);
+            m_lied = m_lied || m_lies != 0;
+            return m_host.lie(m_lies, input.byte() == 0xFF || m_lies == 0 ? UINT64_MAX : PATIENCE);
+        case 9:
+            return misuse(argument);
+        case 10:
+            m_faulty = false;
+            return m_host.fail_nothing();
+        default:
+            for (uint32_t i = 0; i <= argument / 4; ++i)
+                frame(argument % 4);
+        }
+    }
+
+    void open(Input& input)
+    {
+        close();
+        m_was_opened = true;
+        const uint8_t bits = input.byte();
+        const uint8_t sizes = input.byte();
+        if ((bits & 0x80u) != 0)
+            m_host.use_32_bit_only();
+        m_buffer = Bytes((bits & FLVD_OPT_USER_BUFFER) != 0 ? input.word() : 0);
+        const flvd_init_t init = m_host.init(bits & 0x0Fu, CACHES[sizes % CACHES.size()], sizes / 8);
+        flvd_open_info_t info{};
+        m_lied = m_lies != 0;
+        begin();
+        const int32_t rc =
+            QVX_FLV_DMX((bits & 0x70u) == 0x70u ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN, &m_ctx, &init, &info);
+        require((rc == 0) == (m_ctx != nullptr), "an instance of a failed open, or none of a good one");
+        if (m_ctx != nullptr)
+            return judge_opened(info);
+        require(IsListed(Op::Open, rc, g_flvd_lLastError, g_flvd_lErrorLine), "a failure that no open has");
+        m_host.require_clean();
+    }
+
+    void close()
+    {
+        begin();
+        require(m_ctx == nullptr || QVX_FLV_DMX(FLVD_OP_CLOSE, &m_ctx, nullptr, nullptr) == 0, "a close that fails");
+        m_ctx = nullptr;
+        m_host.require_clean();
+    }
+
+    void frame(uint32_t stream)
+    {
+        if (m_ctx == nullptr)
+            return;
+        const bool separate = has(FLVD_OPT_SEPARATE_AUDIO_READER) && m_ctx->opened_for_info == 0;
+        const fio_file_t* const reader =
+            separate && stream == FLVD_STREAM_AUDIO ? m_ctx->audio_reader : m_ctx->main_reader;
+        const flvd_frame_request_t request{m_buffer.data(), static_cast<uint32_t>(m_buffer.size()), stream};
+        flvd_frame_t frame;
+        std::memset(&frame, POISON, sizeof frame);
+        begin();
+        const int64_t before = place(reader);
+        const int32_t rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &frame);
+        require(m_lied || m_faulty || place(reader) >= before, "a request that went back");
+        if (rc == 0) {
+            require(!separate || frame.stream == stream, "a frame of another stream");
+            return judge_frame(frame, m_host.position(reader) - 4);
+        }
+        require(IsListed(Op::Frame, rc, m_ctx->error, m_ctx->error_line), "a failure that no frame has");
+        const bool refused = m_ctx->error <= FLVD_ERR_NO_VIDEO && m_ctx->error >= FLVD_ERR_INFO_ONLY;
+        require(is_filled(frame, refused ? POISON : 0), "the record of a failed request");
+    }
+
+private:
+    bool has(uint32_t option) const { return (m_ctx->options & option) != 0; }
+    void begin()
+    {
+        const auto size = static_cast<uint64_t>(m_host.visible());
+        m_host.begin(m_lied ? BUDGETS : 4000 + 40 * size);
+    }
+    // Calls that are refused whatever the state, and touch nothing.
+
+    void misuse(uint32_t operation)
+    {
+        if (operation == FLVD_OP_CLOSE || operation == FLVD_OP_GET_LAST_ERROR)
+            return;
+        flvd_frame_t frame;
+        std::memset(&frame, POISON, sizeof frame);
+        const bool missing = m_ctx == nullptr && (operation == FLVD_OP_GET_FRAME || operation == FLVD_OP_SEEK);
+        const int32_t rc = QVX_FLV_DMX(operation, &m_ctx, nullptr, &frame);
+        require(rc == (missing ? FLVD_RET_NO_INSTANCE : FLVD_RET_FAILED), "a call that is to be refused");
+        require(is_filled(frame, POISON), "a refused call touched its record");
+    }
+
+    void judge_opened(const flvd_open_info_t& info) const
+    {
+        const bool video = (m_ctx->streams & FLVD_STREAM_VIDEO) != 0;
+        const bool audio = (m_ctx->streams & FLVD_STREAM_AUDIO) != 0;
+        require((video || audio) && info.has_video == (video ? 1u : 0u) && info.has_audio == (audio ? 1u : 0u),
+                "streams");
+        require(info.file_info == &m_ctx->file_info && info.video_info == (video ? &m_ctx->video_info : nullptr) &&
+                    info.audio_info == (audio ? &m_ctx->audio_info : nullptr),
+                "the records of an open");
+        touch(m_ctx->video_info.config, m_ctx->video_info.config_size);
+        touch(m_ctx->audio_info.config, m_ctx->audio_info.config_size);
+        touch(m_ctx->keyframe_arrays.times_ms, m_ctx->keyframe_arrays.times_count);
+        touch(m_ctx->keyframe_arrays.positions, m_ctx->keyframe_arrays.positions_count);
+        require(m_lied || m_faulty || has(FLVD_OPT_PROGRESSIVE) || m_ctx->data_end <= m_host.visible(),
+                "the end of the data");
+    }
+
+    // Where delivery goes on: a growing file's tag that waits to be tried again is gone back to first.
+
+    int64_t place(const fio_file_t* reader) const
+    {
+        const int64_t saved = reader == m_ctx->main_reader ? m_ctx->saved_main_pos : m_ctx->saved_audio_pos;
+        return has(FLVD_OPT_PROGRESSIVE) && saved != 0 ? saved : m_host.position(reader);
+    }
+
+    // While calls fail the way over the back-pointer may have failed too: then the tag may be anywhere.
+
+    void judge_frame(const flvd_frame_t& frame, int64_t behind) const
+    {
+        require(m_buffer.empty() || (frame.data == m_buffer.data() && frame.size <= m_buffer.size()), "another buffer");
+        touch(frame.data, frame.size);
+        behind = m_faulty ? m_host.visible() : behind;
+        while (m_faulty && behind > 0 && !is_tag_of(frame, behind))
+            --behind;
+        require(m_lied || is_tag_of(frame, behind), "a frame that is not a tag of the file");
+    }
+
+    // Whether the file holds this frame, as the data of a tag of its kind, size and time that ends there.
+
+    bool is_tag_of(const flvd_frame_t& frame, int64_t end) const
+    {
+        const int64_t start = end - frame.size;
+        if (start < 0 || end > m_host.visible() ||
+            !std::equal(frame.data, frame.data + frame.size,
+                        m_host.contents().begin() + static_cast<std::ptrdiff_t>(start)))
+            return false;
+        constexpr std::array<uint32_t, 3> codec_headers = {1, 2, 5};
+        return std::any_of(codec_headers.begin(), codec_headers.end(), [&](uint32_t header) {
+            FileTag tag;
+            return read_tag(m_host.contents(), start - header - 11, &tag) &&
+                   tag.type == (frame.stream == 1 ? 9u : 8u) && tag.size == frame.size + header &&
+                   tag.timestamp == frame.timestamp_ms + m_ctx->first_ts;
+        });
+    }
+
+    void seek(int32_t time, uint32_t bits)
+    {
+        if (m_ctx == nullptr)
+            return;
+        const flvd_seek_request_t request{time, (bits & 0x10u) | (bits & 3u) << 8 | (bits & 0x0Cu) << 14};
+        int32_t reached = POISON;
+        begin();
+        const int64_t main = place(m_ctx->main_reader);
+        const int64_t audio = place(m_ctx->audio_reader);
+        const int32_t rc = QVX_FLV_DMX(FLVD_OP_SEEK, &m_ctx, &request, &reached);
+        const bool judged = !m_lied && !m_faulty;
+        if (rc == 0 && judged && ((request.mode & FLVD_SEEK_RELATIVE) == 0 || time != 0))
+            return judge_landing(reached);
+        require(rc == 0 || IsListed(Op::Seek, rc, m_ctx->error, m_ctx->error_line), "a failure that no seek has");
+        require(rc == 0 || reached == POISON, "a failed seek wrote a time");
+        const bool stays = rc != 0 && judged && (request.mode & FLVD_SEEK_TO_END_ON_MISS) == 0;
+        require(!stays || (place(m_ctx->main_reader) == main && place(m_ctx->audio_reader) == audio), "a place lost");
+    }
+
+    void judge_landing(int32_t reached) const
+    {
+        const int64_t position = m_host.position(m_ctx->main_reader);
+        require(position >= m_ctx->data_offset && position <= m_host.visible(), "a seek out of the data");
+        FileTag tag;
+        if ((m_ctx->streams & FLVD_STREAM_VIDEO) == 0 || position == m_ctx->data_offset)
+            return;
+        require(read_tag(m_host.contents(), position, &tag), "a seek to no tag");
+        require(tag.timestamp == m_ctx->first_ts + static_cast<uint32_t>(reached), "a seek that reports another time");
+        if (m_ctx->seek_method == FLVD_SEEK_BY_SCAN) // an index may point at anything that carries about its time
+            require(tag.video() && tag.keyframe(), "a seek to no keyframe");
+    }
+
+    Host m_host;
+    flvd_ctx_t* m_ctx = nullptr;
+    Bytes m_buffer;
+    uint32_t m_lies = 0;
+    bool m_lied = false;   // since the file was opened
+    bool m_faulty = false; // calls may fail or read short
+    bool m_was_opened = false;
+};
+
+void run(Input& input)
+{
+    Run session(input.payload());
+    for (uint32_t i = 0; i < MAX_COMMANDS && !input.empty(); ++i)
+        session.command(input);
+    if (!session.was_opened())
+        session.open(input);
+    for (uint32_t i = 0; i < MAX_PLAYED; ++i)
+        session.frame(1 + i % 2);
+    session.close();
+}
+
+const Target g_target("session", run);
+
+} // namespace
+} // namespace flvd_fuzz

@@ -1,0 +1,320 @@
+// A host that fails: in each scenario every call that can fail fails once, with and without all calls behind it, and
+// every read is cut short. Whatever comes of it is listed, all that was taken is accounted for, what is delivered
+// are frames of the file, and a host that has recovered gets the rest of them.
+
+#include "support/report.h"
+#include "support/session.h"
+
+#include <algorithm>
+#include <iostream>
+#include <set>
+
+using namespace flvd_test;
+
+namespace {
+
+constexpr uint32_t BACK = FLVD_SEEK_BACKWARD, FORTH = FLVD_SEEK_FORWARD, REL = FLVD_SEEK_RELATIVE;
+constexpr uint32_t RETRY = FLVD_SEEK_RETRY_BACKWARD, AT_END = FLVD_SEEK_TO_END_ON_MISS;
+constexpr uint32_t BEFORE = 1, AFTER = 0;      // directions of a frame seek
+constexpr uint32_t SMALL = 1024;               // a cache below LARGE tags, which then cost host calls of their own
+constexpr size_t LARGE = 3000, GROWN = 600000; // GROWN is above the first frame buffer
+constexpr int64_t STEP = 601;                  // of a growing file
+constexpr size_t UNKNOWN = SIZE_MAX;
+constexpr char INITIALS[] = "a   o rwst f"; // of HostFn
+
+struct Seek {
+    int32_t time;
+    uint32_t mode = 0;
+    uint32_t stream = 0; // not 0: a frame seek of that one, `mode` being its direction
+};
+
+struct Scenario {
+    const char* name;
+    Flv flv;
+    std::vector<OpenOptions> opens; // taken in turn
+    std::vector<Seek> seeks = {};
+    int64_t shown = INT64_MAX; // bytes at first
+};
+
+// The nth call fails, or all from there on; with `bytes` the nth read is cut short instead.
+struct Fault {
+    uint64_t nth = 0;
+    bool later = false;
+    uint32_t bytes = 0;
+};
+
+using Seen = std::map<std::pair<int32_t, int32_t>, std::set<char>>; // codes and lines, and what led there
+
+// The frames of the whole file, with the tags' times, and which comes next.
+struct Due {
+    Frames frames;
+    size_t next = 0;
+};
+
+// One scenario under one fault.
+class Course {
+public:
+    Course(const Scenario& scenario, const OpenOptions& open, const Fault& fault, Seen* seen)
+        : m_scenario(scenario), m_fault(fault), m_seen(*seen), m_host(scenario.flv.bytes), m_open(open)
+    {
+        if ((open.options & SEPARATE) != 0)
+            m_streams = {VIDEO, AUDIO};
+        for (const uint32_t stream : m_streams)
+            for (const Frame& frame : scenario.flv.frames(stream != 0 ? stream : BOTH, 0))
+                if ((open.options & USER) == 0 || frame.data.size() <= open.user_buffer_size)
+                    m_due.at(stream).frames.push_back(frame);
+        m_host.set_visible(scenario.shown);
+        m_host.on_call = [this](HostFn fn) { arm(fn); };
+        m_host.on_release = [this](const void* block, uint32_t size) {
+            if (const auto* const ctx = static_cast<const flvd_ctx_t*>(block); size == sizeof(flvd_ctx_t))
+                note(ctx->error, ctx->error_line);
+        };
+        m_host.fail_nth_call(fault.bytes == 0 ? fault.nth : 0);
+        m_host.shorten_nth(HostFn::Read, fault.bytes != 0 ? fault.nth : 0, fault.bytes);
+    }
+    // Returns the number of calls that can fail, and of reads, before the host recovers.
+    std::pair<uint64_t, uint64_t> run()
+    {
+        Session session(m_host, m_open);
+        m_session = &session;
+        m_exact = !fired() && !m_open.for_info;
+        judge(Op::Open, session.open_rc());
+        bool on = session.opened();
+        if (on && fired() && !m_fault.later) {
+            EXPECT_EQ(__FLV_DMX__fioTell64(session.ctx()->main_reader), session.ctx()->data_offset);
+        }
+        take(on ? 3 : 0);
+        for (const Seek& seek : m_scenario.seeks)
+            on = on && go(seek);
+        const std::pair calls(m_host.failable_calls(), m_host.calls(HostFn::Read));
+        if (on)
+            play_out();
+        EXPECT_EQ(session.ctx() != nullptr ? session.close() : 0, 0);
+        EXPECT_EQ(m_host.live_blocks() + m_host.open_handles(), 0u);
+        return calls;
+    }
+
+private:
+    uint64_t calls() const { return m_fault.bytes != 0 ? m_host.calls(HostFn::Read) : m_host.failable_calls(); }
+    bool fired() const { return m_fault.nth != 0 && calls() >= m_fault.nth; }
+    void arm(HostFn fn)
+    {
+        if (calls() + 1 == m_fault.nth)
+            m_by = m_fault.bytes != 0 ? 'r' : INITIALS[static_cast<size_t>(fn)];
+        if (m_fault.later && fired())
+            m_host.fail_from(fn, 1);
+    }
+    void note(int32_t code, int32_t line)
+    {
+        const auto same = [&](const Place& place) { return place.code == code && place.line == line; };
+        EXPECT_TRUE(line == 0 || std::any_of(Places().begin(), Places().end(), same)) << code << " / " << line;
+        m_seen[{code, line}].insert(m_by);
+    }
+    // After every operation: it failed as listed, and what the host holds is what the instance's words say.
+    void judge(Op op, int32_t rc)
+    {
+        const int32_t code = m_session->last_error(), line = m_session->error_line();
+        const bool miss = op == Op::FrameSeek && (rc == FLVD_ERR_END_OF_DATA || line == 0);
+        EXPECT_TRUE(rc == 0 || miss || IsListed(op, rc, code, line)) << rc << ", " << code << " / " << line;
+        note(code, line);
+        EXPECT_EQ(m_session->ctx() != nullptr, m_session->opened());
+        if (!m_session->opened())
+            return;
+        const flvd_ctx_t& ctx = *m_session->ctx();
+        const auto& [video, audio, arrays] = std::tie(ctx.video_info, ctx.audio_info, ctx.keyframe_arrays);
+        std::vector<std::pair<const void*, size_t>> blocks = {
+            {&ctx, sizeof(ctx)},
+            {ctx.frame_buffer, ctx.frame_buffer_size},
+            {video.config, video.config_size},
+            {audio.config, audio.config_size},
+            {arrays.times_ms, arrays.times_count * sizeof(uint32_t)},
+            {arrays.positions, arrays.positions_count * sizeof(int64_t)}};
+        for (const fio_file_t* const reader : std::set<fio_file_t*>{ctx.main_reader, ctx.audio_reader}) {
+            blocks.insert(blocks.end(), {{reader, sizeof(*reader)}, {reader->cache, ctx.cache_size}});
+            EXPECT_LE(uint64_t{reader->head} + reader->count, reader->capacity);
+            EXPECT_EQ(reader->read_size, reader->capacity);
+        }
+        if ((ctx.options & USER) != 0)
+            blocks[1] = {}; // the host's own
+        for (const auto& [block, size] : blocks)
+            EXPECT_EQ(m_host.size_of(block), size);
+        const auto held = [](const auto& block) { return block.first != nullptr; };
+        EXPECT_EQ(static_cast<size_t>(std::count_if(blocks.begin(), blocks.end(), held)), m_host.live_blocks());
+        EXPECT_EQ(m_host.open_handles(), ctx.audio_reader != ctx.main_reader ? 2u : 1u);
+    }
+    // One request. It delivers a frame of the file, the next one unless the fault was met on the way.
+    int32_t frame(uint32_t stream)
+    {
+        const bool before = fired();
+        const auto [rc, got] = m_session->frame(stream);
+        judge(Op::Frame, rc);
+        auto& [frames, next] = m_due.at(stream);
+        if (before != fired() && !(growing() && rc != 0))
+            next = UNKNOWN;
+        if (rc != 0)
+            return rc;
+        const Frame tag{got.stream, got.timestamp + m_session->ctx()->first_ts, got.data};
+        const auto index = static_cast<size_t>(std::find(frames.begin(), frames.end(), tag) - frames.begin());
+        EXPECT_LT(index, frames.size()) << "at " << got.timestamp;
+        EXPECT_TRUE(!m_exact || m_fault.later || next == UNKNOWN || next == index) << index << " for " << next;
+        next = index + 1;
+        return 0;
+    }
+    // Requests of each stream; a growing file grows when it has no more.
+    void take(uint32_t requests)
+    {
+        for (const uint32_t stream : m_streams)
+            for (uint32_t i = 0; i < requests; ++i)
+                if (frame(stream) == FLVD_RET_END)
+                    m_host.grow(STEP);
+    }
+    // False: the reader may stand anywhere now.
+    bool go(const Seek& seek)
+    {
+        flvd_ctx_t& ctx = *m_session->ctx();
+        const bool before = fired();
+        if (seek.stream != 0) {
+            uint32_t result = 0;
+            const auto run = growing() ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
+            judge(Op::FrameSeek, run(&ctx, static_cast<uint32_t>(seek.time), &result, seek.stream, seek.mode));
+            return false;
+        }
+        int32_t reached = -1;
+        const int32_t rc = m_session->seek(seek.time, seek.mode, &reached);
+        judge(Op::Seek, rc);
+        EXPECT_TRUE(rc == 0 ? reached >= 0 && reached < 1000 : reached == -1);
+        EXPECT_TRUE(rc == 0 || rc == -2 || fired() != before || m_fault.later || !m_exact);
+        const bool waits = ctx.saved_main_pos != 0 || ctx.saved_audio_pos != 0; // the way back failed itself
+        EXPECT_TRUE(!waits || growing() || m_fault.later || rc == -2);
+        if (rc == 0 || waits || m_fault.later || (seek.mode & AT_END) != 0)
+            for (Due& due : m_due)
+                due.next = UNKNOWN;
+        take((seek.mode & AT_END) != 0 ? 0 : 2);
+        return true;
+    }
+    // The host is sound again.
+    void play_out()
+    {
+        m_host.on_call = nullptr;
+        m_host.fail_nothing();
+        m_host.set_visible(INT64_MAX);
+        const flvd_ctx_t& ctx = *m_session->ctx();
+        for (const uint32_t stream : m_streams) {
+            size_t failures = 0, requests = 0;
+            for (; failures < 3 && requests < 150; ++requests)
+                failures = frame(stream) == 0 ? 0 : failures + 1;
+            EXPECT_EQ(failures, 3u);
+            const int64_t stopped = __FLV_DMX__fioTell64(stream == AUDIO ? ctx.audio_reader : ctx.main_reader);
+            const bool reads = ctx.opened_for_info == 0 && (stream & ctx.streams) == stream;
+            const bool ends = reads && !m_fault.later;
+            const auto& [frames, next] = m_due.at(stream);
+            EXPECT_TRUE(!ends || !m_exact || next == UNKNOWN || next == frames.size()) << next;
+            EXPECT_TRUE(!ends || stopped >= m_scenario.flv.tags.back().offset) << stopped;
+        }
+    }
+    bool growing() const { return (m_open.options & GROWING) != 0; }
+
+    const Scenario& m_scenario;
+    const Fault m_fault;
+    Seen& m_seen;
+    FakeHost m_host;
+    const OpenOptions m_open;
+    std::array<Due, 3> m_due; // by the stream asked for
+    std::vector<uint32_t> m_streams = {0};
+    Session* m_session = nullptr;
+    char m_by = ' ';
+    bool m_exact = true;
+};
+
+// The first bytes, or more of them.
+Flv Cut(Flv flv, int64_t size)
+{
+    flv.bytes.resize(static_cast<size_t>(size), 0xEE);
+    while (flv.tags.back().end() > size)
+        flv.tags.pop_back();
+    return flv;
+}
+
+std::vector<Scenario> Scenarios()
+{
+    const auto open = [](uint32_t options, uint32_t cache = 0, bool info = false, uint32_t room = 8192) {
+        return OpenOptions{options | USER, info, cache, 0, FakeHost::DEFAULT_FILE, room};
+    };
+    const auto large = [](const Tag& config, const auto& frame, size_t size) {
+        return File({g_meta, config, frame(0, size), frame(40, size), frame(80, 60), frame(120, 60), frame(160, 60)});
+    };
+    const auto mp3 = [](uint32_t ts) { return Tag{8, ts, AudioData(SOUND_MP3, Mp3Frame(LARGE))}; };
+    const uint32_t retry = FORTH | RETRY;
+    const std::vector<Seek> seeks = {{500, BACK}, {500, FORTH}, {-200, REL},   {790, retry},
+                                     {9000},      {-1},         {9000, AT_END}};
+    const std::vector<Seek> growing = {{500, BACK}, {300, FORTH}, {-1}};
+    const Flv chain = MakeChain(), indexed = MakeChain({true, true, true, true}), sound = MakeChain({false});
+    const Flv avc = large(g_avc, Nalu, LARGE), aac = large(g_aac, Raw, 60);
+    const auto is_second = [](const Tag& tag) { return tag.is_keyframe() && tag.timestamp == 200; };
+    const int64_t second_key = std::find_if(indexed.tags.begin(), indexed.tags.end(), is_second)->offset;
+    Flv damaged = chain, last = File({chain.tags.begin() + 1, chain.tags.end()});
+    std::fill_n(damaged.bytes.begin() + damaged.tags[6].offset, damaged.tags[6].size(), uint8_t{0xEE});
+    damaged.tags.erase(damaged.tags.begin() + 6);
+    last.tags.push_back(g_meta);
+    return {
+        {"scan", chain, {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)}, seeks},
+        {"sound", sound, {open(0)}, seeks},
+        {"index", indexed, {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}}, seeks},
+        {"growing", indexed, {open(GROWING), open(GROWING | SEPARATE)}, growing, 6000},
+        {"growing, no index", chain, {open(GROWING)}, {}, 2000},
+        {"information", indexed, {open(0, 0, true), open(SEPARATE, 0, true)}, {{500, BACK}}},
+        {"metadata at the end", File(last.tags), {open(0), open(INDEX)}, seeks},
+        {"damaged", damaged, {open(0), open(SEPARATE)}, seeks},
+        {"bytes behind", Cut(indexed, static_cast<int64_t>(indexed.bytes.size()) + 50), {open(0)}},
+        {"cut in a keyframe", Cut(indexed, second_key + 20), {open(0), open(INDEX)}},
+        {"cut behind it", Cut(indexed, second_key + 900), {open(INDEX)}},
+        {"first tags", File({mp3(0), Screen(0, LARGE), mp3(9), Screen(9), Screen(40), Screen(80)}), {open(0, SMALL)}},
+        {"pictures", avc, {open(0, SMALL)}},
+        {"sounds", large(g_aac, Raw, LARGE), {open(0, SMALL)}},
+        {"plain sounds", large(Pcm(0), Pcm, LARGE), {open(0, SMALL), open(GROWING, SMALL)}},
+        {"huge pictures", large(g_avc, Nalu, GROWN), {{}}},
+        {"huge sounds", large(g_aac, Raw, GROWN), {{}}},
+        {"huge plain sounds", large(Pcm(0), Pcm, GROWN), {{}}},
+        {"growing in a picture", avc, {open(GROWING)}, {}, avc.tags[2].end() - 5},
+        {"growing in its back-pointer", avc, {open(GROWING)}, {}, avc.tags[2].end() - 4},
+        {"growing in a sound", aac, {open(GROWING)}, {}, aac.tags[2].end() - 5},
+        {"growing in its back-pointer", aac, {open(GROWING)}, {}, aac.tags[2].end() - 1},
+        {"frame seek of sound", chain, {open(SEPARATE)}, {{500, BEFORE, AUDIO}}},
+        {"frame seek", chain, {open(0)}, {{500, AFTER, VIDEO}}},
+        {"frame seek back", chain, {open(0)}, {{500, BEFORE, VIDEO}}},
+        {"frame seek by index", indexed, {open(0), open(INDEX)}, {{500, BEFORE, VIDEO}}},
+        {"frame seek to the start", indexed, {open(0), open(INDEX)}, {{0, BEFORE, VIDEO}}},
+    };
+}
+
+TEST(Faults, AreSurvivedAtEveryCall)
+{
+    Seen seen;
+    uint64_t faults = 0;
+    const auto sweep = [&](const Scenario& scenario, const OpenOptions& open) {
+        const auto run = [&](const Fault& fault) {
+            const uint64_t where[] = {open.options, fault.nth, fault.later ? 1u : 0u, fault.bytes};
+            SCOPED_TRACE(scenario.name + testing::PrintToString(where)); // options, call, and later, bytes
+            ++faults;
+            return Course(scenario, open, fault, &seen).run();
+        };
+        const auto [calls, reads] = run({});
+        for (const bool later : {false, true}) {
+            for (uint64_t n = 1; n <= calls; ++n)
+                run({n, later});
+            for (uint64_t n = 1; n <= reads; ++n)
+                for (const uint32_t bytes : later ? std::array{11u, 12u, 15u} : std::array{1u, 16u, 255u})
+                    run({n, later, bytes});
+        }
+    };
+    for (const Scenario& scenario : Scenarios())
+        for (const OpenOptions& open : scenario.opens)
+            sweep(scenario, open);
+    for (const Place& place : Places())
+        for (const char by : place.by)
+            EXPECT_EQ(seen[std::pair(place.code, place.line)].count(by), 1u) << place.line << by;
+    RecordProperty("faults", std::to_string(faults));
+    std::cout << faults << " faults injected\n";
+}
+
+} // namespace

@@ -1,0 +1,129 @@
+// Several instances beside each other and one after the other, calls in the wrong order, and arguments that are not
+// what they should be.
+
+#include "support/report.h"
+#include "support/session.h"
+
+#include <sstream>
+
+using namespace flvd_test;
+
+namespace {
+
+// What the nth call of some order of frames and seeks comes to.
+std::string Step(Session& session, uint32_t n)
+{
+    std::ostringstream out;
+    int32_t reached = -1;
+    if (n % 7 == 6) {
+        const auto time = static_cast<int32_t>(n * 61 % 900);
+        out << session.seek(time, n % 2 == 0 ? FLVD_SEEK_BACKWARD : FLVD_SEEK_FORWARD, &reached) << " at " << reached;
+    } else {
+        const FrameResult result = session.frame(1 + n % 2);
+        out << result.rc << ' ' << testing::PrintToString(result.frame) << testing::PrintToString(result.frame.data);
+    }
+    out << ' ' << session.last_error() << '/' << session.error_line();
+    return out.str();
+}
+
+TEST(Instances, DoNotDisturbEachOther)
+{
+    constexpr uint32_t STEPS = 100;
+    FakeHost host(MakeChain().bytes);
+    host.add_file("b.flv", MakeChain({true, true, true, true, 20, 3}).bytes);
+    host.add_file("c.flv", File({Pcm(0), Screen(5, 5000), Pcm(20), Screen(30, 300), Pcm(40), Screen(50)}).bytes);
+    std::vector<OpenOptions> all;
+    for (const char* const path : {"a.flv", "b.flv", "c.flv"})
+        for (const uint32_t options : {0u, SEPARATE | INDEX, GROWING, USER})
+            all.push_back({options, false, 1024, 0, path});
+    std::vector<std::vector<std::string>> alone;
+    for (const OpenOptions& open : all) {
+        Session session(host, open);
+        alone.emplace_back();
+        for (uint32_t n = 0; n < STEPS; ++n)
+            alone.back().push_back(Step(session, n));
+    }
+    for (size_t one = 0; one < all.size(); ++one)
+        for (size_t other = one; other < all.size(); ++other) {
+            Session first(host, all[one]), second(host, all[other]);
+            for (uint32_t n = 0; n < STEPS && !HasFailure(); ++n) {
+                if (n == STEPS / 2)
+                    first.close(); // the second one goes on
+                EXPECT_TRUE(first.ctx() == nullptr || Step(first, n) == alone[one][n]) << one << " beside " << other;
+                EXPECT_EQ(Step(second, n), alone[other][n]) << other << " beside " << one;
+            }
+        }
+}
+
+TEST(Instances, LeaveNothingBehind)
+{
+    FakeHost host(MakeChain({true, true, true, true}).bytes);
+    size_t held[6] = {}; // after each kind of open
+    for (uint32_t i = 0; i < 10000; ++i) {
+        const uint32_t options = USER | (i % 2 != 0 ? SEPARATE | INDEX : 0);
+        Session session(host, {options, i % 6 > 3, 0, 0, FakeHost::DEFAULT_FILE, 512});
+        ASSERT_EQ(session.frame(VIDEO).rc, i % 6 > 3 ? FLVD_RET_FAILED : 0);
+        ASSERT_EQ(host.live_bytes(), held[i % 6] = i < 6 ? host.live_bytes() : held[i % 6]);
+        ASSERT_EQ(session.close(), 0);
+        ASSERT_EQ(host.live_blocks() + host.open_handles(), 0u);
+    }
+}
+
+TEST(Instances, RefuseCallsInTheWrongOrder)
+{
+    FakeHost host(MakeChain().bytes);
+    Session session(host, {0, true});
+    for (const int32_t rc : {session.frame().rc, session.seek(0, 0)}) // opened for information only
+        EXPECT_EQ(std::pair(rc, session.last_error()), std::pair(FLVD_RET_FAILED + 0, FLVD_ERR_INFO_ONLY + 0));
+    EXPECT_EQ(session.close(), 0);
+    for (const int32_t rc : {session.frame().rc, session.seek(0, 0), session.close(), session.close()})
+        EXPECT_EQ(rc, FLVD_RET_NO_INSTANCE); // the host has cleared its word
+}
+
+TEST(Instances, RefusesWhatItCannotServe)
+{
+    FakeHost host(MakeChain().bytes);
+    Session session(host);
+    flvd_ctx_t* none = nullptr;
+    flvd_ctx_t** const no_handle = nullptr;
+    flvd_ctx_t* live = session.ctx();
+    const flvd_init_t init = host.init();
+    flvd_open_info_t info{};
+    const flvd_frame_request_t request{};
+    flvd_frame_t frame{};
+    const auto expect = [&](uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2, int32_t rc) {
+        g_flvd_lLastError = 77;
+        g_flvd_lErrorLine = 78;
+        EXPECT_EQ(QVX_FLV_DMX(operation, handle, arg1, arg2), rc) << operation;
+        EXPECT_EQ(g_flvd_lLastError, rc == -3 ? -4001 : 77) << operation;
+        EXPECT_EQ(g_flvd_lErrorLine, rc == -3 ? 2273 : 78) << operation;
+        for (flvd_ctx_t** const without : {&none, no_handle})
+            EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, without, nullptr, nullptr), g_flvd_lLastError);
+        EXPECT_EQ(live, session.ctx());
+        EXPECT_EQ(session.last_error(), 0);
+    };
+    for (flvd_ctx_t** const without : {&none, no_handle}) {
+        for (const uint32_t operation : {FLVD_OP_CLOSE, FLVD_OP_GET_FRAME, FLVD_OP_SEEK})
+            expect(operation, without, &request, &frame, -3);
+        expect(FLVD_OP_RESERVED, without, nullptr, nullptr, -1);
+    }
+    for (const uint32_t operation : {FLVD_OP_OPEN, FLVD_OP_OPEN_INFO, FLVD_OP_GET_FRAME, FLVD_OP_SEEK}) {
+        const bool opens = operation == FLVD_OP_OPEN || operation == FLVD_OP_OPEN_INFO;
+        expect(operation, no_handle, &init, &info, opens ? -1 : -3);
+        expect(operation, &live, nullptr, &info, -1);
+        expect(operation, &live, &init, nullptr, -1);
+    }
+    for (const uint32_t operation : {6u, 7u, 8u, 9u, 11u, 0xFFFFFFFFu})
+        expect(operation, &live, &init, &info, -1);
+    EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_RESERVED, &live, nullptr, nullptr), -1);
+    EXPECT_EQ(session.last_error(), -4006);
+    EXPECT_EQ(session.error_line(), 3420);
+
+    FakeHost empty(Bytes{});
+    const flvd_init_t empty_init = empty.init();
+    EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_OPEN, &live, &empty_init, &info), -1);
+    EXPECT_EQ(live, nullptr); // a failed open stores it
+    EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_GET_FRAME, &live, &request, &frame), -3);
+}
+
+} // namespace
