@@ -420,6 +420,8 @@ TEST(ScriptValue, IsConsumedByItsType)
         EXPECT_EQ(Read("'onMetaData' <height:240> "s + value + "<width:320>"), "0 height 240") << value;
     }
     EXPECT_EQ(Read("<a:%5 width:320 b:{c:%6 height:240}>"), "0 width 320 height 240");
+    // A long string that is itself the largest value: what holds it is too large.
+    EXPECT_EQ(Read("'onMetaData' <width:320 a:%12.127.255.255.250>"), "0 width 320");
 }
 
 TEST(ScriptValue, NestsToADepthOf64)

@@ -262,6 +262,7 @@ std::vector<Scenario> Scenarios()
         {"index", indexed, {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}}, seeks},
         {"growing", indexed, {open(GROWING), open(GROWING | SEPARATE)}, growing, 6000},
         {"growing, no index", chain, {open(GROWING)}, {}, 2000},
+        {"growing, odd metadata", File({{18, 0, {5, 5}}, g_avc, Nalu(0, 60), Raw(5, 60)}), {open(GROWING)}},
         {"information", indexed, {open(0, 0, true), open(SEPARATE, 0, true)}, {{500, BACK}}},
         {"metadata at the end", File(last.tags), {open(0), open(INDEX)}, seeks},
         {"damaged", damaged, {open(0), open(SEPARATE)}, seeks},

@@ -260,6 +260,8 @@ TEST(FioRead, CountsWholeElementsAndBelievesNoCountTooLarge)
         EXPECT_EQ(__FLV_DMX__fioWrite(&byte, size, count, f.file), 0u);
     }
     EXPECT_EQ(byte, 77);
+    __FLV_DMX__fiodbgReset();
+    EXPECT_EQ(__FLV_DMX__fiodbgReadBytes(), 0u);
     EXPECT_EQ(f.told(f.peek(1)), "2..3: read(64)=8");
 
     fio_funcs_t boaster = f.host.funcs(); // claims more than it was asked for: not believed

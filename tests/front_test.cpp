@@ -330,6 +330,20 @@ TEST(Delivery, GrowsItsBufferInSteps)
     EXPECT_EQ(session.ctx()->frame_buffer_size, 606208u);
 }
 
+TEST(Delivery, GoesBackWhenItCannotPassDamage)
+{
+    FakeHost host(Concat({g_chain.bytes, Bytes(3u << 20)}));
+    Session session(host, {GROWING});
+    play(session);
+    for (const bool nor_back : {false, true}) {
+        host.reset_calls();
+        nor_back ? host.fail_from(HostFn::Seek, 1) : host.fail_nth(HostFn::Seek, 1);
+        const int32_t rc = session.frame().rc;
+        EXPECT_EQ(std::tuple(rc, session.error_line()), nor_back ? std::tuple(-1, 2945) : std::tuple(-2, 2957));
+        host.fail_nothing();
+    }
+}
+
 TEST(Delivery, EndsARequestAfterItsBudget)
 {
     for (const uint32_t options : {0u, GROWING}) {

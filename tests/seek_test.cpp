@@ -402,6 +402,13 @@ TEST(Seek, TellsEachFailureByItsLine)
     for (const uint32_t time : {0u, 200u, 400u, 600u, 2000u})
         builder.video(time, AvcNalu(true, Noise(99)));
     const Flv lying = builder.build();
+    const auto hide = [](FlvBuilder hidden, bool pictures) { // all tags of one stream are later than the file's end
+        for (uint32_t time = 1538; time <= 1978; time += 40)
+            hidden.add(pictures ? Nalu(time, 60) : Pcm(time));
+        return hidden.build();
+    };
+    const Flv no_picture = hide(FlvBuilder().add(Screen(90000)), false);
+    const Flv no_sound = hide(FlvBuilder().add(g_avc).add(Pcm(90000)), true);
     Flv text = index;
     std::copy(g_string.begin(), g_string.end(), &text.bytes[Elements(text.bytes, POSITIONS) + 36]);
     // A time seek, or the frame seek of a stream with its direction; those that a failing host leads to are in the
@@ -431,6 +438,8 @@ TEST(Seek, TellsEachFailureByItsLine)
                           {index, ONE, AUDIO, 1979, AFTER, 0, 0, 0},
                           {index, ONE, VIDEO, 1801, AFTER, -101, 0, 0},
                           {scan, ONE, VIDEO, 1950, AFTER, -101, 0, 0},
+                          {no_picture, ONE, VIDEO, 1700, AFTER, -101, 0, 0},
+                          {no_sound, TWO, AUDIO, 1700, AFTER, 0, 0, 0},
                           {index, GROWING, AUDIO, 900, BEFORE, -1, 0, 0}};
     for (const Case& c : cases) {
         FakeHost host(c.flv.bytes);

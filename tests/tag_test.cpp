@@ -237,6 +237,7 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
         bytes.resize(100 + left);
         EXPECT_EQ(Reader(bytes).at(100).find(), left < 13 ? NOT_FOUND : 0);
     }
+    EXPECT_EQ(Reader(Bytes() + Sound(), 12).at(0).find(), NOT_FOUND); // no header fits this cache
 }
 
 // A sound tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
@@ -395,6 +396,12 @@ TEST(Extent, EndsWithTheLastTag)
         large.add(Sound(100000));
     const Flv half = large.add(Sound()).build();
     EXPECT_EQ(Probe(Concat({half.bytes, Zeros(3 * MIB)})), Extent(half.bytes.size(), 5, FLVD_SEEK_BY_SCAN, 0, 0));
+    for (uint64_t nth = 255; nth < 275; ++nth) { // a seek of the tail, of the halving or of the last places
+        FakeHost host(Concat({flv.bytes, Zeros(3 * MIB)}));
+        host.fail_nth(HostFn::Seek, nth);
+        Session session(host);
+        EXPECT_TRUE(session.failed_as_listed(Op::Open, session.open_rc())) << nth;
+    }
     FakeHost host(flv.bytes);
     host.start_log();
     const Session session(host);

@@ -79,11 +79,12 @@ WorkCase FalseHeaders(const char* name, uint32_t options, uint32_t cache, Cost p
     return {name, file, options, cache, 2 * pass, pass, 2 * pass};
 }
 
-WorkCase Tail(const char* name, const Bytes& pattern, size_t size)
+WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t options = 0)
 {
     const Bytes file = Concat({MakeChain().bytes, Repeat(pattern, size)});
     const Cost halvings = 4 * Forward(2 * MIB);
-    return {name, file, 0, CACHE, Backward(TAIL_CURSORS) + halvings, Forward(file.size()), Forward(2 * file.size())};
+    return {
+        name, file, options, CACHE, Backward(TAIL_CURSORS) + halvings, Forward(file.size()), Forward(2 * file.size())};
 }
 
 /** Sound alone at the end, behind bytes whose every fourth place leads back a little. */
@@ -115,6 +116,7 @@ std::vector<WorkCase> Cases()
         FalseHeaders("false_headers_in_cache", 0, BIG_CACHE, ForwardInCache(700000, 600000, BIG_CACHE)),
         FalseHeaders("false_headers_growing", GROWING, CACHE, Forward(700000)),
         Tail("zeros", {0}, 3 * MIB),
+        Tail("zeros_growing", {0}, 3 * MIB, GROWING),
         Tail("small_distances", {0, 0, 0, 15}, 2 * MIB),
         Slide(),
         Metadata("nesting", {}, endless),

@@ -431,18 +431,6 @@ int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
 // How a property loop ended.
 enum class FlvdLoop { AtEnd, AtEmptyKey, Failed };
 
-// Passes the end marker when it is next. False when fewer than three bytes are left.
-bool FLVD_PassEndMarker(flvd_ctx_t* ctx, flvd_script_state_t* state, bool* passed)
-{
-    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, FLVD_META_END_SIZE);
-    if (bytes == nullptr)
-        return false;
-    *passed = FLVD_GetBE24(bytes) == FLVD_META_END;
-    if (*passed)
-        FLVD_ScriptSkip(ctx, state, FLVD_META_END_SIZE);
-    return true;
-}
-
 // Reads a key of this length and does what meeting it does. One too long to be known is not met at all: it leaves the
 // pending property as it is.
 bool FLVD_ParseKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
@@ -473,27 +461,24 @@ bool FLVD_ParseProperty(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t ke
     return true;
 }
 
+// Properties up to the end marker or an empty key. An end of the data is a failure.
 FlvdLoop FLVD_ParseProperties(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t* sum)
 {
-    bool ended = false;
-    if (!FLVD_PassEndMarker(ctx, state, &ended))
-        return FlvdLoop::Failed;
-    while (!ended) {
-        if (__FLV_DMX__fioIsEof(ctx->cur_reader) != 0) {
+    for (;;) {
+        const uint8_t* const bytes = FLVD_ScriptPeek(ctx, FLVD_META_END_SIZE);
+        if (bytes == nullptr)
+            return FlvdLoop::Failed;
+        if (FLVD_GetBE24(bytes) == FLVD_META_END) {
             FLVD_ScriptSkip(ctx, state, FLVD_META_END_SIZE);
             return FlvdLoop::AtEnd;
         }
-        const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 2);
-        if (bytes == nullptr)
-            return FlvdLoop::Failed;
         const uint32_t key_length = FLVD_GetBE16(bytes);
         if (key_length == 0)
             return FlvdLoop::AtEmptyKey;
         FLVD_ScriptSkip(ctx, state, 2);
-        if (!FLVD_ParseProperty(ctx, state, key_length, sum) || !FLVD_PassEndMarker(ctx, state, &ended))
+        if (!FLVD_ParseProperty(ctx, state, key_length, sum))
             return FlvdLoop::Failed;
     }
-    return FlvdLoop::AtEnd;
 }
 
 // An object or ECMA array behind its header of so many bytes; `failed` is what a failure of it returns.

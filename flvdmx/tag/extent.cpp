@@ -303,7 +303,7 @@ int32_t FLVD_ProbeExtentQuick(flvd_ctx_t* ctx)
     const int64_t end = FLVD_FindLastTagEnd(ctx, true);
     if (end < 0)
         return FLVD_Fail(ctx, FLVD_SITE_QUICK_LAST_TAG);
-    if (end == FLVD_NO_LAST_TAG || ctx->last_ts != 0) {
+    if (end == FLVD_NO_LAST_TAG) {
         ctx->data_end = ctx->file_size;
         return 0;
     }
@@ -345,7 +345,5 @@ int32_t FLVD_ProbeExtent(flvd_ctx_t* ctx, bool quick)
         return -1;
     if (end == FLVD_NO_LAST_TAG)
         return FLVD_Fail(ctx, FLVD_SITE_NO_TAG);
-    if (ctx->first_ts == 0 && ctx->last_ts != 0 && end == ctx->file_size)
-        return 0;
     return FLVD_WalkBack(ctx, end, FLVD_SITE_WALK_SEEK, FLVD_SITE_WALK_STEP);
 }
