@@ -451,7 +451,7 @@ FLVD_API extern int32_t g_flvd_lErrorLine;
  *         A handle without instance: FLVD_RET_NO_INSTANCE for operations 1 to 3, FLVD_RET_FAILED for operation 4.
  *         A null argument that the operation needs: FLVD_RET_FAILED, nothing recorded, nothing touched.
  *         FLVD_OP_GET_FRAME returns FLVD_RET_END at the end of the data, and after 102 tags without a frame, however
- *         much follows them: a host that wants to be sure asks again while the reader's position moves. With
+ *         much follows them: a host that wants to be sure asks again while the reader stands inside the file. With
  *         FLVD_OPT_PROGRESSIVE it also means that the next tag is not whole yet, or was not when its beginning was
  *         read: ask again after a while, once more after the file has stopped growing.
  */
@@ -470,7 +470,7 @@ FLVD_API void __FLV_DMX__fioSetFunc(const fio_funcs_t* funcs);
  *
  * @param path           passed unchanged to the host's file_open
  * @param mode           FIO_MODE_* bits; combinations that no mode string has are refused before the host is asked
- * @param cache_size     bytes of the cache
+ * @param cache_size     bytes of the cache, at least 1
  * @param overread       non-zero: a refill asks for the whole request behind the cached bytes
  * @param overread_extra extra cache bytes for that, not looked at when overread is 0
  * @return object owned by the caller, or null: bad mode, file_open failed, no memory (nothing is left open)
@@ -680,8 +680,8 @@ FLVD_API void FLVD_SetCallbackforMeta(const flvd_init_t* init);
  *
  * @param ctx    instance; its current reader stands on the first byte of the payload and ends behind it
  * @param length bytes of the payload
- * @return 0 when at least one value was parsed; -1 when none was (with a length of 0, or when the position cannot be
- *         taken, the reader has not moved); FLVD_ERR_END_OF_DATA when the reader could not be put behind the payload
+ * @return 0 when at least one value was parsed; -1 when none was, and when the position cannot be taken;
+ *         FLVD_ERR_END_OF_DATA when the reader could not be put behind the payload
  */
 FLVD_API int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length);
 

@@ -345,6 +345,22 @@ TEST(Delivery, GoesBackWhenItCannotPassDamage)
     }
 }
 
+TEST(Delivery, KeepsItsPlaceBehindManyTagsOfTheOtherStream)
+{
+    std::vector<Tag> tags(4100, Pcm(9));
+    tags.insert(tags.begin(), Screen(0));
+    tags.push_back(Screen(5000));
+    for (uint64_t nth = 1; nth <= 3; ++nth) { // in front of the request, of the search, behind the 4096th tag
+        FakeHost host(File(tags).bytes);
+        Session session(host, {GROWING | SEPARATE});
+        ASSERT_EQ(session.frame(VIDEO).rc, 0);
+        host.reset_calls();
+        host.fail_nth(HostFn::Tell, nth);
+        EXPECT_NE(session.frame(VIDEO).rc, 0) << nth;
+        EXPECT_EQ(session.frame(VIDEO).frame.timestamp, 5000u) << nth;
+    }
+}
+
 TEST(Delivery, EndsARequestAfterItsBudget)
 {
     for (const uint32_t options : {0u, GROWING}) {

@@ -8,7 +8,7 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16, TAGS = 100;
+constexpr uint32_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16;
 constexpr uint64_t MIB = 1u << 20, SEARCH_FALSE_HEADERS = MIB / 64, REQUEST_SEARCHES = 102, TAIL_CURSORS = MIB + 256;
 
 struct Cost {
@@ -23,21 +23,25 @@ Cost operator*(uint64_t n, Cost a)
     return {n * a.calls, n * a.bytes};
 }
 
-/** Going forward over so many bytes, of which some begin false headers, and the few sound tags that each file has. */
+constexpr Cost TAG = {5, 0}, LARGE_TAG = {10, 2 * CACHE + NARROW}, WALKED_TAG = {12, 6 * NARROW};
+constexpr uint64_t FEW = 100; /**< tags that every file has */
+
+/** Going forward over so many bytes, of which some begin false headers, and over a few tags. */
 Cost Forward(uint64_t bytes, uint64_t false_headers = 0, uint32_t cache = CACHE)
 {
-    return {4 * TAGS + 3 * (bytes / (cache - 12) + 2) + 6 * false_headers,
-            bytes + 2 * cache + false_headers * (cache + NARROW)};
+    return Cost{3 * (bytes / (cache - 12) + 2) + 6 * false_headers,
+                bytes + 2 * cache + false_headers * (std::min(cache, CACHE) + NARROW)} +
+           FEW * WALKED_TAG;
 }
 /** The same, with the false tags fitting the cache. */
 Cost ForwardInCache(uint64_t bytes, uint64_t false_headers, uint32_t cache)
 {
-    return Forward(bytes, 0, cache) + Cost{4 * false_headers, bytes};
+    return Forward(bytes, 0, cache) + Cost{6 * false_headers, 0};
 }
 /** Going backward, byte by byte. */
-Cost Backward(uint64_t bytes)
+Cost Backward(uint64_t bytes, uint32_t quantum = NARROW)
 {
-    return bytes * Cost{4, 2 * NARROW};
+    return bytes * Cost{4, 2 * quantum};
 }
 /** Script data: a position for every keyframe array. */
 Cost Script(uint64_t bytes)
@@ -50,6 +54,7 @@ struct WorkCase {
     Bytes file;
     uint32_t options, cache;
     Cost open, play, seek; /**< bounds: of opening, of playing all of it, of one time seek */
+    uint32_t scan_read_size = 0;
 };
 
 Bytes Repeat(const Bytes& pattern, size_t size)
@@ -88,11 +93,28 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
 }
 
 /** Sound alone at the end, behind bytes whose every fourth place leads back a little. */
-WorkCase Slide()
+WorkCase Slide(const char* name, size_t size, uint32_t quantum)
 {
-    const Bytes file = Concat({MakeChain().bytes, Repeat({0, 0, 0, 15}, 300000), Tags(MakeChain({false, true}))});
-    const Cost pass = Forward(file.size());
-    return {"slide", file, 0, CACHE, Backward(300256) + pass, pass, Backward(300256) + pass};
+    const Bytes file = Concat({MakeChain().bytes, Repeat({0, 0, 0, 15}, size), Tags(MakeChain({false, true}))});
+    const Cost pass = Forward(file.size()), back = Backward(size + 256, quantum);
+    return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * quantum}, quantum};
+}
+
+/** Many sound tags. The index, when there is one, leads behind the end of the file. */
+WorkCase ManyTags(const char* name, bool pictures, size_t size, bool index, Cost tag, uint32_t options = 0)
+{
+    constexpr uint64_t count = 500;
+    FlvBuilder builder;
+    if (index)
+        builder.indexed_metadata({}, [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; });
+    for (uint32_t i = 0; i < count; ++i) {
+        if (pictures)
+            builder.video(2 * i, VideoData(1, CODEC_SCREEN, Noise(20)));
+        builder.audio(2 * i, AudioData(SOUND_PCM, Noise(size)));
+    }
+    const Bytes file = builder.build().bytes;
+    const Cost pass = Forward(file.size()) + count * (TAG + tag);
+    return {name, file, options, CACHE, 2 * pass, pass, Forward(file.size()) + 2 * count * WALKED_TAG};
 }
 
 /** Script data in front of an ordinary file. An index in the file is read for its end, its limit and its last time. */
@@ -118,7 +140,13 @@ std::vector<WorkCase> Cases()
         Tail("zeros", {0}, 3 * MIB),
         Tail("zeros_growing", {0}, 3 * MIB, GROWING),
         Tail("small_distances", {0, 0, 0, 15}, 2 * MIB),
-        Slide(),
+        Slide("slide", 300000, NARROW),
+        Slide("slide_by_wide_reads", 30000, CACHE),
+        ManyTags("sound_alone", false, 100, false, TAG),
+        ManyTags("large_tags", true, CACHE, false, LARGE_TAG),
+        ManyTags("large_tags_two_readers", true, CACHE, false, LARGE_TAG, SEPARATE),
+        ManyTags("index_beyond_the_file", true, 100, true, TAG),
+        ManyTags("index_beyond_the_file_two_readers", true, CACHE, true, LARGE_TAG, SEPARATE | INDEX),
         Metadata("nesting", {}, endless),
         Metadata("strings", {}, {2, 1, 0}),
         Metadata("long_strings", {}, {12, 0, 0, 16, 0}),
@@ -143,7 +171,7 @@ TEST_P(Work, StaysWithinItsBound)
 {
     const WorkCase& c = GetParam();
     FakeHost host(c.file);
-    Session session(host, {c.options, false, c.cache});
+    Session session(host, {c.options, false, c.cache, c.scan_read_size});
     ASSERT_TRUE(session.opened());
     hold("open", taken(host), c.open);
     const Cost request = REQUEST_SEARCHES * Forward(2 * MIB, SEARCH_FALSE_HEADERS, c.cache);

@@ -145,7 +145,7 @@ bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
     return ctx->frame_buffer != nullptr;
 }
 
-// Reports a frame of n bytes, now or in a moment in the frame buffer.
+// Reports a frame of n bytes. The buffer may get them after that.
 void FLVD_Report(const flvd_delivery_t& delivery, uint32_t n, flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.ctx;
@@ -175,7 +175,8 @@ bool FLVD_DeliverCached(const flvd_delivery_t& delivery, flvd_frame_t* frame)
         return false;
     ctx->last_frame_size = n;
     FLVD_FioDropBits(reader);
-    FLVD_FioConsume(reader, size); // the bytes stay where they are
+    FLVD_FioConsume(reader,
+                    size); // first, so that nothing need be kept for after the copy; the bytes stay in the cache
     FLVD_Report(delivery, n, frame);
     g_flvd_fioFuncs.mem_copy(ctx->frame_buffer, bytes + FLVD_CODEC_BYTE + header, n);
     return true;

@@ -199,6 +199,8 @@ flvd_site_t FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info)
     if (!FLVD_MeasureExtent(ctx))
         return FLVD_SITE_PROBE_EXTENT;
     FLVD_DeriveDuration(ctx);
-    FLVD_FillRecords(ctx, info);
-    return FLVD_Rewind(ctx) ? FLVD_SITE_NONE : FLVD_SITE_OPEN_REWIND;
+    if (!FLVD_Rewind(ctx))
+        return FLVD_SITE_OPEN_REWIND;
+    FLVD_FillRecords(ctx, info); // last: the records of an open that fails stay empty
+    return FLVD_SITE_NONE;
 }

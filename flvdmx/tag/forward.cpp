@@ -12,6 +12,9 @@ namespace {
 // file made of such headers would cost two seeks and two reads for each of its bytes.
 constexpr int32_t FLVD_BAD_TAG_COST = 64;
 
+// Bytes read at first by a resynchronisation that finds nothing cached, whatever the cache holds.
+constexpr uint32_t FLVD_FIRST_LOOK = 4096;
+
 // Trusting mode takes a position only once in so many tags passed: it has no budget for them, and a host whose seek
 // does not move could send it round for ever.
 constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x1000;
@@ -26,7 +29,7 @@ struct flvd_search_t {
     fio_file_t* file;
     flvd_tag_rules_t rules;
     uint32_t wanted;
-    bool verify;      // careful: back-pointers count, and positions are taken
+    bool verify;      // careful: back-pointers count, and the position of every tag is taken
     int32_t budget;   // bytes that resynchronisation may still cross
     int64_t position; // the last position taken
     bool data_ended;  // the last resynchronisation ran out of data, not out of budget
@@ -64,8 +67,10 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
     const uint32_t step = ctx->cache_size - (FLVD_TAG_PEEK_SIZE - 1); // the last 12 bytes begin the next window
     const int64_t stop = int64_t{(limit - 1) / step} * step + step;   // the limit, in whole windows
     // What is cached comes first: behind a false header that is nearly a window, and filling it up would cost a host
-    // call for each of many.
-    uint32_t size = file->count < FLVD_TAG_PEEK_SIZE ? ctx->cache_size : std::min(file->count, ctx->cache_size);
+    // call for each of many. With nothing cached the first look is a short one: the next false header is often near.
+    const bool cached = file->count >= FLVD_TAG_PEEK_SIZE;
+    uint32_t size = std::min(cached ? file->count : FLVD_FIRST_LOOK, ctx->cache_size);
+    __FLV_DMX__fioSetCacheReadSize(file, std::min(size, file->capacity));
     int64_t scanned = 0;
     while (scanned < stop) {
         const uint8_t* window = nullptr;
@@ -80,6 +85,7 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
         if (found < starts)
             return scanned;
         size = ctx->cache_size;
+        __FLV_DMX__fioSetCacheReadSize(file, FLVD_WHOLE_CACHE);
     }
     return FLVD_ERR_NOT_FOUND;
 }
@@ -182,6 +188,13 @@ bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_inf
     return check.passed ? FLVD_PassGoodTag(search, check.in_place, tag) : FLVD_PassBadTag(search, check.in_place);
 }
 
+// Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
+bool FLVD_GoBack(const flvd_search_t* search)
+{
+    return __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0 ||
+           __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
+}
+
 // Careful mode: a plausible header at the position is taken when its back-pointer agrees and its kind is wanted.
 int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header)
 {
@@ -190,8 +203,7 @@ int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header
     const flvd_check_t check = FLVD_CheckBackPointer(search, header.info);
     if (!check.passed || !FLVD_IsWantedTag(header, search->wanted))
         return FLVD_StepOver(search, check, header.info) ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
-    const bool on_tag = check.in_place || __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
-    return on_tag ? 0 : FLVD_ERR_NOT_FOUND;
+    return check.in_place || FLVD_GoBack(search) ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
 // Trusting mode: the header alone decides; an unwanted tag is passed by its size.
@@ -205,7 +217,7 @@ int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& heade
     if (!moved)
         return FLVD_ERR_END_OF_DATA;
     const bool goes_on = ++search->passed % FLVD_TAGS_PER_POSITION != 0 || FLVD_TakeLaterPosition(search);
-    return goes_on ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
+    return goes_on ? FLVD_SEARCH_ON : FLVD_ERR_END_OF_DATA;
 }
 
 // The search from the position on: 0 with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.

@@ -1,4 +1,4 @@
-// The shared rules that are not asked for every tag passed.
+// Moving between tags: over a back-pointer, and to the first tag.
 
 #include "flvdmx/tag/tag.h"
 
