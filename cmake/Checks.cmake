@@ -5,8 +5,9 @@ find_program(CLANG_TIDY clang-tidy REQUIRED)
 find_program(CPPCHECK cppcheck REQUIRED)
 find_program(VALGRIND valgrind REQUIRED)
 
-foreach(folder IN ITEMS flvdmx host tools tests bench fuzz)
-    file(GLOB_RECURSE found CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${folder}/*.cpp ${folder}/*.h)
+foreach(folder IN ITEMS flvdmx host tools examples packaging tests bench fuzz)
+    file(GLOB_RECURSE found CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${folder}/*.cpp ${folder}/*.h
+        ${folder}/*.hpp ${folder}/*.c)
     list(APPEND sources ${found})
 endforeach()
 

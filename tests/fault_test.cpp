@@ -288,29 +288,34 @@ std::vector<Scenario> Scenarios()
     };
 }
 
+// Every call of a scenario fails, once and from there on, and every read is cut short. Returns the number of courses.
+uint64_t Sweep(const Scenario& scenario, const OpenOptions& open, Seen* seen)
+{
+    uint64_t faults = 0;
+    const auto run = [&](const Fault& fault) {
+        const uint64_t where[] = {open.options, fault.nth, fault.later ? 1u : 0u, fault.bytes};
+        SCOPED_TRACE(scenario.name + testing::PrintToString(where)); // options, call, and later, bytes
+        ++faults;
+        return Course(scenario, open, fault, seen).run();
+    };
+    const auto [calls, reads] = run({});
+    for (const bool later : {false, true}) {
+        for (uint64_t n = 1; n <= calls; ++n)
+            run({n, later});
+        for (uint64_t n = 1; n <= reads; ++n)
+            for (const uint32_t bytes : later ? std::array{11u, 12u, 15u} : std::array{1u, 16u, 255u})
+                run({n, later, bytes});
+    }
+    return faults;
+}
+
 TEST(Faults, AreSurvivedAtEveryCall)
 {
     Seen seen;
     uint64_t faults = 0;
-    const auto sweep = [&](const Scenario& scenario, const OpenOptions& open) {
-        const auto run = [&](const Fault& fault) {
-            const uint64_t where[] = {open.options, fault.nth, fault.later ? 1u : 0u, fault.bytes};
-            SCOPED_TRACE(scenario.name + testing::PrintToString(where)); // options, call, and later, bytes
-            ++faults;
-            return Course(scenario, open, fault, &seen).run();
-        };
-        const auto [calls, reads] = run({});
-        for (const bool later : {false, true}) {
-            for (uint64_t n = 1; n <= calls; ++n)
-                run({n, later});
-            for (uint64_t n = 1; n <= reads; ++n)
-                for (const uint32_t bytes : later ? std::array{11u, 12u, 15u} : std::array{1u, 16u, 255u})
-                    run({n, later, bytes});
-        }
-    };
     for (const Scenario& scenario : Scenarios())
         for (const OpenOptions& open : scenario.opens)
-            sweep(scenario, open);
+            faults += Sweep(scenario, open, &seen);
     for (const Place& place : Places())
         for (const char by : place.by)
             EXPECT_EQ(seen[std::pair(place.code, place.line)].count(by), 1u) << place.line << by;

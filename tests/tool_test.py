@@ -258,14 +258,16 @@ class Failures(Case):
                 (self.write("bare.flv", header), "damaged or cut short (the file has 9 bytes)"),
                 (self.write("header.flv", header + bytes(4)), "nor an audio stream was found (code -1002, line 2458)"),
                 ("/dev/null", "a pipe or device")):
-            for arguments in (["info"], ["info", "--json"], ["frames"], ["frames", "--json"], ["seek", "--json"]):
+            for arguments in (["info"], ["info", "--json"], ["frames"], ["frames", "--json"], ["seek", "--json"],
+                              ["check"], ["check", "--json"], ["extract"], ["plot"]):
                 with self.subTest(path=path, arguments=arguments):
-                    result = run(*arguments, path, *(["1"] if arguments[0] == "seek" else []))
+                    more = {"seek": ["1"], "extract": ["-o", folder / "out"], "plot": ["-o", folder / "out"]}
+                    result = run(*arguments, path, *more.get(arguments[0], []))
                     self.assertEqual(result.returncode, 1)
                     self.assertTrue(result.stderr.startswith(f"flvdmx: {path}: "), result.stderr)
                     self.assertIn(words, result.stderr)
                     self.assertEqual(len(result.stderr.splitlines()), 1)
-                    if arguments == ["info", "--json"]:
+                    if arguments[0] in ("info", "check") and arguments[1:]:
                         [entry] = json.loads(result.stdout)["files"]
                         self.assertTrue(entry["file"] == str(path) and entry["error"]["code"] < 0)
                     else:
@@ -300,7 +302,9 @@ class Failures(Case):
                           ["frames", "--follow", "--timeout", "-1", file], ["frames", "--from", "soon", file],
                           ["seek", file], ["seek", file, "-1"], ["seek", file, "1:60"], ["seek", file, "1:2:3:4"],
                           ["seek", file, "1."], ["seek", file, ""], ["seek", file, "3000000"],
-                          ["seek", file, "99999999999999999999"], ["seek", "--mode", "up", file, "1"]):
+                          ["seek", file, "99999999999999999999"], ["seek", "--mode", "up", file, "1"],
+                          ["extract", file], ["extract", file, "-o", "x", "--stream", "all"], ["plot", file], ["check"],
+                          ["check", "--jobs", "0", file], ["check", "--jump", "-1", file]):
             with self.subTest(arguments):
                 result = run(*arguments)
                 self.assertEqual((result.returncode, result.stdout), (2, ""))
@@ -308,8 +312,8 @@ class Failures(Case):
 
     def test_help_and_version(self):
         self.assertRegex(self.succeed("--version"), r"\Aflvdmx \d+\.\d+\.\d+\n\Z")
-        for arguments in (["--help"], ["info", "--help"], ["frames", "--help"], ["seek", "--help"]):
-            self.assertIn("Usage: flvdmx", self.succeed(*arguments))
+        for arguments in ([], *([c] for c in ("info", "frames", "seek", "extract", "check", "plot"))):
+            self.assertIn("Usage: flvdmx", self.succeed(*arguments, "--help"))
 
 
 class Output(Case):

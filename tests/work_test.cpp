@@ -8,7 +8,7 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16;
+constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20, SEARCH_FALSE_HEADERS = MIB / 64, REQUEST_SEARCHES = 102, TAIL_CURSORS = MIB + 256;
 
 struct Cost {
@@ -27,19 +27,19 @@ constexpr Cost TAG = {5, 0}, LARGE_TAG = {10, 2 * CACHE + NARROW}, WALKED_TAG = 
 constexpr uint64_t FEW = 100; /**< tags that every file has */
 
 /** Going forward over so many bytes, of which some begin false headers, and over a few tags. */
-Cost Forward(uint64_t bytes, uint64_t false_headers = 0, uint32_t cache = CACHE)
+Cost Forward(uint64_t bytes, uint64_t false_headers = 0, uint64_t cache = CACHE)
 {
     return Cost{3 * (bytes / (cache - 12) + 2) + 6 * false_headers,
                 bytes + 2 * cache + false_headers * (std::min(cache, CACHE) + NARROW)} +
            FEW * WALKED_TAG;
 }
 /** The same, with the false tags fitting the cache. */
-Cost ForwardInCache(uint64_t bytes, uint64_t false_headers, uint32_t cache)
+Cost ForwardInCache(uint64_t bytes, uint64_t false_headers, uint64_t cache)
 {
     return Forward(bytes, 0, cache) + Cost{6 * false_headers, 0};
 }
 /** Going backward, byte by byte. */
-Cost Backward(uint64_t bytes, uint32_t quantum = NARROW)
+Cost Backward(uint64_t bytes, uint64_t quantum = NARROW)
 {
     return bytes * Cost{4, 2 * quantum};
 }
@@ -52,9 +52,10 @@ Cost Script(uint64_t bytes)
 struct WorkCase {
     const char* name;
     Bytes file;
-    uint32_t options, cache;
+    uint32_t options;
+    uint64_t cache;
     Cost open, play, seek; /**< bounds: of opening, of playing all of it, of one time seek */
-    uint32_t scan_read_size = 0;
+    uint64_t scan_read_size = 0;
 };
 
 Bytes Repeat(const Bytes& pattern, size_t size)
@@ -78,7 +79,7 @@ Flv Sounds(uint32_t first_ts)
     return builder.build();
 }
 
-WorkCase FalseHeaders(const char* name, uint32_t options, uint32_t cache, Cost pass)
+WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost pass)
 {
     const Bytes file = Concat({Sounds(0).bytes, Repeat({8}, 600000), Tags(Sounds(0x10000000))});
     return {name, file, options, cache, 2 * pass, pass, 2 * pass};
@@ -93,7 +94,7 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
 }
 
 /** Sound alone at the end, behind bytes whose every fourth place leads back a little. */
-WorkCase Slide(const char* name, size_t size, uint32_t quantum)
+WorkCase Slide(const char* name, size_t size, uint64_t quantum)
 {
     const Bytes file = Concat({MakeChain().bytes, Repeat({0, 0, 0, 15}, size), Tags(MakeChain({false, true}))});
     const Cost pass = Forward(file.size()), back = Backward(size + 256, quantum);
@@ -131,7 +132,7 @@ std::vector<WorkCase> Cases()
     const Bytes keyframes = {3, 0, 9, 'k', 'e', 'y', 'f', 'r', 'a', 'm', 'e', 's'}, endless = {10, 255, 255, 255, 255};
     const Bytes times = Concat({{0, 5, 't', 'i', 'm', 'e', 's'}, endless});
     const Bytes positions = Concat({{0, 13, 'f', 'i', 'l', 'e', 'p', 'o', 's', 'i', 't', 'i', 'o', 'n', 's'}, endless});
-    const Bytes numbers = Repeat({0, 0x40, 0, 0, 0, 0, 0, 0, 0}, 9 * 1000);
+    const Bytes numbers = Repeat({0, 0x40, 0, 0, 0, 0, 0, 0, 0}, 9000);
     return {
         FalseHeaders("false_headers", 0, CACHE, Forward(700000, 600000)),
         FalseHeaders("false_headers_two_readers", SEPARATE, CACHE, Forward(700000, 600000)),
@@ -171,7 +172,7 @@ TEST_P(Work, StaysWithinItsBound)
 {
     const WorkCase& c = GetParam();
     FakeHost host(c.file);
-    Session session(host, {c.options, false, c.cache, c.scan_read_size});
+    Session session(host, {c.options, false, static_cast<uint32_t>(c.cache), static_cast<uint32_t>(c.scan_read_size)});
     ASSERT_TRUE(session.opened());
     hold("open", taken(host), c.open);
     const Cost request = REQUEST_SEARCHES * Forward(2 * MIB, SEARCH_FALSE_HEADERS, c.cache);

@@ -41,9 +41,30 @@ struct SeekOptions {
     bool json = false;
 };
 
+struct ExtractOptions {
+    std::string file;
+    std::string out;                                          /**< file or base name, or a folder that exists */
+    uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO; /**< FLVD_STREAM_* bits wanted */
+};
+
+struct CheckOptions {
+    std::vector<std::string> files;
+    bool json = false;
+    uint32_t jobs = 1;       /**< files that are checked at the same time */
+    double jumpSeconds = 10; /**< largest step from one frame of a stream to the next that is no jump */
+};
+
+struct PlotOptions {
+    std::string file;
+    std::string out;
+};
+
 int RunInfo(const InfoOptions& options);
 int RunFrames(const FramesOptions& options);
 int RunSeek(const SeekOptions& options);
+int RunExtract(const ExtractOptions& options);
+int RunCheck(const CheckOptions& options);
+int RunPlot(const PlotOptions& options);
 
 } // namespace tool
 

@@ -8,7 +8,7 @@
 
 #include <fmt/core.h>
 
-#include "host/stdio_host.h"
+#include "flvdmx/stdio_host.h"
 #include "tools/crc32.h"
 #include "tools/time_text.h"
 
@@ -113,6 +113,11 @@ Demuxer::Demuxer(const std::string& path, uint32_t options) : m_path(path)
 Demuxer::~Demuxer()
 {
     QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
+}
+
+uint32_t Demuxer::Streams() const
+{
+    return BitsIf(Video() != nullptr, FLVD_STREAM_VIDEO) | BitsIf(Audio() != nullptr, FLVD_STREAM_AUDIO);
 }
 
 fio_file_t* Demuxer::Reader(uint32_t stream) const

@@ -68,6 +68,7 @@ public:
     flvd_ctx_t* Instance() const { return m_instance; }
     const flvd_video_info_t* Video() const { return m_info.video_info; } /**< null without video */
     const flvd_audio_info_t* Audio() const { return m_info.audio_info; } /**< null without audio */
+    uint32_t Streams() const;                                            /**< FLVD_STREAM_* bits of the streams found */
     bool HasSeparateAudio() const { return (m_instance->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0; }
 
     /**

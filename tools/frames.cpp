@@ -60,12 +60,6 @@ private:
     int64_t m_size;
 };
 
-uint32_t FoundStreams(const Demuxer& demuxer)
-{
-    return BitsIf(demuxer.Video() != nullptr, FLVD_STREAM_VIDEO) |
-           BitsIf(demuxer.Audio() != nullptr, FLVD_STREAM_AUDIO);
-}
-
 // Prints the frames up to the end of the wanted range, and knows when no more of them can come.
 class FramePrinter {
 public:
@@ -111,7 +105,7 @@ void PrintComplete(const FramesOptions& options)
 {
     Demuxer demuxer(options.file, OpenBits(options));
     WarnIfCutShort(demuxer);
-    const uint32_t streams = options.streams & FoundStreams(demuxer);
+    const uint32_t streams = options.streams & demuxer.Streams();
     if (streams == 0)
         throw DemuxError(fmt::format("the file has no {} stream", StreamName(options.streams)));
     SeekToStart(demuxer, options);
@@ -152,7 +146,7 @@ std::unique_ptr<Demuxer> OpenGrowing(const FramesOptions& options, Growth& growt
     for (;;) {
         try {
             auto demuxer = std::make_unique<Demuxer>(options.file, OpenBits(options));
-            const bool complete = (AnnouncedStreams(*demuxer) & ~FoundStreams(*demuxer)) == 0;
+            const bool complete = (AnnouncedStreams(*demuxer) & ~demuxer->Streams()) == 0;
             if (complete || !options.separateAudio || !growth.Wait())
                 return demuxer;
         } catch (const DemuxError& error) {
@@ -176,7 +170,7 @@ void PrintGrowing(const FramesOptions& options)
     const std::unique_ptr<Demuxer> demuxer = OpenGrowing(options, growth);
     SeekToStart(*demuxer, options);
     FrameSource source(*demuxer, options.streams);
-    FramePrinter printer(options, options.streams & (AnnouncedStreams(*demuxer) | FoundStreams(*demuxer)));
+    FramePrinter printer(options, options.streams & (AnnouncedStreams(*demuxer) | demuxer->Streams()));
     while (!printer.Done()) {
         if (const std::optional<Frame> frame = source.Next()) {
             printer.Take(*frame);

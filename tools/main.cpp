@@ -160,6 +160,56 @@ void AddSeek(CLI::App& app, SeekOptions& options)
     });
 }
 
+void AddExtract(CLI::App& app, ExtractOptions& options)
+{
+    CLI::App* const command = app.add_subcommand("extract", "Write the streams to files that players take");
+    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
+    command->add_option("-o,--output", options.out, "Where to write")->required()->type_name("OUT");
+    AddChoice(
+        command, "--stream", {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}},
+        [&options](uint32_t stream) { options.streams = stream; }, "Write only this stream: video or audio");
+    command->footer(
+        "OUT is the file to write when there is one stream, or --stream chooses one. Of two streams it is the\n"
+        "beginning of the names: OUT.h264 and OUT.aac, for instance. A folder that exists takes files\n"
+        "named as FILE. Extensions: h264 (annex B), aac (ADTS), mp3; video and audio for all else, which is\n"
+        "written raw.\n\n"
+        "  flvdmx extract clip.flv -o clip\n"
+        "  flvdmx extract --stream audio clip.flv -o sound.aac");
+}
+
+void AddCheck(CLI::App& app, CheckOptions& options)
+{
+    constexpr double MOST_SECONDS = 4294967; // 32 bits of milliseconds
+    CLI::App* const command = app.add_subcommand("check", "Judge files: damage, timestamps, keyframe index");
+    command->add_option("FILE", options.files, "FLV files")->required()->type_name("");
+    command->add_flag("--json", options.json, "Print one JSON document");
+    command->add_option("--jobs", options.jobs, "Check N files at the same time (default 1)")
+        ->check(CLI::Range(1, 256))
+        ->type_name("N");
+    command
+        ->add_option("--jump", options.jumpSeconds, "Report steps forward in time of more than S seconds (default 10)")
+        ->check(CLI::Range(0.0, MOST_SECONDS))
+        ->type_name("S");
+    command->footer("What is found, by byte:\n"
+                    "  gap              bytes that belong to no tag\n"
+                    "  cut_short        the end of the last tag, or of what the metadata announces, is missing\n"
+                    "  back_pointer     the size behind a tag is wrong\n"
+                    "  no_back_pointer  there is none\n"
+                    "  jump             time runs back, or forward by more than --jump, within a stream\n"
+                    "  index            an entry leads to no keyframe, or its time is wrong by more than a second\n"
+                    "  not_playable     the file cannot be opened for playing\n"
+                    "The first 1000 findings of a file are listed, all are counted.\n\n"
+                    "Exit codes: 0 all files are sound, 1 something was found or a file could not be read.");
+}
+
+void AddPlot(CLI::App& app, PlotOptions& options)
+{
+    CLI::App* const command = app.add_subcommand("plot", "Draw bit rate, keyframes and interleaving over time");
+    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
+    command->add_option("-o,--output", options.out, "SVG file to write")->required()->type_name("OUT");
+    command->footer("  flvdmx plot clip.flv -o clip.svg");
+}
+
 // CLI11 takes `-5` for an option. A blank in front makes it a value, and ParseTime passes over blanks.
 std::vector<std::string> Arguments(int argc, char** argv)
 {
@@ -183,26 +233,34 @@ int Usage(const CLI::App& app, const CLI::ParseError& error)
 
 int Run(int argc, char** argv)
 {
-    CLI::App app("Shows what is in FLV files: streams, frames, and where seeks land.", "flvdmx");
+    CLI::App app("Shows what is in FLV files, judges them and takes them apart.", "flvdmx");
     app.set_version_flag("--version", "flvdmx " FLVDMX_VERSION);
-    app.footer("Exit codes: 0 done, 1 a file could not be demuxed, 2 wrong use.");
+    app.footer("Exit codes: 0 done, 1 a file could not be handled or is not sound, 2 wrong use.");
     app.require_subcommand(0, 1); // none is told below, behind what CLI11 has to say of unknown words
     InfoOptions info;
     FramesOptions frames;
     SeekOptions seek;
+    ExtractOptions extract;
+    CheckOptions check;
+    PlotOptions plot;
     AddInfo(app, info);
     AddFrames(app, frames);
     AddSeek(app, seek);
+    AddExtract(app, extract);
+    AddCheck(app, check);
+    AddPlot(app, plot);
     try {
         app.parse(Arguments(argc, argv));
         if (app.get_subcommands().empty())
-            throw CLI::RequiredError("A subcommand (info, frames or seek)");
+            throw CLI::RequiredError("A subcommand (info, frames, seek, extract, check or plot)");
     } catch (const CLI::ParseError& error) {
         return Usage(app, error);
     }
-    if (app.got_subcommand("info"))
-        return RunInfo(info);
-    return app.got_subcommand("frames") ? RunFrames(frames) : RunSeek(seek);
+    const std::map<std::string, std::function<int()>> commands = {
+        {"info", [&] { return RunInfo(info); }},    {"frames", [&] { return RunFrames(frames); }},
+        {"seek", [&] { return RunSeek(seek); }},    {"extract", [&] { return RunExtract(extract); }},
+        {"check", [&] { return RunCheck(check); }}, {"plot", [&] { return RunPlot(plot); }}};
+    return commands.at(app.get_subcommands().front()->get_name())();
 }
 
 } // namespace

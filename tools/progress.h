@@ -1,29 +1,53 @@
-// A line of progress on standard error, for a user who has sent standard output elsewhere.
+// A line of progress on standard error, wiped at its end.
 #ifndef FLVDMX_TOOLS_PROGRESS_H
 #define FLVDMX_TOOLS_PROGRESS_H
 
 #include <chrono>
 #include <cstdint>
+#include <string>
 
 namespace tool {
 
-/** Shows nothing unless standard error is a terminal and standard output is none; wipes the line at its end. */
+/** Shows a line a few times a second, where it can be seen and disturbs nothing. */
 class Progress {
 public:
+    /** For a user who has sent standard output elsewhere: needs standard error, and only that, on a terminal. */
     Progress();
     ~Progress();
     Progress(const Progress&) = delete;
     Progress& operator=(const Progress&) = delete;
 
-    /** Shows the number of frames and the time reached, a few times a second. */
+    /** Shows the number of frames and the time reached. */
     void Show(uint64_t frames, int64_t timeMs);
 
-private:
+    /** Makes room for something else on the terminal. */
+    void Wipe();
+
+protected:
     using Clock = std::chrono::steady_clock;
 
+    Progress(bool visible, Clock::duration delay) : m_visible(visible), m_next(Clock::now() + delay) {}
+    bool IsDue() const { return m_visible && Clock::now() >= m_next; }
+    void ShowLine(const std::string& text);
+
+private:
     const bool m_visible;
     bool m_shown = false;
-    Clock::time_point m_next = Clock::now();
+    Clock::time_point m_next;
+};
+
+/** A bar for work that prints nothing on its way; it appears when the work has taken a second. */
+class ProgressBar : public Progress {
+public:
+    /** @param name what is worked on
+     *  @param total amount of work, such as bytes */
+    ProgressBar(std::string name, int64_t total);
+
+    void ShowDone(int64_t done);
+
+private:
+    const std::string m_name;
+    const int64_t m_total;
 };
 
 } // namespace tool

@@ -10,15 +10,13 @@
 #include "tools/demuxer.h"
 #include "tools/frame_source.h"
 #include "tools/report.h"
+#include "tools/tags.h"
 #include "tools/time_text.h"
 
 namespace tool {
 
 namespace {
 
-constexpr uint32_t TAG_HEADER_SIZE = 11;
-constexpr uint32_t BACK_POINTER_SIZE = 4;
-constexpr uint32_t CODEC_ID_AVC = 7;
 constexpr int MOST_TAGS_TO_LOOK_AT = 100;
 
 struct Landing {
@@ -28,22 +26,11 @@ struct Landing {
     std::optional<bool> keyframe;         // only with video
 };
 
-// The first two payload bytes of a video tag.
-struct VideoHeader {
-    uint8_t codec; // FrameType and CodecID
-    uint8_t packetType;
-    bool IsKeyframe() const { return codec >> 4 == 1 || codec >> 4 == 4; }
-    // AVC configuration and end of sequence carry no picture.
-    bool IsFrame() const { return (codec & 0x0F) != CODEC_ID_AVC || (packetType != 0 && packetType != 2); }
-};
-
-std::optional<VideoHeader> PeekVideoHeader(fio_file_t* reader)
+std::optional<Tag> PeekTag(fio_file_t* reader)
 {
-    constexpr uint32_t SIZE = TAG_HEADER_SIZE + sizeof(VideoHeader);
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, SIZE, reader) < SIZE)
-        return std::nullopt;
-    return VideoHeader{bytes[TAG_HEADER_SIZE], bytes[TAG_HEADER_SIZE + 1]};
+    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, TAG_HEADER_SIZE + 2, reader);
+    return available < TAG_HEADER_SIZE ? std::nullopt : std::optional(Tag::Parse(0, bytes, available));
 }
 
 // Looks for the next video frame from the reader's position on.
@@ -54,9 +41,9 @@ std::optional<bool> NextPictureIsKeyframe(flvd_ctx_t* instance)
         flvd_tag_info_t tag{};
         if (FLVD_GetCurrTagInfo(instance, reader, &tag, FLVD_TAG_VIDEO, 0) != 0)
             return std::nullopt;
-        const std::optional<VideoHeader> header = PeekVideoHeader(reader);
-        if (!header || header->IsFrame())
-            return header ? std::optional(header->IsKeyframe()) : std::nullopt;
+        const std::optional<Tag> found = PeekTag(reader);
+        if (!found || found->IsFrame())
+            return found ? std::optional(found->IsKeyframe()) : std::nullopt;
         __FLV_DMX__fioSkipBytes(TAG_HEADER_SIZE + tag.data_size + BACK_POINTER_SIZE, reader);
     }
     return std::nullopt;

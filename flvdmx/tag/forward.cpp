@@ -191,8 +191,9 @@ bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_inf
 // Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
 bool FLVD_GoBack(const flvd_search_t* search)
 {
-    return __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0 ||
-           __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
+    if (__FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0)
+        return true;
+    return __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
 }
 
 // Careful mode: a plausible header at the position is taken when its back-pointer agrees and its kind is wanted.

@@ -7,14 +7,24 @@ packet  kind= pos= dts= size= crc= key=   in file order; pos is the tag's start,
 
 Every packet is compared with the tag at its position, so that no change by the prober goes unnoticed. The truncated
 and the damaged sample are expected to give the packets of avc_aac.flv whose tags are whole and untouched.
+
+With the program of the tool as argument, expected/extract.txt is written too: `NAME video|audio SHA-256` of the streams
+that it extracts. Streams with a demuxer of their own must first have been decoded to the same pictures and samples as
+the sample file, of a broken one its tags that are kept; the others must be its frames one behind the other.
 """
+import hashlib
 import json
 import pathlib
 import subprocess
+import sys
+import tempfile
 import zlib
 
 HERE = pathlib.Path(__file__).resolve().parent
 TAG_HEADER, BACK_POINTER = 11, 4
+BROKEN = ["truncated", "damaged"]
+DEMUXERS = {"h264": ["-f", "h264"], "aac": ["-f", "aac"], "mp3": ["-f", "mp3"],
+            "pcm_s16le": ["-f", "s16le", "-ar", "11025", "-ac", "1"]}
 
 
 def probe(path):
@@ -73,20 +83,63 @@ def sound_file(path):
     return duration, [stream_line(s) for s in found["streams"]], packets
 
 
+def decoded(kind, path, *demuxer):
+    """The hashes of the pictures, or one of all samples."""
+    command = ["ffmpeg", "-nostdin", "-v", "error", *demuxer, "-i", str(path), "-map", f"0:{kind[0]}", "-vsync", "0", "-f",
+               "framehash" if kind == "video" else "hash", "-"]
+    lines = subprocess.run(command, check=True, capture_output=True, text=True).stdout.splitlines()
+    return [line.split(",")[-1].strip() for line in lines if line[0] != "#"]
+
+
+def kept_tags(path):
+    """The whole tags of a sample without those that its damage or end has touched."""
+    data = path.read_bytes()
+    whole = (HERE / "avc_aac.flv").read_bytes() if path.stem in BROKEN else data
+    kept, pos = bytearray(whole[:13]), 13
+    while pos < len(whole):
+        end = pos + TAG_HEADER + int.from_bytes(whole[pos + 1:pos + 4], "big") + BACK_POINTER
+        if data[pos:end] == whole[pos:end]:
+            kept += whole[pos:end]
+        pos = end
+    return kept
+
+
+def extracted(tool, path, codecs, folder):
+    kept = folder / "kept.flv"
+    kept.write_bytes(kept_tags(path))
+    for kind, codec in codecs.items():
+        out = folder / "out"
+        subprocess.run([tool, "extract", "--stream", kind, path, "-o", out], check=True, capture_output=True)
+        if codec in DEMUXERS:
+            frames = decoded(kind, kept)
+            assert frames and decoded(kind, out, *DEMUXERS[codec]) == frames, (path, kind)
+        else:
+            assert out.read_bytes() == b"".join(t[2] for t in media_tags(kept.read_bytes()).values() if t[0] == kind)
+        yield f"{path.stem} {kind} {hashlib.sha256(out.read_bytes()).hexdigest()}\n"
+
+
+def write_extracted(tool):
+    lines = []
+    for path in sorted(HERE.glob("*.flv")):
+        codecs = {s["codec_type"]: s["codec_name"] for s in probe(path)["streams"]}
+        with tempfile.TemporaryDirectory() as folder:
+            lines += extracted(tool, path, codecs, pathlib.Path(folder))
+    (HERE / "expected" / "extract.txt").write_text("".join(lines))
+
+
 def write(name, size, duration, streams, packets):
     lines = [f"file size={size} duration_ms={duration}", *streams, *packets]
     (HERE / "expected" / f"{name}.txt").write_text("\n".join(lines) + "\n")
 
 
 def main():
-    broken = ["truncated", "damaged"]
     for path in sorted(HERE.glob("*.flv")):
-        if path.stem not in broken:
+        if path.stem not in BROKEN:
             duration, streams, packets = sound_file(path)
             write(path.stem, path.stat().st_size, duration, streams, packets.values())
     whole = (HERE / "avc_aac.flv").read_bytes()
     _, streams, packets = sound_file(HERE / "avc_aac.flv")
-    for name in broken:
+    for name in BROKEN:
         data = (HERE / f"{name}.flv").read_bytes()
         kept = []
         for pos, line in packets.items():
@@ -94,6 +147,9 @@ def main():
             if data[pos:end] == whole[pos:end]:
                 kept.append(line)
         write(name, len(data), 0, streams, kept)
+    if len(sys.argv) > 1:
+        write_extracted(sys.argv[1])
 
 
-main()
+if __name__ == "__main__":
+    main()

@@ -1,15 +1,16 @@
 /*
- * Host functions over the C library, for flvd_init_t: malloc and friends, and stdio files with 64-bit positions.
- *
- * Usable from C11 and C++17. A host that reads from ordinary files needs nothing else:
+ * Host over the C library's streams: malloc and friends, fopen, fread, fseeko. Runs wherever the C library has files
+ * with 64-bit positions; a host that reads from ordinary files needs nothing else:
  *
  *     flvd_init_t init;
  *     flvd_stdio_host_fill(&init);
  *     init.file_name = path;
  *     result = QVX_FLV_DMX(FLVD_OP_OPEN, &handle, &init, &info);
+ *
+ * Usable from C11 and C++17; link flvdmx-host, which needs the C library alone.
  */
-#ifndef FLVDMX_HOST_STDIO_HOST_H
-#define FLVDMX_HOST_STDIO_HOST_H
+#ifndef FLVDMX_STDIO_HOST_H
+#define FLVDMX_STDIO_HOST_H
 
 #include "flvdmx/flvdmx.h"
 
@@ -23,6 +24,7 @@ extern "C" {
  * @param init block to fill; it may go away after the open, the functions are valid for the whole process
  * @note  Files are read without a buffer of stdio's own, since the library caches. Reads fill the request or have
  *        reached the end; seeks and tells reach beyond 2 GiB through the 64-bit slots, the 32-bit tell fails there.
+ *        All open modes work. Directories are refused.
  */
 void flvd_stdio_host_fill(flvd_init_t* init);
 
@@ -33,4 +35,4 @@ int flvd_stdio_host_open_error(void);
 }
 #endif
 
-#endif /* FLVDMX_HOST_STDIO_HOST_H */
+#endif /* FLVDMX_STDIO_HOST_H */

@@ -1,0 +1,62 @@
+# What is installed, in three components: runtime, development and tools. Everything finds everything else by relative
+# paths, so that an installed tree may be moved.
+
+# On Debian the folder that bears the architecture's name, in cross builds and under every prefix.
+if(EXISTS /etc/debian_version AND CMAKE_LIBRARY_ARCHITECTURE)
+    set(CMAKE_INSTALL_LIBDIR lib/${CMAKE_LIBRARY_ARCHITECTURE} CACHE PATH "Libraries, below the prefix")
+endif()
+include(GNUInstallDirs)
+include(CMakePackageConfigHelpers)
+
+set(package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/flvdmx)
+install(TARGETS flvdmx EXPORT flvdmx
+    LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT runtime NAMELINK_COMPONENT development
+    INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+install(TARGETS flvdmx-host EXPORT flvdmx
+    ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT development
+    INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+install(FILES ${PROJECT_SOURCE_DIR}/flvdmx/flvdmx.h ${PROJECT_SOURCE_DIR}/flvdmx/flvdmx.hpp
+    DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/flvdmx COMPONENT development)
+install(DIRECTORY ${PROJECT_SOURCE_DIR}/host/flvdmx DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT development
+    FILES_MATCHING PATTERN "*_host.h")
+
+install(EXPORT flvdmx NAMESPACE flvdmx:: FILE flvdmxTargets.cmake DESTINATION ${package_dir} COMPONENT development)
+configure_package_config_file(${PROJECT_SOURCE_DIR}/cmake/flvdmxConfig.cmake.in ${PROJECT_BINARY_DIR}/flvdmxConfig.cmake
+    INSTALL_DESTINATION ${package_dir})
+write_basic_package_version_file(${PROJECT_BINARY_DIR}/flvdmxConfigVersion.cmake COMPATIBILITY SameMinorVersion)
+install(FILES ${PROJECT_BINARY_DIR}/flvdmxConfig.cmake ${PROJECT_BINARY_DIR}/flvdmxConfigVersion.cmake
+    DESTINATION ${package_dir} COMPONENT development)
+
+file(RELATIVE_PATH FLVDMX_PREFIX_FROM_PC /${CMAKE_INSTALL_LIBDIR}/pkgconfig /)
+string(REGEX REPLACE "/$" "" FLVDMX_PREFIX_FROM_PC "${FLVDMX_PREFIX_FROM_PC}")
+foreach(name IN ITEMS flvdmx flvdmx-host)
+    configure_file(${PROJECT_SOURCE_DIR}/packaging/${name}.pc.in ${PROJECT_BINARY_DIR}/${name}.pc @ONLY)
+    install(FILES ${PROJECT_BINARY_DIR}/${name}.pc
+        DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
+endforeach()
+
+file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/man)
+# flvdmx_install_man(PAGE COMPONENT): compressed without the time, so that the same sources give the same bytes.
+function(flvdmx_install_man page component)
+    set(source ${PROJECT_SOURCE_DIR}/docs/man/${page})
+    set_property(DIRECTORY ${PROJECT_SOURCE_DIR} APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${source})
+    execute_process(COMMAND gzip -9nc ${source} OUTPUT_FILE ${PROJECT_BINARY_DIR}/man/${page}.gz
+        COMMAND_ERROR_IS_FATAL ANY)
+    string(REGEX REPLACE ".*\\." "" section ${page})
+    install(FILES ${PROJECT_BINARY_DIR}/man/${page}.gz
+        DESTINATION ${CMAKE_INSTALL_MANDIR}/man${section} COMPONENT ${component})
+endfunction()
+
+flvdmx_install_man(QVX_FLV_DMX.3 development)
+if(FLVDMX_TOOLS)
+    file(RELATIVE_PATH lib_from_bin /${CMAKE_INSTALL_BINDIR} /${CMAKE_INSTALL_LIBDIR})
+    set_target_properties(flvdmx-tool PROPERTIES INSTALL_RPATH "$ORIGIN/${lib_from_bin}")
+    install(TARGETS flvdmx-tool RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT tools)
+    # The loader finds the library under the system's own prefix without help.
+    install(CODE "if(CMAKE_INSTALL_PREFIX STREQUAL \"/usr\")
+        file(RPATH_REMOVE FILE \"\$ENV{DESTDIR}/usr/${CMAKE_INSTALL_BINDIR}/flvdmx\")
+    endif()" COMPONENT tools)
+    flvdmx_install_man(flvdmx.1 tools)
+    install(FILES ${PROJECT_SOURCE_DIR}/packaging/flvdmx.bash RENAME flvdmx
+        DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions COMPONENT tools)
+endif()

@@ -1,0 +1,59 @@
+# Debian packages by CPack, one a component: libflvdmx1, libflvdmx-dev, flvdmx-tools.
+
+set(CPACK_GENERATOR DEB)
+set(CPACK_DEB_COMPONENT_INSTALL ON)
+set(CPACK_COMPONENTS_ALL runtime development)
+if(FLVDMX_TOOLS)
+    list(APPEND CPACK_COMPONENTS_ALL tools)
+endif()
+set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
+set(CPACK_STRIP_FILES ON)
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "") # it would stand above the summary of every package
+set(CPACK_PACKAGE_VENDOR "the flvdmx authors")
+set(CPACK_PACKAGE_CONTACT "the flvdmx authors")
+set(CPACK_DEBIAN_PACKAGE_RELEASE 1)
+set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
+set(CPACK_DEBIAN_PACKAGE_CONTROL_STRICT_PERMISSION ON)
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS ON)
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS_POLICY ">=")
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS ${CMAKE_LIBRARY_OUTPUT_DIRECTORY})
+get_target_property(abi flvdmx SOVERSION)
+set(version ${PROJECT_VERSION}-${CPACK_DEBIAN_PACKAGE_RELEASE})
+
+# flvdmx_package(COMPONENT NAME SECTION SUMMARY DESCRIPTION): its control fields and its licence
+macro(flvdmx_package component name section summary description)
+    string(TOUPPER ${component} key)
+    set(CPACK_DEBIAN_${key}_PACKAGE_NAME ${name})
+    set(CPACK_DEBIAN_${key}_PACKAGE_SECTION ${section})
+    set(CPACK_DEBIAN_${key}_DESCRIPTION "${summary}\n${description}")
+    install(FILES ${PROJECT_SOURCE_DIR}/LICENSE RENAME copyright
+        DESTINATION ${CMAKE_INSTALL_DATADIR}/doc/${name} COMPONENT ${component})
+    install(FILES ${PROJECT_SOURCE_DIR}/NEWS.md
+        DESTINATION ${CMAKE_INSTALL_DATADIR}/doc/${name} COMPONENT ${component})
+endmacro()
+
+flvdmx_package(runtime libflvdmx${abi} libs "demultiplexer for the FLV container"
+    "Finds the audio and the video stream of an FLV file, their codec configuration\nand the metadata, and delivers \
+one frame a call. Plays files that are still\nbeing written and survives damage. It uses only the memory and \
+file functions\nthat the program gives it.")
+flvdmx_package(development libflvdmx-dev libdevel "demultiplexer for the FLV container (development files)"
+    "Headers for C and C++, the host kit with ready-made file functions, and the\nfiles for pkg-config and CMake.")
+if(FLVDMX_TOOLS)
+    flvdmx_package(tools flvdmx-tools video "looks into FLV files, judges them and takes them apart"
+        "The program flvdmx lists streams and frames, seeks, extracts elementary\nstreams, checks files for damage and \
+draws their bit rate.")
+endif()
+
+set(CPACK_DEBIAN_RUNTIME_PACKAGE_CONTROL_EXTRA ${PROJECT_SOURCE_DIR}/packaging/triggers)
+set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_DEPENDS "libflvdmx${abi} (= ${version})")
+set(CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS "libflvdmx${abi} (>= ${PROJECT_VERSION})")
+if(CMAKE_CROSSCOMPILING)
+    # The cross compiler's libraries belong to packages that the target does not have: named here as Debian 12 has them.
+    set(CPACK_DEBIAN_PACKAGE_ARCHITECTURE armhf)
+    set(CPACK_DEBIAN_RUNTIME_PACKAGE_DEPENDS "libc6 (>= 2.36)")
+    string(APPEND CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS ", libc6 (>= 2.36), libgcc-s1, libstdc++6 (>= 12)")
+else()
+    set(CPACK_DEBIAN_RUNTIME_PACKAGE_SHLIBDEPS ON)
+    set(CPACK_DEBIAN_TOOLS_PACKAGE_SHLIBDEPS ON)
+endif()
+include(CPack)

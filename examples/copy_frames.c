@@ -1,0 +1,70 @@
+/*
+ * Copies the frames of one stream to a file, one behind the other: copy_frames FILE video|audio OUTPUT
+ *
+ * What comes out are bare frames: an MP3 stream plays as it is, AAC and AVC need their configuration beside it.
+ */
+#include "flvdmx/flvdmx.h"
+#include "flvdmx/window_host.h"
+
+#include <inttypes.h>
+#include <stdio.h>
+#include <string.h>
+
+/* Until the data ends. 0, or a complaint printed. */
+static int copy_stream(flvd_ctx_t* instance, uint32_t stream, FILE* output)
+{
+    const flvd_frame_request_t request = {NULL, 0, 0}; /* one reader for both streams: whatever comes next */
+    flvd_frame_t frame;
+    unsigned long frames = 0;
+    unsigned long bytes = 0;
+    int32_t result;
+
+    while ((result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &instance, &request, &frame)) == 0) {
+        if (frame.stream != stream)
+            continue;
+        if (fwrite(frame.data, 1, frame.size, output) != frame.size) {
+            perror("copy_frames");
+            return -1;
+        }
+        ++frames;
+        bytes += frame.size;
+    }
+    printf("%lu frames, %lu bytes\n", frames, bytes);
+    if (result == FLVD_RET_END)
+        return 0;
+    fprintf(stderr, "copy_frames: error %" PRId32 ", line %" PRId32 "\n", instance->error, instance->error_line);
+    return -1;
+}
+
+int main(int argc, char** argv)
+{
+    flvd_init_t init;
+    flvd_ctx_t* instance = NULL;
+    flvd_open_info_t info;
+    FILE* output;
+    uint32_t stream;
+    int failed;
+
+    if (argc != 4 || (strcmp(argv[2], "video") != 0 && strcmp(argv[2], "audio") != 0)) {
+        fprintf(stderr, "usage: copy_frames FILE video|audio OUTPUT\n");
+        return 2;
+    }
+    stream = strcmp(argv[2], "video") == 0 ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
+    flvd_window_host_fill(&init); /* the fastest for playing a whole file */
+    init.file_name = argv[1];
+    if (QVX_FLV_DMX(FLVD_OP_OPEN, &instance, &init, &info) != 0) {
+        fprintf(stderr, "copy_frames: %s: error %" PRId32 ", line %" PRId32 "\n", argv[1], g_flvd_lLastError,
+                g_flvd_lErrorLine);
+        return 1;
+    }
+    output = fopen(argv[3], "wb");
+    if (output == NULL)
+        perror(argv[3]);
+    failed = output == NULL || copy_stream(instance, stream, output) != 0;
+    if (output != NULL && fclose(output) != 0) {
+        perror(argv[3]);
+        failed = 1;
+    }
+    QVX_FLV_DMX(FLVD_OP_CLOSE, &instance, NULL, NULL);
+    return failed;
+}

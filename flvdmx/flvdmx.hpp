@@ -1,0 +1,534 @@
+/*
+ * flvdmx for C++17: one open file as an object over the C interface of flvdmx.h. Header only.
+ *
+ *     auto file = flvdmx::File::open("clip.flv");
+ *     if (!file)
+ *         return std::fprintf(stderr, "%s\n", file.error().text());
+ *     for (const flvdmx::Frame& frame : file->frames())
+ *         play(frame.stream, frame.time, frame.data);
+ *
+ * Nothing here throws, and nothing needs exceptions or run-time type information: what can fail returns a result<T>.
+ *
+ * THE PROCESS-WIDE TABLES
+ *
+ * The library calls the memory and file functions of its host. They carry no context, so there is one set of them for
+ * the process: every open overwrites it, and all files that are open already go on with the newest functions. Hence:
+ *
+ * - Give every open the same functions. File::open(path) takes those of the stdio host; the other hosts of the kit, and
+ *   hosts of your own, are passed as a Host. Files opened through different hosts must not be open at the same time.
+ * - open() takes open_mutex, so opens may come from any thread as far as other opens are concerned. An open must not
+ * run beside any other call, on whatever File: when threads play files while others open some, they share a lock of
+ *   yours, or hold open_mutex around their own calls.
+ * - One File is used by one thread at a time. Calls on different Files may run at the same time.
+ */
+#ifndef FLVDMX_FLVDMX_HPP
+#define FLVDMX_FLVDMX_HPP
+
+#include "flvdmx/flvdmx.h"
+
+#include <chrono>
+#include <cstddef>
+#include <cstring>
+#include <limits>
+#include <memory>
+#include <mutex>
+#include <new>
+#include <optional>
+#include <string_view>
+#include <utility>
+
+// The stdio host of the kit. Only those who open without a Host need it: they link flvdmx-host.
+extern "C" void flvd_stdio_host_fill(flvd_init_t* init);
+
+namespace flvdmx {
+
+/** Held during every open, for the process-wide tables and the globals in which a failed open leaves its error. */
+inline std::mutex open_mutex;
+
+using Milliseconds = std::chrono::milliseconds;
+
+/** The host's functions: an flvd_init_t of which all but the functions is ignored. */
+using Host = flvd_init_t;
+
+/** A Host from a function of the host kit, such as flvd_posix_host_fill. */
+inline Host make_host(void (*fill)(flvd_init_t*))
+{
+    Host host{};
+    fill(&host);
+    return host;
+}
+
+/** Bytes that belong to somebody else. */
+class Bytes {
+public:
+    constexpr Bytes() = default;
+    constexpr Bytes(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
+    constexpr const uint8_t* data() const { return m_data; }
+    constexpr size_t size() const { return m_size; }
+    constexpr bool empty() const { return m_size == 0; }
+    constexpr const uint8_t* begin() const { return m_data; }
+    constexpr const uint8_t* end() const { return m_data + m_size; }
+    constexpr uint8_t operator[](size_t i) const { return m_data[i]; }
+
+private:
+    const uint8_t* m_data = nullptr;
+    size_t m_size = 0;
+};
+
+/* ------------------------------------------------------------------------------------------ errors */
+
+/** What a failure means for the caller. */
+enum class Kind {
+    none,    /**< no failure */
+    end,     /**< the end of the data */
+    not_yet, /**< the end of what a growing file holds so far: ask again later */
+    miss,    /**< a seek found nothing to land on; playing goes on where it was */
+    failed   /**< anything else */
+};
+
+/** One line of the table of codes. */
+struct ErrorText {
+    int32_t code;     /**< FLVD_ERR_* */
+    const char* name; /**< the same as text */
+    const char* text; /**< what happened */
+};
+
+/** Every code that a failure can have. */
+inline constexpr ErrorText error_texts[] = {
+    {FLVD_ERR_NONE, "FLVD_ERR_NONE", "no error, or a frame that did not fit was passed over"},
+    {FLVD_ERR_POSITION, "FLVD_ERR_POSITION", "the position in the file cannot be told"},
+    {FLVD_ERR_SEEK, "FLVD_ERR_SEEK", "seeking in the file failed"},
+    {FLVD_ERR_NO_MEMORY, "FLVD_ERR_NO_MEMORY", "no memory for the codec configuration, or it is too short"},
+    {FLVD_ERR_INSTANCE_MEMORY, "FLVD_ERR_INSTANCE_MEMORY", "no memory"},
+    {FLVD_ERR_OPEN_MAIN, "FLVD_ERR_OPEN_MAIN", "the file cannot be opened"},
+    {FLVD_ERR_OPEN_AUDIO, "FLVD_ERR_OPEN_AUDIO", "the file cannot be opened a second time, for its audio"},
+    {FLVD_ERR_FRAME_BUFFER, "FLVD_ERR_FRAME_BUFFER", "no memory for the frame buffer"},
+    {FLVD_ERR_NO_STREAM, "FLVD_ERR_NO_STREAM", "neither a video nor an audio stream was found"},
+    {FLVD_ERR_FILE_HEADER, "FLVD_ERR_FILE_HEADER", "no FLV file header"},
+    {FLVD_ERR_EXTENT, "FLVD_ERR_EXTENT", "the end of the valid data was not found"},
+    {FLVD_ERR_FRAME_SEEK, "FLVD_ERR_FRAME_SEEK", "no tag was found to land on"},
+    {FLVD_ERR_SEEK_MISS, "FLVD_ERR_SEEK_MISS", "the target is beyond the end, or no keyframe lies in that direction"},
+    {FLVD_ERR_SEEK_PLACE, "FLVD_ERR_SEEK_PLACE", "the tag at the place sought is not the one expected"},
+    {FLVD_ERR_INDEX_ELEMENT, "FLVD_ERR_INDEX_ELEMENT", "the keyframe index holds something that is not a number"},
+    {FLVD_ERR_AVC_CONFIG, "FLVD_ERR_AVC_CONFIG", "the AVC configuration is damaged"},
+    {FLVD_ERR_VIDEO_HEADER, "FLVD_ERR_VIDEO_HEADER", "the video's own header was not understood"},
+    {FLVD_ERR_AUDIO_HEADER, "FLVD_ERR_AUDIO_HEADER", "the audio's own header was not understood"},
+    {FLVD_ERR_AVC_NO_SEQ_HEADER, "FLVD_ERR_AVC_NO_SEQ_HEADER", "the AVC stream does not begin with its configuration"},
+    {FLVD_ERR_NO_INSTANCE, "FLVD_ERR_NO_INSTANCE", "no file is open"},
+    {FLVD_ERR_NO_VIDEO, "FLVD_ERR_NO_VIDEO", "the file has no video stream"},
+    {FLVD_ERR_NO_AUDIO, "FLVD_ERR_NO_AUDIO", "the file has no audio stream"},
+    {FLVD_ERR_BAD_STREAM, "FLVD_ERR_BAD_STREAM", "with a separate audio reader a stream must be named"},
+    {FLVD_ERR_RESERVED_OP, "FLVD_ERR_RESERVED_OP", "the operation is reserved"},
+    {FLVD_ERR_INFO_ONLY, "FLVD_ERR_INFO_ONLY", "the file was opened for information only"},
+    {FLVD_ERR_NO_TAG, "FLVD_ERR_NO_TAG", "no valid tag was found"},
+    {FLVD_ERR_SHORT_DATA, "FLVD_ERR_SHORT_DATA", "the data ended"},
+    {FLVD_ERR_NOT_SEEKABLE, "FLVD_ERR_NOT_SEEKABLE", "the file cannot be seeked in"},
+};
+
+/** A failure: the library's code and line, and what they mean. */
+class error {
+public:
+    constexpr error() = default;
+    constexpr error(Kind kind, int32_t code, int32_t line) : m_kind(kind), m_code(code), m_line(line) {}
+
+    constexpr Kind kind() const { return m_kind; }
+    constexpr int32_t code() const { return m_code; } /**< FLVD_ERR_* */
+    constexpr int32_t line() const { return m_line; } /**< number of the place of failure, the same in every release */
+    constexpr const char* name() const { return find().name; } /**< such as "FLVD_ERR_SEEK" */
+    constexpr const char* text() const { return find().text; } /**< what happened, for people */
+
+private:
+    constexpr ErrorText find() const
+    {
+        for (const ErrorText& entry : error_texts) {
+            if (entry.code == m_code)
+                return entry;
+        }
+        return {m_code, "unknown", "unknown error"};
+    }
+
+    Kind m_kind = Kind::none;
+    int32_t m_code = FLVD_ERR_NONE;
+    int32_t m_line = 0;
+};
+
+/** A value, or the error that took its place. Access to a value that is not there is undefined: test first. */
+template <typename T> class [[nodiscard]] result {
+public:
+    result(T value) : m_value(std::move(value)) {}
+    result(const flvdmx::error& error) : m_error(error) {}
+
+    explicit operator bool() const { return m_value.has_value(); }
+    T& operator*() { return *m_value; }
+    const T& operator*() const { return *m_value; }
+    T* operator->() { return &*m_value; }
+    const T* operator->() const { return &*m_value; }
+    const flvdmx::error& error() const { return m_error; } /**< of Kind::none when there is a value */
+
+private:
+    std::optional<T> m_value;
+    flvdmx::error m_error;
+};
+
+/* --------------------------------------------------------------------------------- what a file holds */
+
+/** A stream. */
+enum class Stream : uint32_t {
+    any = 0, /**< in requests, without a separate audio reader: whatever comes next */
+    video = FLVD_STREAM_VIDEO,
+    audio = FLVD_STREAM_AUDIO
+};
+
+/** One frame, as the codec wants it: without FLV's headers. */
+struct Frame {
+    Stream stream = Stream::any;
+    Milliseconds time{}; /**< from the file's first timestamp, in decoding order; negative: a tag in front of that */
+    Bytes data;          /**< valid until the next call on the file */
+};
+
+/** The video stream; 0 in all that the file does not tell. */
+struct VideoInfo {
+    uint32_t width = 0;
+    uint32_t height = 0;
+    double frame_rate = 0.0;      /**< frames a second, from the metadata */
+    std::string_view fourcc;      /**< as in flvd_video_info_t, empty for an unknown codec */
+    Bytes config;                 /**< AVC: AVCDecoderConfigurationRecord */
+    Milliseconds last_keyframe{}; /**< file timestamp, from the index or the metadata */
+};
+
+/** The audio stream; 0 in all that the file does not tell. */
+struct AudioInfo {
+    uint32_t sample_rate = 0; /**< Hz */
+    uint32_t sample_size = 0; /**< bits */
+    uint32_t channels = 0;
+    uint32_t format_tag = 0; /**< FLVD_AUDIO_TAG_*, 0 for every other format */
+    uint32_t data_rate = 0;  /**< kbit/s */
+    Bytes config;            /**< AAC: AudioSpecificConfig */
+};
+
+/** How a file can be seeked in. */
+enum class SeekMethod : uint32_t { none = FLVD_SEEK_NONE, by_index = FLVD_SEEK_BY_INDEX, by_scan = FLVD_SEEK_BY_SCAN };
+
+/** What is known of a file; views of it are valid until the file is closed. */
+struct Info {
+    std::string_view path;
+    Milliseconds duration{}; /**< 0 when unknown, as of a growing file */
+    int64_t size = 0;        /**< bytes, 0 for a growing file */
+    SeekMethod seek_method = SeekMethod::none;
+    std::optional<VideoInfo> video;
+    std::optional<AudioInfo> audio;
+};
+
+/* -------------------------------------------------------------------------------- how it is opened */
+
+/** How a file is opened. */
+struct Options {
+    uint32_t cache_size = 0;            /**< bytes of each reader's cache; 0: the library's choice */
+    uint32_t scan_read_size = 0;        /**< bytes a read while scanning; 0: the library's choice */
+    bool separate_audio_reader = false; /**< audio and video are asked for apart, each at its own pace */
+    bool growing = false;               /**< the file may still be written: see File::follow() */
+    bool index_in_memory = false;       /**< keep the keyframe index in memory: faster seeks */
+    bool for_info_only = false; /**< frames and seeks are refused; opens faster: the duration may be the metadata's
+                                     claim, and how to seek is not found out */
+    uint8_t* buffer = nullptr;  /**< the caller's frame buffer, which must outlive the file; null: the library's
+                                     own, which grows as needed. Frames that do not fit are passed over. */
+    uint32_t buffer_size = 0;   /**< its bytes */
+};
+
+/** How to seek; modes are combined with |. */
+enum class SeekMode : uint32_t {
+    automatic = 0, /**< forward, unless the target is earlier than the current position */
+    absolute = 0,  /**< the time counts from the file's first timestamp */
+    backward = FLVD_SEEK_BACKWARD,
+    forward = FLVD_SEEK_FORWARD,
+    relative = FLVD_SEEK_RELATIVE,
+    to_end_on_miss = FLVD_SEEK_TO_END_ON_MISS,
+    retry_backward = FLVD_SEEK_RETRY_BACKWARD
+};
+
+constexpr SeekMode operator|(SeekMode a, SeekMode b)
+{
+    return static_cast<SeekMode>(static_cast<uint32_t>(a) | static_cast<uint32_t>(b));
+}
+
+/* ----------------------------------------------------------------------------------------- the file */
+
+class FrameRange;
+
+/** An open file. Moved, not copied; closes itself. A File that was moved from or closed answers FLVD_ERR_NO_INSTANCE.
+ */
+class File {
+public:
+    /**
+     * Opens a file through the functions of `host`; they stay the process's, see above. The path is copied.
+     * @return the file; Kind::not_yet when a growing file does not hold enough yet; Kind::failed
+     */
+    static result<File> open(std::string_view path, const Host& host, const Options& options = {})
+    {
+        File file;
+        file.m_path.reset(new (std::nothrow) char[path.size() + 1]);
+        if (file.m_path == nullptr)
+            return error(Kind::failed, FLVD_ERR_INSTANCE_MEMORY, 0);
+        path.copy(file.m_path.get(), path.size());
+        file.m_path[path.size()] = '\0';
+        file.m_request = {options.buffer, options.buffer_size, 0};
+        const flvd_init_t init = file.fill_init(host, options);
+        const uint32_t operation = options.for_info_only ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN;
+        const std::lock_guard<std::mutex> lock(open_mutex);
+        if (QVX_FLV_DMX(operation, &file.m_instance, &init, &file.m_info) != 0)
+            return error(kind_of(g_flvd_lLastError, options.growing), g_flvd_lLastError, g_flvd_lErrorLine);
+        return result<File>(std::move(file));
+    }
+
+    /** Opens a file through the stdio host. */
+    static result<File> open(std::string_view path, const Options& options = {})
+    {
+        return open(path, make_host(flvd_stdio_host_fill), options);
+    }
+
+    File(File&& other) noexcept { swap(other); }
+    File& operator=(File&& other) noexcept
+    {
+        File taken(std::move(other));
+        swap(taken);
+        return *this;
+    }
+    File(const File&) = delete;
+    File& operator=(const File&) = delete;
+    ~File() { close(); }
+
+    /** Closes the file; all views of it end. */
+    void close()
+    {
+        if (m_instance != nullptr)
+            QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
+        m_instance = nullptr;
+        m_info = {};
+    }
+
+    bool is_open() const { return m_instance != nullptr; }
+
+    /** The C interface's instance, for what is not wrapped here; null when nothing is open. */
+    flvd_ctx_t* instance() const { return m_instance; }
+
+    Info info() const
+    {
+        Info info;
+        if (m_instance == nullptr)
+            return info;
+        info.path = m_info.file_info->file_name;
+        info.duration = Milliseconds(m_info.file_info->duration_ms);
+        info.size = m_info.file_info->file_size;
+        info.seek_method = static_cast<SeekMethod>(m_info.file_info->seek_method);
+        if (m_info.video_info != nullptr)
+            info.video = describe(*m_info.video_info);
+        if (m_info.audio_info != nullptr)
+            info.audio = describe(*m_info.audio_info);
+        return info;
+    }
+
+    /**
+     * The next frame. Damaged stretches are crossed however long they are, as long as the reader comes further.
+     *
+     * @param stream with a separate audio reader video or audio; without one it is not looked at
+     * @return the frame; Kind::end, for a growing file Kind::not_yet; Kind::failed
+     */
+    result<Frame> next_frame(Stream stream = Stream::any)
+    {
+        m_request.stream = static_cast<uint32_t>(stream);
+        int64_t reached = -1;
+        for (;;) {
+            flvd_frame_t frame{};
+            const int32_t code = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &m_request, &frame);
+            if (code == 0)
+                return describe(frame);
+            if (code != FLVD_RET_END || m_instance->error != FLVD_ERR_SHORT_DATA)
+                return failure();
+            const int64_t position = tell(stream);
+            if (position <= reached || position >= m_instance->data_end)
+                return failure();
+            reached = position;
+        }
+    }
+
+    /**
+     * The next frame of a growing file. While there is none yet, `wait` is called and the file is asked again; when
+     * `wait` returns false, because writing has stopped, it is asked one last time.
+     *
+     * @param wait bool(): sleeps for a while, true when the file may have grown since
+     * @return as next_frame()
+     */
+    template <typename Wait> result<Frame> follow(Wait&& wait, Stream stream = Stream::any)
+    {
+        for (bool again = true;;) {
+            result<Frame> frame = next_frame(stream);
+            if (frame.error().kind() != Kind::not_yet || !again)
+                return frame;
+            again = wait();
+        }
+    }
+
+    /** For range-for: frames up to the first request that fails; last_error() tells why it ended. */
+    inline FrameRange frames(Stream stream = Stream::any);
+
+    /**
+     * Seeks to a keyframe, without video to an audio frame. After a miss or a failure playing goes on where it was.
+     *
+     * @param time from the first timestamp; with SeekMode::relative from the current position. What does not fit 32
+     *             bits counts as the greatest or least time that does.
+     * @return the time reached, from the first timestamp; Kind::miss; Kind::failed
+     */
+    result<Milliseconds> seek(Milliseconds time, SeekMode mode = SeekMode::automatic)
+    {
+        const flvd_seek_request_t request = {clamp(time), static_cast<uint32_t>(mode)};
+        int32_t reached = 0;
+        if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) != 0)
+            return failure();
+        return Milliseconds(reached);
+    }
+
+    /** The last failure of this file, of Kind::none when there was none; later successes leave it in place. */
+    error last_error() const { return failure(); }
+
+private:
+    File() = default;
+
+    void swap(File& other) noexcept
+    {
+        std::swap(m_path, other.m_path);
+        std::swap(m_instance, other.m_instance);
+        std::swap(m_info, other.m_info);
+        std::swap(m_request, other.m_request);
+    }
+
+    static constexpr uint32_t bits_if(bool set, uint32_t bits) { return set ? bits : 0; }
+
+    flvd_init_t fill_init(const Host& host, const Options& options) const
+    {
+        flvd_init_t init = host;
+        init.file_name = m_path.get();
+        init.cache_size = options.cache_size;
+        init.scan_read_size = options.scan_read_size;
+        init.options = bits_if(options.separate_audio_reader, FLVD_OPT_SEPARATE_AUDIO_READER) |
+                       bits_if(options.buffer != nullptr, FLVD_OPT_USER_BUFFER) |
+                       bits_if(options.growing, FLVD_OPT_PROGRESSIVE) |
+                       bits_if(options.index_in_memory, FLVD_OPT_INDEX_IN_MEMORY);
+        return init;
+    }
+
+    int64_t tell(Stream stream) const
+    {
+        const bool audio = stream == Stream::audio; // without a separate reader it is the main one again
+        return __FLV_DMX__fioTell64(audio ? m_instance->audio_reader : m_instance->main_reader);
+    }
+
+    static Kind kind_of(int32_t code, bool growing)
+    {
+        switch (code) {
+        case FLVD_ERR_NONE:
+            return Kind::none;
+        case FLVD_ERR_SEEK_MISS:
+            return Kind::miss;
+        case FLVD_ERR_SHORT_DATA:
+            return growing ? Kind::not_yet : Kind::end;
+        default:
+            return Kind::failed;
+        }
+    }
+
+    error failure() const
+    {
+        if (m_instance == nullptr)
+            return {Kind::failed, FLVD_ERR_NO_INSTANCE, 0};
+        const bool growing = (m_instance->options & FLVD_OPT_PROGRESSIVE) != 0;
+        return {kind_of(m_instance->error, growing), m_instance->error, m_instance->error_line};
+    }
+
+    // Only a tag before the first timestamp wraps, and every tag that is taken lies at or before the last one.
+    Frame describe(const flvd_frame_t& frame) const
+    {
+        const bool wrapped = m_instance->first_ts != 0 && frame.timestamp_ms > m_instance->duration_ms;
+        const int64_t time = int64_t{frame.timestamp_ms} - (wrapped ? int64_t{1} << 32 : 0);
+        return {static_cast<Stream>(frame.stream), Milliseconds(time), Bytes(frame.data, frame.size)};
+    }
+
+    static VideoInfo describe(const flvd_video_info_t& video)
+    {
+        const size_t fourcc = video.fourcc[0] == '\0' ? 0 : sizeof video.fourcc;
+        return {video.width,
+                video.height,
+                video.frame_rate / 1000.0,
+                {video.fourcc, fourcc},
+                {video.config, video.config_size},
+                Milliseconds(video.last_key_time_ms)};
+    }
+
+    static AudioInfo describe(const flvd_audio_info_t& audio)
+    {
+        return {audio.sample_rate, audio.sample_size, audio.channels,
+                audio.format_tag,  audio.data_rate,   {audio.config, audio.config_size}};
+    }
+
+    static int32_t clamp(Milliseconds time)
+    {
+        using Limits = std::numeric_limits<int32_t>;
+        if (time.count() > Limits::max())
+            return Limits::max();
+        return time.count() < Limits::min() ? Limits::min() : static_cast<int32_t>(time.count());
+    }
+
+    std::unique_ptr<char[]> m_path; // the library keeps the address
+    flvd_ctx_t* m_instance = nullptr;
+    flvd_open_info_t m_info{};
+    flvd_frame_request_t m_request{};
+};
+
+/** The frames of a file from where it stands, for one range-for. */
+class FrameRange {
+public:
+    /** The end of the range. */
+    struct Sentinel {};
+
+    /** The place in the range; all of them of one range are the same place. */
+    class Iterator {
+    public:
+        explicit Iterator(FrameRange* range) : m_range(range) {}
+        const Frame& operator*() const { return *m_range->m_frame; }
+        const Frame* operator->() const { return &*m_range->m_frame; }
+        Iterator& operator++()
+        {
+            m_range->advance();
+            return *this;
+        }
+        bool operator!=(Sentinel) const { return static_cast<bool>(m_range->m_frame); }
+        bool operator==(Sentinel) const { return !m_range->m_frame; }
+
+    private:
+        FrameRange* m_range;
+    };
+
+    FrameRange(File& file, Stream stream) : m_file(file), m_stream(stream) {}
+    /** Takes the first frame. */
+    Iterator begin()
+    {
+        advance();
+        return Iterator(this);
+    }
+    static Sentinel end() { return {}; }
+
+private:
+    void advance() { m_frame = m_file.next_frame(m_stream); }
+
+    File& m_file;
+    Stream m_stream;
+    result<Frame> m_frame = flvdmx::error();
+};
+
+inline FrameRange File::frames(Stream stream)
+{
+    return {*this, stream};
+}
+
+} // namespace flvdmx
+
+#endif /* FLVDMX_FLVDMX_HPP */

@@ -1,0 +1,90 @@
+// Host functions over POSIX descriptors.
+#ifndef _FILE_OFFSET_BITS
+#define _FILE_OFFSET_BITS 64 // lseek takes and gives 64 bits on 32-bit systems too
+#endif
+
+#include "flvdmx/posix_host.h"
+
+#include "host/adapter.h"
+#include "host/descriptor.h"
+
+#include <cerrno>
+
+#include <sys/types.h>
+#include <unistd.h>
+
+namespace {
+
+static_assert(sizeof(off_t) == sizeof(int64_t), "lseek must reach beyond 2 GiB");
+
+struct PosixFiles {
+    struct Handle {
+        int descriptor;
+        bool end; // a read met the end of the file and no seek followed
+    };
+
+    static Handle* Open(const char* path, const char* mode)
+    {
+        const int descriptor = flvd_host::OpenDescriptor(path, mode);
+        if (descriptor < 0)
+            return nullptr;
+        auto* const file = flvd_host::NewHandle<Handle>();
+        if (file == nullptr) {
+            close(descriptor);
+            flvd_host::SetOpenError(ENOMEM);
+            return nullptr;
+        }
+        file->descriptor = descriptor;
+        return file;
+    }
+
+    static int Close(Handle* file)
+    {
+        const int result = close(file->descriptor);
+        std::free(file);
+        return result;
+    }
+
+    static size_t Read(Handle* file, void* buffer, size_t wanted)
+    {
+        return flvd_host::ReadAtLeast(file->descriptor, buffer, wanted, wanted, &file->end);
+    }
+
+    static size_t Write(Handle* file, const void* buffer, size_t count)
+    {
+        size_t done = 0;
+        while (done < count) {
+            const ssize_t put = write(file->descriptor, static_cast<const char*>(buffer) + done, count - done);
+            if (put < 0 && errno == EINTR)
+                continue;
+            if (put <= 0)
+                break;
+            done += static_cast<size_t>(put);
+        }
+        return done;
+    }
+
+    static int Seek(Handle* file, int64_t offset, int whence)
+    {
+        if (lseek(file->descriptor, offset, whence) < 0)
+            return -1;
+        file->end = false;
+        return 0;
+    }
+
+    static int64_t Tell(Handle* file) { return lseek(file->descriptor, 0, SEEK_CUR); }
+    static bool AtEnd(const Handle* file) { return file->end; }
+    static int Flush(Handle*) { return 0; } // nothing waits here
+};
+
+} // namespace
+
+void flvd_posix_host_fill(flvd_init_t* init)
+{
+    flvd_host::FillTables<PosixFiles>(init);
+}
+
+int flvd_posix_host_open_error(void)
+{
+    return flvd_host::OpenError();
+}

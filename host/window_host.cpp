@@ -1,0 +1,153 @@
+// Host functions over POSIX descriptors with a window over each file.
+//
+// The position that the library sees is a number here; the descriptor is moved only in front of a read that does not go
+// on where it stands.
+#ifndef _FILE_OFFSET_BITS
+#define _FILE_OFFSET_BITS 64 // lseek takes and gives 64 bits on 32-bit systems too
+#endif
+
+#include "flvdmx/window_host.h"
+
+#include "host/adapter.h"
+#include "host/descriptor.h"
+
+#include <algorithm>
+#include <cerrno>
+
+#include <sys/types.h>
+#include <unistd.h>
+
+namespace {
+
+static_assert(sizeof(off_t) == sizeof(int64_t), "lseek must reach beyond 2 GiB");
+
+constexpr size_t WINDOW = FLVD_WINDOW_HOST_SIZE;
+
+struct WindowFile {
+    int descriptor;
+    bool end;              // a read met the end of the file and no seek followed
+    int64_t position;      // what the library sees
+    int64_t descriptor_at; // where the descriptor stands
+    int64_t start;         // of the window in the file
+    size_t count;          // bytes in it
+    char window[WINDOW];
+};
+
+// Reads from a place of the file on.
+size_t ReadAt(WindowFile* file, int64_t from, void* buffer, size_t least, size_t most)
+{
+    if (from != file->descriptor_at) {
+        if (lseek(file->descriptor, from, SEEK_SET) < 0)
+            return 0;
+        file->descriptor_at = from;
+    }
+    const size_t got = flvd_host::ReadAtLeast(file->descriptor, buffer, least, most, &file->end);
+    file->descriptor_at += static_cast<int64_t>(got);
+    return got;
+}
+
+// Copies what the window holds from the position on, and moves on behind it.
+size_t TakeFromWindow(WindowFile* file, char* buffer, size_t wanted)
+{
+    const int64_t offset = file->position - file->start;
+    if (offset < 0 || offset >= static_cast<int64_t>(file->count))
+        return 0;
+    const auto at = static_cast<size_t>(offset); // below WINDOW
+    const size_t n = std::min(wanted, file->count - at);
+    std::memcpy(buffer, file->window + at, n);
+    file->position += static_cast<int64_t>(n);
+    return n;
+}
+
+// Puts the window where the position is, at its start, or in its middle when it lies before the old window: the library
+// steps backward too. At least `wanted` bytes, fewer than half a window, are there behind the position unless the file
+// ends.
+void MoveWindow(WindowFile* file, size_t wanted)
+{
+    const bool back = file->position < file->start;
+    const int64_t before = back ? std::min(file->position, static_cast<int64_t>(WINDOW / 2)) : 0;
+    file->count = 0;
+    file->start = file->position - before;
+    file->count = ReadAt(file, file->start, file->window, static_cast<size_t>(before) + wanted, WINDOW);
+}
+
+struct WindowFiles {
+    using Handle = WindowFile;
+
+    static Handle* Open(const char* path, const char* mode)
+    {
+        if (!flvd_host::IsReadMode(mode)) {
+            flvd_host::SetOpenError(EACCES);
+            return nullptr;
+        }
+        const int descriptor = flvd_host::OpenDescriptor(path, mode);
+        if (descriptor < 0)
+            return nullptr;
+        auto* const file = flvd_host::NewHandle<Handle>();
+        if (file == nullptr) {
+            close(descriptor);
+            flvd_host::SetOpenError(ENOMEM);
+            return nullptr;
+        }
+        file->descriptor = descriptor;
+        return file;
+    }
+
+    static int Close(Handle* file)
+    {
+        const int result = close(file->descriptor);
+        std::free(file);
+        return result;
+    }
+
+    // What does not fit half a window goes straight to the library.
+    static size_t Read(Handle* file, void* buffer, size_t wanted)
+    {
+        auto* const to = static_cast<char*>(buffer);
+        const size_t done = TakeFromWindow(file, to, wanted);
+        const size_t rest = wanted - done;
+        if (rest == 0)
+            return done;
+        if (rest < WINDOW / 2) {
+            MoveWindow(file, rest);
+            return done + TakeFromWindow(file, to + done, rest);
+        }
+        const size_t got = ReadAt(file, file->position, to + done, rest, rest);
+        file->position += static_cast<int64_t>(got);
+        return done + got;
+    }
+
+    static int Seek(Handle* file, int64_t offset, int whence)
+    {
+        int64_t base = whence == SEEK_CUR ? file->position : 0;
+        if (whence == SEEK_END) {
+            base = lseek(file->descriptor, 0, SEEK_END);
+            if (base < 0)
+                return -1;
+            file->descriptor_at = base;
+        }
+        const int64_t target = flvd_host::Target(base, offset);
+        if (target < 0)
+            return -1;
+        file->position = target;
+        file->end = false;
+        return 0;
+    }
+
+    static size_t Write(Handle*, const void*, size_t) { return 0; }
+    static int64_t Tell(Handle* file) { return file->position; }
+    static bool AtEnd(const Handle* file) { return file->end; }
+    static int Flush(Handle*) { return 0; }
+};
+
+} // namespace
+
+void flvd_window_host_fill(flvd_init_t* init)
+{
+    flvd_host::FillTables<WindowFiles>(init);
+}
+
+int flvd_window_host_open_error(void)
+{
+    return flvd_host::OpenError();
+}

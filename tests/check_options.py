@@ -1,0 +1,49 @@
+"""Holds the manual page and the completion against what the program's --help says: commands and long options.
+
+usage: check_options.py PROGRAM MANUAL COMPLETION
+"""
+import re
+import subprocess
+import sys
+
+program, manual, completion = sys.argv[1:]
+TOP = ""
+
+
+def read(path):
+    with open(path, encoding="utf-8") as file:
+        return file.read()
+
+
+def help_of(*command):
+    return subprocess.run([program, *command, "--help"], check=True, stdout=subprocess.PIPE, text=True).stdout
+
+
+def from_help():
+    commands = re.findall(r"^  (\w+)  ", help_of().split("Subcommands:")[1], re.M)
+    texts = {TOP: help_of(), **{command: help_of(command) for command in commands}}
+    return {name: set(re.findall(r"^  (?:-\w,)?(--[\w-]+)", text, re.M)) for name, text in texts.items()}
+
+
+def from_manual():
+    sections = re.split(r"^\.Ss (\w+).*\n", read(manual).split(".Sh EXIT STATUS")[0], flags=re.M)
+    texts = {TOP: sections[0], **dict(zip(sections[1::2], sections[2::2]))}
+    items = {name: re.findall(r"^\.It (Fl .*)", text, re.M) for name, text in texts.items()}
+    found = {name: {"--" + option for line in lines for option in re.findall(r"Fl Fl ([\w-]+)", line)}
+             for name, lines in items.items()}
+    return {name: options | {"--help"} for name, options in found.items()}  # told once, for all
+
+
+def from_completion():
+    lines = re.findall(r'^ +\[(\w+)\]="(.*)"$', read(completion), re.M)
+    top = re.search(r'options\[\*\]\} (.*?)"', read(completion)).group(1)
+    return {TOP: set(top.split()), **{name: set(options.split()) for name, options in lines}}
+
+
+expected = from_help()
+assert len(expected) > 1 and all("--help" in options for options in expected.values()), expected
+for path, found in ((manual, from_manual()), (completion, from_completion())):
+    names = expected.keys() | found.keys()
+    differ = {name: (expected.get(name), found.get(name)) for name in names if expected.get(name) != found.get(name)}
+    if differ:
+        sys.exit(f"{path}: command: (in --help, there)\n{differ}")

@@ -1,0 +1,51 @@
+"""Makes the Debian packages of a build and looks at them: names, fields, dependencies and files.
+
+usage: check_packages.py CPACK BUILD VERSION TRIPLET
+"""
+import pathlib
+import re
+import subprocess
+import sys
+import tempfile
+
+cpack, build, version, triplet = sys.argv[1:]
+ARCHITECTURES = {"x86_64-linux-gnu": "amd64", "arm-linux-gnueabihf": "armhf"}
+LIB = f"usr/lib/{triplet}"
+DEV = "usr/include/flvdmx"
+EXPECTED = {
+    "libflvdmx1": ("libs", {"libc6"}, {f"{LIB}/libflvdmx.so.1", f"{LIB}/libflvdmx.so.1.0.0"}),
+    "libflvdmx-dev": ("libdevel", {f"libflvdmx1 (= {version}-1)"}, {
+        f"{DEV}/flvdmx.h", f"{DEV}/flvdmx.hpp", f"{DEV}/memory_host.h", f"{DEV}/posix_host.h", f"{DEV}/stdio_host.h",
+        f"{DEV}/window_host.h", f"{LIB}/libflvdmx.so", f"{LIB}/libflvdmx-host.a", f"{LIB}/pkgconfig/flvdmx.pc",
+        f"{LIB}/pkgconfig/flvdmx-host.pc", f"{LIB}/cmake/flvdmx/flvdmxConfig.cmake",
+        f"{LIB}/cmake/flvdmx/flvdmxConfigVersion.cmake", f"{LIB}/cmake/flvdmx/flvdmxTargets.cmake",
+        f"{LIB}/cmake/flvdmx/flvdmxTargets-release.cmake", "usr/share/man/man3/QVX_FLV_DMX.3.gz"}),
+    "flvdmx-tools": ("video", {f"libflvdmx1 (>= {version})", "libc6", "libstdc++6"}, {
+        "usr/bin/flvdmx", "usr/share/man/man1/flvdmx.1.gz", "usr/share/bash-completion/completions/flvdmx"}),
+}
+
+
+def run(*command):
+    return subprocess.run(command, check=True, stdout=subprocess.PIPE, text=True).stdout
+
+
+def check(package, name):
+    section, depends, files = EXPECTED[name]
+    fields = dict(re.findall(r"^(\S+): (.*)$", run("dpkg-deb", "-f", package), re.M))
+    wanted = {"Package": name, "Version": f"{version}-1", "Section": section, "Architecture": ARCHITECTURES[triplet]}
+    assert wanted.items() <= fields.items(), fields
+    found = fields["Depends"].split(", ")
+    assert depends <= {*found, *(text.split(" (")[0] for text in found)}, found
+    lines = run("dpkg-deb", "-c", package).splitlines()
+    assert all(line.split()[1] == "root/root" for line in lines), lines
+    doc = {f"usr/share/doc/{name}/{file}" for file in ("copyright", "NEWS.md")}
+    paths = {line.split(" ./")[1].split(" -> ")[0] for line in lines if line[0] != "d"}
+    assert paths == files | doc, paths ^ (files | doc)
+
+
+with tempfile.TemporaryDirectory() as folder:
+    run(cpack, "--config", f"{build}/CPackConfig.cmake", "-B", folder)
+    packages = {path.name.split("_")[0]: path for path in pathlib.Path(folder).glob("*.deb")}
+    assert packages.keys() == EXPECTED.keys(), packages
+    for name, package in packages.items():
+        check(package, name)

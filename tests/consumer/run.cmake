@@ -1,0 +1,42 @@
+# Installs the build into a prefix, moves that, and uses it as a user would: a C program through pkg-config, programs in
+# C and C++ through CMake, and the tool. Called with BUILD, SOURCES, LIBDIR, CC and SAMPLE.
+
+set(work ${BUILD}/consumer)
+set(prefix ${work}/moved)
+set(ENV{LD_LIBRARY_PATH} ${prefix}/${LIBDIR})
+
+function(run)
+    execute_process(COMMAND ${ARGN} OUTPUT_VARIABLE output COMMAND_ERROR_IS_FATAL ANY)
+    set(output ${output} PARENT_SCOPE)
+endfunction()
+
+function(expect text)
+    if(NOT output MATCHES ${text})
+        message(FATAL_ERROR "not found: ${text}\n${output}")
+    endif()
+endfunction()
+
+file(REMOVE_RECURSE ${work})
+run(${CMAKE_COMMAND} --install ${BUILD} --prefix ${work}/installed)
+file(RENAME ${work}/installed ${prefix})
+
+set(ENV{PKG_CONFIG_LIBDIR} ${prefix}/${LIBDIR}/pkgconfig)
+run(pkg-config --cflags --libs flvdmx-host)
+separate_arguments(flags UNIX_COMMAND "${output}")
+run(${CC} ${SOURCES}/examples/list.c -o ${work}/list ${flags})
+run(${work}/list ${SAMPLE})
+expect("H264, 160 x 120")
+
+foreach(pair IN ITEMS "C list.c H264" "CXX seek.cpp reached 1")
+    separate_arguments(pair)
+    list(POP_FRONT pair language source expected)
+    run(${CMAKE_COMMAND} -S ${SOURCES}/tests/consumer -B ${work}/${language} -G Ninja -DCMAKE_PREFIX_PATH=${prefix}
+        -DLANGUAGE=${language} -DSOURCE=${SOURCES}/examples/${source})
+    run(${CMAKE_COMMAND} --build ${work}/${language})
+    run(${work}/${language}/consumer ${SAMPLE} ${pair})
+    expect(${expected})
+endforeach()
+
+unset(ENV{LD_LIBRARY_PATH})
+run(${prefix}/bin/flvdmx info ${SAMPLE})
+expect("H.264")

@@ -1,0 +1,118 @@
+// The C++ interface: what it adds to the C interface, on samples with known contents and on files in memory.
+
+#include "flvdmx/flvdmx.hpp"
+#include "flvdmx/memory_host.h"
+#include "support/expected.h"
+
+#include <algorithm>
+#include <gtest/gtest.h>
+
+using namespace flvd_test;
+using namespace std::chrono_literals;
+using flvdmx::Kind, flvdmx::SeekMode, flvdmx::Stream;
+
+namespace {
+
+const std::string g_data = FLVDMX_TEST_DATA "/";
+
+flvd_test::Frame Copy(const flvdmx::Frame& frame)
+{
+    return {static_cast<uint32_t>(frame.stream), static_cast<uint32_t>(frame.time.count()),
+            Bytes(frame.data.begin(), frame.data.end())};
+}
+
+class Sample : public testing::TestWithParam<std::string> {};
+// All frames and what is known of the file, against what another demuxer found; one reader, and two with an own buffer.
+TEST_P(Sample, IsDescribedAndPlayed)
+{
+    const Expected expected = ReadExpected(GetParam());
+    Bytes buffer(1u << 16);
+    const flvdmx::Options apart = {0, 2000, true, false, true, false, buffer.data(), 1u << 16};
+    for (const Stream asked : {Stream::any, Stream::video, Stream::audio}) {
+        auto file = flvdmx::File::open(g_data + GetParam() + ".flv", asked == Stream::any ? flvdmx::Options() : apart);
+        ASSERT_TRUE(file) << file.error().text();
+        const flvdmx::Info info = file->info();
+        EXPECT_EQ(info.size, expected.file_size);
+        for (const ExpectedStream& stream : expected.streams) {
+            const bool video = stream.stream == FLVD_STREAM_VIDEO;
+            const flvdmx::Bytes config = video ? info.video->config : info.audio->config;
+            EXPECT_EQ(Bytes(config.begin(), config.end()), stream.extradata);
+            EXPECT_EQ(video ? info.video->width : info.audio->sample_rate, video ? stream.width : stream.sample_rate);
+        }
+        auto packets = expected.packets;
+        const auto other = static_cast<uint32_t>(asked) ^ 3; // nothing has stream 3
+        const auto is_other = [&](const ExpectedPacket& packet) { return packet.stream == other; };
+        packets.erase(std::remove_if(packets.begin(), packets.end(), is_other), packets.end());
+        size_t i = 0;
+        flvdmx::File moved(std::move(*file));
+        for (const flvdmx::Frame& frame : moved.frames(asked))
+            EXPECT_TRUE(i < packets.size() && SameFrame(packets[i++], Copy(frame))) << i;
+        EXPECT_EQ(i, packets.size());
+        EXPECT_EQ(moved.last_error().kind(), Kind::end);
+        EXPECT_STREQ(file->next_frame().error().name(), "FLVD_ERR_NO_INSTANCE");
+    }
+}
+INSTANTIATE_TEST_SUITE_P(Interface, Sample, testing::Values("avc_aac", "h263_mp3"));
+
+// Keyframes every 0.4 s: the index counts from 0, the tags from 23 ms.
+TEST(Interface, SeeksAsNamed)
+{
+    const struct {
+        std::chrono::milliseconds from, time;
+        SeekMode mode;
+        int64_t reached; /**< -1: a miss */
+    } cases[] = {{0ms, 1000ms, SeekMode::automatic, 1223},
+                 {2000ms, 1000ms, SeekMode::absolute, 823},
+                 {0ms, 1000ms, SeekMode::backward, 823},
+                 {2400ms, -500ms, SeekMode::relative, 1623},
+                 {2400ms, -500ms, SeekMode::relative | SeekMode::forward, 2023},
+                 {0ms, 2900ms, SeekMode::forward, -1},
+                 {0ms, 2900ms, SeekMode::forward | SeekMode::retry_backward, 2823},
+                 {0ms, std::chrono::hours(10000), SeekMode::to_end_on_miss, -1}};
+    for (const auto& c : cases) {
+        SCOPED_TRACE(testing::Message() << c.time.count() << " mode " << static_cast<uint32_t>(c.mode));
+        auto file = flvdmx::File::open(g_data + "avc_aac_index.flv");
+        ASSERT_TRUE(file->seek(c.from, SeekMode::forward));
+        const auto reached = file->seek(c.time, c.mode);
+        EXPECT_EQ(reached ? reached->count() : -1, c.reached);
+        EXPECT_EQ(reached.error().kind(), c.reached < 0 ? Kind::miss : Kind::none);
+        const auto next = file->next_frame();
+        EXPECT_EQ(next.error().kind(), c.mode == SeekMode::to_end_on_miss ? Kind::end : Kind::none);
+        EXPECT_TRUE(c.reached < 0 || next->time.count() == c.reached);
+    }
+}
+
+// A file that arrives 100 bytes at a time, played beside another one: no frame is lost or doubled.
+TEST(Interface, FollowsAGrowingFile)
+{
+    const Expected expected = ReadExpected("avc_aac");
+    const Bytes bytes = ReadSample("avc_aac.flv"), other_bytes = ReadSample("mp3_only.flv");
+    flvd_memory_file_t growing = {"growing", bytes.data(), 100, nullptr};
+    flvd_memory_file_t other = {"other", other_bytes.data(), other_bytes.size(), nullptr};
+    flvd_memory_host_add(&growing);
+    flvd_memory_host_add(&other);
+    const flvdmx::Host memory = flvdmx::make_host(flvd_memory_host_fill);
+    const flvdmx::Options options = {8192, 0, false, true};
+    auto file = flvdmx::File::open("growing", memory, options);
+    EXPECT_STREQ(file.error().name(), "FLVD_ERR_NO_STREAM");
+    growing.size = 2500;
+    file = flvdmx::File::open("growing", memory, options);
+    auto second = flvdmx::File::open("other", memory);
+    ASSERT_TRUE(file && second);
+    const auto wait = [&] {
+        growing.size = std::min<uint64_t>(growing.size + 100, bytes.size());
+        return growing.size < bytes.size();
+    };
+    size_t i = 0, others = 0;
+    for (auto frame = file->follow(wait); frame; frame = file->follow(wait)) {
+        EXPECT_TRUE(i < expected.packets.size() && SameFrame(expected.packets[i++], Copy(*frame))) << i;
+        others += second->next_frame() ? 1u : 0u;
+    }
+    EXPECT_EQ(i, expected.packets.size());
+    EXPECT_EQ(others, ReadExpected("mp3_only").packets.size());
+    EXPECT_EQ(file->last_error().kind(), Kind::not_yet);
+    flvd_memory_host_remove(&growing);
+    flvd_memory_host_remove(&other);
+}
+
+} // namespace

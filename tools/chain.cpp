@@ -1,0 +1,190 @@
+// The chain of tags.
+#include "tools/chain.h"
+
+#include <utility>
+
+#include <fmt/core.h>
+
+#include "tools/time_text.h"
+
+namespace tool {
+
+namespace {
+
+bool IsTagType(uint32_t type)
+{
+    return type == FLVD_TAG_TYPE_AUDIO || type == FLVD_TAG_TYPE_VIDEO || type == FLVD_TAG_TYPE_SCRIPT;
+}
+
+int64_t SizeOf(fio_file_t* reader)
+{
+    return __FLV_DMX__fioSeek64(reader, 0, FIO_SEEK_END) == 0 ? __FLV_DMX__fioTell64(reader) : 0;
+}
+
+} // namespace
+
+TagProbe::TagProbe(const Demuxer& demuxer)
+    : m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_fileSize(SizeOf(demuxer.Reader(FLVD_STREAM_VIDEO)))
+{
+}
+
+const uint8_t* TagProbe::Bytes(int64_t position, uint32_t size) const
+{
+    const uint8_t* bytes = nullptr;
+    if (position < 0 || position > m_fileSize || size > m_fileSize - position ||
+        __FLV_DMX__fioSeek64(m_reader, position, FIO_SEEK_SET) != 0)
+        return nullptr;
+    return __FLV_DMX__fioShowBytesByPtr(&bytes, size, m_reader) == size ? bytes : nullptr;
+}
+
+std::optional<Tag> TagProbe::At(int64_t position) const
+{
+    constexpr uint32_t WITH_CODEC = TAG_HEADER_SIZE + 2;
+    const uint8_t* bytes = Bytes(position, WITH_CODEC);
+    const uint32_t available = bytes != nullptr ? WITH_CODEC : TAG_HEADER_SIZE;
+    if (bytes == nullptr)
+        bytes = Bytes(position, TAG_HEADER_SIZE);
+    if (bytes == nullptr || !IsTagType(bytes[0]))
+        return std::nullopt;
+    return Tag::Parse(position, bytes, available);
+}
+
+Chain::Chain(const Demuxer& demuxer, const TagProbe& probe, uint32_t jumpMs, Findings& findings, Progress progress)
+    : m_instance(demuxer.Instance()), m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_probe(probe), m_jumpMs(jumpMs),
+      m_findings(findings), m_progress(std::move(progress)),
+      m_first(m_instance->data_offset + int64_t{BACK_POINTER_SIZE})
+{
+}
+
+void Chain::Walk()
+{
+    const uint8_t* const zeroth = m_probe.Bytes(m_instance->data_offset, BACK_POINTER_SIZE);
+    if (zeroth != nullptr && BigEndian(zeroth, BACK_POINTER_SIZE) != 0)
+        m_findings.Add("back_pointer", m_instance->data_offset,
+                       fmt::format("the back-pointer in front of the first tag is {} instead of 0",
+                                   BigEndian(zeroth, BACK_POINTER_SIZE)));
+    for (int64_t position = m_first; position < m_probe.FileSize();) {
+        m_progress(position);
+        position = Step(position);
+    }
+}
+
+// One step costs one read for most tags: the back-pointer and the next header lie together.
+int64_t Chain::Step(int64_t position)
+{
+    const std::optional<Tag> tag = m_probe.At(position);
+    if (!tag)
+        return Resume(position, tag);
+    if (IsChained(*tag)) {
+        Take(*tag);
+        return tag->End();
+    }
+    for (const int64_t next : {tag->End(), tag->DataEnd()}) {
+        if (CouldFollow(next) || (next == tag->End() && next == m_probe.FileSize())) {
+            TakeUnlinked(*tag, next);
+            return next;
+        }
+    }
+    return Resume(position, tag);
+}
+
+bool Chain::IsChained(const Tag& tag) const
+{
+    const uint8_t* const bytes = m_probe.Bytes(tag.DataEnd(), BACK_POINTER_SIZE);
+    return bytes != nullptr && BigEndian(bytes, BACK_POINTER_SIZE) == TAG_HEADER_SIZE + tag.size;
+}
+
+// Without a back-pointer to confirm it the next header must be beyond doubt: type, StreamID 0, and whole.
+bool Chain::CouldFollow(int64_t position) const
+{
+    constexpr uint32_t STREAM_ID_OFFSET = 8;
+    const std::optional<Tag> next = m_probe.At(position);
+    if (!next || next->DataEnd() > m_probe.FileSize())
+        return false;
+    const uint8_t* const bytes = m_probe.Bytes(position, TAG_HEADER_SIZE);
+    return bytes != nullptr && BigEndian(bytes + STREAM_ID_OFFSET, 3) == 0;
+}
+
+// A player passes such a tag over, unless it is the first script tag.
+void Chain::TakeUnlinked(const Tag& tag, int64_t next)
+{
+    const int64_t offset = tag.DataEnd();
+    const uint8_t* const bytes = m_probe.Bytes(offset, BACK_POINTER_SIZE);
+    if (next == offset)
+        m_findings.Add("no_back_pointer", offset, fmt::format("the tag at byte {} has no back-pointer", tag.position));
+    else if (bytes != nullptr)
+        m_findings.Add("back_pointer", offset,
+                       fmt::format("the back-pointer of the tag at byte {} is {} instead of {}", tag.position,
+                                   BigEndian(bytes, BACK_POINTER_SIZE), TAG_HEADER_SIZE + tag.size));
+    if (tag.position != m_first || tag.type != FLVD_TAG_TYPE_SCRIPT)
+        m_findings.Lose(next - tag.position);
+    Take(tag);
+}
+
+int64_t Chain::Resume(int64_t position, const std::optional<Tag>& tag)
+{
+    const int64_t found = FindTagBehind(position);
+    if (found == 0) {
+        AddRest(position, tag);
+        return m_probe.FileSize();
+    }
+    const int64_t bytes = found - position;
+    m_findings.Add("gap", position, fmt::format("{} bytes belong to no tag", bytes), {{"bytes", bytes}});
+    m_findings.Lose(bytes);
+    return found;
+}
+
+// One search covers a bounded stretch; the next one begins where it ended. 0 is no place for a tag.
+int64_t Chain::FindTagBehind(int64_t position) const
+{
+    int64_t reached = position;
+    if (__FLV_DMX__fioSeek64(m_reader, position + 1, FIO_SEEK_SET) != 0)
+        return 0;
+    for (;;) {
+        flvd_tag_info_t info{};
+        const int32_t result = FLVD_GetCurrTagInfo(m_instance, m_reader, &info,
+                                                   FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT, 1 /* verify */);
+        const int64_t found = __FLV_DMX__fioTell64(m_reader);
+        if (result == 0)
+            return found;
+        if (found <= reached || found >= m_probe.FileSize())
+            return 0;
+        m_progress(reached = found);
+    }
+}
+
+// The end of the file holds no tag any more: its last one was cut off, or something else follows.
+void Chain::AddRest(int64_t position, const std::optional<Tag>& tag)
+{
+    const int64_t rest = m_probe.FileSize() - position;
+    const uint8_t* const type = m_probe.Bytes(position, 1);
+    const bool cutHeader = rest < TAG_HEADER_SIZE && type != nullptr && IsTagType(*type);
+    m_findings.Lose(rest);
+    if (cutHeader)
+        m_findings.Add("cut_short", position, fmt::format("the last tag is cut short: {} bytes of its header", rest),
+                       {{"bytes", rest}});
+    else if (tag && tag->End() > m_probe.FileSize())
+        m_findings.Add("cut_short", position,
+                       fmt::format("the last tag is cut short: {} of its {} bytes", rest, tag->End() - position),
+                       {{"bytes", rest}});
+    else
+        m_findings.Add("gap", position, fmt::format("{} bytes behind the last tag belong to no tag", rest),
+                       {{"bytes", rest}});
+}
+
+void Chain::Take(const Tag& tag)
+{
+    ++m_tags;
+    if (!tag.IsFrame())
+        return;
+    std::optional<uint32_t>& last = m_lastTimes[tag.Stream()];
+    const bool back = last && tag.timestamp < *last;
+    if (last && (back || tag.timestamp - *last > m_jumpMs))
+        m_findings.Add("jump", tag.position,
+                       fmt::format("{} time jumps {} from {} to {}", StreamName(tag.Stream()),
+                                   back ? "back" : "forward", FormatTime(*last), FormatTime(tag.timestamp)),
+                       {{"stream", StreamName(tag.Stream())}, {"from_ms", *last}, {"to_ms", tag.timestamp}});
+    last = tag.timestamp;
+}
+
+} // namespace tool

@@ -1,0 +1,56 @@
+// A drawing in SVG, and the axes of its diagrams.
+#ifndef FLVDMX_TOOLS_SVG_H
+#define FLVDMX_TOOLS_SVG_H
+
+#include <string>
+#include <string_view>
+
+#include <fmt/format.h>
+
+namespace tool {
+
+/** @return the text as XML takes it: escaped, without control characters and broken UTF-8 */
+std::string XmlText(std::string_view text);
+
+/** Collects elements. */
+class Svg {
+public:
+    Svg(double width, double height, std::string_view style, std::string_view title);
+
+    /** Adds an element in fmt's notation. */
+    template <typename... Arguments> void Add(fmt::format_string<Arguments...> format, Arguments&&... arguments)
+    {
+        m_text += fmt::format(format, std::forward<Arguments>(arguments)...) + "\n";
+    }
+    void Line(double x1, double y1, double x2, double y2, const char* kind);
+    void Text(double x, double y, const char* kind, std::string_view text);
+
+    /** @return the whole document */
+    std::string Document() const { return m_text + "</svg>\n"; }
+
+private:
+    std::string m_text;
+};
+
+/** A range of values and the pixels it is drawn to. */
+struct Axis {
+    double low;
+    double high;
+    double from; /**< pixel of low */
+    double to;   /**< pixel of high */
+
+    double At(double value) const { return from + (value - low) / (high - low) * (to - from); }
+};
+
+/** @return distance of round ticks (1, 2 or 5 times a power of ten) of which at most `most` fit the range */
+double RoundStep(double range, int most);
+
+/** @return the same for times in seconds: minutes and hours are round as well */
+double TimeStep(double seconds, int most);
+
+/** @return a time on an axis of so many seconds with so much between its ticks */
+std::string TimeLabel(double seconds, double range, double step);
+
+} // namespace tool
+
+#endif

@@ -1,0 +1,78 @@
+// Tags as they are played.
+#include "tools/tags.h"
+
+namespace tool {
+
+uint32_t BigEndian(const uint8_t* bytes, uint32_t size)
+{
+    uint32_t value = 0;
+    for (uint32_t i = 0; i < size; ++i)
+        value = value << 8 | bytes[i];
+    return value;
+}
+
+Tag Tag::Parse(int64_t position, const uint8_t* bytes, uint32_t available)
+{
+    Tag tag{};
+    tag.position = position;
+    tag.type = bytes[0];
+    tag.size = BigEndian(bytes + 1, 3);
+    tag.timestamp = BigEndian(bytes + 4, 3) | static_cast<uint32_t>(bytes[7]) << 24;
+    if (tag.size > 0 && available > TAG_HEADER_SIZE)
+        tag.codec = bytes[TAG_HEADER_SIZE];
+    if (tag.size > 1 && available > TAG_HEADER_SIZE + 1)
+        tag.packetType = bytes[TAG_HEADER_SIZE + 1];
+    return tag;
+}
+
+// AVC configuration and end of sequence and AAC configuration hold nothing to play.
+bool Tag::IsFrame() const
+{
+    if ((!IsVideo() && !IsAudio()) || size < CodecHeaderSize())
+        return false;
+    return !IsConfig() && !(IsAvc() && packetType == 2);
+}
+
+TagReader::TagReader(const Demuxer& demuxer)
+    : m_instance(demuxer.Instance()), m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_next(m_instance->data_offset)
+{
+}
+
+// One search covers a bounded stretch of damage. While the reader comes further the next search is worth making.
+std::optional<Tag> TagReader::Next()
+{
+    int64_t reached = -1;
+    if (__FLV_DMX__fioSeek64(m_reader, m_next, FIO_SEEK_SET) != 0)
+        return std::nullopt;
+    for (;;) {
+        flvd_tag_info_t info{};
+        const int32_t result =
+            FLVD_GetCurrTagInfo(m_instance, m_reader, &info, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO, 1 /* verify */);
+        const int64_t position = __FLV_DMX__fioTell64(m_reader);
+        if (result == 0) {
+            const uint8_t* bytes = nullptr;
+            const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, TAG_HEADER_SIZE + 2, m_reader);
+            if (available < TAG_HEADER_SIZE)
+                return std::nullopt;
+            const Tag tag = Tag::Parse(position, bytes, available);
+            m_next = tag.End();
+            return tag;
+        }
+        if (position <= reached || position >= m_instance->data_end)
+            return std::nullopt;
+        reached = position;
+    }
+}
+
+std::vector<uint8_t> TagReader::Data(const Tag& tag)
+{
+    const uint32_t header = tag.CodecHeaderSize();
+    if (tag.size <= header ||
+        __FLV_DMX__fioSeek64(m_reader, tag.position + TAG_HEADER_SIZE + header, FIO_SEEK_SET) != 0)
+        return {};
+    std::vector<uint8_t> data(tag.size - header);
+    data.resize(__FLV_DMX__fioRead(data.data(), 1, static_cast<uint32_t>(data.size()), m_reader));
+    return data;
+}
+
+} // namespace tool
