@@ -2,7 +2,13 @@
 #ifndef FLVDMX_HOST_DESCRIPTOR_H
 #define FLVDMX_HOST_DESCRIPTOR_H
 
+#include "host/adapter.h"
+
+#include <cerrno>
 #include <cstddef>
+#include <cstdlib>
+
+#include <unistd.h>
 
 namespace flvd_host {
 
@@ -16,6 +22,30 @@ int OpenDescriptor(const char* path, const char* mode);
  * @return bytes read; fewer than `least`: the end was met, or reading failed
  */
 size_t ReadAtLeast(int descriptor, void* buffer, size_t least, size_t most, bool* end);
+
+/** Opens a file as a handle with a member `descriptor`, the others being zero. @return null as OpenDescriptor() */
+template <typename Handle> Handle* OpenHandle(const char* path, const char* mode)
+{
+    const int descriptor = OpenDescriptor(path, mode);
+    if (descriptor < 0)
+        return nullptr;
+    auto* const file = NewHandle<Handle>();
+    if (file == nullptr) {
+        close(descriptor);
+        SetOpenError(ENOMEM);
+        return nullptr;
+    }
+    file->descriptor = descriptor;
+    return file;
+}
+
+/** Closes what OpenHandle() opened. @return close()'s result */
+template <typename Handle> int CloseHandle(Handle* file)
+{
+    const int result = close(file->descriptor);
+    std::free(file);
+    return result;
+}
 
 } // namespace flvd_host
 

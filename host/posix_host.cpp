@@ -23,27 +23,9 @@ struct PosixFiles {
         bool end; // a read met the end of the file and no seek followed
     };
 
-    static Handle* Open(const char* path, const char* mode)
-    {
-        const int descriptor = flvd_host::OpenDescriptor(path, mode);
-        if (descriptor < 0)
-            return nullptr;
-        auto* const file = flvd_host::NewHandle<Handle>();
-        if (file == nullptr) {
-            close(descriptor);
-            flvd_host::SetOpenError(ENOMEM);
-            return nullptr;
-        }
-        file->descriptor = descriptor;
-        return file;
-    }
+    static Handle* Open(const char* path, const char* mode) { return flvd_host::OpenHandle<Handle>(path, mode); }
 
-    static int Close(Handle* file)
-    {
-        const int result = close(file->descriptor);
-        std::free(file);
-        return result;
-    }
+    static int Close(Handle* file) { return flvd_host::CloseHandle(file); }
 
     static size_t Read(Handle* file, void* buffer, size_t wanted)
     {

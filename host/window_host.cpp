@@ -80,25 +80,10 @@ struct WindowFiles {
             flvd_host::SetOpenError(EACCES);
             return nullptr;
         }
-        const int descriptor = flvd_host::OpenDescriptor(path, mode);
-        if (descriptor < 0)
-            return nullptr;
-        auto* const file = flvd_host::NewHandle<Handle>();
-        if (file == nullptr) {
-            close(descriptor);
-            flvd_host::SetOpenError(ENOMEM);
-            return nullptr;
-        }
-        file->descriptor = descriptor;
-        return file;
+        return flvd_host::OpenHandle<Handle>(path, mode);
     }
 
-    static int Close(Handle* file)
-    {
-        const int result = close(file->descriptor);
-        std::free(file);
-        return result;
-    }
+    static int Close(Handle* file) { return flvd_host::CloseHandle(file); }
 
     // What does not fit half a window goes straight to the library.
     static size_t Read(Handle* file, void* buffer, size_t wanted)
