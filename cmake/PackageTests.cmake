@@ -44,7 +44,8 @@ foreach(target IN ITEMS flvdmx flvdmx-behind)
     endif()
 endforeach()
 
-set(doxygen ${CMAKE_COMMAND} -E env FLVDMX_VERSION=${PROJECT_VERSION} FLVDMX_DOCS=${PROJECT_BINARY_DIR}/docs
-    ${DOXYGEN} ${PROJECT_SOURCE_DIR}/docs/Doxyfile)
-add_custom_target(docs VERBATIM COMMAND ${doxygen} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
-add_test(NAME reference COMMAND ${doxygen} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
+add_custom_target(docs VERBATIM WORKING_DIRECTORY ${PROJECT_SOURCE_DIR}
+    COMMAND ${CMAKE_COMMAND} -E env FLVDMX_VERSION=${PROJECT_VERSION} FLVDMX_DOCS=${PROJECT_BINARY_DIR}/docs
+        ${DOXYGEN} docs/Doxyfile)
+flvdmx_python_test(reference check_reference.py ${DOXYGEN} docs/Doxyfile ${PROJECT_BINARY_DIR}/reference)
+set_tests_properties(reference PROPERTIES WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})

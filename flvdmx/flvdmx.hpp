@@ -37,7 +37,7 @@
 #include <string_view>
 #include <utility>
 
-// The stdio host of the kit. Only those who open without a Host need it: they link flvdmx-host.
+/** The stdio host of the kit. Only those who open without a Host need it: they link flvdmx-host. */
 extern "C" void flvd_stdio_host_fill(flvd_init_t* init);
 
 namespace flvdmx {
@@ -45,6 +45,7 @@ namespace flvdmx {
 /** Held during every open, for the process-wide tables and the globals in which a failed open leaves its error. */
 inline std::mutex open_mutex;
 
+/** Every time and duration. */
 using Milliseconds = std::chrono::milliseconds;
 
 /** The host's functions: an flvd_init_t of which all but the functions is ignored. */
@@ -62,13 +63,14 @@ inline Host make_host(void (*fill)(flvd_init_t*))
 class Bytes {
 public:
     constexpr Bytes() = default;
+    /** Borrows `size` bytes from `data` on. */
     constexpr Bytes(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
-    constexpr const uint8_t* data() const { return m_data; }
-    constexpr size_t size() const { return m_size; }
-    constexpr bool empty() const { return m_size == 0; }
-    constexpr const uint8_t* begin() const { return m_data; }
-    constexpr const uint8_t* end() const { return m_data + m_size; }
-    constexpr uint8_t operator[](size_t i) const { return m_data[i]; }
+    constexpr const uint8_t* data() const { return m_data; }           /**< the first; null when there is none */
+    constexpr size_t size() const { return m_size; }                   /**< their number */
+    constexpr bool empty() const { return m_size == 0; }               /**< true without bytes */
+    constexpr const uint8_t* begin() const { return m_data; }          /**< the first */
+    constexpr const uint8_t* end() const { return m_data + m_size; }   /**< behind the last */
+    constexpr uint8_t operator[](size_t i) const { return m_data[i]; } /**< byte `i`, not checked */
 
 private:
     const uint8_t* m_data = nullptr;
@@ -129,9 +131,10 @@ inline constexpr ErrorText error_texts[] = {
 class error {
 public:
     constexpr error() = default;
+    /** From the library's code and line. */
     constexpr error(Kind kind, int32_t code, int32_t line) : m_kind(kind), m_code(code), m_line(line) {}
 
-    constexpr Kind kind() const { return m_kind; }
+    constexpr Kind kind() const { return m_kind; }    /**< what it means for the caller */
     constexpr int32_t code() const { return m_code; } /**< FLVD_ERR_* */
     constexpr int32_t line() const { return m_line; } /**< number of the place of failure, the same in every release */
     constexpr const char* name() const { return find().name; } /**< such as "FLVD_ERR_SEEK" */
@@ -155,15 +158,15 @@ private:
 /** A value, or the error that took its place. Access to a value that is not there is undefined: test first. */
 template <typename T> class [[nodiscard]] result {
 public:
-    result(T value) : m_value(std::move(value)) {}
-    result(const flvdmx::error& error) : m_error(error) {}
+    result(T value) : m_value(std::move(value)) {}         /**< success */
+    result(const flvdmx::error& error) : m_error(error) {} /**< failure */
 
-    explicit operator bool() const { return m_value.has_value(); }
-    T& operator*() { return *m_value; }
-    const T& operator*() const { return *m_value; }
-    T* operator->() { return &*m_value; }
-    const T* operator->() const { return &*m_value; }
-    const flvdmx::error& error() const { return m_error; } /**< of Kind::none when there is a value */
+    explicit operator bool() const { return m_value.has_value(); } /**< true when there is a value */
+    T& operator*() { return *m_value; }                            /**< the value */
+    const T& operator*() const { return *m_value; }                /**< the value */
+    T* operator->() { return &*m_value; }                          /**< of the value */
+    const T* operator->() const { return &*m_value; }              /**< of the value */
+    const flvdmx::error& error() const { return m_error; }         /**< of Kind::none when there is a value */
 
 private:
     std::optional<T> m_value;
@@ -174,22 +177,22 @@ private:
 
 /** A stream. */
 enum class Stream : uint32_t {
-    any = 0, /**< in requests, without a separate audio reader: whatever comes next */
-    video = FLVD_STREAM_VIDEO,
-    audio = FLVD_STREAM_AUDIO
+    any = 0,                   /**< in requests, without a separate audio reader: whatever comes next */
+    video = FLVD_STREAM_VIDEO, /**< video */
+    audio = FLVD_STREAM_AUDIO  /**< audio */
 };
 
 /** One frame, as the codec wants it: without FLV's headers. */
 struct Frame {
-    Stream stream = Stream::any;
+    Stream stream = Stream::any; /**< video or audio */
     Milliseconds time{}; /**< from the file's first timestamp, in decoding order; negative: a tag in front of that */
     Bytes data;          /**< valid until the next call on the file */
 };
 
 /** The video stream; 0 in all that the file does not tell. */
 struct VideoInfo {
-    uint32_t width = 0;
-    uint32_t height = 0;
+    uint32_t width = 0;           /**< pixels */
+    uint32_t height = 0;          /**< pixels */
     double frame_rate = 0.0;      /**< frames a second, from the metadata */
     std::string_view fourcc;      /**< as in flvd_video_info_t, empty for an unknown codec */
     Bytes config;                 /**< AVC: AVCDecoderConfigurationRecord */
@@ -200,23 +203,27 @@ struct VideoInfo {
 struct AudioInfo {
     uint32_t sample_rate = 0; /**< Hz */
     uint32_t sample_size = 0; /**< bits */
-    uint32_t channels = 0;
-    uint32_t format_tag = 0; /**< FLVD_AUDIO_TAG_*, 0 for every other format */
-    uint32_t data_rate = 0;  /**< kbit/s */
-    Bytes config;            /**< AAC: AudioSpecificConfig */
+    uint32_t channels = 0;    /**< their number */
+    uint32_t format_tag = 0;  /**< FLVD_AUDIO_TAG_*, 0 for every other format */
+    uint32_t data_rate = 0;   /**< kbit/s */
+    Bytes config;             /**< AAC: AudioSpecificConfig */
 };
 
 /** How a file can be seeked in. */
-enum class SeekMethod : uint32_t { none = FLVD_SEEK_NONE, by_index = FLVD_SEEK_BY_INDEX, by_scan = FLVD_SEEK_BY_SCAN };
+enum class SeekMethod : uint32_t {
+    none = FLVD_SEEK_NONE,         /**< not at all */
+    by_index = FLVD_SEEK_BY_INDEX, /**< by the metadata's keyframe index */
+    by_scan = FLVD_SEEK_BY_SCAN    /**< by stepping from tag to tag */
+};
 
 /** What is known of a file; views of it are valid until the file is closed. */
 struct Info {
-    std::string_view path;
-    Milliseconds duration{}; /**< 0 when unknown, as of a growing file */
-    int64_t size = 0;        /**< bytes, 0 for a growing file */
-    SeekMethod seek_method = SeekMethod::none;
-    std::optional<VideoInfo> video;
-    std::optional<AudioInfo> audio;
+    std::string_view path;                     /**< as given to open() */
+    Milliseconds duration{};                   /**< 0 when unknown, as of a growing file */
+    int64_t size = 0;                          /**< bytes, 0 for a growing file */
+    SeekMethod seek_method = SeekMethod::none; /**< how to seek in it */
+    std::optional<VideoInfo> video;            /**< the video stream, if there is one */
+    std::optional<AudioInfo> audio;            /**< the audio stream, if there is one */
 };
 
 /* -------------------------------------------------------------------------------- how it is opened */
@@ -237,15 +244,16 @@ struct Options {
 
 /** How to seek; modes are combined with |. */
 enum class SeekMode : uint32_t {
-    automatic = 0, /**< forward, unless the target is earlier than the current position */
-    absolute = 0,  /**< the time counts from the file's first timestamp */
-    backward = FLVD_SEEK_BACKWARD,
-    forward = FLVD_SEEK_FORWARD,
-    relative = FLVD_SEEK_RELATIVE,
-    to_end_on_miss = FLVD_SEEK_TO_END_ON_MISS,
-    retry_backward = FLVD_SEEK_RETRY_BACKWARD
+    automatic = 0,                             /**< forward, unless the target is earlier than the current position */
+    absolute = 0,                              /**< the time counts from the file's first timestamp */
+    backward = FLVD_SEEK_BACKWARD,             /**< to the keyframe at or before the time */
+    forward = FLVD_SEEK_FORWARD,               /**< to the keyframe at or after the time */
+    relative = FLVD_SEEK_RELATIVE,             /**< the time counts from the current position */
+    to_end_on_miss = FLVD_SEEK_TO_END_ON_MISS, /**< after a miss go to the end */
+    retry_backward = FLVD_SEEK_RETRY_BACKWARD  /**< after a miss try backward, the time being absolute */
 };
 
+/** Both modes. */
 constexpr SeekMode operator|(SeekMode a, SeekMode b)
 {
     return static_cast<SeekMode>(static_cast<uint32_t>(a) | static_cast<uint32_t>(b));
@@ -286,7 +294,9 @@ public:
         return open(path, make_host(flvd_stdio_host_fill), options);
     }
 
+    /** Takes the open file over. */
     File(File&& other) noexcept { swap(other); }
+    /** Closes this file and takes the other over. */
     File& operator=(File&& other) noexcept
     {
         File taken(std::move(other));
@@ -295,7 +305,7 @@ public:
     }
     File(const File&) = delete;
     File& operator=(const File&) = delete;
-    ~File() { close(); }
+    ~File() { close(); } /**< closes the file */
 
     /** Closes the file; all views of it end. */
     void close()
@@ -306,11 +316,12 @@ public:
         m_info = {};
     }
 
-    bool is_open() const { return m_instance != nullptr; }
+    bool is_open() const { return m_instance != nullptr; } /**< false when closed or moved from */
 
     /** The C interface's instance, for what is not wrapped here; null when nothing is open. */
     flvd_ctx_t* instance() const { return m_instance; }
 
+    /** What is in the file; empty when nothing is open. */
     Info info() const
     {
         Info info;
@@ -355,7 +366,8 @@ public:
      * The next frame of a growing file. While there is none yet, `wait` is called and the file is asked again; when
      * `wait` returns false, because writing has stopped, it is asked one last time.
      *
-     * @param wait bool(): sleeps for a while, true when the file may have grown since
+     * @param wait   bool(): sleeps for a while, true when the file may have grown since
+     * @param stream as of next_frame()
      * @return as next_frame()
      */
     template <typename Wait> result<Frame> follow(Wait&& wait, Stream stream = Stream::any)
@@ -376,6 +388,7 @@ public:
      *
      * @param time from the first timestamp; with SeekMode::relative from the current position. What does not fit 32
      *             bits counts as the greatest or least time that does.
+     * @param mode how to get there
      * @return the time reached, from the first timestamp; Kind::miss; Kind::failed
      */
     result<Milliseconds> seek(Milliseconds time, SeekMode mode = SeekMode::automatic)
@@ -492,29 +505,30 @@ public:
     /** The place in the range; all of them of one range are the same place. */
     class Iterator {
     public:
-        explicit Iterator(FrameRange* range) : m_range(range) {}
-        const Frame& operator*() const { return *m_range->m_frame; }
-        const Frame* operator->() const { return &*m_range->m_frame; }
+        explicit Iterator(FrameRange* range) : m_range(range) {}       /**< of a range whose frame was taken */
+        const Frame& operator*() const { return *m_range->m_frame; }   /**< the frame */
+        const Frame* operator->() const { return &*m_range->m_frame; } /**< of the frame */
+        /** Takes the next frame. */
         Iterator& operator++()
         {
             m_range->advance();
             return *this;
         }
-        bool operator!=(Sentinel) const { return static_cast<bool>(m_range->m_frame); }
-        bool operator==(Sentinel) const { return !m_range->m_frame; }
+        bool operator!=(Sentinel) const { return static_cast<bool>(m_range->m_frame); } /**< true at a frame */
+        bool operator==(Sentinel) const { return !m_range->m_frame; }                   /**< true behind the last */
 
     private:
         FrameRange* m_range;
     };
 
-    FrameRange(File& file, Stream stream) : m_file(file), m_stream(stream) {}
+    FrameRange(File& file, Stream stream) : m_file(file), m_stream(stream) {} /**< see File::frames() */
     /** Takes the first frame. */
     Iterator begin()
     {
         advance();
         return Iterator(this);
     }
-    static Sentinel end() { return {}; }
+    static Sentinel end() { return {}; } /**< where every range ends */
 
 private:
     void advance() { m_frame = m_file.next_frame(m_stream); }
