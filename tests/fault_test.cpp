@@ -253,7 +253,7 @@ std::vector<Scenario> Scenarios()
     const auto is_second = [](const Tag& tag) { return tag.is_keyframe() && tag.timestamp == 200; };
     const int64_t second_key = std::find_if(indexed.tags.begin(), indexed.tags.end(), is_second)->offset;
     Flv damaged = chain, last = File({chain.tags.begin() + 1, chain.tags.end()});
-    std::fill_n(damaged.bytes.begin() + damaged.tags[6].offset, damaged.tags[6].size(), uint8_t{0xEE});
+    std::fill_n(&damaged.bytes[static_cast<size_t>(damaged.tags[6].offset)], damaged.tags[6].size(), uint8_t{0xEE});
     damaged.tags.erase(damaged.tags.begin() + 6);
     last.tags.push_back(g_meta);
     return {
