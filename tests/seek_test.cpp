@@ -231,7 +231,7 @@ struct Player {
         if (rc == 0 && what != What::Stay) {
             const size_t pos = Told(reader()), chosen = what == What::Rewind ? FIRST_TAG : entry.pos;
             const bool tag = pos > FIRST_TAG && pos < m.bytes.size(); // else at one of the ends
-            const uint64_t size = tag ? Big(m.bytes, pos + 1, 3) : 0;
+            const auto size = static_cast<size_t>(tag ? Big(m.bytes, pos + 1, 3) : 0);
             EXPECT_TRUE(!tag || Big(m.bytes, pos + 11 + size, 4) == size + 11) << pos;
             place(pos, tag ? TagTime(m.bytes, pos) : pos <= FIRST_TAG ? m.first_ts : m.last_ts);
             // a sound may as well be found at its configuration
