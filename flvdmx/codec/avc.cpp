@@ -49,6 +49,7 @@ constexpr int32_t FLVD_SPS_SEARCH_MIN = 5; // start code, NAL header and one byt
 constexpr uint32_t FLVD_NAL_TYPE_MASK = 0x1F;
 constexpr uint32_t FLVD_NAL_SPS = 7;
 constexpr uint32_t FLVD_UE_MAX_ZEROS = 32;
+constexpr uint32_t FLVD_UE_IN_WINDOW = 1u << 19; // at most 12 zeros: the code has no more than 25 bits
 constexpr uint32_t FLVD_UE_INVALID = 0xFFFFFFFF; // value of a code that no standard encoder writes
 constexpr uint32_t FLVD_SCALING_LISTS = 8;       // also for 4:4:4, where later editions have twelve
 constexpr uint32_t FLVD_SCALING_LISTS_4X4 = 6;
@@ -76,20 +77,33 @@ uint32_t FLVD_SpsByte(int32_t index)
     return index < g_flvd_spsSize ? g_flvd_spsBits.start[index] : 0u;
 }
 
-// u(n). Read through a window of four bytes: up to 25 bits are exact at any position, above that low bits may be 0.
-uint32_t FLVD_SpsGetBits(uint32_t n)
+// The next bits, from four bytes: 25 of them are exact at any position, low bits may be 0.
+uint32_t FLVD_SpsWindow()
 {
     const int32_t byte = g_flvd_spsBits.bit_pos >> 3;
-    const uint32_t window =
-        FLVD_SpsByte(byte) << 24 | FLVD_SpsByte(byte + 1) << 16 | FLVD_SpsByte(byte + 2) << 8 | FLVD_SpsByte(byte + 3);
-    const uint32_t aligned = window << (static_cast<uint32_t>(g_flvd_spsBits.bit_pos) & 7u);
+    const uint32_t window = byte <= g_flvd_spsSize - 4
+                                ? FLVD_GetBE32(g_flvd_spsBits.start + byte)
+                                : FLVD_SpsByte(byte) << 24 | FLVD_SpsByte(byte + 1) << 16 | FLVD_SpsByte(byte + 2) << 8;
+    return window << (static_cast<uint32_t>(g_flvd_spsBits.bit_pos) & 7u);
+}
+
+// u(n).
+uint32_t FLVD_SpsGetBits(uint32_t n)
+{
+    const uint32_t window = FLVD_SpsWindow();
     g_flvd_spsBits.bit_pos += static_cast<int32_t>(n);
-    return n == 0 ? 0 : aligned >> (32 - n);
+    return n == 0 ? 0 : window >> (32 - n);
 }
 
 // ue(v), ISO/IEC 14496-10, 9.1.
 uint32_t FLVD_SpsGetUE()
 {
+    const uint32_t window = FLVD_SpsWindow();
+    if (window >= FLVD_UE_IN_WINDOW) {
+        const int32_t prefix = __builtin_clz(window);
+        g_flvd_spsBits.bit_pos += 2 * prefix + 1;
+        return (window >> (31 - 2 * prefix)) - 1;
+    }
     uint32_t zeros = 0;
     while (FLVD_SpsGetBits(1) == 0)
         if (++zeros == FLVD_UE_MAX_ZEROS)
@@ -220,9 +234,8 @@ int32_t FLVD_ParseH264SPS(flvd_video_info_t* info, const uint8_t* data, int32_t 
     g_flvd_spsBits = {0, data + payload};
     g_flvd_spsSize = length - payload;
     const uint32_t profile_idc = FLVD_SpsGetBits(8);
-    FLVD_SpsGetBits(8); // constraint flags
-    FLVD_SpsGetBits(8); // level_idc
-    FLVD_SpsGetUE();    // seq_parameter_set_id
+    FLVD_SpsGetBits(8 + 8); // constraint flags, level_idc
+    FLVD_SpsGetUE();        // seq_parameter_set_id
     const uint32_t chroma_format_idc = FLVD_IsHighProfile(profile_idc) ? FLVD_SpsReadHighProfile() : FLVD_CHROMA_420;
     FLVD_SpsGetUE(); // log2_max_frame_num_minus4
     if (!FLVD_SpsSkipPictureOrder())

@@ -68,11 +68,25 @@ uint32_t FLVD_FioHostWrite(fio_file_t* file, const void* source, uint32_t n)
 
 } // namespace
 
+uint32_t FLVD_FioReadBytes(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    if (file->state == FIO_STATE_WRITE)
+        __FLV_DMX__fioFlush(file);
+    file->state = FIO_STATE_READ;
+    FLVD_FioDropBits(file);
+    const uint32_t cached = std::min(n, file->count);
+    FLVD_FioTake(file, destination, cached);
+    if (n == cached && file->count != 0)
+        return n;
+    return n - FLVD_FioReadUncached(file, destination + cached, n - cached);
+}
+
 uint32_t __FLV_DMX__fioShowBytesByCopy(void* destination, uint32_t n, fio_file_t* file)
 {
-    const uint32_t available = FLVD_FioRefill(file, n);
+    const uint8_t* bytes = nullptr;
+    const uint32_t available = FLVD_FioPeek(&bytes, n, file);
     if (available != 0)
-        g_flvd_fioFuncs.mem_copy(destination, file->cache + file->head, available);
+        g_flvd_fioFuncs.mem_copy(destination, bytes, available);
     return available;
 }
 
@@ -80,20 +94,7 @@ uint32_t __FLV_DMX__fioRead(void* destination, uint32_t size, uint32_t count, fi
 {
     if (!FLVD_FioIsBlock(size, count))
         return 0;
-    const uint32_t total = size * count;
-    if (file->state == FIO_STATE_WRITE)
-        __FLV_DMX__fioFlush(file);
-    file->state = FIO_STATE_READ;
-    FLVD_FioDropBits(file);
-    auto* const bytes = static_cast<uint8_t*>(destination);
-    if (total < file->count) {
-        FLVD_FioTake(file, bytes, total);
-        return count;
-    }
-    const uint32_t cached = file->count;
-    FLVD_FioTake(file, bytes, cached);
-    const uint32_t missing = FLVD_FioReadUncached(file, bytes + cached, total - cached);
-    return (total - missing) / size;
+    return FLVD_FioReadBytes(file, static_cast<uint8_t*>(destination), size * count) / size;
 }
 
 uint32_t __FLV_DMX__fioWrite(const void* source, uint32_t size, uint32_t count, fio_file_t* file)
@@ -125,10 +126,7 @@ uint32_t __FLV_DMX__fioWrite(const void* source, uint32_t size, uint32_t count, 
 
 int32_t __FLV_DMX__fioSetCacheReadSize(fio_file_t* file, uint32_t size)
 {
-    if (size > file->capacity)
-        return 0;
-    file->read_size = size == FLVD_WHOLE_CACHE ? file->capacity : size;
-    return 1;
+    return FLVD_FioSetReadSize(file, size) ? 1 : 0;
 }
 
 uint32_t __FLV_DMX__fioGetCacheReadSize(fio_file_t* file)

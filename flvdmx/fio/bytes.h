@@ -6,22 +6,22 @@
 #include <cstdint>
 #include <cstring>
 
-constexpr uint32_t FLVD_GetBE16(const uint8_t* p)
+[[gnu::always_inline]] constexpr uint32_t FLVD_GetBE16(const uint8_t* p)
 {
     return uint32_t{p[0]} << 8 | p[1];
 }
 
-constexpr uint32_t FLVD_GetBE24(const uint8_t* p)
+[[gnu::always_inline]] constexpr uint32_t FLVD_GetBE24(const uint8_t* p)
 {
     return uint32_t{p[0]} << 16 | uint32_t{p[1]} << 8 | p[2];
 }
 
-constexpr uint32_t FLVD_GetBE32(const uint8_t* p)
+[[gnu::always_inline]] constexpr uint32_t FLVD_GetBE32(const uint8_t* p)
 {
     return uint32_t{p[0]} << 24 | uint32_t{p[1]} << 16 | uint32_t{p[2]} << 8 | p[3];
 }
 
-constexpr uint64_t FLVD_GetBE64(const uint8_t* p)
+[[gnu::always_inline]] constexpr uint64_t FLVD_GetBE64(const uint8_t* p)
 {
     return uint64_t{FLVD_GetBE32(p)} << 32 | FLVD_GetBE32(p + 4);
 }

@@ -7,7 +7,6 @@
 #include "flvdmx/fio/tables.h"
 
 #include <algorithm>
-#include <cstring>
 #include <iterator>
 
 namespace {
@@ -15,7 +14,6 @@ namespace {
 constexpr uint32_t FIO_ACCESS_MASK = 0x71;
 constexpr uint32_t FIO_FORMAT_MASK = 0x300;
 constexpr uint32_t FIO_SKIP_FAILED = 0xFFFFFFFF;
-constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62;
 constexpr size_t FIO_MODE_TEXT_MAX = 4; // "r+b" and its NUL
 
 struct fio_access_t {
@@ -73,15 +71,6 @@ fio_file_t* FLVD_FioAllocate(uint32_t cache_size, uint32_t extra, void* handle)
     if (file != nullptr)
         g_flvd_fioFuncs.mem_free(file);
     return nullptr;
-}
-
-// Logical position from the host's; -1 when the query failed. A position that no file can have is a failed query:
-// adding sizes to positions never overflows.
-int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
-{
-    if (static_cast<uint64_t>(host) > uint64_t{FIO_POSITION_MAX})
-        return -1;
-    return file->state == FIO_STATE_READ ? host - file->count : host + file->count;
 }
 
 enum class FioWidth { Bits32, Bits64 };
@@ -166,28 +155,12 @@ int32_t __FLV_DMX__fioTell(fio_file_t* file)
 
 int64_t __FLV_DMX__fioTell64(fio_file_t* file)
 {
-    const int64_t host = g_flvd_fioFuncs.file_tell64 != nullptr ? g_flvd_fioFuncs.file_tell64(file->handle)
-                                                                : g_flvd_fioFuncs.file_tell(file->handle);
-    return FLVD_FioLogical(file, host);
+    return FLVD_FioTell(file);
 }
 
 int32_t __FLV_DMX__fioIsEof(fio_file_t* file)
 {
     return file->count != 0 ? 0 : g_flvd_fioFuncs.file_eof(file->handle);
-}
-
-uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n)
-{
-    const uint32_t got = g_flvd_fioFuncs.file_read(destination, 1, n, file->handle);
-    return got <= n ? got : 0;
-}
-
-void FLVD_FioCompact(fio_file_t* file)
-{
-    if (file->head == 0)
-        return;
-    std::memmove(file->cache, file->cache + file->head, file->count);
-    file->head = 0;
 }
 
 uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
@@ -201,18 +174,14 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
         return n;
     FLVD_FioCompact(file);
     const uint32_t want = std::max(n, file->read_size);
-    const uint32_t ask = std::min(file->overread != 0 ? want : want - file->count, allocated - file->count);
-    file->count += FLVD_FioHostRead(file, file->cache + file->count, ask);
+    const uint32_t kept = file->overread != 0 ? 0 : file->count;
+    file->count += FLVD_FioHostRead(file, file->cache + file->count, std::min(want - kept, allocated - file->count));
     return std::min(file->count, n);
 }
 
 uint32_t __FLV_DMX__fioShowBytesByPtr(const uint8_t** bytes, uint32_t n, fio_file_t* file)
 {
-    if (file->state == FIO_STATE_WRITE)
-        return 0;
-    const uint32_t available = FLVD_FioRefill(file, n);
-    *bytes = file->cache + file->head;
-    return available;
+    return file->state != FIO_STATE_WRITE ? FLVD_FioPeek(bytes, n, file) : 0;
 }
 
 uint32_t __FLV_DMX__fioSkipBytes(uint32_t n, fio_file_t* file)

@@ -2,20 +2,33 @@
 #ifndef FLVDMX_FIO_FIO_H
 #define FLVDMX_FIO_FIO_H
 
+#include "flvdmx/fio/tables.h"
 #include "flvdmx/flvdmx.h"
 
+#include <cstring>
+
+constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62;
 constexpr uint32_t FLVD_WHOLE_CACHE = 0; // as a refill quantum: the capacity of the file's cache
 
 // Reads up to n bytes from the host. One that claims more than it was asked for has failed: nothing it says is
 // believed.
-uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n);
+inline uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n)
+{
+    const uint32_t got = g_flvd_fioFuncs.file_read(destination, 1, n, file->handle);
+    return got <= n ? got : 0;
+}
 
 // Moves the cached bytes to the front of the cache.
-void FLVD_FioCompact(fio_file_t* file);
+inline void FLVD_FioCompact(fio_file_t* file)
+{
+    if (file->head == 0)
+        return;
+    std::memmove(file->cache, file->cache + file->head, file->count);
+    file->head = 0;
+}
 
-// Makes up to n bytes visible at cache + head with at most one host read; the logical position stays.
-// Returns how many are, or 0 in the writing state.
-uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
+// Reads and consumes up to n bytes: what is cached, then with host reads. Returns how many there were.
+uint32_t FLVD_FioReadBytes(fio_file_t* file, uint8_t* destination, uint32_t n);
 
 // What every access but a peek does: the bit reader's bits are no longer those at the position.
 inline void FLVD_FioDropBits(fio_file_t* file)
@@ -25,24 +38,28 @@ inline void FLVD_FioDropBits(fio_file_t* file)
 }
 
 // Consumes n cached bytes, n being at most file->count.
-inline void FLVD_FioConsume(fio_file_t* file, uint32_t n)
+[[gnu::always_inline]] inline void FLVD_FioConsume(fio_file_t* file, uint32_t n)
 {
     file->count -= n;
     file->head = file->count == 0 ? 0 : file->head + n;
 }
 
+// Makes up to n bytes visible at cache + head with at most one host read; the logical position stays.
+// Returns how many are, or 0 in the writing state.
+uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
+
 // __FLV_DMX__fioShowBytesByPtr, without a call when the bytes are cached: most of the work on a frame is peeks and
 // skips.
-inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
+[[gnu::always_inline]] inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
-        return __FLV_DMX__fioShowBytesByPtr(bytes, n, file);
+        n = FLVD_FioRefill(file, n);
     *bytes = file->cache + file->head;
     return n;
 }
 
 // __FLV_DMX__fioSkipBytes in the same way. The bit reader's own skips do not come through here.
-inline uint32_t FLVD_FioSkip(uint32_t n, fio_file_t* file)
+[[gnu::always_inline]] inline uint32_t FLVD_FioSkip(uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
         return __FLV_DMX__fioSkipBytes(n, file);
@@ -57,6 +74,32 @@ inline bool FLVD_FioAtEnd(fio_file_t* file)
     return file->count == 0 && __FLV_DMX__fioIsEof(file) != 0;
 }
 
+// Logical position from the host's; -1 when the query failed. A position that no file can have is a failed query:
+// adding sizes to positions never overflows.
+inline int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
+{
+    if (static_cast<uint64_t>(host) > uint64_t{FIO_POSITION_MAX})
+        return -1;
+    return file->state == FIO_STATE_READ ? host - file->count : host + file->count;
+}
+
+// __FLV_DMX__fioTell64 for the playing path, which asks twice a frame.
+inline int64_t FLVD_FioTell(const fio_file_t* file)
+{
+    const int64_t host = g_flvd_fioFuncs.file_tell64 != nullptr ? g_flvd_fioFuncs.file_tell64(file->handle)
+                                                                : g_flvd_fioFuncs.file_tell(file->handle);
+    return FLVD_FioLogical(file, host);
+}
+
+// __FLV_DMX__fioSetCacheReadSize in the same way.
+inline bool FLVD_FioSetReadSize(fio_file_t* file, uint32_t size)
+{
+    if (size > file->capacity)
+        return false;
+    file->read_size = size == FLVD_WHOLE_CACHE ? file->capacity : size;
+    return true;
+}
+
 inline void FLVD_FioEmpty(fio_file_t* file)
 {
     file->head = 0;
@@ -69,9 +112,9 @@ class FLVD_ReadSizeGuard {
 public:
     FLVD_ReadSizeGuard(fio_file_t* file, uint32_t during, uint32_t after) : m_file(file), m_after(after)
     {
-        __FLV_DMX__fioSetCacheReadSize(m_file, during);
+        FLVD_FioSetReadSize(m_file, during);
     }
-    ~FLVD_ReadSizeGuard() { __FLV_DMX__fioSetCacheReadSize(m_file, m_after); }
+    ~FLVD_ReadSizeGuard() { FLVD_FioSetReadSize(m_file, m_after); }
     FLVD_ReadSizeGuard(const FLVD_ReadSizeGuard&) = delete;
     FLVD_ReadSizeGuard& operator=(const FLVD_ReadSizeGuard&) = delete;
 

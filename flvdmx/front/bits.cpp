@@ -21,15 +21,24 @@ void FLVD_BitConsumeBytes(fio_file_t* file, uint32_t n)
     file->bit_skip_pending = 0; // a skip that was refused leaves it set
 }
 
+// The four bytes from an index on; zeros stand for those that are not there.
+uint32_t FLVD_BitWord(const uint8_t* bytes, uint32_t from, uint32_t available)
+{
+    if (available >= from + 4)
+        return FLVD_GetBE32(bytes + from);
+    uint32_t word = 0;
+    for (uint32_t i = from; i < from + 4; ++i)
+        word = word << 8 | (i < available ? bytes[i] : 0u);
+    return word;
+}
+
 void FLVD_BitRefill(fio_file_t* file)
 {
     const auto left = static_cast<uint32_t>(file->bits_left);
     const uint32_t held = left / 8; // whole bytes behind the position that are in `bits` already
     const uint8_t* bytes = nullptr;
     const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, held + FLVD_BIT_REFILL / 8, file);
-    uint64_t word = 0;
-    for (uint32_t i = held; i < held + FLVD_BIT_REFILL / 8; ++i)
-        word = word << 8 | (i < available ? bytes[i] : 0u);
+    const uint64_t word = FLVD_BitWord(bytes, held, available);
     file->bits |= word << (FLVD_BIT_REFILL - left);
     file->bits_left += static_cast<int32_t>(FLVD_BIT_REFILL);
 }
@@ -55,10 +64,7 @@ int32_t __FLV_DMX__bitInit(fio_file_t* file)
 {
     const uint8_t* bytes = nullptr;
     const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BIT_CACHE / 8, file);
-    uint64_t bits = 0;
-    for (uint32_t i = 0; i < FLVD_BIT_CACHE / 8; ++i)
-        bits = bits << 8 | (i < available ? bytes[i] : 0u);
-    file->bits = bits;
+    file->bits = uint64_t{FLVD_BitWord(bytes, 0, available)} << 32 | FLVD_BitWord(bytes, 4, available);
     file->bits_left = static_cast<int32_t>(FLVD_BIT_CACHE);
     return 1;
 }

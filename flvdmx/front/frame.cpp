@@ -191,7 +191,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, uint32_t n, const 
         FLVD_Record(ctx, sites.no_room);
         return FLVD_PassBytes(delivery, n, sites);
     }
-    if (__FLV_DMX__fioRead(ctx->frame_buffer, 1, n, delivery.reader) < n)
+    if (FLVD_FioReadBytes(delivery.reader, ctx->frame_buffer, n) < n)
         return FLVD_LoseTag(delivery, sites.short_read, sites.rollback_payload);
     ctx->last_frame_size = n;
     const uint8_t* back_pointer = nullptr;

@@ -5,6 +5,7 @@
 // consumes at least a byte a turn.
 
 #include "flvdmx/fio/bytes.h"
+#include "flvdmx/fio/fio.h"
 #include "flvdmx/flvdmx.h"
 
 #include <cstring>
@@ -14,10 +15,9 @@ namespace {
 
 constexpr uint32_t FLVD_META_CONTAINERS_MAX = 64;
 constexpr uint32_t FLVD_META_SIZE_MAX = 0x7FFFFFFF; // results are signed
-constexpr uint32_t FLVD_META_SCRATCH = 256;         // a key or text of up to 255 bytes and a NUL
-constexpr uint32_t FLVD_META_SCRATCH_TEXT = FLVD_META_SCRATCH - 1;
-constexpr uint32_t FLVD_META_DATE_SIZE = 10; // double and time zone
-constexpr uint32_t FLVD_META_END_SIZE = 3;   // 00 00 09
+constexpr uint32_t FLVD_META_TEXT_MAX = 255;        // longer keys and texts are passed unread
+constexpr uint32_t FLVD_META_DATE_SIZE = 10;        // double and time zone
+constexpr uint32_t FLVD_META_END_SIZE = 3;          // 00 00 09
 constexpr uint32_t FLVD_META_END = 0x000009;
 constexpr uint32_t FLVD_META_ARRAY_HEADER = 5; // type marker and count
 
@@ -124,7 +124,7 @@ struct flvd_script_state_t {
     uint64_t consumed;             // bytes of it, and of what lies behind it when a value runs over
     uint32_t containers;           // open at present
     uint64_t kept_elements;        // of all keyframe arrays asked for so far
-    uint8_t scratch[FLVD_META_SCRATCH];
+    uint8_t scratch[FLVD_META_TEXT_MAX];
 };
 
 double FLVD_SlotNumber(const flvd_script_state_t* state)
@@ -139,19 +139,35 @@ double FLVD_SlotNumber(const flvd_script_state_t* state)
 const uint8_t* FLVD_ScriptPeek(flvd_ctx_t* ctx, uint32_t n)
 {
     const uint8_t* bytes = nullptr;
-    return __FLV_DMX__fioShowBytesByPtr(&bytes, n, ctx->cur_reader) == n ? bytes : nullptr;
+    return FLVD_FioPeek(&bytes, n, ctx->cur_reader) == n ? bytes : nullptr;
+}
+
+// Consumes peeked bytes; they stay in the cache.
+void FLVD_ScriptConsume(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
+{
+    FLVD_FioDropBits(ctx->cur_reader);
+    FLVD_FioConsume(ctx->cur_reader, n);
+    state->consumed += n;
+}
+
+const uint8_t* FLVD_ScriptTake(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
+{
+    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, n);
+    if (bytes != nullptr)
+        FLVD_ScriptConsume(ctx, state, n);
+    return bytes;
 }
 
 bool FLVD_ScriptSkip(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
 {
-    const uint32_t skipped = __FLV_DMX__fioSkipBytes(n, ctx->cur_reader);
+    const uint32_t skipped = FLVD_FioSkip(n, ctx->cur_reader);
     state->consumed += skipped;
     return skipped == n;
 }
 
 bool FLVD_ScriptRead(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
 {
-    const uint32_t read = __FLV_DMX__fioRead(state->scratch, 1, n, ctx->cur_reader);
+    const uint32_t read = FLVD_FioReadBytes(ctx->cur_reader, state->scratch, n);
     state->consumed += read;
     return read == n;
 }
@@ -161,7 +177,7 @@ bool FLVD_ScriptPassText(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t l
 {
     if (length == 0)
         return true;
-    return length <= FLVD_META_SCRATCH_TEXT ? FLVD_ScriptRead(ctx, state, length) : FLVD_ScriptSkip(ctx, state, length);
+    return length <= FLVD_META_TEXT_MAX ? FLVD_ScriptRead(ctx, state, length) : FLVD_ScriptSkip(ctx, state, length);
 }
 
 // Payload bytes behind the position; a value may run over the end.
@@ -177,23 +193,32 @@ bool FLVD_KeepsIndex(const flvd_ctx_t* ctx)
 
 // Keys.
 
-// Looks a lower-case key with its NUL up.
+// Four letters as small ones. What the bit makes a small letter was a letter.
+uint32_t FLVD_SmallLetters(const void* text)
+{
+    uint32_t letters = 0;
+    std::memcpy(&letters, text, sizeof letters);
+    return letters | 0x20202020;
+}
+
+// True when a key of the name's length is the name in any case. Four letters at a time, the last four perhaps again.
+bool FLVD_IsKey(const uint8_t* key, const flvd_meta_key_t& known)
+{
+    const uint32_t last = known.length - 4;
+    uint32_t i = 0;
+    while (i < last && FLVD_SmallLetters(key + i) == FLVD_SmallLetters(known.name + i))
+        i += 4;
+    return i >= last && FLVD_SmallLetters(key + last) == FLVD_SmallLetters(known.name + last);
+}
+
 uint32_t FLVD_FindKey(const uint8_t* key, uint32_t length)
 {
     if (length > FLVD_META_KEY_LENGTH_MAX)
         return FLVD_META_KEY_NONE;
-    uint32_t index = g_flvd_metaFirstKey.index[length];
-    for (; g_flvd_metaKeyTable[index].length == length; ++index)
-        if (std::memcmp(key, g_flvd_metaKeyTable[index].name, length + 1) == 0)
+    for (uint32_t index = g_flvd_metaFirstKey.index[length]; g_flvd_metaKeyTable[index].length == length; ++index)
+        if (FLVD_IsKey(key, g_flvd_metaKeyTable[index]))
             return index;
     return FLVD_META_KEY_NONE;
-}
-
-void FLVD_LowerCase(uint8_t* text)
-{
-    for (; *text != 0; ++text)
-        if (*text >= 'A' && *text <= 'Z')
-            *text = static_cast<uint8_t>(*text + ('a' - 'A'));
 }
 
 void FLVD_AssignFileSize(flvd_ctx_t* ctx, uint32_t size)
@@ -296,53 +321,48 @@ int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state);
 
 int32_t FLVD_ParseNumber(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, FLVD_AMF_NUMBER_SIZE);
+    const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, FLVD_AMF_NUMBER_SIZE);
     if (bytes == nullptr)
         return -1;
     const double number = FLVD_GetDouble(bytes);
     std::memcpy(state->value, &number, sizeof number);
-    FLVD_ScriptSkip(ctx, state, FLVD_AMF_NUMBER_SIZE);
     return 1 + FLVD_AMF_NUMBER_SIZE;
 }
 
 int32_t FLVD_ParseBoolean(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 1);
+    const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 1);
     if (bytes == nullptr)
         return -1;
     state->value[0] = *bytes;
-    FLVD_ScriptSkip(ctx, state, 1);
     return 1 + 1;
 }
 
 int32_t FLVD_ParseReference(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 2);
+    const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 2);
     if (bytes == nullptr)
         return -1;
     const auto reference = static_cast<uint16_t>(FLVD_GetBE16(bytes));
     std::memcpy(state->value, &reference, sizeof reference);
-    FLVD_ScriptSkip(ctx, state, 2);
     return 1 + 2;
 }
 
 int32_t FLVD_ParseString(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 2);
+    const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 2);
     if (bytes == nullptr)
         return -1;
     const uint32_t length = FLVD_GetBE16(bytes);
-    FLVD_ScriptSkip(ctx, state, 2);
     return FLVD_ScriptPassText(ctx, state, length) ? static_cast<int32_t>(1 + 2 + length) : -1;
 }
 
 int32_t FLVD_ParseLongString(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 4);
+    const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 4);
     if (bytes == nullptr)
         return -1;
     const uint32_t length = FLVD_GetBE32(bytes);
-    FLVD_ScriptSkip(ctx, state, 4);
     if (length > FLVD_META_SIZE_MAX - (1 + 4))
         return -1;
     return FLVD_ScriptPassText(ctx, state, length) ? static_cast<int32_t>(1 + 4 + length) : -1;
@@ -410,11 +430,10 @@ uint32_t FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, ui
 
 int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    const uint8_t* const bytes = FLVD_ScriptPeek(ctx, 4);
+    const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 4);
     if (bytes == nullptr)
         return -1;
     const uint32_t count = FLVD_GetBE32(bytes);
-    FLVD_ScriptSkip(ctx, state, 4);
     state->array_count = count;
     const uint32_t key = FLVD_BeginKeyframeArray(ctx, state, count);
     uint32_t size = FLVD_META_ARRAY_HEADER;
@@ -435,12 +454,10 @@ enum class FlvdLoop { AtEnd, AtEmptyKey, Failed };
 // pending property as it is.
 bool FLVD_ParseKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
 {
-    if (length > FLVD_META_SCRATCH_TEXT)
+    if (length > FLVD_META_TEXT_MAX)
         return FLVD_ScriptSkip(ctx, state, length);
     if (!FLVD_ScriptRead(ctx, state, length))
         return false;
-    state->scratch[length] = 0;
-    FLVD_LowerCase(state->scratch);
     FLVD_MeetKey(ctx, state, FLVD_FindKey(state->scratch, length));
     return true;
 }
@@ -469,13 +486,13 @@ FlvdLoop FLVD_ParseProperties(flvd_ctx_t* ctx, flvd_script_state_t* state, uint3
         if (bytes == nullptr)
             return FlvdLoop::Failed;
         if (FLVD_GetBE24(bytes) == FLVD_META_END) {
-            FLVD_ScriptSkip(ctx, state, FLVD_META_END_SIZE);
+            FLVD_ScriptConsume(ctx, state, FLVD_META_END_SIZE);
             return FlvdLoop::AtEnd;
         }
         const uint32_t key_length = FLVD_GetBE16(bytes);
         if (key_length == 0)
             return FlvdLoop::AtEmptyKey;
-        FLVD_ScriptSkip(ctx, state, 2);
+        FLVD_ScriptConsume(ctx, state, 2);
         if (!FLVD_ParseProperty(ctx, state, key_length, sum))
             return FlvdLoop::Failed;
     }
@@ -494,9 +511,8 @@ int32_t FLVD_ParsePropertyList(flvd_ctx_t* ctx, flvd_script_state_t* state, uint
 
 int32_t FLVD_ParseEcmaArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    if (FLVD_ScriptPeek(ctx, 4) == nullptr)
+    if (FLVD_ScriptTake(ctx, state, 4) == nullptr) // the count is a hint
         return -1;
-    FLVD_ScriptSkip(ctx, state, 4); // the count is a hint
     return FLVD_ParsePropertyList(ctx, state, FLVD_META_ARRAY_HEADER, -1);
 }
 
@@ -521,11 +537,10 @@ int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     if (FLVD_ScriptLeft(state) == 0)
         return -1;
-    const uint8_t* const marker = FLVD_ScriptPeek(ctx, 1);
+    const uint8_t* const marker = FLVD_ScriptTake(ctx, state, 1);
     if (marker == nullptr)
         return -1;
     state->value_type = *marker;
-    FLVD_ScriptSkip(ctx, state, 1);
     switch (state->value_type) {
     case FLVD_AMF_NUMBER:
         return FLVD_ParseNumber(ctx, state);

@@ -2,34 +2,64 @@
 
 #include "flvdmx/tag/tag.h"
 
+#include <algorithm>
+
 namespace {
 
-// True when the tag at the position is sound, wanted and in the cache whole, so that nothing need be read or moved to
-// take it: most tags of a file that is played.
-bool FLVD_IsCachedAndSound(const flvd_ctx_t* ctx, const fio_file_t* file, uint32_t wanted, flvd_tag_header_t* header)
+// True when the tag at the position is cached far enough to be judged, plausible and wanted. Not for script data, whose
+// back-pointer need not agree.
+bool FLVD_IsNextWanted(const flvd_ctx_t* ctx, const fio_file_t* file, uint32_t wanted, flvd_tag_header_t* header)
 {
     if (file->count < FLVD_TAG_PEEK_SIZE || file->state != FIO_STATE_READ || file->read_size != file->capacity)
         return false;
-    const uint8_t* const bytes = file->cache + file->head;
-    *header = FLVD_ReadTagHeader(bytes);
-    const uint32_t size = header->info.data_size + FLVD_TAG_OVERHEAD;
-    return size <= file->count && FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, header->info.data_size) &&
-           FLVD_IsPlausibleTag(FLVD_TagRules(ctx), *header) && FLVD_IsWantedTag(*header, wanted);
+    *header = FLVD_ReadTagHeader(file->cache + file->head);
+    return header->info.type != FLVD_TAG_TYPE_SCRIPT && FLVD_IsPlausibleTag(FLVD_TagRules(ctx), *header) &&
+           FLVD_IsWantedTag(*header, wanted);
 }
 
 } // namespace
 
+bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
+{
+    __FLV_DMX__fioSkipBytes(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
+    const uint32_t quantum = file->read_size;
+    const FLVD_ReadSizeGuard narrow(file, std::min(quantum, FLVD_NARROW_READ), quantum);
+    const uint8_t* bytes = nullptr;
+    return FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
+           FLVD_IsBackPointer(bytes, tag.data_size);
+}
+
+bool FLVD_GoBackToTag(fio_file_t* file, int64_t position)
+{
+    if (__FLV_DMX__fioSeek64(file, position, FIO_SEEK_SET) == 0)
+        return true;
+    return __FLV_DMX__fioSeek64(file, position, FIO_SEEK_SET) == 0;
+}
+
 int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
 {
-    const int64_t position = __FLV_DMX__fioTell64(file);
+    const int64_t position = FLVD_FioTell(file);
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
     if (position == ctx->data_offset)
         FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
+    // What follows up to the search is that search, for a tag that ends it at once.
     flvd_tag_header_t header;
-    if (verify == 0 || !FLVD_IsCachedAndSound(ctx, file, wanted, &header))
+    if (verify == 0 || !FLVD_IsNextWanted(ctx, file, wanted, &header))
         return FLVD_SearchFrom(ctx, file, info, wanted, verify != 0, position);
-    if (__FLV_DMX__fioTell64(file) < position)
+    const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
+    const bool large = size > file->capacity;
+    if (!large) {
+        const uint8_t* const back_pointer = file->cache + file->head + size - FLVD_BACK_POINTER_SIZE;
+        if (size > file->count || !FLVD_IsBackPointer(back_pointer, header.info.data_size))
+            return FLVD_SearchFrom(ctx, file, info, wanted, true, position);
+    }
+    const int64_t start = FLVD_FioTell(file);
+    if (start < position)
+        return FLVD_ERR_NOT_FOUND;
+    if (large && !FLVD_CheckBehind(file, header.info))
+        return FLVD_SearchPastBadTag(ctx, file, info, wanted, start);
+    if (large && !FLVD_GoBackToTag(file, start))
         return FLVD_ERR_NOT_FOUND;
     *info = header.info;
     return 0;

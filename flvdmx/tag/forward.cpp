@@ -122,18 +122,6 @@ bool FLVD_TakeLaterPosition(flvd_search_t* search)
     return FLVD_TakePosition(search) && search->position > before;
 }
 
-// Moves behind a tag's data and looks at its back-pointer. The tag is mostly gone back to, which empties the cache, so
-// no more is read here than needed.
-bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
-{
-    FLVD_FioSkip(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
-    const uint32_t quantum = __FLV_DMX__fioGetCacheReadSize(file);
-    const FLVD_ReadSizeGuard narrow(file, std::min(quantum, FLVD_NARROW_READ), quantum);
-    const uint8_t* bytes = nullptr;
-    return FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
-           FLVD_IsBackPointer(bytes, tag.data_size);
-}
-
 // Outcome of a back-pointer check. In place, the reader still stands on the tag; else it stands behind the tag's data.
 struct flvd_check_t {
     bool passed;
@@ -188,14 +176,6 @@ bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_inf
     return check.passed ? FLVD_PassGoodTag(search, check.in_place, tag) : FLVD_PassBadTag(search, check.in_place);
 }
 
-// Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
-bool FLVD_GoBack(const flvd_search_t* search)
-{
-    if (__FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0)
-        return true;
-    return __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
-}
-
 // Careful mode: a plausible header at the position is taken when its back-pointer agrees and its kind is wanted.
 int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header)
 {
@@ -204,7 +184,7 @@ int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header
     const flvd_check_t check = FLVD_CheckBackPointer(search, header.info);
     if (!check.passed || !FLVD_IsWantedTag(header, search->wanted))
         return FLVD_StepOver(search, check, header.info) ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
-    return check.in_place || FLVD_GoBack(search) ? 0 : FLVD_ERR_NOT_FOUND;
+    return check.in_place || FLVD_GoBackToTag(search->file, search->position) ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
 // Trusting mode: the header alone decides; an unwanted tag is passed by its size.
@@ -242,6 +222,18 @@ int32_t FLVD_SearchTag(flvd_search_t* search, flvd_tag_header_t* header)
         if (result != FLVD_SEARCH_ON)
             return result;
     }
+}
+
+// Results of FLVD_GetCurrTagInfo.
+int32_t FLVD_RunSearch(flvd_search_t* search, flvd_tag_info_t* info)
+{
+    flvd_tag_header_t header;
+    const int32_t result = FLVD_SearchTag(search, &header);
+    if (result == FLVD_BUDGET_SPENT)
+        return search->data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+    if (result == 0)
+        *info = header.info;
+    return result;
 }
 
 uint32_t FLVD_VideoKind(const flvd_tag_header_t& header, uint32_t wanted)
@@ -293,17 +285,18 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 
 } // namespace
 
-int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, bool verify,
-                        int64_t position)
+[[gnu::noinline]] int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
+                                          bool verify, int64_t position)
 {
     flvd_search_t search = FLVD_Search(ctx, file, wanted, verify, position);
-    flvd_tag_header_t header;
-    const int32_t result = FLVD_SearchTag(&search, &header);
-    if (result == FLVD_BUDGET_SPENT)
-        return search.data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
-    if (result == 0)
-        *info = header.info;
-    return result;
+    return FLVD_RunSearch(&search, info);
+}
+
+[[gnu::noinline]] int32_t FLVD_SearchPastBadTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info,
+                                                uint32_t wanted, int64_t position)
+{
+    flvd_search_t search = FLVD_Search(ctx, file, wanted, true, position);
+    return FLVD_PassBadTag(&search, false) ? FLVD_RunSearch(&search, info) : FLVD_ERR_NOT_FOUND;
 }
 
 int32_t FLVD_FindNextTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)

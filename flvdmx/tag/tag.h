@@ -64,7 +64,7 @@ inline flvd_tag_rules_t FLVD_TagRules(const flvd_ctx_t* ctx)
 
 // Timestamp of the tag header at `bytes`, 11 bytes long: TimestampExtended, the top byte, stands behind the other
 // three.
-constexpr uint32_t FLVD_TagTimestamp(const uint8_t* bytes)
+[[gnu::always_inline]] constexpr uint32_t FLVD_TagTimestamp(const uint8_t* bytes)
 {
     const uint32_t field = FLVD_GetBE32(bytes + FLVD_TIMESTAMP_FIELD);
     return field >> 8 | field << 24;
@@ -142,9 +142,20 @@ inline bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted)
 // False when fewer than 4 bytes are there.
 bool FLVD_PassBackPointer(fio_file_t* file, uint32_t data_size);
 
+// Moves behind a tag's data and looks at its back-pointer. The tag is mostly gone back to, which empties the cache, so
+// no more is read here than needed.
+bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag);
+
+// Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
+bool FLVD_GoBackToTag(fio_file_t* file, int64_t position);
+
 // The search of FLVD_GetCurrTagInfo from a position that was taken; its results.
 int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, bool verify,
                         int64_t position);
+
+// The same in careful mode when the tag there was looked behind and its back-pointer disagreed.
+int32_t FLVD_SearchPastBadTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
+                              int64_t position);
 
 // Puts a reader in front of the first tag, on PreviousTagSize0. Returns the host's seek result.
 int32_t FLVD_SeekToFirstTag(const flvd_ctx_t* ctx, fio_file_t* file);
