@@ -98,6 +98,7 @@ class Frames(Case):
                 numbers = [json.loads(line)["number"] for line in result.stdout.splitlines()]
                 self.assertEqual(numbers, list(range(1, len(numbers) + 1)))
                 self.assertEqual("no whole tag" in result.stderr, name == "truncated")
+                self.assertEqual("hold no sound tag" in result.stderr, name == "damaged")
 
     def test_text_says_the_same(self):
         for name in ("avc_aac", "pcm_only"):
@@ -109,7 +110,9 @@ class Frames(Case):
     def test_separate_audio_is_merged_by_time(self):
         for name in ("avc_aac", "avc_bframes_aac", "h263_mp3", "avc_only", "mp3_only", "damaged"):
             with self.subTest(name):
-                frames = json_frames(self.succeed("frames", "--json", "--separate-audio", sample(name)))
+                result = run("frames", "--json", "--separate-audio", sample(name))
+                self.assertEqual((result.returncode, "hold no sound tag" in result.stderr), (0, name == "damaged"))
+                frames = json_frames(result.stdout)
                 self.assertEqual([f[1] for f in frames], sorted(f[1] for f in frames))
                 for kind in ("video", "audio"):
                     self.assertEqual([f for f in frames if f[0] == kind],
@@ -293,10 +296,28 @@ class Failures(Case):
             self.assertEqual((result.returncode, result.stdout), (1, ""))
             self.assertIn("the file has no video stream", result.stderr)
 
+    def test_streams_closed_or_full(self):
+        out = self.write("any", b"").parent / "out"
+        for closed in ("2>&-", "2>/dev/full", ">&- 2>&-"):
+            command = f'"$0" extract "$1" -o "$2" {closed}; a=$?; "$0" info missing.flv {closed}; echo $a $?'
+            status = subprocess.run(["sh", "-c", command, TOOL, sample("pcm_only"), out], stdout=subprocess.PIPE, text=True)
+            self.assertEqual(status.stdout, "0 1\n", closed)
+            self.assertNotIn(b"flvdmx", out.read_bytes())  # the note about raw streams
+
+    def test_file_that_another_was_appended_to(self):
+        data = (DATA / "avc_aac.flv").read_bytes()
+        header, tags = split_tags(data)
+        path = self.write("two.flv", data + b"".join(tags[:60]))
+        frames = json_frames(self.succeed("frames", "--json", path))
+        again = [f for f in Expected("avc_aac").frames if f[1] <= max(f[1] for f in frames[-40:])]
+        self.assertEqual(frames[:172], Expected("avc_aac").frames)
+        self.assertEqual(frames[172:], again[:len(frames) - 172])
+
     def test_wrong_use(self):
         file = sample("avc_aac")
         for arguments in ([], ["play", file], ["info"], ["info", "--count", "1", file], ["frames"],
                           ["frames", file, file], ["frames", "--stream", "subtitles", file],
+                          ["check", "--jump", "nan", file], ["extract", "-o", "", file],
                           ["frames", "--count", "-1", file],
                           ["frames", "--count", "x", file], ["frames", "--timeout", "1", file],
                           ["frames", "--follow", "--timeout", "-1", file], ["frames", "--from", "soon", file],

@@ -3,8 +3,6 @@
 
 #include <fmt/core.h>
 
-#include "tools/tags.h"
-
 namespace tool {
 
 namespace {
@@ -16,27 +14,60 @@ constexpr uint32_t ESCAPED_OBJECT_TYPE = 31;
 constexpr uint32_t EXPLICIT_FREQUENCY = 15;
 constexpr uint32_t FREQUENCIES = 13; // indices with a meaning
 
-// The object type of an escape stands in the six bits behind it.
-std::string ObjectTypeText(uint32_t objectType, uint32_t nextSix)
+constexpr uint32_t SBR_OBJECT_TYPE = 5; // HE-AAC: the core's own type follows
+constexpr uint32_t PS_OBJECT_TYPE = 29; // HE-AAC version 2, likewise
+
+// The configuration as a row of bits; those behind its end are 0.
+class Bits {
+public:
+    explicit Bits(const std::vector<uint8_t>& bytes) : m_bytes(bytes) {}
+
+    uint32_t Take(uint32_t count)
+    {
+        uint32_t value = 0;
+        for (; count > 0; --count, ++m_taken) {
+            const size_t byte = m_taken / 8;
+            value = value << 1 | (byte < m_bytes.size() ? m_bytes[byte] >> (7 - m_taken % 8) & 1U : 0U);
+        }
+        return value;
+    }
+    uint32_t TakeObjectType()
+    {
+        const uint32_t objectType = Take(5);
+        return objectType == ESCAPED_OBJECT_TYPE ? 32 + Take(6) : objectType;
+    }
+    bool AreShort() const { return m_taken > m_bytes.size() * 8; }
+
+private:
+    const std::vector<uint8_t>& m_bytes;
+    size_t m_taken = 0;
+};
+
+// Passes the output rate of HE-AAC. @return the core's object type, which a decoder needs no more than that
+uint32_t TakeCore(Bits& bits)
 {
-    const uint32_t number = objectType == ESCAPED_OBJECT_TYPE ? 32 + nextSix : objectType;
-    return fmt::format("AAC of object type {} cannot be written as ADTS, which has types 1 to 4", number);
+    constexpr uint32_t EXPLICIT_BITS = 24;
+    if (bits.Take(4) == EXPLICIT_FREQUENCY)
+        bits.Take(EXPLICIT_BITS);
+    return bits.TakeObjectType();
 }
 
 } // namespace
 
 std::string Adts::Configure(const std::vector<uint8_t>& config)
 {
-    if (config.size() < 2)
-        return "the AAC configuration is cut short";
-    const uint32_t bits = BigEndian(config.data(), 2);
-    const uint32_t objectType = bits >> 11;
-    const uint32_t frequencyIndex = bits >> 7 & 0x0F;
-    const uint32_t channels = bits >> 3 & 0x0F;
-    if (objectType == 0 || objectType > MOST_OBJECT_TYPE)
-        return ObjectTypeText(objectType, bits >> 5 & 0x3F);
+    Bits bits(config);
+    uint32_t objectType = bits.TakeObjectType();
+    const uint32_t frequencyIndex = bits.Take(4);
+    const uint32_t channels = bits.Take(4);
     if (frequencyIndex == EXPLICIT_FREQUENCY)
         return "AAC with an explicit sampling frequency cannot be written as ADTS, which has a list of them";
+    if (objectType == SBR_OBJECT_TYPE || objectType == PS_OBJECT_TYPE)
+        objectType = TakeCore(bits);
+    if (bits.AreShort())
+        return "the AAC configuration is cut short";
+    if (objectType == 0 || objectType > MOST_OBJECT_TYPE)
+        return fmt::format("AAC of object type {} cannot be written as ADTS, which has types 1 to 4", objectType);
     if (frequencyIndex >= FREQUENCIES)
         return fmt::format("the AAC configuration has the reserved sampling frequency index {}", frequencyIndex);
     if (channels == 0)

@@ -12,7 +12,8 @@ namespace tool {
 class Adts {
 public:
     /**
-     * Takes an AudioSpecificConfig, valid for the frames behind it.
+     * Takes an AudioSpecificConfig, valid for the frames behind it. Of HE-AAC the headers describe the core; decoders
+     * find the rest in the frames.
      * @return why it cannot be written, the one before staying valid; empty when it can
      */
     std::string Configure(const std::vector<uint8_t>& config);

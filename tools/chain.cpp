@@ -76,6 +76,8 @@ int64_t Chain::Step(int64_t position)
     if (!tag)
         return Resume(position, tag);
     if (IsChained(*tag)) {
+        if (IsLate(*tag))
+            m_findings.Lose(tag->End() - tag->position);
         Take(*tag);
         return tag->End();
     }
@@ -86,6 +88,12 @@ int64_t Chain::Step(int64_t position)
         }
     }
     return Resume(position, tag);
+}
+
+// A player passes it over: a complete file has nothing later than its last tags.
+bool Chain::IsLate(const Tag& tag) const
+{
+    return tag.type != FLVD_TAG_TYPE_SCRIPT && m_instance->last_ts != 0 && tag.timestamp > m_instance->last_ts;
 }
 
 bool Chain::IsChained(const Tag& tag) const

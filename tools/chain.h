@@ -49,6 +49,7 @@ public:
 
 private:
     int64_t Step(int64_t position);
+    bool IsLate(const Tag& tag) const;
     bool IsChained(const Tag& tag) const;
     bool CouldFollow(int64_t position) const;
     void TakeUnlinked(const Tag& tag, int64_t next);

@@ -1,14 +1,15 @@
 // The entry point behind a class, and the words for what can go wrong.
 #include "tools/demuxer.h"
 
+#include <cstdint>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 
 #include <fmt/core.h>
+#include <sys/stat.h>
 
-#include "flvdmx/stdio_host.h"
+#include "flvdmx/window_host.h"
 #include "tools/crc32.h"
 #include "tools/time_text.h"
 
@@ -60,8 +61,6 @@ bool BeginsWithSignature(const std::string& path)
 std::string HeaderFailureText(const std::string& path)
 {
     std::error_code failure;
-    if (!std::filesystem::is_regular_file(path, failure))
-        return "no FLV file: a pipe or device cannot be read at any place";
     const auto size = std::filesystem::file_size(path, failure);
     if (failure)
         return "no FLV file header";
@@ -72,10 +71,20 @@ std::string HeaderFailureText(const std::string& path)
     return "no FLV file header: this is not an FLV file";
 }
 
+// A pipe that nobody writes to would not even open.
+void RefusePipe(const std::string& path)
+{
+    struct stat status {};
+    if (stat(path.c_str(), &status) != 0 || S_ISREG(status.st_mode) || S_ISBLK(status.st_mode) ||
+        S_ISDIR(status.st_mode))
+        return;
+    throw DemuxError("cannot be opened: a pipe or device cannot be read at any place", FLVD_ERR_OPEN_MAIN);
+}
+
 std::string OpenFailureText(const std::string& path, int32_t code)
 {
     if (code == FLVD_ERR_OPEN_MAIN || code == FLVD_ERR_OPEN_AUDIO) {
-        const int error = flvd_stdio_host_open_error();
+        const int error = flvd_window_host_open_error();
         return fmt::format("cannot be opened: {}", error != 0 ? std::strerror(error) : "no memory");
     }
     if (code == FLVD_ERR_FILE_HEADER)
@@ -102,8 +111,9 @@ std::string DemuxError::Message() const
 
 Demuxer::Demuxer(const std::string& path, uint32_t options) : m_path(path)
 {
+    RefusePipe(path);
     flvd_init_t init;
-    flvd_stdio_host_fill(&init);
+    flvd_window_host_fill(&init);
     init.file_name = m_path.c_str();
     init.options = options;
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &m_instance, &init, &m_info) != 0)
@@ -158,8 +168,7 @@ std::optional<Frame> Demuxer::NextFrame(uint32_t stream)
 
 Frame Demuxer::Describe(const flvd_frame_t& frame) const
 {
-    // Only a tag before the first timestamp can wrap, and every tag that is taken lies at or before the last one.
-    const bool wrapped = m_instance->first_ts != 0 && frame.timestamp_ms > m_instance->duration_ms;
+    const bool wrapped = frame.timestamp_ms > UINT32_MAX - m_instance->first_ts; // a tag before the first timestamp
     const int64_t time = frame.timestamp_ms - (wrapped ? int64_t{1} << 32 : 0);
     return {frame.stream, time, frame.size, Crc32(frame.data, frame.size)};
 }

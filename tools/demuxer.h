@@ -1,4 +1,4 @@
-// One open file: the library's entry point with the stdio host, results as exceptions with words for the user.
+// One open file: the library's entry point with the window host, results as exceptions with words for the user.
 #ifndef FLVDMX_TOOLS_DEMUXER_H
 #define FLVDMX_TOOLS_DEMUXER_H
 
@@ -82,6 +82,13 @@ public:
      * @return the time reached in ms
      */
     int32_t Seek(int32_t time, uint32_t mode);
+
+    /**
+     * From now on a tag may have any time, as in a file that is growing. Without it a complete file gives no tag that
+     * is later than its last ones, as most tags of a file may be to which the beginning of another was appended. Not to
+     * be followed by a seek.
+     */
+    void AcceptAllTimes() { m_instance->last_ts = 0; }
 
     /** @return the reader that serves `stream`, borrowed */
     fio_file_t* Reader(uint32_t stream) const;

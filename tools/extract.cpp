@@ -113,6 +113,8 @@ public:
                      fmt::format("note: the {} is written raw, its frames one behind the other", StreamName(m_stream)));
     }
 
+    void Begin() { m_out->Begin(); }
+
     void Take(const Tag& tag, const Bytes& data)
     {
         if (tag.IsConfig()) {
@@ -146,7 +148,7 @@ private:
 
 void Extract(const ExtractOptions& options)
 {
-    const Demuxer demuxer(options.file, 0);
+    Demuxer demuxer(options.file, 0);
     WarnIfCutShort(demuxer);
     std::vector<StreamWriter> writers;
     for (const uint32_t stream : {FLVD_STREAM_VIDEO, FLVD_STREAM_AUDIO}) {
@@ -156,8 +158,11 @@ void Extract(const ExtractOptions& options)
     if (writers.empty())
         throw DemuxError(fmt::format("the file has no {} stream", StreamName(options.streams)));
     ProgressBar progress(options.file, demuxer.Instance()->data_end);
-    for (StreamWriter& writer : writers) // only now: what cannot be written leaves no file behind
+    for (StreamWriter& writer : writers) // only now, and all before the first one is touched
         writer.Open(options.out, writers.size() > 1);
+    for (StreamWriter& writer : writers)
+        writer.Begin();
+    demuxer.AcceptAllTimes();
     TagReader reader(demuxer);
     while (const std::optional<Tag> tag = reader.Next()) {
         progress.ShowDone(tag->position);
@@ -168,6 +173,7 @@ void Extract(const ExtractOptions& options)
     }
     for (StreamWriter& writer : writers)
         writer.Finish();
+    WarnOfSkipped(demuxer, reader);
 }
 
 } // namespace

@@ -15,6 +15,7 @@
 #include "tools/frame_source.h"
 #include "tools/progress.h"
 #include "tools/report.h"
+#include "tools/tags.h"
 
 namespace tool {
 
@@ -101,6 +102,15 @@ void SeekToStart(Demuxer& demuxer, const FramesOptions& options)
         demuxer.Seek(*options.fromMs, FLVD_SEEK_BACKWARD);
 }
 
+// The entry point does not tell what it passes over: that takes a walk of its own.
+void WarnOfLoss(const Demuxer& demuxer)
+{
+    TagReader reader(demuxer);
+    while (reader.Next())
+        ;
+    WarnOfSkipped(demuxer, reader);
+}
+
 void PrintComplete(const FramesOptions& options)
 {
     Demuxer demuxer(options.file, OpenBits(options));
@@ -109,14 +119,17 @@ void PrintComplete(const FramesOptions& options)
     if (streams == 0)
         throw DemuxError(fmt::format("the file has no {} stream", StreamName(options.streams)));
     SeekToStart(demuxer, options);
+    demuxer.AcceptAllTimes();
     FrameSource source(demuxer, streams);
     FramePrinter printer(options, streams);
     while (!printer.Done()) {
         const std::optional<Frame> frame = source.Next();
         if (!frame)
-            return;
+            break;
         printer.Take(*frame);
     }
+    if (!printer.Done() && !options.fromMs)
+        WarnOfLoss(demuxer);
 }
 
 // The streams that the file header promises. Read through the library's own reader, which is put back.

@@ -9,7 +9,9 @@
 #include <vector>
 
 #include <CLI/CLI.hpp>
+#include <fcntl.h>
 #include <fmt/core.h>
+#include <unistd.h>
 
 #include "tools/commands.h"
 #include "tools/report.h"
@@ -40,13 +42,18 @@ const CLI::Validator IS_COUNT(
     },
     "", "count");
 
+constexpr double MOST_SECONDS = 4294967; // 32 bits of milliseconds
+
 const CLI::Validator IS_SECONDS(
     [](const std::string& text) {
         double seconds = -1;
-        const bool valid = CLI::detail::lexical_cast(text, seconds) && seconds >= 0;
+        const bool valid = CLI::detail::lexical_cast(text, seconds) && seconds >= 0 && seconds <= MOST_SECONDS;
         return valid ? std::string() : fmt::format("'{}' is no number of seconds", text);
     },
     "", "seconds");
+
+const CLI::Validator IS_NAME([](const std::string& text) { return std::string(text.empty() ? "no name" : ""); }, "",
+                             "name");
 
 CLI::Option* AddTime(CLI::App* command, const char* name, const std::function<void(int32_t)>& take, const char* help)
 {
@@ -164,7 +171,7 @@ void AddExtract(CLI::App& app, ExtractOptions& options)
 {
     CLI::App* const command = app.add_subcommand("extract", "Write the streams to files that players take");
     command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
-    command->add_option("-o,--output", options.out, "Where to write")->required()->type_name("OUT");
+    command->add_option("-o,--output", options.out, "Where to write")->required()->check(IS_NAME)->type_name("OUT");
     AddChoice(
         command, "--stream", {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}},
         [&options](uint32_t stream) { options.streams = stream; }, "Write only this stream: video or audio");
@@ -179,7 +186,6 @@ void AddExtract(CLI::App& app, ExtractOptions& options)
 
 void AddCheck(CLI::App& app, CheckOptions& options)
 {
-    constexpr double MOST_SECONDS = 4294967; // 32 bits of milliseconds
     CLI::App* const command = app.add_subcommand("check", "Judge files: damage, timestamps, keyframe index");
     command->add_option("FILE", options.files, "FLV files")->required()->type_name("");
     command->add_flag("--json", options.json, "Print one JSON document");
@@ -188,7 +194,7 @@ void AddCheck(CLI::App& app, CheckOptions& options)
         ->type_name("N");
     command
         ->add_option("--jump", options.jumpSeconds, "Report steps forward in time of more than S seconds (default 10)")
-        ->check(CLI::Range(0.0, MOST_SECONDS))
+        ->check(IS_SECONDS)
         ->type_name("S");
     command->footer("What is found, by byte:\n"
                     "  gap              bytes that belong to no tag\n"
@@ -206,7 +212,7 @@ void AddPlot(CLI::App& app, PlotOptions& options)
 {
     CLI::App* const command = app.add_subcommand("plot", "Draw bit rate, keyframes and interleaving over time");
     command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
-    command->add_option("-o,--output", options.out, "SVG file to write")->required()->type_name("OUT");
+    command->add_option("-o,--output", options.out, "SVG file to write")->required()->check(IS_NAME)->type_name("OUT");
     command->footer("  flvdmx plot clip.flv -o clip.svg");
 }
 
@@ -215,6 +221,8 @@ std::vector<std::string> Arguments(int argc, char** argv)
 {
     std::vector<std::string> arguments(argv + 1, argv + argc);
     for (std::string& text : arguments) {
+        if (text == "--") // names only from here on
+            break;
         if (!text.empty() && text.front() == '-' && ParseTime(text))
             text.insert(0, 1, ' ');
     }
@@ -226,9 +234,19 @@ int Usage(const CLI::App& app, const CLI::ParseError& error)
     if (error.get_exit_code() == static_cast<int>(CLI::ExitCodes::Success)) // help or version
         return app.exit(error);
     const std::vector<CLI::App*> commands = app.get_subcommands();
-    fmt::print(stderr, "flvdmx: {}\nTry 'flvdmx {}--help'.\n", error.what(),
-               commands.empty() ? "" : commands.front()->get_name() + " ");
+    Tell(fmt::format("flvdmx: {}\nTry 'flvdmx {}--help'.\n", error.what(),
+                     commands.empty() ? "" : commands.front()->get_name() + " "));
     return WRONG_USE;
+}
+
+// A file that is opened must not take the number of a standard stream that was closed: it would get the messages.
+void OccupyStandardStreams()
+{
+    int descriptor = open("/dev/null", O_RDWR | O_CLOEXEC);
+    while (descriptor >= 0 && descriptor <= STDERR_FILENO)
+        descriptor = open("/dev/null", O_RDWR | O_CLOEXEC);
+    if (descriptor >= 0)
+        close(descriptor);
 }
 
 int Run(int argc, char** argv)
@@ -271,6 +289,7 @@ int Run(int argc, char** argv)
 int main(int argc, char** argv)
 {
     std::signal(SIGPIPE, SIG_IGN);
+    tool::OccupyStandardStreams();
     try {
         const int exitCode = tool::Run(argc, argv);
         tool::Flush();
@@ -278,9 +297,9 @@ int main(int argc, char** argv)
     } catch (const std::system_error& error) {
         if (error.code() == std::errc::broken_pipe)
             return tool::DONE;
-        fmt::print(stderr, "flvdmx: cannot write: {}\n", error.code().message());
+        tool::Tell(fmt::format("flvdmx: cannot write: {}\n", error.code().message()));
     } catch (const std::exception& error) {
-        fmt::print(stderr, "flvdmx: {}\n", error.what());
+        tool::Tell(fmt::format("flvdmx: {}\n", error.what()));
     }
     return tool::FAILED;
 }

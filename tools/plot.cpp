@@ -106,14 +106,13 @@ private:
 
     void DrawTitle()
     {
-        const flvd_ctx_t& instance = *m_demuxer.Instance();
         m_svg.Text(LEFT, 34, "title", std::filesystem::path(m_demuxer.Path()).filename().string());
-        std::string about = fmt::format("{} \u00b7 {}", FormatTime(instance.duration_ms),
-                                        Amount(BYTE_UNITS, static_cast<double>(instance.file_size)));
+        std::string about = fmt::format("{} \u00b7 {}", FormatTime(m_timeline.durationMs),
+                                        Amount(BYTE_UNITS, static_cast<double>(m_demuxer.Instance()->file_size)));
         if (m_demuxer.Video() != nullptr)
-            about += StreamText(m_timeline.video, VideoCodec(instance));
+            about += StreamText(m_timeline.video, VideoCodec(*m_demuxer.Instance()));
         if (m_demuxer.Audio() != nullptr)
-            about += StreamText(m_timeline.audio, AudioCodec(instance));
+            about += StreamText(m_timeline.audio, AudioCodec(*m_demuxer.Instance()));
         m_svg.Text(LEFT, 55, "about", about);
     }
 
@@ -302,11 +301,12 @@ private:
 int RunPlot(const PlotOptions& options)
 {
     try {
-        const Demuxer demuxer(options.file, 0);
+        Demuxer demuxer(options.file, 0);
         WarnIfCutShort(demuxer);
         const Timeline timeline = ReadTimeline(demuxer, COLUMNS);
         const std::string drawing = Plot(demuxer, timeline).Draw();
         OutputFile file(options.out, options.file);
+        file.Begin();
         file.Write(drawing);
         file.Close();
         return DONE;

@@ -37,7 +37,7 @@ void Progress::Wipe()
 
 void Progress::ShowLine(const std::string& text)
 {
-    fmt::print(stderr, "{}{}", WIPE_LINE, text);
+    std::fputs((WIPE_LINE + text).c_str(), stderr);
     std::fflush(stderr);
     m_shown = true;
     m_next = Clock::now() + INTERVAL;

@@ -29,10 +29,15 @@ void PrintJson(const Json& document, int indent)
     Print(document.dump(indent, ' ', false, Json::error_handler_t::replace) + "\n");
 }
 
+void Tell(const std::string& text)
+{
+    std::fputs(text.c_str(), stderr);
+}
+
 void Complain(const std::string& file, std::string_view text)
 {
     std::fflush(stdout); // what came before is to stand before it on a terminal
-    fmt::print(stderr, "flvdmx: {}: {}\n", file, text);
+    Tell(fmt::format("flvdmx: {}: {}\n", file, text));
 }
 
 void WarnIfCutShort(const Demuxer& demuxer)
@@ -42,6 +47,15 @@ void WarnIfCutShort(const Demuxer& demuxer)
         Complain(demuxer.Path(), "warning: the file is cut short: its metadata announces more bytes than it has");
     if (const int64_t bytes = BytesBehindLastTag(instance); bytes > 0)
         Complain(demuxer.Path(), fmt::format("warning: the last {} bytes hold no whole tag and are not played", bytes));
+}
+
+void WarnOfSkipped(const Demuxer& demuxer, const TagReader& reader)
+{
+    if (reader.Skipped() > 0)
+        Complain(demuxer.Path(),
+                 fmt::format("warning: {} bytes, the first at byte {}, hold no sound tag of the streams "
+                             "and are left out",
+                             reader.Skipped(), reader.FirstSkipped()));
 }
 
 Json ErrorObject(const DemuxError& error)

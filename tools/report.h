@@ -9,6 +9,7 @@
 #include <nlohmann/json.hpp>
 
 #include "tools/demuxer.h"
+#include "tools/tags.h"
 
 namespace tool {
 
@@ -26,8 +27,14 @@ void PrintJson(const Json& document, int indent = -1);
 /** Writes `flvdmx: FILE: TEXT` to standard error. */
 void Complain(const std::string& file, std::string_view text);
 
+/** Writes to standard error; when that fails there is nobody to tell. */
+void Tell(const std::string& text);
+
 /** Tells on standard error what of a complete file will not be played. */
 void WarnIfCutShort(const Demuxer& demuxer);
+
+/** Tells on standard error what a reader at its end has passed over. */
+void WarnOfSkipped(const Demuxer& demuxer, const TagReader& reader);
 
 /** @return message, code and line as an object */
 Json ErrorObject(const DemuxError& error);

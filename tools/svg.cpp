@@ -3,6 +3,7 @@
 
 #include <cmath>
 #include <cstdlib>
+#include <cstring>
 
 #include "tools/report.h"
 
@@ -20,7 +21,11 @@ std::string XmlText(std::string_view text)
     // The JSON library knows UTF-8: what it takes comes back as it was, the rest as replacement characters.
     const std::string dump = Json(text).dump(-1, ' ', false, Json::error_handler_t::replace);
     std::string escaped;
-    for (const char c : Json::parse(dump).get<std::string>()) {
+    std::string known = Json::parse(dump).get<std::string>();
+    for (const char* const noCharacter : {"\uFFFE", "\uFFFF"}) // not even XML's references can name these
+        for (size_t at = 0; (at = known.find(noCharacter, at)) != std::string::npos;)
+            known.replace(at, std::strlen(noCharacter), "\uFFFD");
+    for (const char c : known) {
         if (c == '&')
             escaped += "&amp;";
         else if (c == '<')

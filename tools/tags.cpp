@@ -34,34 +34,58 @@ bool Tag::IsFrame() const
 }
 
 TagReader::TagReader(const Demuxer& demuxer)
-    : m_instance(demuxer.Instance()), m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_next(m_instance->data_offset)
+    : m_instance(demuxer.Instance()), m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_streams(demuxer.Streams()),
+      m_next(m_instance->data_offset), m_end(m_next + BACK_POINTER_SIZE)
 {
 }
 
 // One search covers a bounded stretch of damage. While the reader comes further the next search is worth making.
-std::optional<Tag> TagReader::Next()
+std::optional<Tag> TagReader::Find()
 {
     int64_t reached = -1;
     if (__FLV_DMX__fioSeek64(m_reader, m_next, FIO_SEEK_SET) != 0)
         return std::nullopt;
     for (;;) {
         flvd_tag_info_t info{};
-        const int32_t result =
-            FLVD_GetCurrTagInfo(m_instance, m_reader, &info, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO, 1 /* verify */);
+        const int32_t result = FLVD_GetCurrTagInfo(m_instance, m_reader, &info,
+                                                   FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT, 1 /* verify */);
         const int64_t position = __FLV_DMX__fioTell64(m_reader);
         if (result == 0) {
             const uint8_t* bytes = nullptr;
             const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, TAG_HEADER_SIZE + 2, m_reader);
             if (available < TAG_HEADER_SIZE)
                 return std::nullopt;
-            const Tag tag = Tag::Parse(position, bytes, available);
-            m_next = tag.End();
-            return tag;
+            return Tag::Parse(position, bytes, available);
         }
         if (position <= reached || position >= m_instance->data_end)
             return std::nullopt;
         reached = position;
     }
+}
+
+void TagReader::Skip(int64_t from, int64_t to)
+{
+    if (from >= to)
+        return;
+    if (m_skipped == 0)
+        m_firstSkipped = from;
+    m_skipped += to - from;
+}
+
+std::optional<Tag> TagReader::Next()
+{
+    while (const std::optional<Tag> tag = Find()) {
+        Skip(m_end, tag->position);
+        m_next = m_end = tag->End();
+        if (tag->type == FLVD_TAG_TYPE_SCRIPT)
+            continue;
+        if ((tag->Stream() & m_streams) != 0)
+            return tag;
+        Skip(tag->position, m_end);
+    }
+    Skip(m_end, m_instance->data_end);
+    m_next = m_end = m_instance->data_end;
+    return std::nullopt;
 }
 
 std::vector<uint8_t> TagReader::Data(const Tag& tag)

@@ -43,7 +43,7 @@ struct Tag {
     bool IsKeyframe() const { return IsVideo() && IsFrame() && (codec >> 4 == 1 || codec >> 4 == 4); }
 };
 
-/** Walks over the tags that a player of the file gets, those with codec configurations included. */
+/** Walks over the tags of the streams that were found, those with codec configurations included. */
 class TagReader {
 public:
     /** @param demuxer borrowed; its main reader is used */
@@ -52,13 +52,24 @@ public:
     /** @return the next audio or video tag; nothing at the end of the data */
     std::optional<Tag> Next();
 
+    /** @return bytes passed so far that belong to none of these tags and to no script tag */
+    int64_t Skipped() const { return m_skipped; }
+    int64_t FirstSkipped() const { return m_firstSkipped; } /**< their place in the file */
+
     /** @return what stands behind the codec header of a tag just delivered */
     std::vector<uint8_t> Data(const Tag& tag);
 
 private:
+    std::optional<Tag> Find();
+    void Skip(int64_t from, int64_t to);
+
     flvd_ctx_t* m_instance;
     fio_file_t* m_reader;
+    const uint32_t m_streams;
     int64_t m_next;
+    int64_t m_end; // of the tag before
+    int64_t m_skipped = 0;
+    int64_t m_firstSkipped = 0;
 };
 
 } // namespace tool

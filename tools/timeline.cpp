@@ -5,6 +5,7 @@
 #include <cmath>
 
 #include "tools/progress.h"
+#include "tools/report.h"
 #include "tools/svg.h"
 #include "tools/tags.h"
 
@@ -17,10 +18,11 @@ constexpr double LEAST_DURATION = 0.1;
 constexpr double LEAST_INTERVAL = 0.1; // a few frames
 constexpr int MOST_INTERVALS = 200;
 
-Timeline Prepare(double seconds, size_t columns)
+Timeline Prepare(int64_t durationMs, size_t columns)
 {
     Timeline timeline{};
-    timeline.duration = std::max(seconds, LEAST_DURATION);
+    timeline.durationMs = durationMs;
+    timeline.duration = std::max(static_cast<double>(durationMs) / MILLISECONDS_A_SECOND, LEAST_DURATION);
     timeline.interval = std::max(TimeStep(timeline.duration, MOST_INTERVALS), LEAST_INTERVAL);
     timeline.columns = columns;
     timeline.lead.resize(columns);
@@ -37,28 +39,32 @@ size_t CellOf(double time, double cellSize, size_t cells)
     return static_cast<size_t>(std::clamp(std::floor(time / cellSize), 0.0, static_cast<double>(cells - 1)));
 }
 
-} // namespace
-
-void Range::Take(double value)
+int64_t TimeOf(const Demuxer& demuxer, const Tag& tag)
 {
-    low = std::min(low, value);
-    high = std::max(high, value);
+    return int64_t{tag.timestamp} - demuxer.Instance()->first_ts;
 }
 
-Timeline ReadTimeline(const Demuxer& demuxer, size_t columns)
+int64_t LatestTime(const Demuxer& demuxer)
 {
-    const flvd_ctx_t& instance = *demuxer.Instance();
-    Timeline timeline = Prepare(instance.duration_ms / MILLISECONDS_A_SECOND, columns);
+    int64_t latest = demuxer.Instance()->duration_ms;
+    TagReader reader(demuxer);
+    while (const std::optional<Tag> tag = reader.Next())
+        latest = std::max(latest, TimeOf(demuxer, *tag));
+    return latest;
+}
+
+Timeline Gather(const Demuxer& demuxer, TagReader& reader, int64_t durationMs, size_t columns)
+{
+    Timeline timeline = Prepare(durationMs, columns);
     std::optional<double> videoTime;
     std::optional<double> audioTime;
     double lead = 0;
-    ProgressBar progress(demuxer.Path(), instance.data_end);
-    TagReader reader(demuxer);
+    ProgressBar progress(demuxer.Path(), demuxer.Instance()->data_end);
     while (const std::optional<Tag> tag = reader.Next()) {
         progress.ShowDone(tag->position);
-        if (!tag->IsFrame() || (demuxer.Streams() & tag->Stream()) == 0)
+        if (!tag->IsFrame())
             continue;
-        const double time = static_cast<double>(int64_t{tag->timestamp} - instance.first_ts) / MILLISECONDS_A_SECOND;
+        const double time = static_cast<double>(TimeOf(demuxer, *tag)) / MILLISECONDS_A_SECOND;
         StreamTimeline& stream = tag->IsVideo() ? timeline.video : timeline.audio;
         const size_t column = CellOf(time, timeline.duration / static_cast<double>(columns), columns);
         stream.bits[CellOf(time, timeline.interval, stream.bits.size())] += tag->size * 8.0;
@@ -73,6 +79,28 @@ Timeline ReadTimeline(const Demuxer& demuxer, size_t columns)
             timeline.lead[column].Take(lead = *audioTime - *videoTime);
         }
     }
+    return timeline;
+}
+
+} // namespace
+
+void Range::Take(double value)
+{
+    low = std::min(low, value);
+    high = std::max(high, value);
+}
+
+// A file whose times all lie below those at its end is read once. Else the axis needs the latest time first.
+Timeline ReadTimeline(Demuxer& demuxer, size_t columns)
+{
+    TagReader reader(demuxer);
+    Timeline timeline = Gather(demuxer, reader, demuxer.Instance()->duration_ms, columns);
+    if (reader.Skipped() == 0)
+        return timeline;
+    demuxer.AcceptAllTimes();
+    TagReader again(demuxer);
+    timeline = Gather(demuxer, again, LatestTime(demuxer), columns);
+    WarnOfSkipped(demuxer, again);
     return timeline;
 }
 

@@ -30,7 +30,8 @@ struct StreamTimeline {
 /** Times in seconds from the first timestamp; intervals, the last one with the rest, and columns divide the duration.
  */
 struct Timeline {
-    double duration;
+    int64_t durationMs;
+    double duration; /**< seconds, never 0 */
     double interval; /**< seconds */
     size_t columns;
     StreamTimeline video;
@@ -39,8 +40,9 @@ struct Timeline {
     std::vector<Range> lead;       /**< of each column: by how much audio is ahead of video in the file, seconds */
 };
 
-/** Reads the whole file. The memory taken depends on the duration only by the keyframes. */
-Timeline ReadTimeline(const Demuxer& demuxer, size_t columns);
+/** Reads the whole file, and tells on standard error what it passed over. The memory taken depends on the duration only
+ * by the keyframes. */
+Timeline ReadTimeline(Demuxer& demuxer, size_t columns);
 
 } // namespace tool
 
