@@ -35,6 +35,13 @@ foreach(name IN ITEMS flvdmx flvdmx-host)
         DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
 endforeach()
 
+# What those who write a host read and copy; the folders lie as in the source tree, for links and includes.
+set(doc_dir ${CMAKE_INSTALL_DATADIR}/doc/flvdmx)
+install(FILES ${PROJECT_SOURCE_DIR}/docs/host-guide.md ${PROJECT_SOURCE_DIR}/docs/damage.md
+    DESTINATION ${doc_dir}/docs COMPONENT development)
+install(DIRECTORY ${PROJECT_SOURCE_DIR}/examples ${PROJECT_SOURCE_DIR}/host DESTINATION ${doc_dir} COMPONENT development
+    FILES_MATCHING PATTERN "*.c" PATTERN "*.cpp" PATTERN "*.h" PATTERN "host/flvdmx" EXCLUDE)
+
 file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/man)
 # flvdmx_install_man(PAGE COMPONENT): compressed without the time, so that the same sources give the same bytes.
 function(flvdmx_install_man page component)

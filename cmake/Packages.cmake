@@ -20,11 +20,12 @@ set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS ${CMAKE_LIBRARY_OUTPUT_DIRECTORY
 get_target_property(abi flvdmx SOVERSION)
 set(version ${PROJECT_VERSION}-${CPACK_DEBIAN_PACKAGE_RELEASE})
 
-# flvdmx_package(COMPONENT NAME SECTION SUMMARY DESCRIPTION): its control fields and its licence
-macro(flvdmx_package component name section summary description)
+# flvdmx_package(COMPONENT NAME SECTION MULTIARCH SUMMARY DESCRIPTION): its control fields and its licence. CPack has no
+# variable for the field Multi-Arch before 3.31: it is a second line of the section's.
+macro(flvdmx_package component name section multiarch summary description)
     string(TOUPPER ${component} key)
     set(CPACK_DEBIAN_${key}_PACKAGE_NAME ${name})
-    set(CPACK_DEBIAN_${key}_PACKAGE_SECTION ${section})
+    set(CPACK_DEBIAN_${key}_PACKAGE_SECTION "${section}\nMulti-Arch: ${multiarch}")
     set(CPACK_DEBIAN_${key}_DESCRIPTION "${summary}\n${description}")
     install(FILES ${PROJECT_SOURCE_DIR}/LICENSE RENAME copyright
         DESTINATION ${CMAKE_INSTALL_DATADIR}/doc/${name} COMPONENT ${component})
@@ -32,14 +33,14 @@ macro(flvdmx_package component name section summary description)
         DESTINATION ${CMAKE_INSTALL_DATADIR}/doc/${name} COMPONENT ${component})
 endmacro()
 
-flvdmx_package(runtime libflvdmx${abi} libs "demultiplexer for the FLV container"
+flvdmx_package(runtime libflvdmx${abi} libs same "demultiplexer for the FLV container"
     "Finds the audio and the video stream of an FLV file, their codec configuration\nand the metadata, and delivers \
 one frame a call. Plays files that are still\nbeing written and survives damage. It uses only the memory and \
 file functions\nthat the program gives it.")
-flvdmx_package(development libflvdmx-dev libdevel "demultiplexer for the FLV container (development files)"
+flvdmx_package(development libflvdmx-dev libdevel same "demultiplexer for the FLV container (development files)"
     "Headers for C and C++, the host kit with ready-made file functions, and the\nfiles for pkg-config and CMake.")
 if(FLVDMX_TOOLS)
-    flvdmx_package(tools flvdmx-tools video "looks into FLV files, judges them and takes them apart"
+    flvdmx_package(tools flvdmx-tools video foreign "looks into FLV files, judges them and takes them apart"
         "The program flvdmx lists streams and frames, seeks, extracts elementary\nstreams, checks files for damage and \
 draws their bit rate.")
 endif()

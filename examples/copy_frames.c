@@ -10,16 +10,32 @@
 #include <stdio.h>
 #include <string.h>
 
+/*
+ * Takes the next frame, of both streams, as the file has one reader. A request ends after 102 tags without a frame,
+ * inside the file: it is asked again while that leads on.
+ */
+static int32_t next_frame(flvd_ctx_t* instance, flvd_frame_t* frame)
+{
+    const flvd_frame_request_t request = {NULL, 0, 0};
+    int64_t reached = -1;
+    for (;;) {
+        const int32_t result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &instance, &request, frame);
+        const int64_t position = __FLV_DMX__fioTell64(instance->main_reader);
+        if (result != FLVD_RET_END || position <= reached || position >= instance->data_end)
+            return result;
+        reached = position;
+    }
+}
+
 /* Until the data ends. 0, or a complaint printed. */
 static int copy_stream(flvd_ctx_t* instance, uint32_t stream, FILE* output)
 {
-    const flvd_frame_request_t request = {NULL, 0, 0}; /* one reader for both streams: whatever comes next */
     flvd_frame_t frame;
     unsigned long frames = 0;
     unsigned long bytes = 0;
     int32_t result;
 
-    while ((result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &instance, &request, &frame)) == 0) {
+    while ((result = next_frame(instance, &frame)) == 0) {
         if (frame.stream != stream)
             continue;
         if (fwrite(frame.data, 1, frame.size, output) != frame.size) {

@@ -16,9 +16,9 @@
  *
  * - Give every open the same functions. File::open(path) takes those of the stdio host; the other hosts of the kit, and
  *   hosts of your own, are passed as a Host. Files opened through different hosts must not be open at the same time.
- * - open() takes open_mutex, so opens may come from any thread as far as other opens are concerned. An open must not
- * run beside any other call, on whatever File: when threads play files while others open some, they share a lock of
- *   yours, or hold open_mutex around their own calls.
+ * - Opening and closing hold open_mutex, so threads may open files, look at their Info and let them go as they like.
+ *   All other calls take no lock, and an open must not run beside them, on whatever File: when threads play files while
+ *   others open some, they hold open_mutex around their own calls as well.
  * - One File is used by one thread at a time. Calls on different Files may run at the same time.
  */
 #ifndef FLVDMX_FLVDMX_HPP
@@ -42,21 +42,32 @@ extern "C" void flvd_stdio_host_fill(flvd_init_t* init);
 
 namespace flvdmx {
 
-/** Held during every open, for the process-wide tables and the globals in which a failed open leaves its error. */
-inline std::mutex open_mutex;
+/**
+ * Held while a file is opened, for the process-wide tables and the globals in which a failed open leaves its error, and
+ * while one is closed, which uses the tables. Whoever holds it may open and close.
+ */
+inline std::recursive_mutex open_mutex;
 
 /** Every time and duration. */
 using Milliseconds = std::chrono::milliseconds;
 
-/** The host's functions: an flvd_init_t of which all but the functions is ignored. */
-using Host = flvd_init_t;
+/** The host's functions. */
+class Host {
+public:
+    /** From a block of which all but the functions is ignored. */
+    explicit Host(const flvd_init_t& functions) : m_functions(functions) {}
+    const flvd_init_t& functions() const { return m_functions; } /**< the block */
+
+private:
+    flvd_init_t m_functions;
+};
 
 /** A Host from a function of the host kit, such as flvd_posix_host_fill. */
 inline Host make_host(void (*fill)(flvd_init_t*))
 {
-    Host host{};
-    fill(&host);
-    return host;
+    flvd_init_t functions{};
+    fill(&functions);
+    return Host(functions);
 }
 
 /** Bytes that belong to somebody else. */
@@ -83,7 +94,7 @@ private:
 enum class Kind {
     none,    /**< no failure */
     end,     /**< the end of the data */
-    not_yet, /**< the end of what a growing file holds so far: ask again later */
+    not_yet, /**< a growing file holds no more so far: ask, or open it, again later */
     miss,    /**< a seek found nothing to land on; playing goes on where it was */
     failed   /**< anything else */
 };
@@ -155,18 +166,23 @@ private:
     int32_t m_line = 0;
 };
 
-/** A value, or the error that took its place. Access to a value that is not there is undefined: test first. */
+/**
+ * A value, or the error that took its place. Access to a value that is not there is undefined: test first. Of a
+ * temporary, `->` is refused: nobody can have tested it, and a range-for over what it leads to would outlive it.
+ */
 template <typename T> class [[nodiscard]] result {
 public:
     result(T value) : m_value(std::move(value)) {}         /**< success */
     result(const flvdmx::error& error) : m_error(error) {} /**< failure */
 
     explicit operator bool() const { return m_value.has_value(); } /**< true when there is a value */
-    T& operator*() { return *m_value; }                            /**< the value */
-    const T& operator*() const { return *m_value; }                /**< the value */
-    T* operator->() { return &*m_value; }                          /**< of the value */
-    const T* operator->() const { return &*m_value; }              /**< of the value */
-    const flvdmx::error& error() const { return m_error; }         /**< of Kind::none when there is a value */
+    T& operator*() & { return *m_value; }                          /**< the value */
+    const T& operator*() const& { return *m_value; }               /**< the value */
+    T&& operator*() && { return std::move(*m_value); }             /**< the value, to be taken */
+    T* operator->() & { return &*m_value; }                        /**< of the value */
+    const T* operator->() const& { return &*m_value; }             /**< of the value */
+    T* operator->() && = delete;                                   /**< refused */
+    flvdmx::error error() const { return m_error; }                /**< of Kind::none when there is a value */
 
 private:
     std::optional<T> m_value;
@@ -269,7 +285,8 @@ class File {
 public:
     /**
      * Opens a file through the functions of `host`; they stay the process's, see above. The path is copied.
-     * @return the file; Kind::not_yet when a growing file does not hold enough yet; Kind::failed
+     * @return the file; Kind::not_yet when a growing file does not hold a file header and the beginning of a stream,
+     *         which more bytes may bring; Kind::failed
      */
     static result<File> open(std::string_view path, const Host& host, const Options& options = {})
     {
@@ -282,7 +299,7 @@ public:
         file.m_request = {options.buffer, options.buffer_size, 0};
         const flvd_init_t init = file.fill_init(host, options);
         const uint32_t operation = options.for_info_only ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN;
-        const std::lock_guard<std::mutex> lock(open_mutex);
+        const std::lock_guard<std::recursive_mutex> lock(open_mutex);
         if (QVX_FLV_DMX(operation, &file.m_instance, &init, &file.m_info) != 0)
             return error(kind_of(g_flvd_lLastError, options.growing), g_flvd_lLastError, g_flvd_lErrorLine);
         return result<File>(std::move(file));
@@ -310,8 +327,10 @@ public:
     /** Closes the file; all views of it end. */
     void close()
     {
-        if (m_instance != nullptr)
-            QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
+        if (m_instance == nullptr)
+            return;
+        const std::lock_guard<std::recursive_mutex> lock(open_mutex);
+        QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
         m_instance = nullptr;
         m_info = {};
     }
@@ -353,9 +372,7 @@ public:
             const int32_t code = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &m_request, &frame);
             if (code == 0)
                 return describe(frame);
-            if (code != FLVD_RET_END || m_instance->error != FLVD_ERR_SHORT_DATA)
-                return failure();
-            const int64_t position = tell(stream);
+            const int64_t position = code == FLVD_RET_END ? tell(stream) : reached;
             if (position <= reached || position >= m_instance->data_end)
                 return failure();
             reached = position;
@@ -381,7 +398,7 @@ public:
     }
 
     /** For range-for: frames up to the first request that fails; last_error() tells why it ended. */
-    inline FrameRange frames(Stream stream = Stream::any);
+    inline FrameRange frames(Stream stream = Stream::any) &;
 
     /**
      * Seeks to a keyframe, without video to an audio frame. After a miss or a failure playing goes on where it was.
@@ -418,7 +435,7 @@ private:
 
     flvd_init_t fill_init(const Host& host, const Options& options) const
     {
-        flvd_init_t init = host;
+        flvd_init_t init = host.functions();
         init.file_name = m_path.get();
         init.cache_size = options.cache_size;
         init.scan_read_size = options.scan_read_size;
@@ -444,6 +461,9 @@ private:
             return Kind::miss;
         case FLVD_ERR_SHORT_DATA:
             return growing ? Kind::not_yet : Kind::end;
+        case FLVD_ERR_NO_STREAM:
+        case FLVD_ERR_FILE_HEADER:
+            return growing ? Kind::not_yet : Kind::failed;
         default:
             return Kind::failed;
         }
@@ -538,7 +558,7 @@ private:
     result<Frame> m_frame = flvdmx::error();
 };
 
-inline FrameRange File::frames(Stream stream)
+inline FrameRange File::frames(Stream stream) &
 {
     return {*this, stream};
 }

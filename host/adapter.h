@@ -5,7 +5,7 @@
 //     int Close(Handle*)                                            0: done
 //     size_t Read(Handle*, void* buffer, size_t wanted)             fewer than wanted: the end was reached
 //     size_t Write(Handle*, const void* buffer, size_t count)       fewer than count: failed
-//     int Seek(Handle*, int64_t offset, int whence)                 0: done; the end flag is cleared
+//     int Seek(Handle*, int64_t offset, int whence)                 0: done; the end flag is cleared; whence is known
 //     int64_t Tell(Handle*)                                         negative: failed
 //     bool AtEnd(const Handle*)                                     a read has met the end and no seek followed
 //     int Flush(Handle*)                                            0: done
@@ -83,9 +83,11 @@ template <typename Files> struct Adapter {
         return size == 0 ? 0 : static_cast<uint32_t>(Files::Write(As(handle), buffer, size_t{size} * count) / size);
     }
 
+    // Systems have origins of their own behind the three.
     static int32_t Seek64(void* handle, int64_t offset, int32_t whence)
     {
-        return Files::Seek(As(handle), offset, whence);
+        const bool known = whence == FIO_SEEK_SET || whence == FIO_SEEK_CUR || whence == FIO_SEEK_END;
+        return known ? Files::Seek(As(handle), offset, whence) : -1;
     }
     static int64_t Tell64(void* handle) { return Files::Tell(As(handle)); }
 

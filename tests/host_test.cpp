@@ -79,6 +79,8 @@ TEST_P(Host, ReadsSeeksAndTells)
         EXPECT_EQ(t.file_tell(handle), at > INT32_MAX ? -1 : at);
     }
     EXPECT_NE(t.file_seek64(handle, -1, 0), 0);
+    for (const int unknown : {-1, 3})
+        EXPECT_NE(t.file_seek64(handle, 1, unknown), 0);
     EXPECT_EQ(t.file_tell64(handle), at) << "a seek that failed moves nothing";
     for (const std::string& path : {folder + "/absent", folder})
         EXPECT_EQ(t.file_open(path.c_str(), "rb"), nullptr) << path;

@@ -21,6 +21,11 @@ flvd_test::Frame Copy(const flvdmx::Frame& frame)
             Bytes(frame.data.begin(), frame.data.end())};
 }
 
+// A range-for over the frames of a file that is gone by then does not compile.
+template <typename R, typename = void> constexpr bool g_has_frames = false;
+template <typename R> constexpr bool g_has_frames<R, std::void_t<decltype(std::declval<R>()->frames())>> = true;
+static_assert(g_has_frames<flvdmx::result<flvdmx::File>&> && !g_has_frames<flvdmx::result<flvdmx::File>>);
+
 class Sample : public testing::TestWithParam<std::string> {};
 // All frames and what is known of the file, against what another demuxer found; one reader, and two with an own buffer.
 TEST_P(Sample, IsDescribedAndPlayed)
@@ -93,10 +98,13 @@ TEST(Interface, FollowsAGrowingFile)
     flvd_memory_host_add(&other);
     const flvdmx::Host memory = flvdmx::make_host(flvd_memory_host_fill);
     const flvdmx::Options options = {8192, 0, false, true};
-    auto file = flvdmx::File::open("growing", memory, options);
-    EXPECT_STREQ(file.error().name(), "FLVD_ERR_NO_STREAM");
+    for (growing.size = 0; growing.size <= 258; ++growing.size) { // there begins the first media tag
+        EXPECT_EQ(flvdmx::File::open("growing", memory, options).error().kind(), Kind::not_yet) << growing.size;
+        EXPECT_EQ(flvdmx::File::open("growing", memory, {}).error().kind(), Kind::failed) << growing.size;
+    }
     growing.size = 2500;
-    file = flvdmx::File::open("growing", memory, options);
+    const std::lock_guard lock(flvdmx::open_mutex); // opens and closes all the same
+    auto file = flvdmx::File::open("growing", memory, options);
     auto second = flvdmx::File::open("other", memory);
     ASSERT_TRUE(file && second);
     const auto wait = [&] {
@@ -113,6 +121,28 @@ TEST(Interface, FollowsAGrowingFile)
     EXPECT_EQ(file->last_error().kind(), Kind::not_yet);
     flvd_memory_host_remove(&growing);
     flvd_memory_host_remove(&other);
+}
+
+// More tags without a frame than one request passes.
+TEST(Interface, CrossesTagsWithoutAFrame)
+{
+    std::vector<Tag> tags = {g_avc, Nalu(0), Nalu(40)};
+    tags.insert(tags.begin() + 2, 150, g_avc);
+    const Bytes bytes = File(tags, 1).bytes;
+    flvd_memory_file_t memory = {"memory", bytes.data(), bytes.size(), nullptr};
+    flvd_memory_host_add(&memory);
+    for (const bool growing : {false, true}) {
+        const flvdmx::Options options = {0, 0, false, growing};
+        auto file = flvdmx::File::open("memory", flvdmx::make_host(flvd_memory_host_fill), options);
+        int64_t last = -1, count = 0;
+        for (const flvdmx::Frame& frame : file->frames()) {
+            last = frame.time.count();
+            ++count;
+        }
+        EXPECT_TRUE(count == 2 && last == 40) << count;
+        EXPECT_EQ(file->last_error().kind(), growing ? Kind::not_yet : Kind::end);
+    }
+    flvd_memory_host_remove(&memory);
 }
 
 } // namespace

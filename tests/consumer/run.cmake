@@ -1,8 +1,10 @@
-# Installs the build into a prefix, moves that, and uses it as a user would: a C program through pkg-config, programs in
-# C and C++ through CMake, and the tool. Called with BUILD, SOURCES, LIBDIR, CC and SAMPLE.
+# Installs the build into a prefix, moves that, and uses it as a user would: the examples that it holds, in C through
+# pkg-config, in C and C++ through CMake, a copy of the host kit, and the tool. Called with BUILD, SOURCES, LIBDIR, CC
+# and SAMPLE.
 
 set(work ${BUILD}/consumer)
 set(prefix ${work}/moved)
+set(doc ${prefix}/share/doc/flvdmx)
 set(ENV{LD_LIBRARY_PATH} ${prefix}/${LIBDIR})
 
 function(run)
@@ -23,7 +25,7 @@ file(RENAME ${work}/installed ${prefix})
 set(ENV{PKG_CONFIG_LIBDIR} ${prefix}/${LIBDIR}/pkgconfig)
 run(pkg-config --cflags --libs flvdmx-host)
 separate_arguments(flags UNIX_COMMAND "${output}")
-run(${CC} ${SOURCES}/examples/list.c -o ${work}/list ${flags})
+run(${CC} ${doc}/examples/list.c -o ${work}/list ${flags})
 run(${work}/list ${SAMPLE})
 expect("H264, 160 x 120")
 
@@ -31,11 +33,16 @@ foreach(pair IN ITEMS "C list.c H264" "CXX seek.cpp reached 1")
     separate_arguments(pair)
     list(POP_FRONT pair language source expected)
     run(${CMAKE_COMMAND} -S ${SOURCES}/tests/consumer -B ${work}/${language} -G Ninja -DCMAKE_PREFIX_PATH=${prefix}
-        -DLANGUAGE=${language} -DSOURCE=${SOURCES}/examples/${source})
+        -DLANGUAGE=${language} -DSOURCE=${doc}/examples/${source})
     run(${CMAKE_COMMAND} --build ${work}/${language})
     run(${work}/${language}/consumer ${SAMPLE} ${pair})
     expect(${expected})
 endforeach()
+
+run(pkg-config --cflags flvdmx)
+separate_arguments(flags UNIX_COMMAND "${output}")
+file(GLOB copied ${doc}/host/*.cpp)
+run(${CC} -std=c++17 -fsyntax-only -I${doc} ${flags} ${copied})
 
 unset(ENV{LD_LIBRARY_PATH})
 run(${prefix}/bin/flvdmx info ${SAMPLE})
