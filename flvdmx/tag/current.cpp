@@ -2,8 +2,6 @@
 
 #include "flvdmx/tag/tag.h"
 
-#include <algorithm>
-
 namespace {
 
 // True when the tag at the position is cached far enough to be judged, plausible and wanted. Not for script data, whose
@@ -23,7 +21,7 @@ bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
 {
     __FLV_DMX__fioSkipBytes(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
     const uint32_t quantum = file->read_size;
-    const FLVD_ReadSizeGuard narrow(file, std::min(quantum, FLVD_NARROW_READ), quantum);
+    const FLVD_ReadSizeGuard narrow(file, quantum > FLVD_NARROW_READ ? FLVD_BACK_POINTER_SIZE : quantum, quantum);
     const uint8_t* bytes = nullptr;
     return FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
            FLVD_IsBackPointer(bytes, tag.data_size);

@@ -1,0 +1,127 @@
+// What the library asks of its host: calls and bytes of every operation, and for the worst files the processor time as
+// well. flvdmx-cost FOLDER prints one JSON document.
+
+#include "flvdmx_player.h"
+#include "hosts.h"
+
+#include <nlohmann/json.hpp>
+
+#include <algorithm>
+#include <cstdio>
+#include <ctime>
+#include <filesystem>
+#include <string>
+
+using namespace flvd_bench;
+using nlohmann::json;
+
+namespace {
+
+constexpr uint32_t MOST_FRAMES = 2'000'000; // nothing here has as many
+
+double ProcessorSeconds()
+{
+    timespec now{};
+    clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &now);
+    return static_cast<double>(now.tv_sec) + 1e-9 * static_cast<double>(now.tv_nsec);
+}
+
+/** One operation's price; the largest of several. */
+struct Price {
+    HostCost cost;
+    uint64_t calls = 0, bytes = 0;
+    double seconds = 0;
+
+    void raise(const HostCost& other, double other_seconds)
+    {
+        cost = other;
+        calls = std::max(calls, other.file_calls());
+        bytes = std::max(bytes, other.bytes);
+        seconds = std::max(seconds, other_seconds);
+    }
+    json text() const
+    {
+        return {{"calls", calls},
+                {"bytes", bytes},
+                {"seconds", seconds},
+                {"reads", cost.of(HostFn::Read)},
+                {"seeks", cost.of(HostFn::Seek)},
+                {"tells", cost.of(HostFn::Tell)},
+                {"eofs", cost.of(HostFn::Eof)},
+                {"held", cost.held}};
+    }
+};
+
+class Meter {
+public:
+    explicit Meter(uint32_t options) : m_watch(MakeHost(g_hosts[0], options)), m_player(m_watch.init()) {}
+
+    FlvdmxPlayer& player() { return m_player; }
+
+    template <class Work> void measure(Price& price, const Work& work)
+    {
+        m_watch.take_cost();
+        const double begin = ProcessorSeconds();
+        work();
+        const double seconds = ProcessorSeconds() - begin;
+        price.raise(m_watch.take_cost(), seconds);
+    }
+
+private:
+    HostWatch m_watch;
+    FlvdmxPlayer m_player;
+};
+
+/** All operations on one file: opening, each frame and all of them, seeks; the first seek on an instance of its own. */
+json Measure(const std::string& path, uint32_t options)
+{
+    Meter meter(options);
+    Price open, play, request, seek, first_seek;
+    bool opened = false;
+    meter.measure(open, [&] { opened = meter.player().open(path); });
+    if (!opened)
+        return {{"open", open.text()}, {"opened", false}};
+    const uint32_t duration = meter.player().instance().duration_ms;
+    const auto time = static_cast<int32_t>(uint64_t{duration} * 6 / 10) + 7;
+    meter.measure(first_seek, [&] { meter.player().seek(time); });
+    meter.player().open(path);
+    Tally tally;
+    meter.measure(play, [&] { tally = meter.player().play(); });
+    if (std::filesystem::file_size(path) < 8u << 20) { // the worst files; what one request costs matters there
+        meter.player().open(path);
+        flvd_frame_t frame{};
+        bool more = true;
+        for (uint32_t i = 0; more && i < MOST_FRAMES; ++i)
+            meter.measure(request, [&] { more = meter.player().frame(frame); });
+        for (const uint32_t mode : {uint32_t{FLVD_SEEK_FORWARD}, uint32_t{FLVD_SEEK_BACKWARD}})
+            for (const int32_t to : {100, 700, time, 0x10000000})
+                meter.measure(seek, [&] { meter.player().seek_only(to, mode); });
+    }
+    return {{"opened", true},
+            {"size", std::filesystem::file_size(path)},
+            {"frames", tally.frames},
+            {"payload", tally.bytes},
+            {"open", open.text()},
+            {"play", play.text()},
+            {"request", request.text()},
+            {"seek", seek.text()},
+            {"first_seek", first_seek.text()}};
+}
+
+} // namespace
+
+int main(int argc, char** argv)
+{
+    if (argc != 2)
+        return 2;
+    json all;
+    for (const auto& entry : std::filesystem::directory_iterator(argv[1]))
+        if (entry.path().extension() == ".flv") {
+            const std::string name = entry.path().stem();
+            all[name] = Measure(entry.path(), 0);
+            if (name == "hd_index")
+                all["hd_index_memory"] = Measure(entry.path(), FLVD_OPT_INDEX_IN_MEMORY);
+        }
+    std::puts(all.dump(1).c_str());
+    return 0;
+}
