@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <cstdio>
 #include <ctime>
+#include <exception>
 #include <filesystem>
 #include <string>
 
@@ -108,20 +109,31 @@ json Measure(const std::string& path, uint32_t options)
             {"first_seek", first_seek.text()}};
 }
 
+json MeasureAll(const std::string& folder)
+{
+    json all;
+    for (const auto& entry : std::filesystem::directory_iterator(folder)) {
+        if (entry.path().extension() != ".flv")
+            continue;
+        const std::string name = entry.path().stem();
+        all[name] = Measure(entry.path(), 0);
+        if (name == "hd_index")
+            all["hd_index_memory"] = Measure(entry.path(), FLVD_OPT_INDEX_IN_MEMORY);
+    }
+    return all;
+}
+
 } // namespace
 
 int main(int argc, char** argv)
 {
     if (argc != 2)
         return 2;
-    json all;
-    for (const auto& entry : std::filesystem::directory_iterator(argv[1]))
-        if (entry.path().extension() == ".flv") {
-            const std::string name = entry.path().stem();
-            all[name] = Measure(entry.path(), 0);
-            if (name == "hd_index")
-                all["hd_index_memory"] = Measure(entry.path(), FLVD_OPT_INDEX_IN_MEMORY);
-        }
-    std::puts(all.dump(1).c_str());
+    try {
+        std::puts(MeasureAll(argv[1]).dump(1).c_str());
+    } catch (const std::exception& error) {
+        std::fputs(error.what(), stderr);
+        return 1;
+    }
     return 0;
 }
