@@ -17,14 +17,14 @@ bool FLVD_IsNextWanted(const flvd_ctx_t* ctx, const fio_file_t* file, uint32_t w
 
 } // namespace
 
-bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag)
+bool FLVD_CheckBehind(fio_file_t* file, uint32_t data_size)
 {
-    __FLV_DMX__fioSkipBytes(tag.data_size + FLVD_TAG_HEADER_SIZE, file);
+    __FLV_DMX__fioSkipBytes(data_size + FLVD_TAG_HEADER_SIZE, file);
     const uint32_t quantum = file->read_size;
     const FLVD_ReadSizeGuard narrow(file, quantum > FLVD_NARROW_READ ? FLVD_BACK_POINTER_SIZE : quantum, quantum);
     const uint8_t* bytes = nullptr;
     return FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
-           FLVD_IsBackPointer(bytes, tag.data_size);
+           FLVD_IsBackPointer(bytes, data_size);
 }
 
 bool FLVD_GoBackToTag(fio_file_t* file, int64_t position)
@@ -41,7 +41,7 @@ int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* 
         return FLVD_ERR_NOT_FOUND;
     if (position == ctx->data_offset)
         FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
-    // What follows up to the search is that search, for a tag that ends it at once.
+    // What follows is the search, for a tag that ends it at once.
     flvd_tag_header_t header;
     if (verify == 0 || !FLVD_IsNextWanted(ctx, file, wanted, &header))
         return FLVD_SearchFrom(ctx, file, info, wanted, verify != 0, position);
@@ -55,7 +55,7 @@ int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* 
     const int64_t start = FLVD_FioTell(file);
     if (start < position)
         return FLVD_ERR_NOT_FOUND;
-    if (large && !FLVD_CheckBehind(file, header.info))
+    if (large && !FLVD_CheckBehind(file, header.info.data_size))
         return FLVD_SearchPastBadTag(ctx, file, info, wanted, start);
     if (large && !FLVD_GoBackToTag(file, start))
         return FLVD_ERR_NOT_FOUND;

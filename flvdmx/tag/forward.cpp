@@ -144,7 +144,7 @@ flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_i
         if (FLVD_FioPeek(&bytes, size, file) == first)
             return {exempt, true};
     }
-    return {FLVD_CheckBehind(file, tag) || exempt, false};
+    return {FLVD_CheckBehind(file, tag.data_size) || exempt, false};
 }
 
 // Behind a tag whose back-pointer disagrees: the search goes on one byte after the tag's start. False when the reader

@@ -144,7 +144,7 @@ bool FLVD_PassBackPointer(fio_file_t* file, uint32_t data_size);
 
 // Moves behind a tag's data and looks at its back-pointer. The tag is mostly gone back to, which empties the cache, so
 // no more is read here than needed.
-bool FLVD_CheckBehind(fio_file_t* file, const flvd_tag_info_t& tag);
+bool FLVD_CheckBehind(fio_file_t* file, uint32_t data_size);
 
 // Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
 bool FLVD_GoBackToTag(fio_file_t* file, int64_t position);
