@@ -2,7 +2,7 @@
 """What the library takes of its target: footprint.py PREFIX LIBRARY OBJECTS [--json].
 
 PREFIX stands before the binutils' names, OBJECTS is a folder with the compiler's call graphs (.ci) of the library's sources
-and the object of instance_size.c. Fails when a bound is passed. Calls of host functions count nothing.
+and the object of instance_size.cpp. Fails when a bound is passed. Calls of host functions count nothing.
 """
 
 import glob
@@ -24,7 +24,7 @@ def sections(prefix, library):
 
 
 def instance(prefix, objects):
-    found = glob.glob(os.path.join(objects, "**", "instance_size.c.o*"), recursive=True)
+    found = glob.glob(os.path.join(objects, "**", "instance_size.cpp.o*"), recursive=True)
     listing = subprocess.run([prefix + "nm", "-S", found[0]], check=True, stdout=subprocess.PIPE, text=True).stdout
     return int(re.search(r"^\w+ (\w+) \w flvd_instance_size", listing, re.M).group(1), 16)
 

@@ -453,7 +453,9 @@ FLVD_API extern int32_t g_flvd_lErrorLine;
  *         FLVD_OP_GET_FRAME returns FLVD_RET_END at the end of the data, and after 102 tags without a frame, however
  *         much follows them: a host that wants to be sure asks again while the reader stands inside the file. With
  *         FLVD_OPT_PROGRESSIVE it also means that the next tag is not whole yet, or was not when its beginning was
- *         read: ask again after a while, once more after the file has stopped growing.
+ *         read: ask again after a while, once more after the file has stopped growing. Streams that the open did not
+ *         find are not found later: open again until those that are awaited are there. Of a complete file tags with a
+ *         time later than its last ones are passed over, as most of a second file that was appended to it may be.
  */
 FLVD_API int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2);
 

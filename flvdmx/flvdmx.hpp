@@ -287,6 +287,8 @@ public:
      * Opens a file through the functions of `host`; they stay the process's, see above. The path is copied.
      * @return the file; Kind::not_yet when a growing file does not hold a file header and the beginning of a stream,
      *         which more bytes may bring; Kind::failed
+     * @note What the open did not find is not found later: look at info() for the streams that are awaited, and open
+     *       a growing file again while one is missing.
      */
     static result<File> open(std::string_view path, const Host& host, const Options& options = {})
     {

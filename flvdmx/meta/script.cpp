@@ -428,7 +428,8 @@ uint32_t FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, ui
     return FLVD_META_KEY_NONE;
 }
 
-int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
+// Not inlined: what it needs of the stack would be taken for every container that is nested in another.
+[[gnu::noinline]] int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 4);
     if (bytes == nullptr)

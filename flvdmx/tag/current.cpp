@@ -15,6 +15,14 @@ bool FLVD_IsNextWanted(const flvd_ctx_t* ctx, const fio_file_t* file, uint32_t w
            FLVD_IsWantedTag(*header, wanted);
 }
 
+// True when the tag at the position is cached whole and its back-pointer agrees.
+bool FLVD_IsCachedAndSound(const fio_file_t* file, uint32_t data_size)
+{
+    const uint32_t size = data_size + FLVD_TAG_OVERHEAD;
+    return size <= file->count &&
+           FLVD_IsBackPointer(file->cache + file->head + size - FLVD_BACK_POINTER_SIZE, data_size);
+}
+
 } // namespace
 
 bool FLVD_CheckBehind(fio_file_t* file, uint32_t data_size)
@@ -45,13 +53,9 @@ int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* 
     flvd_tag_header_t header;
     if (verify == 0 || !FLVD_IsNextWanted(ctx, file, wanted, &header))
         return FLVD_SearchFrom(ctx, file, info, wanted, verify != 0, position);
-    const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
-    const bool large = size > file->capacity;
-    if (!large) {
-        const uint8_t* const back_pointer = file->cache + file->head + size - FLVD_BACK_POINTER_SIZE;
-        if (size > file->count || !FLVD_IsBackPointer(back_pointer, header.info.data_size))
-            return FLVD_SearchFrom(ctx, file, info, wanted, true, position);
-    }
+    const bool large = header.info.data_size + FLVD_TAG_OVERHEAD > file->capacity;
+    if (!large && !FLVD_IsCachedAndSound(file, header.info.data_size))
+        return FLVD_SearchFrom(ctx, file, info, wanted, true, position);
     const int64_t start = FLVD_FioTell(file);
     if (start < position)
         return FLVD_ERR_NOT_FOUND;
