@@ -2,7 +2,8 @@
 
 _flvdmx() {
     local cur prev words cword
-    _init_completion || return
+    local split
+    _init_completion -s || return
 
     local -A options=(
         [info]="--help --json"

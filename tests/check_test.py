@@ -74,6 +74,8 @@ class Check(Case):
                 ("cut in header", whole[:start(90) + 5], [], [("cut_short", start(90), 5)], 5),
                 ("cut in back-pointer", whole[:start(90) - 1], [], [("cut_short", start(89), size[89] - 1)], size[89] - 1),
                 ("cut between", whole[:start(90)], [], [], 0),
+                ("another codec", put({video[9]: TAGS[video[9]][:11] + b"\x22" + TAGS[video[9]][12:]}), [],
+                 [("passed_over", start(video[9]))], size[video[9]]),
                 ("forward", put(late), [], [("jump", start(i)) for i in firsts], 0),
                 ("allowed", put(late), ["--jump", "60.1"], [], 0),
                 ("back", put({video[30]: shift(TAGS[video[30]], -500)}), [], [("jump", start(video[30]))], 0),
@@ -113,6 +115,14 @@ class Check(Case):
     def test_no_right_back_pointer_at_all(self):
         found = self.check(HEADER + b"".join(tag[:-4] + ZEROS for tag in TAGS))
         self.assertEqual(found["counts"], {"not_playable": 1, "back_pointer": len(TAGS)})
+
+    def test_player_of_two_files_in_one(self):
+        """What `check` calls lost is what frames of a player lack."""
+        found = self.check(HEADER + b"".join(TAGS + TAGS[1:60]))
+        self.assertEqual({"jump", "passed_over"}, set(found["counts"]))
+        times = [t for t in map(lambda t: int.from_bytes(t[4:7], "big"), TAGS[1:60])]
+        late = [len(t) for t in TAGS if int.from_bytes(t[4:7], "big") > max(times)]
+        self.assertEqual(found["lost_bytes"], sum(late))
 
     def test_ruined_file_is_not_listed_whole(self):
         found = self.check(HEADER + TAGS[1] + TAGS[2] + b"".join(TAGS[20] + b"\x55" for _ in range(1500)) + TAGS[20])

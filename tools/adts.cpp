@@ -27,7 +27,7 @@ public:
         uint32_t value = 0;
         for (; count > 0; --count, ++m_taken) {
             const size_t byte = m_taken / 8;
-            value = value << 1 | (byte < m_bytes.size() ? m_bytes[byte] >> (7 - m_taken % 8) & 1U : 0U);
+            value = value << 1 | (byte < m_bytes.size() ? uint32_t{m_bytes[byte]} >> (7 - m_taken % 8) & 1U : 0U);
         }
         return value;
     }

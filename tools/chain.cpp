@@ -50,8 +50,8 @@ std::optional<Tag> TagProbe::At(int64_t position) const
 }
 
 Chain::Chain(const Demuxer& demuxer, const TagProbe& probe, uint32_t jumpMs, Findings& findings, Progress progress)
-    : m_instance(demuxer.Instance()), m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_probe(probe), m_jumpMs(jumpMs),
-      m_findings(findings), m_progress(std::move(progress)),
+    : m_instance(demuxer.Instance()), m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_streams(demuxer.Streams()),
+      m_probe(probe), m_jumpMs(jumpMs), m_findings(findings), m_progress(std::move(progress)),
       m_first(m_instance->data_offset + int64_t{BACK_POINTER_SIZE})
 {
 }
@@ -76,8 +76,7 @@ int64_t Chain::Step(int64_t position)
     if (!tag)
         return Resume(position, tag);
     if (IsChained(*tag)) {
-        if (IsLate(*tag))
-            m_findings.Lose(tag->End() - tag->position);
+        JudgePlayed(*tag);
         Take(*tag);
         return tag->End();
     }
@@ -90,10 +89,33 @@ int64_t Chain::Step(int64_t position)
     return Resume(position, tag);
 }
 
-// A player passes it over: a complete file has nothing later than its last tags.
-bool Chain::IsLate(const Tag& tag) const
+// Why a player passes over a tag of which the chain holds; empty when it does not.
+std::string_view Chain::WhyPassedOver(const Tag& tag) const
 {
-    return tag.type != FLVD_TAG_TYPE_SCRIPT && m_instance->last_ts != 0 && tag.timestamp > m_instance->last_ts;
+    if (tag.type == FLVD_TAG_TYPE_SCRIPT)
+        return "";
+    if ((m_streams & tag.Stream()) == 0)
+        return "are of a stream that cannot be played";
+    const bool sameCodec = tag.IsVideo() ? ((tag.codec ^ m_instance->video_codec_filter) & CODEC_ID_MASK) == 0 &&
+                                               tag.codec >> 4 <= MOST_FRAME_TYPE
+                                         : tag.codec == m_instance->audio_format_filter;
+    if (!sameCodec)
+        return "are of another codec than the stream";
+    if (m_instance->last_ts != 0 && tag.timestamp > m_instance->last_ts)
+        return "are later than the last ones of the file";
+    return tag.size < tag.CodecHeaderSize() ? "are too short for a frame" : "";
+}
+
+// One finding for all tags in a row.
+void Chain::JudgePlayed(const Tag& tag)
+{
+    const std::string_view why = WhyPassedOver(tag);
+    if (!why.empty())
+        m_findings.Lose(tag.End() - tag.position);
+    if (!why.empty() && why != m_passedOver)
+        m_findings.Add("passed_over", tag.position, fmt::format("tags from here on {}", why));
+    if (tag.type != FLVD_TAG_TYPE_SCRIPT)
+        m_passedOver = why;
 }
 
 bool Chain::IsChained(const Tag& tag) const

@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <functional>
 #include <optional>
+#include <string_view>
 
 #include "tools/demuxer.h"
 #include "tools/findings.h"
@@ -49,7 +50,8 @@ public:
 
 private:
     int64_t Step(int64_t position);
-    bool IsLate(const Tag& tag) const;
+    std::string_view WhyPassedOver(const Tag& tag) const;
+    void JudgePlayed(const Tag& tag);
     bool IsChained(const Tag& tag) const;
     bool CouldFollow(int64_t position) const;
     void TakeUnlinked(const Tag& tag, int64_t next);
@@ -60,12 +62,14 @@ private:
 
     flvd_ctx_t* m_instance;
     fio_file_t* m_reader;
+    const uint32_t m_streams;
     const TagProbe& m_probe;
     const uint32_t m_jumpMs;
     Findings& m_findings;
     const Progress m_progress;
     const int64_t m_first; // position of the first tag
     uint64_t m_tags = 0;
+    std::string_view m_passedOver; // why the audio or video tag before was
     std::optional<uint32_t> m_lastTimes[FLVD_STREAM_AUDIO + 1];
 };
 

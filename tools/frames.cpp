@@ -181,9 +181,9 @@ void PrintGrowing(const FramesOptions& options)
 {
     Growth growth(options.file, options.timeoutSeconds);
     const std::unique_ptr<Demuxer> demuxer = OpenGrowing(options, growth);
+    FramePrinter printer(options, options.streams & (AnnouncedStreams(*demuxer) | demuxer->Streams()));
     SeekToStart(*demuxer, options);
     FrameSource source(*demuxer, options.streams);
-    FramePrinter printer(options, options.streams & (AnnouncedStreams(*demuxer) | demuxer->Streams()));
     while (!printer.Done()) {
         if (const std::optional<Frame> frame = source.Next()) {
             printer.Take(*frame);

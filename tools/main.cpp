@@ -201,6 +201,7 @@ void AddCheck(CLI::App& app, CheckOptions& options)
                     "  cut_short        the end of the last tag, or of what the metadata announces, is missing\n"
                     "  back_pointer     the size behind a tag is wrong\n"
                     "  no_back_pointer  there is none\n"
+                    "  passed_over      tags that a player leaves out: of another codec, too late, too short\n"
                     "  jump             time runs back, or forward by more than --jump, within a stream\n"
                     "  index            an entry leads to no keyframe, or its time is wrong by more than a second\n"
                     "  not_playable     the file cannot be opened for playing\n"

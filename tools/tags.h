@@ -12,6 +12,8 @@ namespace tool {
 
 constexpr uint32_t TAG_HEADER_SIZE = 11;
 constexpr uint32_t BACK_POINTER_SIZE = 4;
+constexpr uint32_t CODEC_ID_MASK = 0x0F;
+constexpr uint32_t MOST_FRAME_TYPE = 5;   /**< FrameType of video */
 constexpr uint32_t CODEC_ID_AVC = 7;      /**< CodecID of video */
 constexpr uint32_t SOUND_FORMAT_AAC = 10; /**< SoundFormat of audio */
 
