@@ -27,88 +27,14 @@ Input::Input(const uint8_t* data, size_t size)
     m_control.assign(control, end);
 }
 
-struct Host::Functions {
-    static Host& host() { return static_cast<Host&>(current()); }
-    static const fio_funcs_t& honest() { return host().m_honest; }
-    static bool lies(Lie lie) { return (host().m_lies >> static_cast<uint32_t>(lie) & 1u) != 0; }
-
-    static void* Alloc(uint32_t size)
-    {
-        void* const memory = honest().mem_alloc(size == FRAME_BUFFER_SIZE ? 1 : size);
-        if (size != FRAME_BUFFER_SIZE || memory == nullptr || std::exchange(host().m_frame_buffer_held, true))
-            return memory;
-        honest().mem_free(memory);
-        return g_frame_buffer.get();
-    }
-    static void Free(void* memory)
-    {
-        if (memory != g_frame_buffer.get())
-            return honest().mem_free(memory);
-        require(std::exchange(host().m_frame_buffer_held, false), "a frame buffer that is released twice");
-    }
-    static uint32_t Read(void* buffer, uint32_t size, uint32_t count, void* handle)
-    {
-        if (host().refuses(1))
-            return 0;
-        const uint32_t got = honest().file_read(buffer, size, count, handle);
-        host().refuses(got / 1024);
-        if (lies(Lie::ReadStands))
-            honest().file_seek64(handle, -int64_t{got}, FIO_SEEK_CUR);
-        return lies(Lie::ReadClaimsMore) ? count + 1 : got;
-    }
-    static int32_t Seek64(void* handle, int64_t offset, int32_t whence)
-    {
-        if (host().refuses(1) || lies(Lie::SeekStands))
-            return lies(Lie::SeekStands) ? 0 : -1;
-        return honest().file_seek64(handle, offset, lies(Lie::SeekForgetsWhere) ? FIO_SEEK_SET : whence);
-    }
-    static int64_t Tell64(void* handle)
-    {
-        const int64_t position = host().refuses(1) ? -1 : honest().file_tell64(handle);
-        const auto call = static_cast<int64_t>(host().calls(HostFn::Tell));
-        if (lies(Lie::TellGoesBack) && position > call % 16)
-            return position - call % 2 * (call % 16);
-        if (position >= 0 && lies(Lie::TellHuge))
-            return INT64_MAX - call;
-        return position >= 0 && lies(Lie::TellStands) ? 20 : position;
-    }
-    static int32_t Seek(void* handle, int32_t offset, int32_t whence) { return Seek64(handle, offset, whence); }
-    static int32_t Tell(void* handle) { return static_cast<int32_t>(Tell64(handle)); }
-    static int32_t Eof(void* handle)
-    {
-        const int32_t at_end = honest().file_eof(handle);
-        return lies(Lie::AlwaysAtEnd) ? 1 : lies(Lie::NeverAtEnd) ? 0 : at_end;
-    }
-};
-
-Host::Host(Bytes file) : FakeHost(std::move(file)), m_honest(FakeHost::funcs())
+Host::Host(Bytes file) : FakeHost(std::move(file))
 {
     on_call = [this](HostFn) { require(m_calls_left-- != 0, "more host calls than an operation may cost"); };
 }
 
-template <class Table> void Host::install(Table* table)
-{
-    table->mem_alloc = Functions::Alloc;
-    table->mem_free = Functions::Free;
-    table->file_read = Functions::Read;
-    table->file_seek = Functions::Seek;
-    table->file_tell = Functions::Tell;
-    table->file_eof = Functions::Eof;
-    table->file_seek64 = table->file_seek64 != nullptr ? Functions::Seek64 : nullptr;
-    table->file_tell64 = table->file_tell64 != nullptr ? Functions::Tell64 : nullptr;
-}
-
-flvd_init_t Host::init(uint32_t options, uint32_t cache_size, uint32_t scan_read_size) const
-{
-    flvd_init_t init = FakeHost::init(options, cache_size, scan_read_size);
-    install(&init);
-    return init;
-}
-
 fio_file_t* Host::open_reader(uint32_t cache_size, uint32_t overread_extra) const
 {
-    fio_funcs_t table = FakeHost::funcs();
-    install(&table);
+    const fio_funcs_t table = funcs();
     __FLV_DMX__fioSetFunc(&table);
     return __FLV_DMX__fioOpen(DEFAULT_FILE, FIO_MODE_READ, cache_size, overread_extra != 0 ? 1 : 0, overread_extra);
 }
@@ -128,9 +54,60 @@ bool Host::refuses(uint64_t effort)
     return refused;
 }
 
-int64_t Host::position(const fio_file_t* reader) const
+void* Host::alloc(uint32_t size)
 {
-    const int64_t host = m_honest.file_tell64(reader->handle);
+    void* const memory = FakeHost::alloc(size == FRAME_BUFFER_SIZE ? 1 : size);
+    if (size != FRAME_BUFFER_SIZE || memory == nullptr || std::exchange(m_frame_buffer_held, true))
+        return memory;
+    FakeHost::release(memory);
+    return g_frame_buffer.get();
+}
+
+void Host::release(void* memory)
+{
+    if (memory != g_frame_buffer.get())
+        return FakeHost::release(memory);
+    require(std::exchange(m_frame_buffer_held, false), "a frame buffer that is released twice");
+}
+
+int32_t Host::eof(void* handle)
+{
+    const int32_t at_end = FakeHost::eof(handle);
+    return lies(Lie::AlwaysAtEnd) ? 1 : lies(Lie::NeverAtEnd) ? 0 : at_end;
+}
+
+uint32_t Host::read(void* buffer, uint32_t size, uint32_t count, void* handle)
+{
+    if (refuses(1))
+        return 0;
+    const uint32_t got = FakeHost::read(buffer, size, count, handle);
+    refuses(got / 1024);
+    if (lies(Lie::ReadStands))
+        FakeHost::seek(handle, -int64_t{got}, FIO_SEEK_CUR, true);
+    return lies(Lie::ReadClaimsMore) ? count + 1 : got;
+}
+
+int32_t Host::seek(void* handle, int64_t offset, int32_t whence, bool wide)
+{
+    if (refuses(1) || lies(Lie::SeekStands))
+        return lies(Lie::SeekStands) ? 0 : -1;
+    return FakeHost::seek(handle, offset, lies(Lie::SeekForgetsWhere) ? FIO_SEEK_SET : whence, wide);
+}
+
+int64_t Host::tell(void* handle, bool wide)
+{
+    const int64_t position = refuses(1) ? -1 : FakeHost::tell(handle, wide);
+    const auto call = static_cast<int64_t>(calls(HostFn::Tell));
+    if (lies(Lie::TellGoesBack) && position > call % 16)
+        return position - call % 2 * (call % 16);
+    if (position >= 0 && lies(Lie::TellHuge))
+        return INT64_MAX - call;
+    return position >= 0 && lies(Lie::TellStands) ? 20 : position;
+}
+
+int64_t Host::position(const fio_file_t* reader)
+{
+    const int64_t host = FakeHost::tell(reader->handle, true);
     return reader->state == FIO_STATE_READ ? host - reader->count : host + reader->count;
 }
 

@@ -37,6 +37,16 @@ private:
     size_t m_next = 0;
 };
 
+/** A course: the control bytes are its calls, each a code and an argument. */
+template <class Course, uint32_t MAX_CALLS> void run_calls(Input& input)
+{
+    Course course(input);
+    for (uint32_t i = 0; i < MAX_CALLS && !input.empty(); ++i) {
+        const uint8_t code = input.byte();
+        course.call(code, input.byte());
+    }
+}
+
 /** A fuzz target. Each is a static object; the programs find it in the list. */
 struct Target {
     Target(const char* its_name, void (*its_run)(Input&)) : name(its_name), run(its_run), next(first) { first = this; }
@@ -63,7 +73,6 @@ enum class Lie : uint8_t {
 class Host : public FakeHost {
 public:
     explicit Host(Bytes file);
-    flvd_init_t init(uint32_t options, uint32_t cache_size, uint32_t scan_read_size) const;
     /** The library's file layer gets this host's functions and opens the file. */
     fio_file_t* open_reader(uint32_t cache_size, uint32_t overread_extra = 0) const;
     /** Tells these lies (bits 1 << Lie) from now on, until `patience` calls or KiB read are used up; then it refuses.
@@ -72,15 +81,19 @@ public:
     /** The next operation may cost so many calls. */
     void begin(uint64_t calls) { m_calls_left = calls; }
     /** Where a reader really stands. */
-    int64_t position(const fio_file_t* reader) const;
+    int64_t position(const fio_file_t* reader);
     void require_clean() const;
 
 private:
-    struct Functions;
-    template <class Table> static void install(Table* table);
+    bool lies(Lie lie) const { return (m_lies >> static_cast<uint32_t>(lie) & 1u) != 0; }
     bool refuses(uint64_t effort);
+    void* alloc(uint32_t size) override;
+    void release(void* memory) override;
+    int32_t eof(void* handle) override;
+    uint32_t read(void* buffer, uint32_t size, uint32_t count, void* handle) override;
+    int32_t seek(void* handle, int64_t offset, int32_t whence, bool wide) override;
+    int64_t tell(void* handle, bool wide) override;
 
-    const fio_funcs_t m_honest;
     uint32_t m_lies = 0;
     uint64_t m_patience = UINT64_MAX;
     uint64_t m_calls_left = UINT64_MAX;

@@ -7,7 +7,6 @@
 namespace flvd_fuzz {
 namespace {
 
-constexpr uint32_t MAX_CALLS = 24;
 constexpr uint32_t ANY_CODEC = 0xFFFF;
 constexpr int64_t BEYOND = 64; // how far behind the end of the file a reader is put
 constexpr uint32_t POISON = 0x5A5A5A5A;
@@ -32,6 +31,7 @@ public:
         m_ctx.cache_size = 1024u + (bits >> 4u) * 300u;
         m_reader = m_host.open_reader(m_ctx.cache_size);
     }
+    ~Navigation() { __FLV_DMX__fioClose(m_reader); }
 
     void call(uint32_t code, uint32_t bits)
     {
@@ -60,14 +60,9 @@ public:
                          search(begin, wanted, verify != 0));
         }
     }
-    void close()
-    {
-        __FLV_DMX__fioClose(m_reader);
-        m_host.require_clean();
-    }
 
 private:
-    void judge(int32_t rc, const flvd_tag_info_t& info, const Found& expected) const
+    void judge(int32_t rc, const flvd_tag_info_t& info, const Found& expected)
     {
         if (expected.rc == UNKNOWN)
             return;
@@ -170,17 +165,7 @@ private:
     fio_file_t* m_reader = nullptr;
 };
 
-void run(Input& input)
-{
-    Navigation navigation(input);
-    for (uint32_t i = 0; i < MAX_CALLS && !input.empty(); ++i) {
-        const uint8_t code = input.byte();
-        navigation.call(code, input.byte());
-    }
-    navigation.close();
-}
-
-const Target g_target("navigation", run);
+const Target g_target("navigation", run_calls<Navigation, 24>);
 
 } // namespace
 } // namespace flvd_fuzz

@@ -6,7 +6,6 @@
 namespace flvd_fuzz {
 namespace {
 
-constexpr uint32_t MAX_CALLS = 120;
 constexpr uint32_t BIT_READER_CACHE = 8; // a smaller cache does not hold what the bit reader looks at
 
 class Reader {
@@ -17,6 +16,7 @@ public:
         m_file = m_host.open_reader(1u + input.byte() % 64u, extra);
         m_room = m_file->capacity + extra;
     }
+    ~Reader() { __FLV_DMX__fioClose(m_file); }
 
     void call(uint8_t code, uint32_t n)
     {
@@ -24,11 +24,6 @@ public:
         apply(code, n);
         require(__FLV_DMX__fioTell64(m_file) == m_position, "another position");
         require(uint64_t{m_file->head} + m_file->count <= m_room, "more cached than there is room for");
-    }
-    void close()
-    {
-        __FLV_DMX__fioClose(m_file);
-        m_host.require_clean();
     }
 
 private:
@@ -121,17 +116,7 @@ private:
     int64_t m_position = 0, m_bit = 0;
 };
 
-void run(Input& input)
-{
-    Reader reader(input);
-    for (uint32_t i = 0; i < MAX_CALLS && !input.empty(); ++i) {
-        const uint8_t code = input.byte();
-        reader.call(code, input.byte());
-    }
-    reader.close();
-}
-
-const Target g_target("reader", run);
+const Target g_target("reader", run_calls<Reader, 120>);
 
 } // namespace
 } // namespace flvd_fuzz

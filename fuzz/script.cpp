@@ -8,8 +8,14 @@ namespace {
 
 constexpr size_t START = 24; // of the payload in the file
 
+template <class Element> void append_bytes(Bytes* out, const Element* begin, size_t count)
+{
+    const auto* const first = reinterpret_cast<const uint8_t*>(begin);
+    out->insert(out->end(), first, first + count * sizeof(Element));
+}
+
 // What a payload sets in an instance as the probing has it when it meets the script tag.
-std::vector<int64_t> outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length)
+Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length)
 {
     const flvd_init_t init = host.init(options, 0, 0);
     flvd_ctx_t ctx{};
@@ -23,37 +29,22 @@ std::vector<int64_t> outcome(Host& host, uint32_t options, uint32_t cache_size, 
     require(rc == 0 || rc == -1, "a result that reading of metadata has not");
     require(host.position(ctx.cur_reader) == int64_t{START} + length, "the reader is not behind the payload");
 
-    const auto& [video, audio] = std::tie(ctx.video_info, ctx.audio_info);
     const auto& [index, arrays] = std::tie(ctx.keyframe_index, ctx.keyframe_arrays);
     const auto end = host.visible() + 5; // a key in the last bytes announces an array behind them
     require(index.times_offset <= end && index.positions_offset <= end, "an index outside the file");
     require(arrays.times_count <= length && arrays.positions_count <= length, "an array larger than the payload");
     const bool kept = (options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
     require(kept || arrays.times_ms == nullptr, "an index in memory that was not asked for");
-    std::vector<int64_t> values = {rc,
-                                   video.width,
-                                   video.height,
-                                   video.frame_rate,
-                                   video.last_key_time_ms,
-                                   audio.sample_rate,
-                                   audio.sample_size,
-                                   audio.data_rate,
-                                   ctx.file_size,
-                                   ctx.audio_delay_ms,
-                                   ctx.last_keyframe_ms,
-                                   ctx.last_keyframe_pos,
-                                   index.times_offset,
-                                   index.entry_count,
-                                   ctx.file_shorter_than_meta,
-                                   arrays.times_count,
-                                   arrays.positions_count,
-                                   index.positions_offset};
-    values.insert(values.end(), arrays.times_ms, arrays.times_ms + arrays.times_count);
-    values.insert(values.end(), arrays.positions, arrays.positions + arrays.positions_count);
+    Bytes values(1, static_cast<uint8_t>(rc));
+    append_bytes(&values, arrays.times_ms, arrays.times_count);
+    append_bytes(&values, arrays.positions, arrays.positions_count);
     init.mem_free(arrays.times_ms);
     init.mem_free(arrays.positions);
     __FLV_DMX__fioClose(ctx.cur_reader);
-    host.require_clean();
+    ctx.cur_reader = nullptr;
+    ctx.keyframe_arrays.times_ms = nullptr;
+    ctx.keyframe_arrays.positions = nullptr;
+    append_bytes(&values, &ctx, 1);
     return values;
 }
 

@@ -68,8 +68,6 @@ public:
             m_lies ^= 1u << argument % static_cast<uint32_t>(Lie::Count);
             m_lied = m_lied || m_lies != 0;
             return m_host.lie(m_lies, input.byte() == 0xFF || m_lies == 0 ? UINT64_MAX : PATIENCE);
-        case 9:
-            return misuse(argument);
         case 10:
             m_faulty = false;
             return m_host.fail_nothing();
@@ -139,20 +137,6 @@ private:
         const auto size = static_cast<uint64_t>(m_host.visible());
         m_host.begin(m_lied ? BUDGETS : 4000 + 40 * size);
     }
-    // Calls that are refused whatever the state, and touch nothing.
-
-    void misuse(uint32_t operation)
-    {
-        if (operation == FLVD_OP_CLOSE || operation == FLVD_OP_GET_LAST_ERROR)
-            return;
-        flvd_frame_t frame;
-        std::memset(&frame, POISON, sizeof frame);
-        const bool missing = m_ctx == nullptr && (operation == FLVD_OP_GET_FRAME || operation == FLVD_OP_SEEK);
-        const int32_t rc = QVX_FLV_DMX(operation, &m_ctx, nullptr, &frame);
-        require(rc == (missing ? FLVD_RET_NO_INSTANCE : FLVD_RET_FAILED), "a call that is to be refused");
-        require(is_filled(frame, POISON), "a refused call touched its record");
-    }
-
     void judge_opened(const flvd_open_info_t& info) const
     {
         const bool video = (m_ctx->streams & FLVD_STREAM_VIDEO) != 0;
@@ -172,7 +156,7 @@ private:
 
     // Where delivery goes on: a growing file's tag that waits to be tried again is gone back to first.
 
-    int64_t place(const fio_file_t* reader) const
+    int64_t place(const fio_file_t* reader)
     {
         const int64_t saved = reader == m_ctx->main_reader ? m_ctx->saved_main_pos : m_ctx->saved_audio_pos;
         return has(FLVD_OPT_PROGRESSIVE) && saved != 0 ? saved : m_host.position(reader);
@@ -227,7 +211,7 @@ private:
         require(!stays || (place(m_ctx->main_reader) == main && place(m_ctx->audio_reader) == audio), "a place lost");
     }
 
-    void judge_landing(int32_t reached) const
+    void judge_landing(int32_t reached)
     {
         const int64_t position = m_host.position(m_ctx->main_reader);
         require(position >= m_ctx->data_offset && position <= m_host.visible(), "a seek out of the data");

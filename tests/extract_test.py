@@ -1,20 +1,13 @@
 #!/usr/bin/env python3
-"""`flvdmx extract`: what comes out must be what an independent decoder makes the same pictures and sound of."""
-import contextlib
+"""`flvdmx extract`: what comes out has once been decoded to the same pictures and sound by an independent decoder."""
 import hashlib
 import os
-import pathlib
 import pty
-import shutil
 import subprocess
-import sys
 import time
 import unittest
 
 from tool_test import DATA, SAMPLES, TOOL, Case, Expected, run, sample, split_tags
-
-sys.path.insert(0, str(DATA))
-import make_expected  # noqa: E402
 
 HASHES = {(name, kind): sha for name, kind, sha in
           (line.split() for line in (DATA / "expected" / "extract.txt").read_text().splitlines())}
@@ -58,13 +51,6 @@ class Extract(Case):
                     for kind in kinds:
                         found = hashlib.sha256((folder / files[kind]).read_bytes()).hexdigest()
                         self.assertEqual(found, HASHES[name, kind])
-
-    @unittest.skipUnless(shutil.which("ffmpeg"), "needs ffmpeg")
-    def test_decodes_to_the_same(self):
-        for name in SAMPLES:
-            codecs = {kind: stream["codec"] for kind, stream in Expected(name).streams.items()}
-            lines = make_expected.extracted(TOOL, DATA / f"{name}.flv", codecs, self.write("any", b"").parent)
-            self.assertEqual([tuple(line.split()) for line in lines], [(name, k, HASHES[name, k]) for k in codecs])
 
     def test_annexb(self):
         """Rewritten with each size of lengths, with configurations between, and with damaged lengths."""
@@ -135,11 +121,7 @@ class Extract(Case):
             os.close(end)
             time.sleep(3)
             self.assertEqual(hashlib.sha256((folder / "out").read_bytes()).hexdigest(), HASHES["aac_only", "audio"])
-            shown = b""
-            with contextlib.suppress(OSError):  # a terminal that is closed on the other side ends with an error
-                while more := os.read(terminal, 10000):
-                    shown += more
-        os.close(terminal)
+            shown = self.shown(terminal)
         self.assertEqual(process.returncode, 0)
         self.assertRegex(shown, rb"\A\r\x1b\[K\S+aac_only.flv \[#* *\] +\d+%.*\r\x1b\[K\Z")
 

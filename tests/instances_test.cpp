@@ -55,31 +55,6 @@ TEST(Instances, DoNotDisturbEachOther)
         }
 }
 
-TEST(Instances, LeaveNothingBehind)
-{
-    FakeHost host(MakeChain({true, true, true, true}).bytes);
-    size_t held[6] = {}; // after each kind of open
-    for (uint32_t i = 0; i < 10000; ++i) {
-        const uint32_t options = USER | (i % 2 != 0 ? SEPARATE | INDEX : 0);
-        Session session(host, {options, i % 6 > 3, 0, 0, FakeHost::DEFAULT_FILE, 512});
-        ASSERT_EQ(session.frame(VIDEO).rc, i % 6 > 3 ? FLVD_RET_FAILED : 0);
-        ASSERT_EQ(host.live_bytes(), held[i % 6] = i < 6 ? host.live_bytes() : held[i % 6]);
-        ASSERT_EQ(session.close(), 0);
-        ASSERT_EQ(host.live_blocks() + host.open_handles(), 0u);
-    }
-}
-
-TEST(Instances, RefuseCallsInTheWrongOrder)
-{
-    FakeHost host(MakeChain().bytes);
-    Session session(host, {0, true});
-    for (const int32_t rc : {session.frame().rc, session.seek(0, 0)}) // opened for information only
-        EXPECT_EQ(std::pair(rc, session.last_error()), std::pair(FLVD_RET_FAILED + 0, FLVD_ERR_INFO_ONLY + 0));
-    EXPECT_EQ(session.close(), 0);
-    for (const int32_t rc : {session.frame().rc, session.seek(0, 0), session.close(), session.close()})
-        EXPECT_EQ(rc, FLVD_RET_NO_INSTANCE); // the host has cleared its word
-}
-
 TEST(Instances, RefusesWhatItCannotServe)
 {
     FakeHost host(MakeChain().bytes);

@@ -7,7 +7,7 @@
 #include "support/session.h"
 
 #include <algorithm>
-#include <array>
+#include <map>
 #include <optional>
 
 using namespace flvd_test;
@@ -33,7 +33,6 @@ struct Sample {
     Expected expected;
     std::vector<Packet> packets;
 
-    // The frames of some streams.
     Frames frames(uint32_t streams) const
     {
         Frames out;
@@ -59,23 +58,17 @@ Sample Load(const std::string& name)
 
 const std::vector<Sample>& Samples()
 {
-    static const std::vector<Sample> samples = [] {
-        std::vector<Sample> all;
-        for (const char* const name :
-             {"aac_only", "avc_aac", "avc_aac_index", "avc_bframes_aac", "avc_only", "h263_mp3", "mp3_only", "pcm_only",
-              "screen", "speex_only", "truncated", "damaged"})
-            all.push_back(Load(name));
-        return all;
-    }();
+    static const std::vector<Sample> samples = {Load("aac_only"),        Load("avc_aac"),   Load("avc_aac_index"),
+                                                Load("avc_bframes_aac"), Load("avc_only"),  Load("h263_mp3"),
+                                                Load("mp3_only"),        Load("pcm_only"),  Load("screen"),
+                                                Load("speex_only"),      Load("truncated"), Load("damaged")};
     return samples;
 }
 
 // The streams to ask for, one after the other.
-const std::vector<uint32_t>& Streams(uint32_t options)
+std::vector<uint32_t> Streams(uint32_t options)
 {
-    static const std::vector<uint32_t> each = {FLVD_STREAM_VIDEO, FLVD_STREAM_AUDIO};
-    static const std::vector<uint32_t> together = {BOTH};
-    return (options & SEPARATE) != 0 ? each : together;
+    return (options & SEPARATE) != 0 ? std::vector{VIDEO, AUDIO} : std::vector{BOTH};
 }
 
 // Plays what was opened to its end, which has to come in time. `exact`: the frames whose tags lie whole in what the
@@ -102,21 +95,19 @@ void PlayOut(const FakeHost& host, Session& session, const OpenOptions& open, co
 
 void ExpectStreams(const flvd_open_info_t& info, const Expected& expected)
 {
-    const ExpectedStream* const video = expected.find(FLVD_STREAM_VIDEO);
-    const ExpectedStream* const audio = expected.find(FLVD_STREAM_AUDIO);
-    ASSERT_EQ(info.has_video != 0, video != nullptr);
-    ASSERT_EQ(info.has_audio != 0, audio != nullptr);
+    const ExpectedStream* const video = expected.find(VIDEO);
+    const ExpectedStream* const audio = expected.find(AUDIO);
+    ASSERT_EQ(std::pair(info.has_video != 0, info.has_audio != 0), std::pair(video != nullptr, audio != nullptr));
     if (video != nullptr) {
-        EXPECT_EQ(Bytes(info.video_info->config, info.video_info->config + info.video_info->config_size),
-                  video->extradata);
-        EXPECT_EQ(info.video_info->width, video->width);
-        EXPECT_EQ(info.video_info->height, video->height);
+        const flvd_video_info_t& found = *info.video_info;
+        EXPECT_EQ(Bytes(found.config, found.config + found.config_size), video->extradata);
+        EXPECT_EQ(std::pair(found.width, found.height), std::pair(video->width, video->height));
     }
     if (audio != nullptr) {
-        EXPECT_EQ(Bytes(info.audio_info->config, info.audio_info->config + info.audio_info->config_size),
-                  audio->extradata);
-        EXPECT_EQ(info.audio_info->channels, audio->channels);
-        EXPECT_TRUE(audio->codec == "speex" || info.audio_info->sample_rate == audio->sample_rate);
+        const flvd_audio_info_t& found = *info.audio_info;
+        EXPECT_EQ(Bytes(found.config, found.config + found.config_size), audio->extradata);
+        EXPECT_EQ(found.channels, audio->channels);
+        EXPECT_TRUE(audio->codec == "speex" || found.sample_rate == audio->sample_rate) << found.sample_rate;
     }
 }
 
@@ -150,7 +141,7 @@ TEST(Samples, DeliverWhatTheProberFound)
 
 // The file grows by one byte at a time: until it can be opened, with two readers until both streams can be seen, and
 // then between requests.
-std::array<Frames, BOTH + 1> PlayGrowing(const Sample& sample, uint32_t options)
+void PlayGrowing(const Sample& sample, uint32_t options)
 {
     FakeHost host(sample.bytes);
     host.set_visible(0);
@@ -159,31 +150,25 @@ std::array<Frames, BOTH + 1> PlayGrowing(const Sample& sample, uint32_t options)
     do
         session.emplace(host, OpenOptions{options});
     while ((!session->opened() || session->info().has_video + session->info().has_audio < streams) && host.grow(1));
-    std::array<Frames, BOTH + 1> delivered;
+    std::map<uint32_t, Frames> delivered;
     for (bool more = true; more;) {
         more = host.grow(1);
-        for (const uint32_t stream : Streams(options)) {
-            FrameResult result = session->frame(stream);
-            if (result.rc != 0)
-                continue;
-            more = true;
-            delivered[stream].push_back(std::move(result.frame));
-        }
+        for (const uint32_t stream : Streams(options))
+            if (FrameResult result = session->frame(stream); result.rc == 0) {
+                more = true;
+                delivered[stream].push_back(std::move(result.frame));
+            }
     }
-    return delivered;
+    for (const uint32_t stream : Streams(options))
+        EXPECT_EQ(delivered[stream], sample.frames(stream)) << sample.name << " stream " << stream;
 }
 
 TEST(Samples, GrowByOneByteBetweenRequests)
 {
-    for (const Sample& sample : Samples()) {
-        for (const uint32_t options : {GROWING, GROWING | SEPARATE}) {
-            if (sample.name == "damaged") // nothing can tell damage from what has not been written yet
-                continue;
-            const auto delivered = PlayGrowing(sample, options);
-            for (const uint32_t stream : Streams(options))
-                EXPECT_EQ(delivered[stream], sample.frames(stream)) << sample.name << " stream " << stream;
-        }
-    }
+    for (const Sample& sample : Samples())
+        for (const uint32_t options : {GROWING, GROWING | SEPARATE})
+            if (sample.name != "damaged") // nothing can tell damage from what has not been written yet
+                PlayGrowing(sample, options);
 }
 
 // Taken in turn. The last one takes the longest: the library's own frame buffer is large.

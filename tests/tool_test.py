@@ -25,6 +25,10 @@ def sample(name):
     return str(DATA / f"{name}.flv")
 
 
+def sample_bytes(name):
+    return (DATA / f"{name}.flv").read_bytes()
+
+
 def run(*arguments, **options):
     return subprocess.run([TOOL, *map(str, arguments)], capture_output=True, text=True, timeout=60, **options)
 
@@ -46,6 +50,7 @@ class Expected:
         self.first = min((int(p["dts"]) for p in self.packets
                           if self.streams[p["kind"]]["codec"] not in ALWAYS_KEYED), default=0)
         self.frames = [(p["kind"], int(p["dts"]) - self.first, int(p["size"]), p["crc"]) for p in self.packets]
+        self.of = {kind: [f for f in self.frames if f[0] == kind] for kind in ("video", "audio")}
         self.keyframes = [(int(p["dts"]) - self.first, int(p["pos"]), i) for i, p in enumerate(self.packets)
                           if p["kind"] == "video" and p["key"] == "1"]
 
@@ -81,6 +86,16 @@ class Case(unittest.TestCase):
         path.write_bytes(data)
         return path
 
+    @staticmethod
+    def shown(terminal):
+        """All that was written to a pseudo terminal."""
+        shown = b""
+        with contextlib.suppress(OSError):  # a terminal that is closed on the other side ends with an error
+            while more := os.read(terminal, 10000):
+                shown += more
+        os.close(terminal)
+        return shown
+
     def succeed(self, *arguments, stderr=""):
         result = run(*arguments)
         self.assertEqual((result.returncode, result.stderr), (0, stderr))
@@ -91,41 +106,31 @@ class Frames(Case):
     def test_every_sample(self):
         for name in SAMPLES:
             expected = Expected(name)
-            with self.subTest(name):
-                result = run("frames", "--json", sample(name))
-                self.assertEqual(result.returncode, 0)
-                self.assertEqual(json_frames(result.stdout), expected.frames)
-                numbers = [json.loads(line)["number"] for line in result.stdout.splitlines()]
-                self.assertEqual(numbers, list(range(1, len(numbers) + 1)))
-                self.assertEqual("no whole tag" in result.stderr, name == "truncated")
-                self.assertEqual("hold no sound tag" in result.stderr, name == "damaged")
-
-    def test_text_says_the_same(self):
-        for name in ("avc_aac", "pcm_only"):
-            text = self.succeed("frames", sample(name)).splitlines()
+            for arguments in ([], ["--separate-audio"]):
+                with self.subTest(name=name, arguments=arguments):
+                    result = run("frames", "--json", *arguments, sample(name))
+                    self.assertEqual(result.returncode, 0)
+                    frames = json_frames(result.stdout)
+                    if arguments:
+                        self.assertEqual([f[1] for f in frames], sorted(f[1] for f in frames))
+                        frames.sort(key=lambda f: f[0] == "audio")
+                    self.assertEqual(frames, [*expected.of["video"], *expected.of["audio"]] if arguments else expected.frames)
+                    numbers = [json.loads(line)["number"] for line in result.stdout.splitlines()]
+                    self.assertEqual(numbers, list(range(1, len(numbers) + 1)))
+                    self.assertEqual("no whole tag" in result.stderr, name == "truncated")
+                    self.assertEqual("hold no sound tag" in result.stderr, name == "damaged")
+            text = run("frames", sample(name)).stdout.splitlines()
             lines = [line.split() for line in text]
-            self.assertEqual([(s, milliseconds(t), int(n), c) for _, s, t, n, c in lines], Expected(name).frames)
+            self.assertEqual([(s, milliseconds(t), int(n), c) for _, s, t, n, c in lines], expected.frames)
             self.assertEqual(len({len(line) for line in text}), 1)  # aligned
 
-    def test_separate_audio_is_merged_by_time(self):
-        for name in ("avc_aac", "avc_bframes_aac", "h263_mp3", "avc_only", "mp3_only", "damaged"):
-            with self.subTest(name):
-                result = run("frames", "--json", "--separate-audio", sample(name))
-                self.assertEqual((result.returncode, "hold no sound tag" in result.stderr), (0, name == "damaged"))
-                frames = json_frames(result.stdout)
-                self.assertEqual([f[1] for f in frames], sorted(f[1] for f in frames))
-                for kind in ("video", "audio"):
-                    self.assertEqual([f for f in frames if f[0] == kind],
-                                     [f for f in Expected(name).frames if f[0] == kind])
-
     def test_selection(self):
-        frames = Expected("avc_aac").frames
-        start = max(k for k in Expected("avc_aac").keyframes if k[0] <= 1500)
+        expected = Expected("avc_aac")
+        frames, of = expected.frames, expected.of
+        start = max(k for k in expected.keyframes if k[0] <= 1500)
         for arguments, wanted in (
-                (["--stream", "video"], [f for f in frames if f[0] == "video"]),
-                (["--stream", "audio", "--separate-audio"], [f for f in frames if f[0] == "audio"]),
-                (["--count", 7], frames[:7]), (["--count", 0], []),
-                (["--stream", "audio", "--count", 3], [f for f in frames if f[0] == "audio"][:3]),
+                (["--stream", "video"], of["video"]), (["--stream", "audio", "--separate-audio"], of["audio"]),
+                (["--count", 7], frames[:7]), (["--count", 0], []), (["--stream", "audio", "--count", 3], of["audio"][:3]),
                 (["--to", "0.5"], [f for f in frames if f[1] <= 500]),
                 (["--from", "0:01.5"], frames[start[2]:]),
                 (["--from", "1.5", "--to", "0:00:01.75"], [f for f in frames[start[2]:] if f[1] <= 1750])):
@@ -133,7 +138,7 @@ class Frames(Case):
                 self.assertEqual(json_frames(self.succeed("frames", "--json", sample("avc_aac"), *arguments)), wanted)
 
     def test_streams_that_are_not_interleaved(self):
-        header, tags = split_tags(pathlib.Path(sample("avc_aac")).read_bytes())
+        header, tags = split_tags(sample_bytes("avc_aac"))
         path = self.write("apart.flv", header + b"".join(sorted(tags, key=lambda tag: -tag[0])))  # script, video, audio
         expected = Expected("avc_aac")
         first = expected.keyframes[0][0]  # probing ends at the audio configuration and has seen only pictures by then
@@ -146,7 +151,7 @@ class Frames(Case):
                 self.assertEqual(json_frames(self.succeed("frames", "--json", path, *arguments)), wanted)
 
     def test_more_unplayed_tags_than_one_request_passes(self):
-        header, tags = split_tags(pathlib.Path(sample("avc_aac")).read_bytes())
+        header, tags = split_tags(sample_bytes("avc_aac"))
         config = next(tag for tag in tags if tag[0] == 9)
         path = self.write("configs.flv", header + b"".join(tags[:40] + [config] * 250 + tags[40:]))
         self.assertEqual(json_frames(self.succeed("frames", "--json", path)), Expected("avc_aac").frames)
@@ -282,7 +287,7 @@ class Failures(Case):
         self.assertEqual(["error" in f for f in json.loads(result.stdout)["files"]], [False, True, False])
 
     def test_any_cut_ends_cleanly(self):
-        data = pathlib.Path(sample("avc_aac_index")).read_bytes()
+        data = sample_bytes("avc_aac_index")
         for cut in (*range(14, 1500, 371), *range(1500, len(data), 5999)):
             result = run("frames", "--json", self.write("cut.flv", data[:cut]))
             self.assertIn(result.returncode, (0, 1))
@@ -305,7 +310,7 @@ class Failures(Case):
             self.assertNotIn(b"flvdmx", out.read_bytes())  # the note about raw streams
 
     def test_file_that_another_was_appended_to(self):
-        data = (DATA / "avc_aac.flv").read_bytes()
+        data = sample_bytes("avc_aac")
         header, tags = split_tags(data)
         path = self.write("two.flv", data + b"".join(tags[:60]))
         frames = json_frames(self.succeed("frames", "--json", path))
@@ -357,12 +362,7 @@ class Output(Case):
         terminal, end = pty.openpty()
         result = subprocess.run([TOOL, "frames", sample("avc_aac")], stdout=subprocess.PIPE, stderr=end)
         os.close(end)
-        shown = b""
-        with contextlib.suppress(OSError):  # the end of a terminal
-            while True:
-                shown += os.read(terminal, 1000)
-        os.close(terminal)
-        self.assertRegex(shown, rb"\A\r\x1b\[K1 frames, 0:00:00\.\d{3}.*\r\x1b\[K\Z")
+        self.assertRegex(self.shown(terminal), rb"\A\r\x1b\[K1 frames, 0:00:00\.\d{3}.*\r\x1b\[K\Z")
         self.assertEqual(len(result.stdout.splitlines()), len(Expected("avc_aac").frames))
 
 
@@ -405,7 +405,7 @@ class Follow(Case):
     def test_growing_file(self):
         cases = (("avc_aac", []), ("avc_aac", ["--separate-audio"]), ("h263_mp3", []), ("aac_only", []),
                  ("avc_aac_index", ["--separate-audio"]))
-        data = {name: pathlib.Path(sample(name)).read_bytes() for name, _ in cases}
+        data = {name: sample_bytes(name) for name, _ in cases}
         results = self.follow_all([((data[name], "--timeout", "4", *arguments), {"gate_at": len(data[name]) // 2})
                                    for name, arguments in cases])
         for (name, arguments), (frames, code, stderr) in zip(cases, results):
@@ -416,7 +416,7 @@ class Follow(Case):
                     self.assertEqual([f for f in frames if f[0] == kind], [f for f in wanted if f[0] == kind])
 
     def test_ends_at_the_wanted_frame_without_waiting(self):
-        data = pathlib.Path(sample("avc_aac")).read_bytes()
+        data = sample_bytes("avc_aac")
         for arguments, last in ((["--count", "9"], None), (["--to", "0.3"], 300)):
             start = time.monotonic()
             frames, code, _ = self.follow(data, "--timeout", "20", *arguments)
@@ -425,8 +425,12 @@ class Follow(Case):
                              [f for f in Expected("avc_aac").frames if f[1] <= last])
             self.assertLess(time.monotonic() - start, 15)
 
+    def test_start_is_searched_in_what_is_there(self):
+        arguments = ("frames", "--json", "--from", "2", sample("avc_aac_index"))
+        self.assertEqual(self.succeed(*arguments, "--follow", "--timeout", "1"), self.succeed(*arguments))
+
     def test_writer_that_stops(self):
-        data = pathlib.Path(sample("avc_aac")).read_bytes()
+        data = sample_bytes("avc_aac")
         cases = ((len(data) // 2 + 3, 0, r"warning: the last \d+ bytes hold no whole frame"),
                  (8, 1, "damaged or cut short"), (30, 1, "stream was found|ends too early"))
         results = self.follow_all([((data[:size], "--timeout", "4"), {}) for size, _, _ in cases])

@@ -1,5 +1,5 @@
 // Work is bounded: the worst files that we can think of, and what each operation costs on them. The bounds are those of
-// docs/damage.md, made for the size of each file.
+// docs/damage.md, made for the size of each file. What the sound case costs does not vary and is held as it is.
 
 #include "support/report.h"
 #include "support/session.h"
@@ -10,6 +10,7 @@ namespace {
 
 constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20, SEARCH_FALSE_HEADERS = MIB / 64, REQUEST_SEARCHES = 102, TAIL_CURSORS = MIB + 256;
+constexpr uint32_t FRAMES = 200, SMALL = 80, LARGE = 10000; // of sound files; the cache does not hold LARGE
 
 struct Cost {
     uint64_t calls = 0, bytes = 0;
@@ -23,30 +24,19 @@ Cost operator*(uint64_t n, Cost a)
     return {n * a.calls, n * a.bytes};
 }
 
-constexpr Cost TAG = {5, 0}, LARGE_TAG = {10, 2 * CACHE + NARROW}, WALKED_TAG = {12, 6 * NARROW};
+constexpr Cost FALSE_HEADER = {6, 0}, TAG = {5, 0}, LARGE_TAG = {10, 2 * CACHE + NARROW}, WALKED_TAG = {12, 6 * NARROW};
 constexpr uint64_t FEW = 100; /**< tags that every file has */
 
 /** Going forward over so many bytes, of which some begin false headers, and over a few tags. */
 Cost Forward(uint64_t bytes, uint64_t false_headers = 0, uint64_t cache = CACHE)
 {
-    return Cost{3 * (bytes / (cache - 12) + 2) + 6 * false_headers,
-                bytes + 2 * cache + false_headers * (std::min(cache, CACHE) + NARROW)} +
-           FEW * WALKED_TAG;
-}
-/** The same, with the false tags fitting the cache. */
-Cost ForwardInCache(uint64_t bytes, uint64_t false_headers, uint64_t cache)
-{
-    return Forward(bytes, 0, cache) + Cost{6 * false_headers, 0};
+    return Cost{3 * (bytes / (cache - 12) + 2), bytes + 2 * cache + false_headers * (std::min(cache, CACHE) + NARROW)} +
+           false_headers * FALSE_HEADER + FEW * WALKED_TAG;
 }
 /** Going backward, byte by byte. */
 Cost Backward(uint64_t bytes, uint64_t quantum = NARROW)
 {
     return bytes * Cost{4, 2 * quantum};
-}
-/** Script data: a position for every keyframe array. */
-Cost Script(uint64_t bytes)
-{
-    return Forward(2 * bytes) + Cost{bytes / 8, 0};
 }
 
 struct WorkCase {
@@ -71,26 +61,23 @@ Bytes Tags(const Flv& flv)
 }
 
 /** Sound whose header byte is 8, the tag type: in a run of it every byte begins a plausible tag. */
-Flv Sounds(uint32_t first_ts)
-{
-    FlvBuilder builder(4);
-    for (uint32_t i = 0; i < 20; ++i)
-        builder.audio(first_ts + 40 * i, AudioData(8, Noise(200)));
-    return builder.build();
-}
-
 WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost pass)
 {
-    const Bytes file = Concat({Sounds(0).bytes, Repeat({8}, 600000), Tags(Sounds(0x10000000))});
+    const auto sounds = [](uint32_t first_ts) {
+        FlvBuilder builder(4);
+        for (uint32_t i = 0; i < 20; ++i)
+            builder.audio(first_ts + 40 * i, AudioData(8, Noise(200)));
+        return builder.build();
+    };
+    const Bytes file = Concat({sounds(0).bytes, Repeat({8}, 600000), Tags(sounds(0x10000000))});
     return {name, file, options, cache, 2 * pass, pass, 2 * pass};
 }
 
 WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t options = 0)
 {
     const Bytes file = Concat({MakeChain().bytes, Repeat(pattern, size)});
-    const Cost halvings = 4 * Forward(2 * MIB);
-    return {
-        name, file, options, CACHE, Backward(TAIL_CURSORS) + halvings, Forward(file.size()), Forward(2 * file.size())};
+    const Cost open = Backward(TAIL_CURSORS) + 4 * Forward(2 * MIB);
+    return {name, file, options, CACHE, open, Forward(file.size()), Forward(2 * file.size())};
 }
 
 /** Sound alone at the end, behind bytes whose every fourth place leads back a little. */
@@ -110,21 +97,24 @@ WorkCase ManyTags(const char* name, bool pictures, size_t size, bool index, Cost
         builder.indexed_metadata({}, [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; });
     for (uint32_t i = 0; i < count; ++i) {
         if (pictures)
-            builder.video(2 * i, VideoData(1, CODEC_SCREEN, Noise(20)));
-        builder.audio(2 * i, AudioData(SOUND_PCM, Noise(size)));
+            builder.add(Screen(2 * i, 20));
+        builder.add(Pcm(2 * i, size));
     }
     const Bytes file = builder.build().bytes;
     const Cost pass = Forward(file.size()) + count * (TAG + tag);
     return {name, file, options, CACHE, 2 * pass, pass, Forward(file.size()) + 2 * count * WALKED_TAG};
 }
 
-/** Script data in front of an ordinary file. An index in the file is read for its end, its limit and its last time. */
+/**
+ * Script data in front of an ordinary file: it costs a position for every keyframe array. An index in the file is read
+ * for its end, its limit and its last time.
+ */
 WorkCase Metadata(const char* name, const Bytes& head, const Bytes& pattern, uint32_t options = 0)
 {
     const Bytes payload = Concat({amf::String("onMetaData"), head, Repeat(pattern, MIB)});
     const Bytes file = Concat({FlvBuilder().script(payload).build().bytes, Tags(MakeChain())});
-    const Cost pass = Forward(file.size());
-    return {name, file, options, CACHE, Script(payload.size()) + 4 * pass, pass, 3 * pass};
+    const Cost pass = Forward(file.size()), script = Forward(2 * payload.size()) + Cost{payload.size() / 8, 0};
+    return {name, file, options, CACHE, script + 4 * pass, pass, 3 * pass};
 }
 
 std::vector<WorkCase> Cases()
@@ -133,66 +123,123 @@ std::vector<WorkCase> Cases()
     const Bytes times = Concat({{0, 5, 't', 'i', 'm', 'e', 's'}, endless});
     const Bytes positions = Concat({{0, 13, 'f', 'i', 'l', 'e', 'p', 'o', 's', 'i', 't', 'i', 'o', 'n', 's'}, endless});
     const Bytes numbers = Repeat({0, 0x40, 0, 0, 0, 0, 0, 0, 0}, 9000);
+    const Cost in_cache = Forward(700000, 0, BIG_CACHE) + 600000 * FALSE_HEADER;
     return {
-        FalseHeaders("false_headers", 0, CACHE, Forward(700000, 600000)),
-        FalseHeaders("false_headers_two_readers", SEPARATE, CACHE, Forward(700000, 600000)),
-        FalseHeaders("false_headers_in_cache", 0, BIG_CACHE, ForwardInCache(700000, 600000, BIG_CACHE)),
-        FalseHeaders("false_headers_growing", GROWING, CACHE, Forward(700000)),
+        FalseHeaders("false headers", 0, CACHE, Forward(700000, 600000)),
+        FalseHeaders("false headers, two readers", SEPARATE, CACHE, Forward(700000, 600000)),
+        FalseHeaders("false headers in the cache", 0, BIG_CACHE, in_cache),
+        FalseHeaders("false headers, growing", GROWING, CACHE, Forward(700000)),
         Tail("zeros", {0}, 3 * MIB),
-        Tail("zeros_growing", {0}, 3 * MIB, GROWING),
-        Tail("small_distances", {0, 0, 0, 15}, 2 * MIB),
+        Tail("zeros, growing", {0}, 3 * MIB, GROWING),
+        Tail("small distances", {0, 0, 0, 15}, 2 * MIB),
         Slide("slide", 300000, NARROW),
-        Slide("slide_by_wide_reads", 30000, CACHE),
-        ManyTags("sound_alone", false, 100, false, TAG),
-        ManyTags("large_tags", true, CACHE, false, LARGE_TAG),
-        ManyTags("large_tags_two_readers", true, CACHE, false, LARGE_TAG, SEPARATE),
-        ManyTags("index_beyond_the_file", true, 100, true, TAG),
-        ManyTags("index_beyond_the_file_two_readers", true, CACHE, true, LARGE_TAG, SEPARATE | INDEX),
+        Slide("slide by wide reads", 30000, CACHE),
+        ManyTags("sound alone", false, 100, false, TAG),
+        ManyTags("large tags", true, CACHE, false, LARGE_TAG),
+        ManyTags("large tags, two readers", true, CACHE, false, LARGE_TAG, SEPARATE),
+        ManyTags("index beyond the file", true, 100, true, TAG),
+        ManyTags("index beyond the file, two readers", true, CACHE, true, LARGE_TAG, SEPARATE | INDEX),
         Metadata("nesting", {}, endless),
         Metadata("strings", {}, {2, 1, 0}),
-        Metadata("long_strings", {}, {12, 0, 0, 16, 0}),
+        Metadata("long strings", {}, {12, 0, 0, 16, 0}),
         Metadata("objects", {}, keyframes),
-        Metadata("array_keys", Concat({keyframes, {3}}), {0, 5, 't', 'i', 'm', 'e', 's', 1, 1}),
-        Metadata("endless_times_kept", Concat({keyframes, {3}, times}), {5}, INDEX),
-        Metadata("endless_index", Concat({keyframes, {3}, times, numbers, positions}), {0}),
+        Metadata("array keys", Concat({keyframes, {3}}), {0, 5, 't', 'i', 'm', 'e', 's', 1, 1}),
+        Metadata("endless times, kept", Concat({keyframes, {3}, times}), {5}, INDEX),
+        Metadata("endless index", Concat({keyframes, {3}, times, numbers, positions}), {0}),
     };
 }
 
-class Work : public testing::TestWithParam<WorkCase> {
-protected:
-    static Cost taken(const FakeHost& host) { return {host.io_calls() + host.calls(HostFn::Eof), host.bytes_read()}; }
-    static void hold(const char* what, Cost cost, Cost bound)
-    {
-        EXPECT_LE(cost.calls, bound.calls) << what;
-        EXPECT_LE(cost.bytes, bound.bytes) << what;
-    }
-};
-
-TEST_P(Work, StaysWithinItsBound)
+/** Counts what the host was asked for since the last count. */
+Cost Taken(FakeHost& host)
 {
-    const WorkCase& c = GetParam();
+    const Cost taken = {host.io_calls() + host.calls(HostFn::Eof), host.bytes_read()};
+    host.reset_calls();
+    return taken;
+}
+Cost Hold(const char* what, Cost cost, Cost bound)
+{
+    EXPECT_LE(cost.calls, bound.calls) << what;
+    EXPECT_LE(cost.bytes, bound.bytes) << what;
+    return cost;
+}
+
+void HoldAll(const WorkCase& c)
+{
     FakeHost host(c.file);
     Session session(host, {c.options, false, static_cast<uint32_t>(c.cache), static_cast<uint32_t>(c.scan_read_size)});
     ASSERT_TRUE(session.opened());
-    hold("open", taken(host), c.open);
+    Hold("open", Taken(host), c.open);
     const Cost request = REQUEST_SEARCHES * Forward(2 * MIB, SEARCH_FALSE_HEADERS, c.cache);
     Cost all;
     for (int32_t rc = 0; rc == 0;) {
-        host.reset_calls();
         rc = session.frame(AUDIO).rc;
-        hold("request", taken(host), request);
-        all = all + taken(host);
+        all = all + Hold("request", Taken(host), request);
     }
-    hold("play", all, c.play);
+    Hold("play", all, c.play);
     for (const int32_t time : {100, 700, 0x10000000})
         for (const uint32_t mode : {uint32_t{FLVD_SEEK_FORWARD}, uint32_t{FLVD_SEEK_BACKWARD}}) {
-            host.reset_calls();
             session.seek(time, mode);
-            hold("seek", taken(host), c.seek);
+            Hold("seek", Taken(host), c.seek);
         }
 }
 
-INSTANTIATE_TEST_SUITE_P(WorstFiles, Work, testing::ValuesIn(Cases()),
-                         [](const testing::TestParamInfo<WorkCase>& i) { return std::string(i.param.name); });
+TEST(Work, StaysWithinItsBoundOnTheWorstFiles)
+{
+    for (const WorkCase& c : Cases()) {
+        SCOPED_TRACE(c.name);
+        HoldAll(c);
+    }
+}
+
+using HostCalls = std::array<uint64_t, 4>; // reads, seeks, position queries, bytes
+
+// What does not vary is held as it is: a change that costs a call, or saves one, is to be seen.
+TEST(Work, CostsSoMuchOnSoundFiles)
+{
+    const auto opened = [](Session&) {};
+    const auto played = [](Session& session) { EXPECT_EQ(play(session).size(), FRAMES); };
+    const auto one = [](Session& session) { EXPECT_EQ(session.frame().frame.data.size(), LARGE); };
+    const auto sought = [](Session& session) {
+        int32_t reached = 0;
+        EXPECT_EQ(session.seek(4200, FLVD_SEEK_BACKWARD, &reached), 0);
+        EXPECT_EQ(reached, 4000);
+    };
+    const struct {
+        const char* name;
+        size_t size;
+        uint32_t options;
+        bool index;
+        int before; /**< frames that are not counted; -1: opening is counted too */
+        void (*act)(Session&);
+        HostCalls calls;
+    } cases[] = {
+        {"opening reads head and tail", SMALL, 0, false, -1, opened, {6, 9, 14, 2 * CACHE + 40}},
+        {"large frames do not matter to it", LARGE, 0, false, -1, opened, {7, 11, 14, 2 * CACHE + 44}},
+        {"small frames take whole caches and two positions", SMALL, 0, false, 0, played, {5, 1, 2 * FRAMES + 4, 20095}},
+        {"a large frame is looked behind once", LARGE, 0, false, 1, one, {4, 2, 2, LARGE + CACHE + 20}},
+        {"a seek by index in memory", SMALL, INDEX, true, 0, sought, {1, 1, 1, CACHE}},
+        {"a seek by index in the file", SMALL, 0, true, 0, sought, {3, 3, 1, 3 * CACHE}}};
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        FlvBuilder builder(1);
+        if (c.index)
+            builder.indexed_metadata({});
+        else
+            builder.add(g_meta);
+        builder.add(g_avc);
+        for (uint32_t i = 0; i < FRAMES; ++i)
+            builder.video(40 * i, AvcNalu(i % 20 == 0, Noise(c.size, i + 1)));
+        FakeHost host(builder.build().bytes);
+        Session session(host, {c.options});
+        for (int i = 0; i < c.before; ++i)
+            session.frame();
+        if (c.before >= 0)
+            host.reset_calls();
+        c.act(session);
+        EXPECT_EQ((HostCalls{host.calls(HostFn::Read), host.calls(HostFn::Seek), host.calls(HostFn::Tell),
+                             host.bytes_read()}),
+                  c.calls);
+    }
+}
 
 } // namespace

@@ -22,6 +22,7 @@ import zlib
 
 HERE = pathlib.Path(__file__).resolve().parent
 TAG_HEADER, BACK_POINTER = 11, 4
+KINDS, CODEC_BYTES = {8: "audio", 9: "video"}, {(9, 7): 5, (8, 10): 2}  # in front of the frame; else 1
 BROKEN = ["truncated", "damaged"]
 DEMUXERS = {"h264": ["-f", "h264"], "aac": ["-f", "aac"], "mp3": ["-f", "mp3"],
             "pcm_s16le": ["-f", "s16le", "-ar", "11025", "-ac", "1"]}
@@ -34,27 +35,35 @@ def probe(path):
 
 
 def hexdump_bytes(text):
-    lines = [line[10:50] for line in text.splitlines() if line]
-    return "".join(lines).replace(" ", "")
+    return "".join(line[10:50] for line in text.splitlines() if line).replace(" ", "")
+
+
+def all_tags(data):
+    """Each tag with its back-pointer, by the chain alone: {offset: bytes}."""
+    tags, pos = {}, 13
+    while pos < len(data):
+        tags[pos] = data[pos:pos + TAG_HEADER + int.from_bytes(data[pos + 1:pos + 4], "big") + BACK_POINTER]
+        pos += len(tags[pos])
+    return tags
 
 
 def media_tags(data):
-    """Offsets of all tags that carry a frame, by the chain alone: {offset: (kind, timestamp, frame bytes)}."""
-    tags, pos = {}, int.from_bytes(data[5:9], "big") + BACK_POINTER
-    while pos + TAG_HEADER < len(data):
-        size = int.from_bytes(data[pos + 1:pos + 4], "big")
-        timestamp = int.from_bytes(data[pos + 4:pos + 7], "big") | data[pos + 7] << 24
-        body = data[pos + TAG_HEADER:pos + TAG_HEADER + size]
-        if data[pos] == 9:
-            avc = body[0] & 15 == 7
-            if not avc or body[1] not in (0, 2):
-                tags[pos] = ("video", timestamp, body[5 if avc else 1:])
-        elif data[pos] == 8:
-            aac = body[0] >> 4 == 10
-            if not aac or body[1] != 0:
-                tags[pos] = ("audio", timestamp, body[2 if aac else 1:])
-        pos += TAG_HEADER + size + BACK_POINTER
-    return tags
+    """All tags that carry a frame: {offset: (kind, timestamp, frame bytes)}."""
+    media = {}
+    for pos, tag in all_tags(data).items():
+        if tag[0] in KINDS:
+            body, timestamp = tag[TAG_HEADER:-BACK_POINTER], int.from_bytes(tag[4:7], "big") | tag[7] << 24
+            codec_bytes = CODEC_BYTES.get((tag[0], body[0] & 15 if tag[0] == 9 else body[0] >> 4), 1)
+            if codec_bytes == 1 or body[1] not in (0, 2):
+                media[pos] = (KINDS[tag[0]], timestamp, body[codec_bytes:])
+    return media
+
+
+def kept_tags(path):
+    """The whole tags of a sample without those that its damage or end has touched: {offset: bytes}."""
+    data = path.read_bytes()
+    whole = all_tags((HERE / "avc_aac.flv").read_bytes() if path.stem in BROKEN else data)
+    return {pos: tag for pos, tag in whole.items() if data[pos:pos + len(tag)] == tag}
 
 
 def stream_line(stream):
@@ -91,22 +100,9 @@ def decoded(kind, path, *demuxer):
     return [line.split(",")[-1].strip() for line in lines if line[0] != "#"]
 
 
-def kept_tags(path):
-    """The whole tags of a sample without those that its damage or end has touched."""
-    data = path.read_bytes()
-    whole = (HERE / "avc_aac.flv").read_bytes() if path.stem in BROKEN else data
-    kept, pos = bytearray(whole[:13]), 13
-    while pos < len(whole):
-        end = pos + TAG_HEADER + int.from_bytes(whole[pos + 1:pos + 4], "big") + BACK_POINTER
-        if data[pos:end] == whole[pos:end]:
-            kept += whole[pos:end]
-        pos = end
-    return kept
-
-
 def extracted(tool, path, codecs, folder):
     kept = folder / "kept.flv"
-    kept.write_bytes(kept_tags(path))
+    kept.write_bytes(b"".join([path.read_bytes()[:13], *kept_tags(path).values()]))
     for kind, codec in codecs.items():
         out = folder / "out"
         subprocess.run([tool, "extract", "--stream", kind, path, "-o", out], check=True, capture_output=True)
@@ -127,26 +123,13 @@ def write_extracted(tool):
     (HERE / "expected" / "extract.txt").write_text("".join(lines))
 
 
-def write(name, size, duration, streams, packets):
-    lines = [f"file size={size} duration_ms={duration}", *streams, *packets]
-    (HERE / "expected" / f"{name}.txt").write_text("\n".join(lines) + "\n")
-
-
 def main():
     for path in sorted(HERE.glob("*.flv")):
-        if path.stem not in BROKEN:
-            duration, streams, packets = sound_file(path)
-            write(path.stem, path.stat().st_size, duration, streams, packets.values())
-    whole = (HERE / "avc_aac.flv").read_bytes()
-    _, streams, packets = sound_file(HERE / "avc_aac.flv")
-    for name in BROKEN:
-        data = (HERE / f"{name}.flv").read_bytes()
-        kept = []
-        for pos, line in packets.items():
-            end = pos + TAG_HEADER + int.from_bytes(whole[pos + 1:pos + 4], "big") + BACK_POINTER
-            if data[pos:end] == whole[pos:end]:
-                kept.append(line)
-        write(name, len(data), 0, streams, kept)
+        broken = path.stem in BROKEN
+        duration, streams, packets = sound_file(HERE / "avc_aac.flv" if broken else path)
+        lines = [f"file size={path.stat().st_size} duration_ms={0 if broken else duration}", *streams,
+                 *(packets[pos] for pos in kept_tags(path) if pos in packets)]
+        (HERE / "expected" / f"{path.stem}.txt").write_text("\n".join(lines) + "\n")
     if len(sys.argv) > 1:
         write_extracted(sys.argv[1])
 

@@ -13,7 +13,6 @@ static constexpr uint8_t FRESH_MEMORY = 0xA5;
 static constexpr uint8_t RELEASED_MEMORY = 0xDD;
 
 static FakeHost* g_current = nullptr;
-static FakeHost::ViolationHandler g_handler = nullptr;
 
 FakeHost::FakeHost() : m_previous(g_current)
 {
@@ -43,15 +42,10 @@ FakeHost& FakeHost::current()
     return *g_current;
 }
 
-void FakeHost::set_violation_handler(ViolationHandler handler)
-{
-    g_handler = handler;
-}
-
 void FakeHost::violation(const std::string& what)
 {
-    if (g_handler != nullptr) {
-        g_handler(what);
+    if (m_handler != nullptr) {
+        m_handler(what);
         return;
     }
     std::fprintf(stderr, "fake host: %s\n", what.c_str());
@@ -62,17 +56,6 @@ void FakeHost::add_file(const std::string& path, Bytes contents)
 {
     const auto size = static_cast<int64_t>(contents.size());
     add_sparse_file(path, size, {{0, std::move(contents)}});
-}
-
-void FakeHost::add_sparse_file(const std::string& path, int64_t size, std::map<int64_t, Bytes> extents)
-{
-    m_files[path] = std::make_shared<File>(File{std::move(extents), size, size});
-}
-
-void FakeHost::set_visible(int64_t size, const std::string& path)
-{
-    File& file = *m_files.at(path);
-    file.visible = std::min(size, file.size);
 }
 
 bool FakeHost::grow(int64_t n, const std::string& path)
@@ -131,11 +114,6 @@ void FakeHost::fail_nothing()
     m_read_limit = UINT32_MAX;
 }
 
-uint64_t FakeHost::io_calls() const
-{
-    return calls(HostFn::Read) + calls(HostFn::Write) + calls(HostFn::Seek) + calls(HostFn::Tell);
-}
-
 void FakeHost::reset_calls()
 {
     m_calls = {};
@@ -149,11 +127,6 @@ void FakeHost::start_log(bool memory)
     m_logging = true;
     m_log_memory = memory;
     m_log.clear();
-}
-
-std::string FakeHost::take_log()
-{
-    return std::exchange(m_log, {});
 }
 
 size_t FakeHost::live_bytes() const
@@ -282,9 +255,7 @@ void* FakeHost::open(const char* path, const char* mode)
     if (allowed && mode[0] == 'w')
         add_file(path, {});
     const auto file = m_files.find(path);
-    const bool opened = allowed && file != m_files.end();
-    log(m_logging, "open", std::string(path) + "," + mode, opened ? "1" : "0");
-    if (!opened)
+    if (!logged("open", std::string(path) + "," + mode, allowed && file != m_files.end()))
         return nullptr;
     m_handles.push_back(std::make_unique<Handle>(Handle{file->second}));
     return m_handles.back().get();
@@ -296,24 +267,19 @@ int32_t FakeHost::close(void* pointer)
     Handle* const closing = handle(pointer);
     if (closing != nullptr)
         closing->open = false;
-    log(m_logging, "close", "", closing != nullptr ? "0" : "-1");
-    return closing != nullptr ? 0 : -1;
+    return logged("close", "", closing != nullptr ? 0 : -1);
 }
 
 int32_t FakeHost::eof(void* pointer)
 {
     begin(HostFn::Eof);
-    const Handle* const handle = this->handle(pointer);
-    const int32_t result = handle != nullptr && handle->eof ? 1 : 0;
-    log(m_logging, "eof", "", std::to_string(result));
-    return result;
+    const Handle* const asked = handle(pointer);
+    return logged("eof", "", asked != nullptr && asked->eof ? 1 : 0);
 }
 
 int32_t FakeHost::flush(void* pointer)
 {
-    const int32_t result = begin(HostFn::Flush) && handle(pointer) != nullptr ? 0 : -1;
-    log(m_logging, "flush", "", std::to_string(result));
-    return result;
+    return logged("flush", "", begin(HostFn::Flush) && handle(pointer) != nullptr ? 0 : -1);
 }
 
 void FakeHost::fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count)
@@ -327,35 +293,36 @@ void FakeHost::fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count
     }
 }
 
+// The handle of a read or write.
+FakeHost::Handle* FakeHost::transfer(const char* what, const void* buffer, uint32_t size, uint32_t count, void* pointer)
+{
+    if (size != 1)
+        violation(std::string(what) + " elements of size " + std::to_string(size));
+    check_range(what, buffer, count);
+    return handle(pointer);
+}
+
 // As fread of a C library: short only at the end, which sets the end flag; with the flag set nothing is read.
 uint32_t FakeHost::read(void* buffer, uint32_t size, uint32_t count, void* pointer)
 {
     const bool allowed = begin(HostFn::Read);
-    if (size != 1)
-        violation("read with an element size of " + std::to_string(size));
-    check_range("read of", buffer, count);
-    Handle* const from = handle(pointer);
+    Handle* const from = transfer("read of", buffer, size, count, pointer);
     uint32_t got = 0;
     if (allowed && from != nullptr && !from->eof) {
         const int64_t left = std::max<int64_t>(from->file->visible - from->pos, 0);
-        from->eof = left < count;
         got = limited(HostFn::Read, static_cast<uint32_t>(std::min<int64_t>(left, count)));
         fetch(*from->file, from->pos, static_cast<uint8_t*>(buffer), got);
         from->pos += got;
-        from->eof = from->eof && got == left;
+        from->eof = left < count && got == left;
     }
     m_bytes_read += got;
-    log(m_logging, "read", std::to_string(count), std::to_string(got));
-    return got;
+    return logged("read", std::to_string(count), got);
 }
 
 uint32_t FakeHost::write(const void* buffer, uint32_t size, uint32_t count, void* pointer)
 {
     const bool allowed = begin(HostFn::Write);
-    if (size != 1)
-        violation("write with an element size of " + std::to_string(size));
-    check_range("write of", buffer, count);
-    Handle* const to = handle(pointer);
+    Handle* const to = transfer("write of", buffer, size, count, pointer);
     uint32_t done = 0;
     if (allowed && to != nullptr) {
         File& file = *to->file;
@@ -366,28 +333,23 @@ uint32_t FakeHost::write(const void* buffer, uint32_t size, uint32_t count, void
         to->pos += done;
         file.size = file.visible = static_cast<int64_t>(data.size());
     }
-    log(m_logging, "write", std::to_string(count), std::to_string(done));
-    return done;
+    return logged("write", std::to_string(count), done);
 }
 
 int32_t FakeHost::seek(void* pointer, int64_t offset, int32_t whence, bool wide)
 {
     const bool allowed = begin(HostFn::Seek);
     Handle* const moved = handle(pointer);
-    int32_t result = -1;
+    int64_t target = -1;
     if (allowed && moved != nullptr && whence >= FIO_SEEK_SET && whence <= FIO_SEEK_END) {
         const int64_t base = whence == FIO_SEEK_SET ? 0 : whence == FIO_SEEK_CUR ? moved->pos : moved->file->visible;
-        int64_t target = 0;
-        const bool reachable = !__builtin_add_overflow(base, offset, &target) && target >= 0;
-        if (reachable && (wide || target <= INT32_MAX)) {
-            moved->pos = target;
-            moved->eof = false;
-            result = 0;
-        }
+        if (__builtin_add_overflow(base, offset, &target) || (!wide && target > INT32_MAX))
+            target = -1;
     }
+    if (target >= 0)
+        std::tie(moved->pos, moved->eof) = std::pair(target, false);
     const std::string arguments = std::to_string(offset) + "," + std::to_string(whence);
-    log(m_logging, wide ? "seek64" : "seek", arguments, std::to_string(result));
-    return result;
+    return logged(wide ? "seek64" : "seek", arguments, target >= 0 ? 0 : -1);
 }
 
 int64_t FakeHost::tell(void* pointer, bool wide)
@@ -395,9 +357,7 @@ int64_t FakeHost::tell(void* pointer, bool wide)
     const bool allowed = begin(HostFn::Tell);
     const Handle* const asked = handle(pointer);
     const bool works = allowed && asked != nullptr && (wide || asked->pos <= INT32_MAX);
-    const int64_t result = works ? asked->pos : -1;
-    log(m_logging, wide ? "tell64" : "tell", "", std::to_string(result));
-    return result;
+    return logged(wide ? "tell64" : "tell", "", works ? asked->pos : -1);
 }
 
 } // namespace flvd_test

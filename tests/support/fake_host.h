@@ -13,6 +13,7 @@
 
 #include "flv_writer.h"
 
+#include <algorithm>
 #include <array>
 #include <functional>
 #include <map>
@@ -29,22 +30,28 @@ public:
     FakeHost();
     /** A host with one file, "a.flv". */
     explicit FakeHost(Bytes file);
-    ~FakeHost();
+    virtual ~FakeHost();
     FakeHost(const FakeHost&) = delete;
     FakeHost& operator=(const FakeHost&) = delete;
 
     static FakeHost& current();
     using ViolationHandler = void (*)(const std::string& what);
-    static void set_violation_handler(ViolationHandler handler);
+    static void set_violation_handler(ViolationHandler handler) { m_handler = handler; }
 
     /* -- files */
 
     static constexpr const char* DEFAULT_FILE = "a.flv";
     void add_file(const std::string& path, Bytes contents);
     /** A file of `size` bytes, zero but for the given extents {offset: bytes}. May be far beyond 4 GiB. */
-    void add_sparse_file(const std::string& path, int64_t size, std::map<int64_t, Bytes> extents);
+    void add_sparse_file(const std::string& path, int64_t size, std::map<int64_t, Bytes> extents)
+    {
+        m_files[path] = std::make_shared<File>(File{std::move(extents), size, size});
+    }
     /** Shows only the first `size` bytes (at most all): what a growing file has so far. Open handles see it at once. */
-    void set_visible(int64_t size, const std::string& path = DEFAULT_FILE);
+    void set_visible(int64_t size, const std::string& path = DEFAULT_FILE)
+    {
+        m_files.at(path)->visible = std::min(size, m_files.at(path)->size);
+    }
     /** Shows n bytes more. @return false when everything was visible already */
     bool grow(int64_t n, const std::string& path = DEFAULT_FILE);
     int64_t visible(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->visible; }
@@ -84,7 +91,10 @@ public:
     /** Calls of functions that can fail. */
     uint64_t failable_calls() const { return m_failable_calls; }
     /** Reads, writes, seeks and tells. */
-    uint64_t io_calls() const;
+    uint64_t io_calls() const
+    {
+        return calls(HostFn::Read) + calls(HostFn::Write) + calls(HostFn::Seek) + calls(HostFn::Tell);
+    }
     uint64_t bytes_read() const { return m_bytes_read; }
     void reset_calls();
     /** Starts a log of all file calls (of memory calls too with `memory`). */
@@ -94,7 +104,7 @@ public:
      * read(4096)=100 write(8)=8 seek(10,1)=0 seek64(10,0)=0 tell()=5 tell64()=5 eof()=1 flush()=0 close()=0
      * alloc(64)=1 free(1)= copy(16)= set(0,16)=. Blocks show as 1, or 0 for null.
      */
-    std::string take_log();
+    std::string take_log() { return std::exchange(m_log, {}); }
 
     /** Size of a block that is held, 0 for any other pointer. */
     size_t size_of(const void* block) const
@@ -107,6 +117,14 @@ public:
     size_t open_handles() const;
     /** All file_open modes so far, successful or not. */
     const std::vector<std::string>& open_modes() const { return m_open_modes; }
+
+protected:
+    virtual void* alloc(uint32_t size);
+    virtual void release(void* memory);
+    virtual int32_t eof(void* pointer);
+    virtual uint32_t read(void* buffer, uint32_t size, uint32_t count, void* pointer);
+    virtual int32_t seek(void* pointer, int64_t offset, int32_t whence, bool wide);
+    virtual int64_t tell(void* pointer, bool wide);
 
 private:
     struct File {
@@ -127,23 +145,24 @@ private:
     bool begin(HostFn fn);
     uint32_t limited(HostFn fn, uint32_t count) const;
     void log(bool wanted, const char* name, const std::string& arguments, const std::string& result);
+    template <class Result> Result logged(const char* name, const std::string& arguments, Result result)
+    {
+        log(m_logging, name, arguments, std::to_string(result));
+        return result;
+    }
     Handle* handle(void* pointer);
     void check_range(const char* what, const void* pointer, uint32_t count);
+    Handle* transfer(const char* what, const void* buffer, uint32_t size, uint32_t count, void* pointer);
 
-    void* alloc(uint32_t size);
-    void release(void* memory);
     void* copy(void* destination, const void* source, uint32_t count);
     void* set(void* destination, int value, uint32_t count);
     void* open(const char* path, const char* mode);
     int32_t close(void* pointer);
-    int32_t eof(void* pointer);
     int32_t flush(void* pointer);
-    uint32_t read(void* buffer, uint32_t size, uint32_t count, void* pointer);
     uint32_t write(const void* buffer, uint32_t size, uint32_t count, void* pointer);
-    int32_t seek(void* pointer, int64_t offset, int32_t whence, bool wide);
-    int64_t tell(void* pointer, bool wide);
     static void fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count);
 
+    static inline ViolationHandler m_handler = nullptr;
     FakeHost* m_previous;
     std::map<std::string, std::shared_ptr<File>> m_files;
     std::vector<std::unique_ptr<Handle>> m_handles;

@@ -74,7 +74,7 @@ static Bytes Marked(uint8_t marker, uint64_t number, int bytes)
     return out;
 }
 
-static Bytes Text(uint8_t marker, int length_bytes, const std::string& text)
+Bytes Text(uint8_t marker, int length_bytes, const std::string& text)
 {
     Bytes out = Marked(marker, text.size(), length_bytes);
     out.insert(out.end(), text.begin(), text.end());
@@ -88,18 +88,7 @@ Bytes Number(double value)
     return Marked(0, bits, 8);
 }
 
-Bytes String(const std::string& text)
-{
-    return Text(2, 2, text);
-}
-
-Bytes LongString(const std::string& text)
-{
-    return Text(12, 4, text);
-}
-
-// With their end marker, without type marker.
-static Bytes Properties(const std::vector<Property>& properties)
+Bytes Properties(const std::vector<Property>& properties)
 {
     Bytes out;
     for (const auto& [name, value] : properties) {
@@ -109,11 +98,6 @@ static Bytes Properties(const std::vector<Property>& properties)
     }
     Put(out, 9, 3);
     return out;
-}
-
-Bytes Object(const std::vector<Property>& properties)
-{
-    return Concat({{3}, Properties(properties)});
 }
 
 Bytes EcmaArray(const std::vector<Property>& properties, std::optional<uint32_t> count)
@@ -134,11 +118,6 @@ Bytes NumberArray(const std::vector<double>& numbers)
     std::vector<Bytes> elements(numbers.size());
     std::transform(numbers.begin(), numbers.end(), elements.begin(), Number);
     return StrictArray(elements);
-}
-
-Bytes OnMetaData(const std::vector<Property>& properties)
-{
-    return Concat({String("onMetaData"), EcmaArray(properties)});
 }
 
 } // namespace amf
@@ -168,38 +147,28 @@ Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps)
     return out;
 }
 
-Bytes SmallAvcRecord()
-{
-    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
-}
-
-static Bytes Filled(Bytes head, size_t size, uint32_t seed)
+Bytes Filled(Bytes head, size_t size)
 {
     if (size > head.size())
-        Append(head, Noise(size - head.size(), seed));
+        Append(head, Noise(size - head.size()));
     return head;
 }
 
-Bytes Mp3Frame(size_t size, uint32_t seed)
-{
-    return Filled({0xFF, 0xFB, 0x90, 0x64}, size, seed);
-}
-
-Bytes H263Picture(uint32_t size_code, uint32_t width, uint32_t height, size_t size, uint32_t seed)
+Bytes H263Picture(uint32_t size_code, uint32_t width, uint32_t height, size_t size)
 {
     BitWriter head;
-    head.u(17, 1).u(5, 0).u(8, seed).u(3, size_code);
+    head.u(17, 1).u(5, 0).u(8, 1).u(3, size_code);
     if (size_code < 2) {
         const int bits = size_code == 0 ? 8 : 16;
         head.u(bits, width).u(bits, height);
     }
-    return Filled(head.bytes(), size, seed);
+    return Filled(head.bytes(), size);
 }
 
-Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust, size_t size, uint32_t seed)
+Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust, size_t size)
 {
     const Bytes offset_to_alpha = alpha ? Bytes{0, 0, 100} : Bytes{};
-    return Filled(Concat({{adjust}, offset_to_alpha, {0x00, 0x46, rows, columns, rows, columns}}), size, seed);
+    return Filled(Concat({{adjust}, offset_to_alpha, {0x00, 0x46, rows, columns, rows, columns}}), size);
 }
 
 bool operator==(const Frame& a, const Frame& b)
@@ -226,11 +195,6 @@ bool Tag::is_frame() const
     if (codec_bytes() == 5)
         return (data[1] & 0xFD) != 0;
     return codec_bytes() == 1 || data[1] != 0;
-}
-
-bool Tag::is_keyframe() const
-{
-    return type == 9 && is_frame() && data[0] >> 4 == 1;
 }
 
 uint32_t Flv::first_ts() const
@@ -265,12 +229,6 @@ FlvBuilder& FlvBuilder::indexed_metadata(std::vector<amf::Property> properties, 
     m_index_properties = std::move(properties);
     m_index_hook = std::move(hook);
     return script({});
-}
-
-FlvBuilder& FlvBuilder::prefix(Bytes bytes)
-{
-    m_prefix = std::move(bytes);
-    return *this;
 }
 
 Bytes FlvBuilder::index_data(const std::vector<Tag>& tags) const
@@ -332,8 +290,7 @@ Flv FlvBuilder::build() const
 
 Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
 {
-    FlvBuilder builder(flags, static_cast<uint32_t>(prefix.size()) + header);
-    builder.prefix(prefix);
+    FlvBuilder builder(flags, static_cast<uint32_t>(prefix.size()) + header, prefix);
     for (const Tag& tag : tags)
         builder.add(tag);
     return builder.build();

@@ -43,15 +43,20 @@ namespace amf {
 using Property = std::pair<std::string, Bytes>;
 
 Bytes Number(double value);
-Bytes String(const std::string& text);
-Bytes LongString(const std::string& text);
-Bytes Object(const std::vector<Property>& properties);
+Bytes Text(uint8_t marker, int length_bytes, const std::string& text);
+inline const auto String = [](const std::string& text) { return Text(2, 2, text); };
+inline const auto LongString = [](const std::string& text) { return Text(12, 4, text); };
+/** With their end marker, without type marker. */
+Bytes Properties(const std::vector<Property>& properties);
+inline const auto Object = [](const std::vector<Property>& all) { return Concat({{3}, Properties(all)}); };
 /** `count` defaults to the number of properties. */
 Bytes EcmaArray(const std::vector<Property>& properties, std::optional<uint32_t> count = {});
 Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count = {});
 Bytes NumberArray(const std::vector<double>& numbers);
 /** The string "onMetaData" and an ECMA array. */
-Bytes OnMetaData(const std::vector<Property>& properties);
+inline const auto OnMetaData = [](const std::vector<Property>& properties) {
+    return Concat({String("onMetaData"), EcmaArray(properties)});
+};
 } // namespace amf
 
 /* Tag data (what follows the 11-byte tag header), codec header bytes included. */
@@ -72,13 +77,17 @@ inline const auto AacRaw = [](const Bytes& payload, uint8_t header = 0xAF) { ret
 /** AVCDecoderConfigurationRecord with the given parameter sets. */
 Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
 /** A record of one baseline parameter set, 320 x 240. */
-Bytes SmallAvcRecord();
+inline const auto SmallAvcRecord = [] {
+    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
+};
+/** A payload that begins so and goes on with noise. */
+Bytes Filled(Bytes head, size_t size);
 /** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
-Bytes Mp3Frame(size_t size = 200, uint32_t seed = 1);
+inline const auto Mp3Frame = [](size_t size = 200) { return Filled({0xFF, 0xFB, 0x90, 0x64}, size); };
 /** Sorenson H.263 picture header; size_code 0 and 1 carry width and height, 2 to 6 a fixed size. */
-Bytes H263Picture(uint32_t size_code, uint32_t width = 0, uint32_t height = 0, size_t size = 200, uint32_t seed = 1);
+Bytes H263Picture(uint32_t size_code, uint32_t width = 0, uint32_t height = 0, size_t size = 200);
 /** VP6 intra picture of profile 3 showing columns x rows macroblocks; `adjust` is cropped from width, height. */
-Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust = 0, size_t size = 200, uint32_t seed = 1);
+Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust = 0, size_t size = 200);
 
 constexpr uint8_t SOUND_MP3 = 0x2F;
 constexpr uint8_t SOUND_PCM = 0x3E;
@@ -115,7 +124,7 @@ struct Tag {
     /** It carries a frame: no script data, no configuration packet, not too short. */
     bool is_frame() const;
     /** A video frame of FrameType 1. */
-    bool is_keyframe() const;
+    bool is_keyframe() const { return type == 9 && is_frame() && data[0] >> 4 == 1; }
     uint32_t stream() const { return type == 9 ? 1u : 2u; }
 };
 
@@ -150,8 +159,11 @@ using IndexHook = std::function<void(std::vector<double>& times, std::vector<dou
 /** Collects tags and builds the file. All adders return the builder. */
 class FlvBuilder {
 public:
-    /** header: flags byte of the file header (1 video, 4 audio); data_offset: DataOffset as written. */
-    explicit FlvBuilder(uint8_t flags = 5, uint32_t data_offset = 9) : m_flags(flags), m_data_offset(data_offset) {}
+    /** flags: of the file header (1 video, 4 audio); data_offset: as written; prefix: in front of the file header. */
+    explicit FlvBuilder(uint8_t flags = 5, uint32_t data_offset = 9, Bytes prefix = {})
+        : m_flags(flags), m_data_offset(data_offset), m_prefix(std::move(prefix))
+    {
+    }
 
     FlvBuilder& add(Tag tag);
     FlvBuilder& video(uint32_t timestamp, Bytes data) { return add({9, timestamp, std::move(data)}); }
@@ -161,8 +173,6 @@ public:
     FlvBuilder& metadata(const std::vector<amf::Property>& properties) { return script(amf::OnMetaData(properties)); }
     /** onMetaData with "keyframes" behind the given properties: every keyframe of the file, at its real place. */
     FlvBuilder& indexed_metadata(std::vector<amf::Property> properties, IndexHook hook = {});
-    /** Bytes in front of the file header. */
-    FlvBuilder& prefix(Bytes bytes);
 
     Flv build() const;
 
