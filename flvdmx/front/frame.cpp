@@ -175,8 +175,7 @@ bool FLVD_DeliverCached(const flvd_delivery_t& delivery, flvd_frame_t* frame)
         return false;
     ctx->last_frame_size = n;
     FLVD_FioDropBits(reader);
-    FLVD_FioConsume(reader,
-                    size); // first, so that nothing need be kept for after the copy; the bytes stay in the cache
+    FLVD_FioConsume(reader, size); // first: nothing need be kept for after the copy; the bytes stay in the cache
     FLVD_Report(delivery, n, frame);
     g_flvd_fioFuncs.mem_copy(ctx->frame_buffer, bytes + FLVD_CODEC_BYTE + header, n);
     return true;
@@ -203,7 +202,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, uint32_t n, const 
     return FlvdTurn::Delivered;
 }
 
-// Handles a tag that is not delivered from the cache.
+// Handles the media tag whose header the reader stands on, whatever of it is cached.
 [[gnu::noinline]] FlvdTurn FLVD_DeliverTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
 {
     fio_file_t* const reader = delivery.reader;
@@ -224,19 +223,13 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, uint32_t n, const 
     return FLVD_DeliverPayload(delivery, tag.data_size - header, sites, frame);
 }
 
-// Handles the media tag whose header the reader stands on.
-FlvdTurn FLVD_HandleTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
-{
-    return FLVD_DeliverCached(delivery, frame) ? FlvdTurn::Delivered : FLVD_DeliverTag(delivery, frame);
-}
-
 // Complete file: describes the next tag, or passes what is there by the size of the last one.
 FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
     if (FLVD_FioAtEnd(delivery->reader))
         return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
-    if (FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 1) == 0)
-        return FLVD_HandleTag(*delivery, frame);
+    if (FLVD_GetPlayedTag(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted) == 0)
+        return FLVD_DeliverCached(*delivery, frame) ? FlvdTurn::Delivered : FLVD_DeliverTag(*delivery, frame);
     const uint32_t skipped = FLVD_FioSkip(delivery->tag.data_size + FLVD_TAG_OVERHEAD, delivery->reader);
     return skipped != 0 ? FlvdTurn::Next : FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
 }
@@ -261,7 +254,7 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
         return FLVD_FailRequest(*delivery, site);
     const int32_t result = FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 0);
     if (result == 0)
-        return FLVD_HandleTag(*delivery, frame);
+        return FLVD_DeliverTag(*delivery, frame);
     if (result == FLVD_ERR_END_OF_DATA)
         return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_END);
     // A budget that is spent has moved the reader. Else a position query failed: going on would lead into the tag.

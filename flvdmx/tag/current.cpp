@@ -42,17 +42,14 @@ bool FLVD_GoBackToTag(fio_file_t* file, int64_t position)
     return __FLV_DMX__fioSeek64(file, position, FIO_SEEK_SET) == 0;
 }
 
-int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
+int32_t FLVD_GetPlayedTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted)
 {
-    const int64_t position = FLVD_FioTell(file);
+    const int64_t position = FLVD_StartOnTag(ctx, file);
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
-    if (position == ctx->data_offset)
-        FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
-    // What follows is the search, for a tag that ends it at once.
     flvd_tag_header_t header;
-    if (verify == 0 || !FLVD_IsNextWanted(ctx, file, wanted, &header))
-        return FLVD_SearchFrom(ctx, file, info, wanted, verify != 0, position);
+    if (!FLVD_IsNextWanted(ctx, file, wanted, &header))
+        return FLVD_SearchFrom(ctx, file, info, wanted, true, position);
     const bool large = header.info.data_size + FLVD_TAG_OVERHEAD > file->capacity;
     if (!large && !FLVD_IsCachedAndSound(file, header.info.data_size))
         return FLVD_SearchFrom(ctx, file, info, wanted, true, position);

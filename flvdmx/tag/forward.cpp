@@ -299,6 +299,12 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
     return FLVD_PassBadTag(&search, false) ? FLVD_RunSearch(&search, info) : FLVD_ERR_NOT_FOUND;
 }
 
+int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
+{
+    const int64_t position = FLVD_StartOnTag(ctx, file);
+    return position >= 0 ? FLVD_SearchFrom(ctx, file, info, wanted, verify != 0, position) : FLVD_ERR_NOT_FOUND;
+}
+
 int32_t FLVD_FindNextTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
 {
     const int64_t distance = FLVD_ScanForTag(ctx, file, limit);

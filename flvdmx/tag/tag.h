@@ -149,6 +149,19 @@ bool FLVD_CheckBehind(fio_file_t* file, uint32_t data_size);
 // Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
 bool FLVD_GoBackToTag(fio_file_t* file, int64_t position);
 
+// Takes the position a search begins at, and passes PreviousTagSize0 when the reader stands on it. Below 0: the query
+// failed.
+inline int64_t FLVD_StartOnTag(const flvd_ctx_t* ctx, fio_file_t* file)
+{
+    const int64_t position = FLVD_FioTell(file);
+    if (position == ctx->data_offset)
+        FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
+    return position;
+}
+
+// FLVD_GetCurrTagInfo in careful mode, with a short way for a tag that ends the search at once, as most do in playing.
+int32_t FLVD_GetPlayedTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted);
+
 // The search of FLVD_GetCurrTagInfo from a position that was taken; its results.
 int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, bool verify,
                         int64_t position);
