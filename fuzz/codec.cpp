@@ -4,7 +4,8 @@
 
 #include <cstring>
 
-namespace flvd_fuzz {
+using namespace flvd_fuzz;
+
 namespace {
 
 // The first MPEG audio frame header, or 0.
@@ -34,8 +35,7 @@ void run_audio(Input& input)
         info.sample_rate = info.channels = 0;
     if (header != 0)
         info.sample_size = info.format_tag = info.data_rate = 0;
-    const flvd_audio_info_t untouched{};
-    require(same_bytes(info, untouched), "an audio header that changed something else");
+    require(same_bytes(info, flvd_audio_info_t{}), "an audio header that changed something else");
 }
 
 // Appends parameter sets with start codes. False when the record ends before them.
@@ -46,9 +46,8 @@ bool append_sets(const Bytes& record, uint32_t count, size_t* at, Bytes* sets)
         const size_t length = left >= 2 ? read_be(record, *at, 2) : left;
         if (length + 2 > left)
             return false;
-        const auto begin = record.begin() + static_cast<std::ptrdiff_t>(*at + 2);
-        sets->insert(sets->end(), {0, 0, 0, 1});
-        sets->insert(sets->end(), begin, begin + static_cast<std::ptrdiff_t>(length));
+        const uint8_t* const begin = record.data() + *at + 2;
+        Append(*sets, Concat({{0, 0, 0, 1}, Bytes(begin, begin + length)}));
         *at += 2 + length;
     }
     return true;
@@ -74,8 +73,7 @@ void judge_picture(int32_t codec, const Bytes& data)
         info.width = info.height = 0;
     if (rc == 0 && codec == 7)
         std::memset(info.fourcc, 0, sizeof info.fourcc);
-    const flvd_video_info_t untouched{};
-    require(same_bytes(info, untouched), "a picture header that changed something else");
+    require(same_bytes(info, flvd_video_info_t{}), "a picture header that changed something else");
 }
 
 // The control bytes are the codec of a picture header and the room for the parameter sets.
@@ -94,8 +92,6 @@ void run_avc(Input& input)
     judge_picture(7, out);
 }
 
-const Target g_audio("audio", run_audio);
-const Target g_avc("avc", run_avc);
+const Target g_audio("audio", run_audio), g_avc("avc", run_avc);
 
 } // namespace
-} // namespace flvd_fuzz

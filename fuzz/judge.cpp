@@ -39,12 +39,6 @@ fio_file_t* Host::open_reader(uint32_t cache_size, uint32_t overread_extra) cons
     return __FLV_DMX__fioOpen(DEFAULT_FILE, FIO_MODE_READ, cache_size, overread_extra != 0 ? 1 : 0, overread_extra);
 }
 
-void Host::lie(uint32_t lies, uint64_t patience)
-{
-    m_lies = lies;
-    m_patience = patience;
-}
-
 // Honest work is no effort.
 bool Host::refuses(uint64_t effort)
 {

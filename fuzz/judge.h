@@ -47,13 +47,10 @@ template <class Course, uint32_t MAX_CALLS> void run_calls(Input& input)
     }
 }
 
-/** A fuzz target. Each is a static object; the programs find it in the list. */
+/** A fuzz target. Each is a static object; the programs find what it runs by its name. */
 struct Target {
-    Target(const char* its_name, void (*its_run)(Input&)) : name(its_name), run(its_run), next(first) { first = this; }
-    static inline const Target* first = nullptr;
-    const char* const name;
-    void (*const run)(Input&);
-    const Target* const next;
+    Target(const char* name, void (*run)(Input&)) { all[name] = run; }
+    static inline std::map<std::string, void (*)(Input&)> all;
 };
 
 enum class Lie : uint8_t {
@@ -77,7 +74,7 @@ public:
     fio_file_t* open_reader(uint32_t cache_size, uint32_t overread_extra = 0) const;
     /** Tells these lies (bits 1 << Lie) from now on, until `patience` calls or KiB read are used up; then it refuses.
      */
-    void lie(uint32_t lies, uint64_t patience);
+    void lie(uint32_t lies, uint64_t patience) { std::tie(m_lies, m_patience) = std::tie(lies, patience); }
     /** The next operation may cost so many calls. */
     void begin(uint64_t calls) { m_calls_left = calls; }
     /** Where a reader really stands. */
@@ -95,8 +92,7 @@ private:
     int64_t tell(void* handle, bool wide) override;
 
     uint32_t m_lies = 0;
-    uint64_t m_patience = UINT64_MAX;
-    uint64_t m_calls_left = UINT64_MAX;
+    uint64_t m_patience = UINT64_MAX, m_calls_left = UINT64_MAX;
     bool m_frame_buffer_held = false;
 };
 

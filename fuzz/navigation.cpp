@@ -4,12 +4,13 @@
 
 #include "judge.h"
 
-namespace flvd_fuzz {
+using namespace flvd_fuzz;
+
 namespace {
 
 constexpr uint32_t ANY_CODEC = 0xFFFF;
 constexpr int64_t BEYOND = 64; // how far behind the end of the file a reader is put
-constexpr uint32_t POISON = 0x5A5A5A5A;
+constexpr flvd_tag_info_t UNTOUCHED = {0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A};
 constexpr int32_t UNKNOWN = 1; // the host was asked to go in front of the file: nothing is said of what follows
 
 struct Found {
@@ -37,7 +38,7 @@ public:
     {
         const int64_t from = m_host.position(m_reader);
         const uint32_t wanted = (bits & 3u) | (bits & 0x1Cu) << 14; // stream bits, then script, keyframe, configuration
-        flvd_tag_info_t info{POISON, POISON, POISON, POISON};
+        flvd_tag_info_t info = UNTOUCHED;
         m_host.begin(4000 + 40 * m_file.size());
         switch (code % 8) {
         case 0:
@@ -68,9 +69,8 @@ private:
             return;
         require(rc == expected.rc, "another result");
         const FileTag& tag = expected.tag;
-        const flvd_tag_info_t untouched{POISON, POISON, POISON, POISON};
         const flvd_tag_info_t described{tag.type, tag.size, tag.timestamp, tag.stream_id};
-        require(same_bytes(info, rc == 0 ? described : untouched), "another record");
+        require(same_bytes(info, rc == 0 ? described : UNTOUCHED), "another record");
         require(rc != 0 || m_host.position(m_reader) == expected.position, "another place");
     }
     void judge_find(int64_t from, uint32_t limit)
@@ -168,4 +168,3 @@ private:
 const Target g_target("navigation", run_calls<Navigation, 24>);
 
 } // namespace
-} // namespace flvd_fuzz

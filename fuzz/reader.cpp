@@ -3,7 +3,8 @@
 
 #include "judge.h"
 
-namespace flvd_fuzz {
+using namespace flvd_fuzz;
+
 namespace {
 
 constexpr uint32_t BIT_READER_CACHE = 8; // a smaller cache does not hold what the bit reader looks at
@@ -50,9 +51,8 @@ private:
             return require(got == std::min(left(n), m_room) && holds(bytes, got), "peeked bytes");
         }
         case 1: {
-            const uint32_t element = 1 + code / 64u;
+            const uint32_t element = 1 + code / 64u, expected = left(n * element);
             Bytes copy(size_t{n} * element);
-            const uint32_t expected = left(n * element);
             const uint32_t got = __FLV_DMX__fioRead(copy.data(), element, n, m_file);
             require(got == expected / element && holds(copy.data(), expected), "read bytes");
             return move_to(m_position + expected);
@@ -119,4 +119,3 @@ private:
 const Target g_target("reader", run_calls<Reader, 120>);
 
 } // namespace
-} // namespace flvd_fuzz

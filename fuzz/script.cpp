@@ -35,7 +35,8 @@ Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length
     require(arrays.times_count <= length && arrays.positions_count <= length, "an array larger than the payload");
     const bool kept = (options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
     require(kept || arrays.times_ms == nullptr, "an index in memory that was not asked for");
-    Bytes values(1, static_cast<uint8_t>(rc));
+    Bytes values;
+    append_bytes(&values, &rc, 1);
     append_bytes(&values, arrays.times_ms, arrays.times_count);
     append_bytes(&values, arrays.positions, arrays.positions_count);
     init.mem_free(arrays.times_ms);
@@ -50,8 +51,7 @@ Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length
 
 void run(Input& input)
 {
-    Bytes file(START, 0x11);
-    Append(file, input.payload());
+    Bytes file = Concat({Bytes(START, 0x11), input.payload()});
     const uint32_t options = input.byte() & 0x0Fu;
     const uint32_t behind = input.byte(); // bytes of the file that are not the payload's
     const uint32_t cache_size = 256u + 16u * input.byte();

@@ -11,21 +11,21 @@
 #include <functional>
 #include <numeric>
 
-namespace flvd_fuzz {
+using namespace flvd_fuzz;
+
 namespace {
 
-constexpr uint32_t MAX_COMMANDS = 64;
-constexpr uint32_t MAX_PLAYED = 24; // frames asked for behind the commands
+constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // frames asked for behind the commands
 constexpr uint64_t PATIENCE = 2000; // of most hosts that lie: they may lead through whole budgets, which takes long
 constexpr uint64_t BUDGETS = 30'000'000; // calls that a patient one may cost
 constexpr uint8_t POISON = 0x5A;
 constexpr std::array<uint32_t, 8> CACHES = {0, 1024, 1, 1500, 65536, 4096, 16000, 0xFFFFFFFF};
 
-bool is_filled(const flvd_frame_t& frame, uint8_t value)
+flvd_frame_t filled(uint8_t value)
 {
-    flvd_frame_t filled;
-    std::memset(&filled, value, sizeof filled);
-    return same_bytes(frame, filled);
+    flvd_frame_t frame;
+    std::memset(&frame, value, sizeof frame);
+    return frame;
 }
 
 // Reads it all, so that a sanitizer sees what is not there.
@@ -81,8 +81,7 @@ public:
     {
         close();
         m_was_opened = true;
-        const uint8_t bits = input.byte();
-        const uint8_t sizes = input.byte();
+        const uint8_t bits = input.byte(), sizes = input.byte();
         if ((bits & 0x80u) != 0)
             m_host.use_32_bit_only();
         m_buffer = Bytes((bits & FLVD_OPT_USER_BUFFER) != 0 ? input.word() : 0);
@@ -111,12 +110,10 @@ public:
     {
         if (m_ctx == nullptr)
             return;
-        const bool separate = has(FLVD_OPT_SEPARATE_AUDIO_READER) && m_ctx->opened_for_info == 0;
-        const fio_file_t* const reader =
-            separate && stream == FLVD_STREAM_AUDIO ? m_ctx->audio_reader : m_ctx->main_reader;
+        const bool separate = has(SEPARATE) && m_ctx->opened_for_info == 0;
+        const fio_file_t* const reader = separate && stream == AUDIO ? m_ctx->audio_reader : m_ctx->main_reader;
         const flvd_frame_request_t request{m_buffer.data(), static_cast<uint32_t>(m_buffer.size()), stream};
-        flvd_frame_t frame;
-        std::memset(&frame, POISON, sizeof frame);
+        flvd_frame_t frame = filled(POISON);
         begin();
         const int64_t before = place(reader);
         const int32_t rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &frame);
@@ -127,25 +124,20 @@ public:
         }
         require(IsListed(Op::Frame, rc, m_ctx->error, m_ctx->error_line), "a failure that no frame has");
         const bool refused = m_ctx->error <= FLVD_ERR_NO_VIDEO && m_ctx->error >= FLVD_ERR_INFO_ONLY;
-        require(is_filled(frame, refused ? POISON : 0), "the record of a failed request");
+        require(same_bytes(frame, filled(refused ? POISON : 0)), "the record of a failed request");
     }
 
 private:
     bool has(uint32_t option) const { return (m_ctx->options & option) != 0; }
-    void begin()
-    {
-        const auto size = static_cast<uint64_t>(m_host.visible());
-        m_host.begin(m_lied ? BUDGETS : 4000 + 40 * size);
-    }
+    void begin() { m_host.begin(m_lied ? BUDGETS : 4000 + 40 * static_cast<uint64_t>(m_host.visible())); }
     void judge_opened(const flvd_open_info_t& info) const
     {
-        const bool video = (m_ctx->streams & FLVD_STREAM_VIDEO) != 0;
-        const bool audio = (m_ctx->streams & FLVD_STREAM_AUDIO) != 0;
-        require((video || audio) && info.has_video == (video ? 1u : 0u) && info.has_audio == (audio ? 1u : 0u),
-                "streams");
-        require(info.file_info == &m_ctx->file_info && info.video_info == (video ? &m_ctx->video_info : nullptr) &&
-                    info.audio_info == (audio ? &m_ctx->audio_info : nullptr),
-                "the records of an open");
+        const bool video = (m_ctx->streams & FLVD_STREAM_VIDEO) != 0, audio = (m_ctx->streams & FLVD_STREAM_AUDIO) != 0;
+        require(video || audio, "no stream");
+        require(info.has_video == (video ? 1u : 0u) && info.has_audio == (audio ? 1u : 0u), "streams");
+        require(info.file_info == &m_ctx->file_info, "the record of the file");
+        require(info.video_info == (video ? &m_ctx->video_info : nullptr), "the record of video");
+        require(info.audio_info == (audio ? &m_ctx->audio_info : nullptr), "the record of audio");
         touch(m_ctx->video_info.config, m_ctx->video_info.config_size);
         touch(m_ctx->audio_info.config, m_ctx->audio_info.config_size);
         touch(m_ctx->keyframe_arrays.times_ms, m_ctx->keyframe_arrays.times_count);
@@ -180,16 +172,14 @@ private:
     {
         const int64_t start = end - frame.size;
         if (start < 0 || end > m_host.visible() ||
-            !std::equal(frame.data, frame.data + frame.size,
-                        m_host.contents().begin() + static_cast<std::ptrdiff_t>(start)))
+            !std::equal(frame.data, frame.data + frame.size, m_host.contents().data() + start))
             return false;
-        constexpr std::array<uint32_t, 3> codec_headers = {1, 2, 5};
-        return std::any_of(codec_headers.begin(), codec_headers.end(), [&](uint32_t header) {
-            FileTag tag;
-            return read_tag(m_host.contents(), start - header - 11, &tag) &&
-                   tag.type == (frame.stream == 1 ? 9u : 8u) && tag.size == frame.size + header &&
-                   tag.timestamp == frame.timestamp_ms + m_ctx->first_ts;
-        });
+        const uint32_t type = frame.stream == VIDEO ? 9 : 8, timestamp = frame.timestamp_ms + m_ctx->first_ts;
+        for (const uint32_t header : {1u, 2u, 5u}) // of the codec
+            if (FileTag tag; read_tag(m_host.contents(), start - header - 11, &tag) && tag.type == type &&
+                             tag.size == frame.size + header && tag.timestamp == timestamp)
+                return true;
+        return false;
     }
 
     void seek(int32_t time, uint32_t bits)
@@ -199,8 +189,7 @@ private:
         const flvd_seek_request_t request{time, (bits & 0x10u) | (bits & 3u) << 8 | (bits & 0x0Cu) << 14};
         int32_t reached = POISON;
         begin();
-        const int64_t main = place(m_ctx->main_reader);
-        const int64_t audio = place(m_ctx->audio_reader);
+        const int64_t main = place(m_ctx->main_reader), audio = place(m_ctx->audio_reader);
         const int32_t rc = QVX_FLV_DMX(FLVD_OP_SEEK, &m_ctx, &request, &reached);
         const bool judged = !m_lied && !m_faulty;
         if (rc == 0 && judged && ((request.mode & FLVD_SEEK_RELATIVE) == 0 || time != 0))
@@ -228,9 +217,8 @@ private:
     flvd_ctx_t* m_ctx = nullptr;
     Bytes m_buffer;
     uint32_t m_lies = 0;
-    bool m_lied = false;   // since the file was opened
-    bool m_faulty = false; // calls may fail or read short
-    bool m_was_opened = false;
+    bool m_was_opened = false, m_lied = false; // a lie counts until the file is closed
+    bool m_faulty = false;                     // calls may fail or read short
 };
 
 void run(Input& input)
@@ -248,4 +236,3 @@ void run(Input& input)
 const Target g_target("session", run);
 
 } // namespace
-} // namespace flvd_fuzz

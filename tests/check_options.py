@@ -2,6 +2,7 @@
 
 usage: check_options.py PROGRAM MANUAL COMPLETION
 """
+import pathlib
 import re
 import subprocess
 import sys
@@ -11,8 +12,7 @@ TOP = ""
 
 
 def read(path):
-    with open(path, encoding="utf-8") as file:
-        return file.read()
+    return pathlib.Path(path).read_text(encoding="utf-8")
 
 
 def help_of(*command):
@@ -26,12 +26,11 @@ def from_help():
 
 
 def from_manual():
-    sections = re.split(r"^\.Ss (\w+).*\n", read(manual).split(".Sh EXIT STATUS")[0], flags=re.M)
-    texts = {TOP: sections[0], **dict(zip(sections[1::2], sections[2::2]))}
-    items = {name: re.findall(r"^\.It (Fl .*)", text, re.M) for name, text in texts.items()}
-    found = {name: {"--" + option for line in lines for option in re.findall(r"Fl Fl ([\w-]+)", line)}
-             for name, lines in items.items()}
-    return {name: options | {"--help"} for name, options in found.items()}  # told once, for all
+    first, *sections = re.split(r"^\.Ss (\w+).*\n", read(manual).split(".Sh EXIT STATUS")[0], flags=re.M)
+    texts = {TOP: first, **dict(zip(sections[::2], sections[1::2]))}
+    items = {name: " ".join(re.findall(r"^\.It (Fl .*)", text, re.M)) for name, text in texts.items()}
+    return {name: {"--help", *("--" + option for option in re.findall(r"Fl Fl ([\w-]+)", text))}  # help: told once
+            for name, text in items.items()}
 
 
 def from_completion():

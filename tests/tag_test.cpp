@@ -22,14 +22,17 @@ constexpr int64_t WINDOW = CACHE - 12;                   // candidate starts in 
 constexpr int64_t SCANNED = (MIB / WINDOW + 1) * WINDOW; // what a failed scan has looked at
 
 using Found = std::tuple<int32_t, int64_t, uint32_t>; // result, place and kind, the latter two on success alone
-Found Failed(int32_t rc)
-{
-    return {rc, 0, 0};
-}
+const Found g_notFound{NOT_FOUND, 0, 0}, g_atFirst{AT_FIRST, 0, 0}, g_ended{ENDED, 0, 0};
 
 // A reader on some bytes, with an instance that knows nothing of its streams.
-class Reader {
-public:
+struct Reader {
+    FakeHost host;
+    flvd_ctx_t ctx{};
+    fio_file_t* file;
+    int64_t end;
+    flvd_tag_info_t info{77, 77, 77, 77};
+    uint32_t kind = 0;
+
     explicit Reader(const Bytes& bytes, uint32_t cache = CACHE, uint32_t quantum = 0) : host(bytes)
     {
         const fio_funcs_t funcs = host.funcs();
@@ -43,11 +46,6 @@ public:
     }
     ~Reader() { __FLV_DMX__fioClose(file); }
 
-    FakeHost host;
-    flvd_ctx_t ctx{};
-    fio_file_t* file;
-    int64_t end;
-
     Reader& at(int64_t pos)
     {
         host.fail_nothing();
@@ -55,30 +53,24 @@ public:
         host.reset_calls();
         return *this;
     }
-    Found verify(uint32_t wanted) { return found(FLVD_GetCurrTagInfo(&ctx, file, &m_info, wanted, 1)); }
-    Found trust(uint32_t wanted) { return found(FLVD_GetCurrTagInfo(&ctx, file, &m_info, wanted, 0)); }
-    Found next(uint32_t wanted) { return found(FLVD_MoveToNextTag(&ctx, file, &m_info, wanted, &m_kind)); }
-    Found prev(uint32_t wanted) { return found(FLVD_MoveToPrevTag(&ctx, file, &m_info, wanted, &m_kind)); }
+    Found verify(uint32_t wanted) { return found(FLVD_GetCurrTagInfo(&ctx, file, &info, wanted, 1)); }
+    Found trust(uint32_t wanted) { return found(FLVD_GetCurrTagInfo(&ctx, file, &info, wanted, 0)); }
+    Found next(uint32_t wanted) { return found(FLVD_MoveToNextTag(&ctx, file, &info, wanted, &kind)); }
+    Found prev(uint32_t wanted) { return found(FLVD_MoveToPrevTag(&ctx, file, &info, wanted, &kind)); }
     int64_t find(int64_t limit = MIB) { return FLVD_FindNextTag(&ctx, file, static_cast<uint32_t>(limit)); }
 
-private:
     // A record is written on success alone, and then describes the header that the reader stands on.
     Found found(int32_t rc)
     {
-        const flvd_tag_info_t info = std::exchange(m_info, {77, 77, 77, 77});
-        const uint32_t kind = std::exchange(m_kind, 0);
-        Bytes header;
-        Put(header, uint64_t{info.type} << 24 | info.data_size, 4);
-        Put(header, uint64_t{info.timestamp << 8} << 24 | uint64_t{info.timestamp >> 24} << 24 | info.stream_id, 7);
-        Bytes expected{77, 0, 0, 77, 0, 0, 77, 0, 0, 0, 77};
+        const auto [type, size, time, stream] = std::exchange(info, {77, 77, 77, 77});
+        Bytes header, expected{77, 0, 0, 77, 0, 0, 77, 0, 0, 0, 77};
+        Put(header, uint64_t{type} << 24 | size, 4);
+        Put(header, uint64_t{time << 8 | time >> 24} << 24 | stream, 7);
         if (rc == 0)
             expected.resize(__FLV_DMX__fioShowBytesByCopy(expected.data(), 11, file));
         EXPECT_EQ(header, expected);
-        return {rc, rc == 0 ? __FLV_DMX__fioTell64(file) : 0, kind};
+        return {rc, rc == 0 ? __FLV_DMX__fioTell64(file) : 0, std::exchange(kind, 0)};
     }
-
-    flvd_tag_info_t m_info{77, 77, 77, 77};
-    uint32_t m_kind = 0;
 };
 using Step = Found (Reader::*)(uint32_t wanted);
 constexpr Step FORWARD[] = {&Reader::verify, &Reader::trust, &Reader::next};
@@ -86,23 +78,20 @@ constexpr Step FORWARD[] = {&Reader::verify, &Reader::trust, &Reader::next};
 // Tags that fit the cache, narrow reads, and tags larger than the cache take different ways to the same result.
 constexpr std::pair<uint32_t, uint32_t> READERS[] = {{CACHE, 0}, {CACHE, 16}, {64, 0}};
 
-Tag Sound(size_t size = 100, std::optional<uint32_t> back_pointer = {})
+const auto Sound = [](size_t size = 100, std::optional<uint32_t> back_pointer = {}) {
+    return Tag{8, 5, AacRaw(Noise(size - 2)), back_pointer};
+};
+const auto Picture = [](size_t size = 100) { return Nalu(5, size - 5); };
+const auto Zeros = [](int64_t count) { return Bytes(static_cast<size_t>(count)); };
+// As they stand in a file.
+Bytes Tags(const std::vector<Tag>& tags)
 {
-    return {8, 5, AacRaw(Noise(size - 2)), back_pointer};
+    const Bytes file = File(tags).bytes;
+    return {file.begin() + FIRST_TAG, file.end()};
 }
-Tag Picture(size_t size = 100, std::optional<uint32_t> back_pointer = {})
-{
-    return {9, 5, AvcNalu(true, Noise(size - 5)), back_pointer};
-}
-// As it stands in a file.
 Bytes operator+(const Bytes& front, const Tag& tag)
 {
-    const Bytes file = FlvBuilder().add(tag).build().bytes;
-    return Concat({front, Bytes(file.begin() + FIRST_TAG, file.end())});
-}
-Bytes Zeros(int64_t count)
-{
-    return Bytes(static_cast<size_t>(count));
+    return Concat({front, Tags({tag})});
 }
 
 TEST(TagHeader, IsPlausibleForThisFile)
@@ -140,49 +129,47 @@ TEST(TagHeader, IsPlausibleForThisFile)
 
 TEST(TagKinds, AreFilteredAndReportedInBothDirections)
 {
+    const Bytes script = amf::Number(1);
     FlvBuilder builder;
-    builder.script(amf::Number(1)).video(0, AvcConfig(SmallAvcRecord())).audio(0, AacConfig({0x12, 0x10}));
-    builder.add(Picture()).video(1, AvcNalu(false, Noise(60))).add(Sound());
+    builder.script(script).add(g_avc).add(g_aac).add(Picture()).video(1, AvcNalu(false, Noise(60))).add(Sound());
     builder.video(2, Concat({{0x27, 0, 0, 0, 0}, Noise(70)})); // a sequence header in an inter frame
     builder.video(3, Concat({{0x47, 1, 0, 0, 0}, Noise(80)})); // a generated keyframe
     builder.video(4, VideoData(1, CODEC_H263, Noise(90))).video(5, VideoData(2, CODEC_H263, Noise(40)));
-    const Flv flv = builder.audio(6, AudioData(SOUND_MP3, Noise(50))).video(7, AvcEnd()).script(amf::Number(1)).build();
-    struct Case {
+    const Flv flv = builder.audio(6, AudioData(SOUND_MP3, Noise(50))).video(7, AvcEnd()).script(script).build();
+    constexpr uint32_t s = SCRIPT, k = KEY, vc = VIDEO | CONFIG, kc = KEY | CONFIG, ac = AUDIO | CONFIG;
+    // What is found when such tags are wanted, and the kinds reported on the way forward and backward.
+    const struct {
         uint32_t wanted;
         std::vector<size_t> tags;
         std::vector<uint32_t> forward, backward;
-    };
-    constexpr uint32_t s = SCRIPT, k = KEY, vc = VIDEO | CONFIG, kc = KEY | CONFIG, ac = AUDIO | CONFIG;
-    const Case cases[] = {{ANY,
-                           {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12},
-                           {s, kc, ac, k, 1, 2, vc, k, kc, vc, ac, k, s},
-                           {s, 1, 2, 1, 1, 2, 1, 1, 1, 1, 2, 1, s}},
-                          {AUDIO, {2, 5, 10}, {ac, 2, ac}, {2, 2, 2}},
-                          {ac, {2, 10}, {ac, ac}, {ac, 2}},
-                          {vc, {1, 6, 8, 9}, {vc, vc, kc, vc}, {vc, vc, 1, 1}},
-                          {KEY, {1, 3, 7, 8, 11}, {k, k, k, k, k}, {k, k, k, k, k}},
-                          {kc | AUDIO, {1, 2, 3, 7, 8, 10, 11}, {k, ac, k, k, k, ac, k}, {k, ac, k, k, k, 2, k}},
-                          {kc & ~VIDEO, {}, {}, {}}};
-    for (const auto& [cache, quantum] : READERS) {
-        Reader r(flv.bytes, cache, quantum);
-        for (const Case& c : cases) {
-            SCOPED_TRACE(c.wanted);
-            const auto offset = [&](size_t i) { return i < c.tags.size() ? flv.tags[c.tags[i]].offset : 0; };
+    } cases[] = {{ANY,
+                  {0, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12},
+                  {s, kc, ac, k, 1, 2, vc, k, kc, vc, ac, k, s},
+                  {s, 1, 2, 1, 1, 2, 1, 1, 1, 1, 2, 1, s}},
+                 {AUDIO, {2, 5, 10}, {ac, 2, ac}, {2, 2, 2}},
+                 {ac, {2, 10}, {ac, ac}, {ac, 2}},
+                 {vc, {1, 6, 8, 9}, {vc, vc, kc, vc}, {vc, vc, 1, 1}},
+                 {kc | AUDIO, {1, 2, 3, 7, 8, 10, 11}, {k, ac, k, k, k, ac, k}, {k, ac, k, k, k, 2, k}},
+                 {kc & ~VIDEO, {}, {}, {}}};
+    for (const auto& [cache, quantum] : READERS)
+        for (const auto& [wanted, tags, forward, backward] : cases) {
+            SCOPED_TRACE(wanted);
+            Reader r(flv.bytes, cache, quantum);
             for (const Step step : FORWARD) {
                 r.at(DATA_OFFSET);
-                for (size_t i = 0; i < c.tags.size(); ++i) {
-                    EXPECT_EQ((r.*step)(c.wanted), Found(0, offset(i), step == &Reader::next ? c.forward[i] : 0));
-                    r.at(step == &Reader::next ? offset(i) : flv.tags[c.tags[i]].end());
+                for (size_t i = 0; i < tags.size(); ++i) {
+                    const Tag& tag = flv.tags[tags[i]];
+                    EXPECT_EQ((r.*step)(wanted), Found(0, tag.offset, step == &Reader::next ? forward[i] : 0));
+                    r.at(step == &Reader::next ? tag.offset : tag.end());
                 }
-                EXPECT_EQ((r.*step)(c.wanted), Failed(ENDED));
+                EXPECT_EQ((r.*step)(wanted), g_ended);
             }
             r.at(r.end);
-            for (size_t i = c.tags.size(); i-- > 0;)
-                EXPECT_EQ(r.prev(c.wanted), Found(0, offset(i), c.backward[i]));
-            EXPECT_EQ(r.prev(c.wanted), Failed(AT_FIRST));
+            for (size_t i = tags.size(); i-- > 0;)
+                EXPECT_EQ(r.prev(wanted), Found(0, flv.tags[tags[i]].offset, backward[i]));
+            EXPECT_EQ(r.prev(wanted), g_atFirst);
             EXPECT_LE(r.host.calls(HostFn::Read), 4 * flv.tags.size()); // unwanted tags are not slid over
         }
-    }
 }
 
 TEST(BackPointer, HasToAgreeButForTheFirstScriptTag)
@@ -200,42 +187,33 @@ TEST(BackPointer, HasToAgreeButForTheFirstScriptTag)
         EXPECT_EQ(r.at(FIRST_TAG).next(ANY), Found(0, inside, KEY));
         EXPECT_EQ(r.next(ANY), Found(0, flv.tags[2].offset, KEY));
         EXPECT_EQ(r.next(ANY), Found(0, flv.tags[4].offset, AUDIO));
-        EXPECT_EQ(r.next(ANY), Failed(ENDED));
+        EXPECT_EQ(r.next(ANY), g_ended);
         for (const Tag& first : {script, Sound(9)}) { // cut in its back-pointer
             Bytes cut = Zeros(FIRST_TAG) + first;
             cut.pop_back();
             const Found found = Reader(cut, cache, quantum).at(DATA_OFFSET).verify(ANY);
-            EXPECT_EQ(found, first.type == 18 ? Found(0, FIRST_TAG, 0) : Failed(ENDED));
+            EXPECT_EQ(found, first.type == 18 ? Found(0, FIRST_TAG, 0) : g_ended);
         }
     }
 }
 
 TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
 {
-    struct Case {
-        int64_t distance, limit, result;
-    };
-    const Case cases[] = {{0, MIB, 0},
-                          {1, MIB, 1},
-                          {5000, MIB, 5000},
-                          {WINDOW - 1, 1, WINDOW - 1},
-                          {WINDOW, WINDOW, NOT_FOUND},
-                          {WINDOW, WINDOW + 1, WINDOW},
-                          {0, 0, NOT_FOUND},
-                          {SCANNED - 1, MIB, SCANNED - 1},
-                          {SCANNED, MIB, NOT_FOUND}};
-    for (const auto& [distance, limit, result] : cases) {
-        SCOPED_TRACE(distance);
+    const auto find = [](int64_t distance, int64_t limit) {
+        SCOPED_TRACE(testing::PrintToString(std::pair(distance, limit)));
+        const bool covered = distance < (limit + WINDOW - 1) / WINDOW * WINDOW; // whole windows are looked at
         Reader r(Zeros(100 + distance) + Sound(), CACHE, 16);
-        EXPECT_EQ(r.at(100).find(limit), result);
+        EXPECT_EQ(r.at(100).find(limit), covered ? distance : NOT_FOUND);
         EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), 16u);
         const auto reads = static_cast<int64_t>(r.host.calls(HostFn::Read));
-        EXPECT_TRUE(result < 0 || (reads == distance / WINDOW + 1 && __FLV_DMX__fioTell64(r.file) == 100 + distance));
-    }
-    for (const size_t left : {12u, 13u}) {
-        Bytes bytes = Zeros(100) + Sound();
-        bytes.resize(100 + left);
-        EXPECT_EQ(Reader(bytes).at(100).find(), left < 13 ? NOT_FOUND : 0);
+        EXPECT_TRUE(!covered || (reads == distance / WINDOW + 1 && __FLV_DMX__fioTell64(r.file) == 100 + distance));
+    };
+    for (const int64_t distance : {int64_t{0}, int64_t{1}, WINDOW - 1, WINDOW, SCANNED - 1, SCANNED})
+        for (const int64_t limit : {int64_t{0}, int64_t{1}, WINDOW, WINDOW + 1, MIB})
+            find(distance, limit);
+    for (const int left : {12, 13}) {
+        const Bytes sound = Zeros(100) + Sound();
+        EXPECT_EQ(Reader({sound.begin(), sound.begin() + 100 + left}).at(100).find(), left < 13 ? NOT_FOUND : 0);
     }
     EXPECT_EQ(Reader(Bytes() + Sound(), 12).at(0).find(), NOT_FOUND); // no header fits this cache
 }
@@ -243,13 +221,7 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
 // A sound tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
 const Tag BAD{8, 0, Bytes{0xAF, 1, 0xEE, 0xEE, 0xEE}, 0xEEEEEEEE};
 constexpr int64_t BAD_SIZE = 20, BAD_COST = BAD_SIZE - 1 + 64; // the distance to the next, and the penalty
-Bytes Bad(int64_t count)
-{
-    Bytes out;
-    for (const Bytes one = Bytes() + BAD; count > 0; --count)
-        Append(out, one);
-    return out;
-}
+const auto Bad = [](int64_t count) { return Tags(std::vector(static_cast<size_t>(count), BAD)); };
 
 TEST(Resynchronisation, CoversOneMiBInAll)
 {
@@ -293,27 +265,27 @@ TEST(PrevTag, SlidesBackWhereTheChainIsDamaged)
     const int64_t first = flv.tags[0].offset, second = flv.tags[1].offset, last = flv.tags[3].offset;
     Reader r(Concat({flv.bytes, Zeros(37)}));
     for (const int64_t pos : {int64_t{5}, DATA_OFFSET, first})
-        EXPECT_EQ(r.at(pos).prev(ANY), Failed(AT_FIRST));
+        EXPECT_EQ(r.at(pos).prev(ANY), g_atFirst);
     EXPECT_EQ(r.at(second).prev(ANY), Found(0, first, AUDIO));
     EXPECT_EQ(r.at(r.end).prev(ANY), Found(0, last, VIDEO));
     r.at(last).host.fail_nth(HostFn::Tell, 2);
-    EXPECT_EQ(r.prev(VIDEO), Failed(NOT_FOUND));
+    EXPECT_EQ(r.prev(VIDEO), g_notFound);
     r.ctx.data_offset = static_cast<int32_t>(second) - 4;
-    EXPECT_EQ(r.at(second).prev(ANY), Failed(AT_FIRST));
+    EXPECT_EQ(r.at(second).prev(ANY), g_atFirst);
     r.ctx.video_codec_filter = CODEC_H263; // the picture is slid over, not stepped over
     EXPECT_EQ(r.at(r.end - 37).prev(ANY), Found(0, flv.tags[2].offset, AUDIO));
     EXPECT_GE(r.host.calls(HostFn::Read), 80u);
-    EXPECT_EQ(Reader(chain({}, 12).bytes).at(second).prev(ANY), Failed(AT_FIRST));
+    EXPECT_EQ(Reader(chain({}, 12).bytes).at(second).prev(ANY), g_atFirst);
     const auto cursor = static_cast<uint32_t>(last - 4), astray = cursor - static_cast<uint32_t>(first);
     for (const uint32_t damage : {0u, 0x80000065u, 0xFFFFFFFFu, cursor, cursor + 1, cursor - 1, 102u, astray})
         EXPECT_EQ(Reader(chain(damage).bytes).at(last).prev(ANY), Found(0, second, VIDEO)) << damage;
     const Bytes eight = Concat({flv.bytes, {0, 0, 0, 8}}); // leads to 12 bytes before the end
-    EXPECT_EQ(Reader(eight).at(flv.tags[3].end() + 4).prev(ANY), Failed(ENDED));
+    EXPECT_EQ(Reader(eight).at(flv.tags[3].end() + 4).prev(ANY), g_ended);
     EXPECT_EQ(Reader(Concat({eight, {0}})).at(flv.tags[3].end() + 4).prev(ANY), Found(0, last, VIDEO));
     Reader twice(Concat({Zeros(FIRST_TAG) + Sound(), Zeros(MIB - 1) + Picture(), {0}}), CACHE, 16);
     EXPECT_EQ(twice.at(twice.end).prev(AUDIO), Found(0, FIRST_TAG, AUDIO)); // the picture restores the budget
     Reader spent(Concat({Zeros(FIRST_TAG) + Sound(), Zeros(MIB)}), CACHE, 16);
-    EXPECT_EQ(spent.at(spent.end).prev(ANY), Failed(NOT_FOUND));
+    EXPECT_EQ(spent.at(spent.end).prev(ANY), g_notFound);
 }
 
 TEST(HostCalls, OfTheBackPointerCheck)
@@ -327,10 +299,6 @@ TEST(HostCalls, OfTheBackPointerCheck)
         EXPECT_EQ(calls.substr(0, log.size()), log);
         EXPECT_EQ(calls.find("seek", log.size()), std::string::npos);
         EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), quantum != 0 ? quantum : CACHE);
-        if (calls == log && tag.size() == 115 && quantum == 0) {
-            FLVD_GetCurrTagInfo(&r.ctx, r.file, &info, VIDEO, 1); // the sound is passed, the picture taken
-            EXPECT_EQ(r.host.take_log(), "tell64()=243 tell64()=243 tell64()=243 tell64()=243");
-        }
     };
     const std::string whole = "tell64()=13 eof()=0 read(4096)=4096 tell64()=4109";
     check(Sound(), 0, "tell64()=13 eof()=0 read(4096)=230 tell64()=243");
@@ -353,51 +321,32 @@ Extent Probe(const Bytes& file, const OpenOptions& open = {})
     EXPECT_EQ(ctx.last_keyframe_ms, ctx.video_info.last_key_time_ms);
     return {ctx.data_end, ctx.last_ts, ctx.seek_method, ctx.keyframe_index.entry_count, ctx.last_keyframe_ms};
 }
-constexpr uint32_t MEMORY = FLVD_OPT_INDEX_IN_MEMORY, FROM_FILE = 0;
 const OpenOptions QUICK{0, true};
 
 // Pictures every 40 ms, each second one a keyframe, sound up to 782 ms; with `hook` a keyframe index.
 Flv Chain(const IndexHook& hook = {})
 {
-    ChainOptions options;
-    options.metadata = false;
-    options.gop = 2;
     FlvBuilder builder;
     if (hook)
         builder.indexed_metadata({}, hook);
-    for (const Tag& tag : MakeChain(options).tags)
+    for (const Tag& tag : MakeChain({true, true, false, false, 20, 2}).tags)
         builder.add(tag);
     return builder.build();
-}
-// Cut 20 bytes into a picture.
-Bytes CutIn(const Flv& flv, uint32_t picture)
-{
-    Bytes out = flv.bytes;
-    for (const Tag& tag : flv.tags)
-        if (tag.type == 9 && tag.is_frame() && tag.timestamp == 40 * picture)
-            out.resize(static_cast<size_t>(tag.offset) + 20);
-    return out;
-}
-Bytes Behind(const Flv& flv, size_t size)
-{
-    return Concat({flv.bytes, Bytes(size, 0xEE)});
 }
 
 TEST(Extent, EndsWithTheLastTag)
 {
     const Flv flv = Chain();
     const auto size = static_cast<int64_t>(flv.bytes.size());
-    for (const Bytes& file : {flv.bytes, Behind(flv, 100), Concat({flv.bytes, Bad(3 * MIB / BAD_SIZE)})})
-        EXPECT_EQ(Probe(file), Extent(size, 782, FLVD_SEEK_BY_SCAN, 0, 0));
-    EXPECT_EQ(Probe(Behind(flv, 15), QUICK), Extent(size, 782, FLVD_SEEK_NONE, 0, 0));
-    EXPECT_EQ(Probe(Behind(flv, 16), QUICK), Extent(size + 16, 0, FLVD_SEEK_NONE, 0, 0));
-    FlvBuilder large(4);
-    for (int i = 0; i < 20; ++i)
-        large.add(Sound(100000));
-    const Flv half = large.add(Sound()).build();
-    EXPECT_EQ(Probe(Concat({half.bytes, Zeros(3 * MIB)})), Extent(half.bytes.size(), 5, FLVD_SEEK_BY_SCAN, 0, 0));
+    const auto behind = [&flv](const Bytes& more) { return Concat({flv.bytes, more}); };
+    for (const Bytes& more : {Bytes(), Bytes(100, 0xEE), Bad(3 * MIB / BAD_SIZE)})
+        EXPECT_EQ(Probe(behind(more)), Extent(size, 782, FLVD_SEEK_BY_SCAN, 0, 0));
+    EXPECT_EQ(Probe(behind(Bytes(15, 0xEE)), QUICK), Extent(size, 782, FLVD_SEEK_NONE, 0, 0));
+    EXPECT_EQ(Probe(behind(Bytes(16, 0xEE)), QUICK), Extent(size + 16, 0, FLVD_SEEK_NONE, 0, 0));
+    const Bytes half = File(std::vector(20, Sound(100000)), 4).bytes + Sound();
+    EXPECT_EQ(Probe(Concat({half, Zeros(3 * MIB)})), Extent(half.size(), 5, FLVD_SEEK_BY_SCAN, 0, 0));
     for (uint64_t nth = 255; nth < 275; ++nth) { // a seek of the tail, of the halving or of the last places
-        FakeHost host(Concat({flv.bytes, Zeros(3 * MIB)}));
+        FakeHost host(behind(Zeros(3 * MIB)));
         host.fail_nth(HostFn::Seek, nth);
         Session session(host);
         EXPECT_TRUE(session.failed_as_listed(Op::Open, session.open_rc())) << nth;
@@ -412,88 +361,70 @@ TEST(Extent, EndsWithTheLastTag)
 
 TEST(Extent, TakesTheLargestTimeOfTheLastTags)
 {
-    const auto last = [](uint32_t picture, uint32_t sounds) {
-        FlvBuilder builder;
-        if (picture != 0)
-            builder.video(0, VideoData(1, 3, Noise(50))).video(picture, VideoData(2, 3, Noise(50)));
+    const auto last = [](std::vector<Tag> tags, uint32_t sounds) {
         for (uint32_t i = 0; i < sounds; ++i)
-            builder.audio(900 - i, AudioData(SOUND_PCM, Noise(40)));
-        return std::get<1>(Probe(builder.build().bytes));
+            tags.push_back(Pcm(900 - i));
+        return std::get<1>(Probe(File(tags).bytes));
     };
-    EXPECT_EQ(last(700, 1), 900u);
-    EXPECT_EQ(last(1700, 9), 1700u);
-    EXPECT_EQ(last(1700, 10), 900u); // the eleventh from the end
-    EXPECT_EQ(last(0, 2), 899u);     // sound alone: the last tag decides
+    const Tag picture{9, 1700, VideoData(2, CODEC_SCREEN, Noise(50))};
+    EXPECT_EQ(last({Screen(0), Screen(700)}, 1), 900u);
+    EXPECT_EQ(last({Screen(0), picture}, 9), 1700u);
+    EXPECT_EQ(last({Screen(0), picture}, 10), 900u); // the eleventh from the end
+    EXPECT_EQ(last({}, 2), 899u);                    // sound alone: the last tag decides
 }
 
 TEST(Extent, TrimsAKeyframeIndexToTheData)
 {
     const Flv flv = Chain([](auto&, auto&) {});
     const auto size = static_cast<int64_t>(flv.bytes.size());
-    const Bytes cut = CutIn(flv, 11), cut_key = CutIn(flv, 10);
-    const Bytes one = Chain([](auto& times, auto& positions) { times.resize(1), positions.resize(1); }).bytes;
-    const auto astray = [](double position) { // the last position inside the file leads to no tag
-        return Chain([position](auto&, auto& positions) { positions[3] = position, positions[4] = 1e12; });
+    const auto cut = [&flv](size_t tag) { // 20 bytes into it
+        return Bytes(flv.bytes.data(), flv.bytes.data() + flv.tags[tag].offset + 20);
     };
-    const Bytes no_step = Concat({Behind(astray(static_cast<double>(size + 24)), 20), {0, 0, 0, 7, 0xEE}});
-    const Bytes last = Chain([](auto&, auto& positions) { positions.back() = -5; }).bytes;
-    for (const uint32_t options : {MEMORY, FROM_FILE}) {
+    const Bytes cut_key = cut(31), cut_picture = cut(34);
+    const auto astray = [](double position, double next) { // the last position inside the file leads to no tag
+        return Chain([=](auto&, auto& positions) { positions[3] = position, positions[4] = next; });
+    };
+    const Bytes beyond = astray(static_cast<double>(size) + 24, 1e12).bytes;
+    const Bytes no_step = Concat({beyond, Bytes(20, 0xEE), {0, 0, 0, 7, 0xEE}});
+    for (const uint32_t options : {INDEX, 0u}) {
         const auto extent = [options](const Bytes& file) { return Probe(file, {options}); };
-        EXPECT_EQ(extent(flv.bytes), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720));
-        EXPECT_EQ(extent(Behind(flv, 100)), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720));
-        EXPECT_EQ(extent(cut), Extent(cut.size() - 20, 437, FLVD_SEEK_BY_INDEX, 7, 480)); // one behind the end stays
+        const Extent all(size, 782, FLVD_SEEK_BY_INDEX, 10, 720);
+        EXPECT_EQ(extent(flv.bytes), all);
+        EXPECT_EQ(extent(Concat({flv.bytes, Bytes(100, 0xEE)})), all);
+        // One entry behind the end stays.
+        EXPECT_EQ(extent(cut_picture), Extent(cut_picture.size() - 20, 437, FLVD_SEEK_BY_INDEX, 7, 480));
         EXPECT_EQ(extent(cut_key), Extent(cut_key.size() - 20, 391, FLVD_SEEK_BY_INDEX, 6, 400));
-        EXPECT_EQ(extent(one), Extent(one.size(), 782, FLVD_SEEK_NONE, 1, 0));
-        EXPECT_EQ(extent(astray(std::nan("")).bytes), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720));
-        EXPECT_EQ(extent(last), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720)); // no matter: all entries are inside
+        EXPECT_EQ(extent(astray(NAN, 1e12).bytes), all);
         EXPECT_EQ(extent(no_step), Extent(size, 782, FLVD_SEEK_BY_INDEX, 4, 240));
+        const Bytes one = Chain([](auto& times, auto& positions) { times.resize(1), positions.resize(1); }).bytes;
+        EXPECT_EQ(extent(one), Extent(one.size(), 782, FLVD_SEEK_NONE, 1, 0));
+        const Bytes last = Chain([](auto&, auto& positions) { positions.back() = -5; }).bytes;
+        EXPECT_EQ(extent(last), all); // no matter: all entries are inside
     }
 }
 
 TEST(Extent, TakesTheLastTimeThatAnIndexHas)
 {
     const Bytes one = amf::Number(1), two = amf::Number(2), text = amf::String("a text");
-    const auto index = [&](const std::vector<Bytes>& times, const Bytes& second) {
-        std::vector<amf::Property> arrays{{"filepositions", amf::StrictArray({amf::Number(13), second, two})}};
+    const auto index = [&](const std::vector<Bytes>& times, const Bytes& second, std::optional<uint32_t> count = {}) {
+        std::vector<amf::Property> arrays{{"filepositions", amf::StrictArray({amf::Number(13), second, two}, count)}};
         if (!times.empty())
             arrays.insert(arrays.begin(), {"times", amf::StrictArray(times)});
         return amf::Property("keyframes", amf::Object(arrays));
     };
-    const auto extent = [](const std::vector<amf::Property>& properties, uint32_t options) {
+    const auto extent = [](const std::vector<amf::Property>& properties, uint32_t options = 0) {
         const Extent all = Probe(FlvBuilder(4).metadata(properties).add(Sound()).build().bytes, {options});
         return std::pair(std::get<2>(all), std::get<4>(all));
     };
     using Last = std::pair<uint32_t, uint32_t>;
-    EXPECT_EQ(extent({index({one, two, text}, two)}, FROM_FILE), Last(FLVD_SEEK_BY_INDEX, 2000));
-    EXPECT_EQ(extent({index({text, one, two}, two)}, FROM_FILE), Last(FLVD_SEEK_BY_INDEX, 0));
-    EXPECT_EQ(extent({index({one, text, two}, text)}, FROM_FILE), Last(FLVD_SEEK_BY_INDEX, 1000));
-    EXPECT_EQ(extent({index({}, two)}, FROM_FILE), Last(FLVD_SEEK_BY_SCAN, 0));
-    EXPECT_EQ(extent({index({one}, two), index({}, two)}, MEMORY), Last(FLVD_SEEK_BY_INDEX, 1000));
-}
-
-TEST(Extent, RefusesAnIndexThatEndsEarlyOrLeadsInFrontOfTheFile)
-{
-    // Code and line in the instance when the open fails.
-    const auto failure = [](const Bytes& file, uint32_t options) {
-        FakeHost host(file);
-        std::pair<int32_t, int32_t> out;
-        host.on_release = [&out](const void* block, uint32_t size) {
-            const auto* const ctx = static_cast<const flvd_ctx_t*>(block);
-            out = size == sizeof(*ctx) ? std::pair{ctx->error, ctx->error_line} : out;
-        };
-        EXPECT_FALSE(Session(host, {options}).opened());
-        EXPECT_EQ(g_flvd_lLastError, FLVD_ERR_EXTENT);
-        return out;
-    };
-    using Site = std::pair<int32_t, int32_t>;
-    const Bytes negative = Chain([](auto&, auto& positions) { positions[0] = -5, positions[1] = 1e12; }).bytes;
-    EXPECT_EQ(failure(negative, MEMORY), Site(-2, 338));
-    EXPECT_EQ(failure(negative, FROM_FILE), Site(-2, 308));
-    const Bytes index =
-        amf::Object({{"times", amf::NumberArray({1, 2, 3})}, {"filepositions", amf::NumberArray({13})}});
-    Bytes early = FlvBuilder(4).add(Sound()).metadata({{"keyframes", index}}).build().bytes;
-    early[early.size() - 4 - 6 - 9 - 1] = 3; // three positions are claimed
-    EXPECT_EQ(failure(early, FROM_FILE), Site(0, 0));
+    EXPECT_EQ(extent({index({one, two, text}, two)}), Last(FLVD_SEEK_BY_INDEX, 2000));
+    EXPECT_EQ(extent({index({text, one, two}, two)}), Last(FLVD_SEEK_BY_INDEX, 0));
+    EXPECT_EQ(extent({index({one, text, two}, text)}), Last(FLVD_SEEK_BY_INDEX, 1000));
+    EXPECT_EQ(extent({index({}, two)}), Last(FLVD_SEEK_BY_SCAN, 0));
+    EXPECT_EQ(extent({index({one}, two), index({}, two)}, INDEX), Last(FLVD_SEEK_BY_INDEX, 1000));
+    FakeHost host(FlvBuilder(4).add(Sound()).metadata({index(std::vector<Bytes>(9, one), two, 9)}).build().bytes);
+    EXPECT_EQ(Session(host).open_rc(), -1); // the index ends with the file
+    EXPECT_EQ(g_flvd_lLastError, FLVD_ERR_EXTENT);
 }
 
 } // namespace

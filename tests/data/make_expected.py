@@ -21,6 +21,7 @@ import tempfile
 import zlib
 
 HERE = pathlib.Path(__file__).resolve().parent
+SAMPLES = sorted(HERE.glob("*.flv"))
 TAG_HEADER, BACK_POINTER = 11, 4
 KINDS, CODEC_BYTES = {8: "audio", 9: "video"}, {(9, 7): 5, (8, 10): 2}  # in front of the frame; else 1
 BROKEN = ["truncated", "damaged"]
@@ -32,10 +33,6 @@ def probe(path):
     command = ["ffprobe", "-v", "error", "-show_format", "-show_streams", "-show_packets", "-show_data",
                "-show_data_hash", "CRC32", "-of", "json", str(path)]
     return json.loads(subprocess.run(command, check=True, capture_output=True, text=True).stdout)
-
-
-def hexdump_bytes(text):
-    return "".join(line[10:50] for line in text.splitlines() if line).replace(" ", "")
 
 
 def all_tags(data):
@@ -67,25 +64,22 @@ def kept_tags(path):
 
 
 def stream_line(stream):
-    fields = {"kind": stream["codec_type"], "codec": stream["codec_name"], "width": stream.get("width", 0),
-              "height": stream.get("height", 0), "rate": stream.get("sample_rate", 0),
-              "channels": stream.get("channels", 0), "extradata": hexdump_bytes(stream.get("extradata", ""))}
-    return "stream " + " ".join(f"{key}={value}" for key, value in fields.items())
+    width, height, rate, channels = (stream.get(key, 0) for key in ("width", "height", "sample_rate", "channels"))
+    extradata = "".join(line[10:50] for line in stream.get("extradata", "").splitlines()).replace(" ", "")  # of a dump
+    return (f"stream kind={stream['codec_type']} codec={stream['codec_name']} width={width} height={height} "
+            f"rate={rate} channels={channels} extradata={extradata}")
 
 
 def packet_line(packet, tag):
     kind, timestamp, frame = tag
-    assert kind == packet["codec_type"] and timestamp == packet["dts"], packet
-    assert len(frame) == int(packet["size"]), packet
-    crc = packet["data_hash"].split(":")[1]
-    assert int(crc, 16) == zlib.crc32(frame), packet
-    key = int(packet["flags"][0] == "K")
+    crc, key = packet["data_hash"].split(":")[1], int(packet["flags"][0] == "K")
+    found = (packet["codec_type"], packet["dts"], int(packet["size"]), int(crc, 16))
+    assert found == (kind, timestamp, len(frame), zlib.crc32(frame)), packet
     return f"packet kind={kind} pos={packet['pos']} dts={timestamp} size={len(frame)} crc={crc} key={key}"
 
 
 def sound_file(path):
-    data, found = path.read_bytes(), probe(path)
-    tags = media_tags(data)
+    tags, found = media_tags(path.read_bytes()), probe(path)
     assert [int(p["pos"]) for p in found["packets"]] == list(tags), path
     duration = round(float(found["format"].get("duration", 0)) * 1000)
     packets = {int(p["pos"]): packet_line(p, tags[int(p["pos"])]) for p in found["packets"]}
@@ -94,8 +88,8 @@ def sound_file(path):
 
 def decoded(kind, path, *demuxer):
     """The hashes of the pictures, or one of all samples."""
-    command = ["ffmpeg", "-nostdin", "-v", "error", *demuxer, "-i", str(path), "-map", f"0:{kind[0]}", "-vsync", "0", "-f",
-               "framehash" if kind == "video" else "hash", "-"]
+    command = ["ffmpeg", "-nostdin", "-v", "error", *demuxer, "-i", str(path), "-map", f"0:{kind[0]}", "-vsync", "0",
+               "-f", "framehash" if kind == "video" else "hash", "-"]
     lines = subprocess.run(command, check=True, capture_output=True, text=True).stdout.splitlines()
     return [line.split(",")[-1].strip() for line in lines if line[0] != "#"]
 
@@ -116,7 +110,7 @@ def extracted(tool, path, codecs, folder):
 
 def write_extracted(tool):
     lines = []
-    for path in sorted(HERE.glob("*.flv")):
+    for path in SAMPLES:
         codecs = {s["codec_type"]: s["codec_name"] for s in probe(path)["streams"]}
         with tempfile.TemporaryDirectory() as folder:
             lines += extracted(tool, path, codecs, pathlib.Path(folder))
@@ -124,7 +118,7 @@ def write_extracted(tool):
 
 
 def main():
-    for path in sorted(HERE.glob("*.flv")):
+    for path in SAMPLES:
         broken = path.stem in BROKEN
         duration, streams, packets = sound_file(HERE / "avc_aac.flv" if broken else path)
         lines = [f"file size={path.stat().st_size} duration_ms={0 if broken else duration}", *streams,

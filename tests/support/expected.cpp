@@ -2,7 +2,6 @@
 
 #include "tools/crc32.h"
 
-#include <algorithm>
 #include <fstream>
 #include <iterator>
 #include <map>
@@ -51,20 +50,12 @@ Expected ReadExpected(const std::string& name)
         if (kind == "file")
             out.file_size = number("size");
         else if (kind == "stream")
-            out.streams.push_back({stream, fields.at("codec"), number("width"), number("height"), number("rate"),
-                                   number("channels"), FromHex(fields.at("extradata"))});
+            out.streams.push_back({stream, number("width"), number("rate"), FromHex(fields.at("extradata"))});
         else if (kind == "packet")
             out.packets.push_back(
                 {stream, number("pos"), number("dts"), number("size"), number("crc", 16), number("key") != 0});
     }
     return out;
-}
-
-const ExpectedStream* Expected::find(uint32_t stream) const
-{
-    const auto has = [stream](const ExpectedStream& candidate) { return candidate.stream == stream; };
-    const auto found = std::find_if(streams.begin(), streams.end(), has);
-    return found != streams.end() ? &*found : nullptr;
 }
 
 bool SameFrame(const ExpectedPacket& packet, const Frame& frame, uint32_t first_ts)

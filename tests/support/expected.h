@@ -10,11 +10,7 @@ Bytes ReadSample(const std::string& name);
 
 struct ExpectedStream {
     uint32_t stream = 0; /**< 1 video, 2 audio */
-    std::string codec;   /**< as ffprobe names it */
-    uint32_t width = 0;
-    uint32_t height = 0;
-    uint32_t sample_rate = 0;
-    uint32_t channels = 0;
+    uint32_t width = 0, sample_rate = 0;
     Bytes extradata;
 };
 
@@ -33,8 +29,6 @@ struct Expected {
     int64_t file_size = 0;
     std::vector<ExpectedStream> streams;
     std::vector<ExpectedPacket> packets; /**< in file order */
-
-    const ExpectedStream* find(uint32_t stream) const;
 };
 
 /** expected/NAME.txt; throws when it cannot be read. */

@@ -12,42 +12,19 @@ static constexpr uint32_t HUGE_BLOCK = 64u << 20;
 static constexpr uint8_t FRESH_MEMORY = 0xA5;
 static constexpr uint8_t RELEASED_MEMORY = 0xDD;
 
-static FakeHost* g_current = nullptr;
-
-FakeHost::FakeHost() : m_previous(g_current)
-{
-    g_current = this;
-}
-
-FakeHost::FakeHost(Bytes file) : FakeHost()
-{
-    add_file(DEFAULT_FILE, std::move(file));
-}
-
 FakeHost::~FakeHost()
 {
-    if (live_blocks() != 0)
-        violation(std::to_string(live_blocks()) + " blocks were not released");
-    if (open_handles() != 0)
-        violation(std::to_string(open_handles()) + " files were not closed");
+    if (live_blocks() + open_handles() != 0)
+        violation(std::to_string(live_blocks()) + " blocks and " + std::to_string(open_handles()) + " files were kept");
     for (const auto& [block, size] : m_blocks)
         std::free(const_cast<uint8_t*>(block));
-    g_current = m_previous;
-}
-
-FakeHost& FakeHost::current()
-{
-    if (g_current == nullptr)
-        std::abort();
-    return *g_current;
+    m_current = m_previous;
 }
 
 void FakeHost::violation(const std::string& what)
 {
-    if (m_handler != nullptr) {
-        m_handler(what);
-        return;
-    }
+    if (m_handler != nullptr)
+        return m_handler(what);
     std::fprintf(stderr, "fake host: %s\n", what.c_str());
     std::abort();
 }
@@ -65,28 +42,10 @@ bool FakeHost::grow(int64_t n, const std::string& path)
     return visible(path) > before;
 }
 
-flvd_init_t FakeHost::init(uint32_t options, uint32_t cache_size, uint32_t scan_read_size, const char* path) const
-{
-    const fio_funcs_t t = funcs();
-    flvd_init_t init;
-    std::memset(static_cast<void*>(&init), 0x5A, sizeof(init));
-    std::tie(init.mem_alloc, init.mem_free, init.mem_copy, init.mem_set, init.file_open, init.file_close) =
-        std::tie(t.mem_alloc, t.mem_free, t.mem_copy, t.mem_set, t.file_open, t.file_close);
-    std::tie(init.file_read, init.file_write, init.file_seek, init.file_tell, init.file_eof, init.file_flush) =
-        std::tie(t.file_read, t.file_write, t.file_seek, t.file_tell, t.file_eof, t.file_flush);
-    std::tie(init.mem_slot1, init.mem_slot3, init.mem_slot5, init.file_seek64, init.file_tell64) =
-        std::tie(t.mem_slot1, t.mem_slot3, t.mem_slot5, t.file_seek64, t.file_tell64);
-    std::tie(init.file_name, init.options, init.cache_size, init.scan_read_size) =
-        std::tie(path, options, cache_size, scan_read_size);
-    return init;
-}
-
 // The functions pass on to the current host. The carried slots are functions that must never run.
-fio_funcs_t FakeHost::funcs() const
+template <class Table> void FakeHost::fill(Table& table) const
 {
-    const flvd_mem_slot_fn carried = [] { violation("a carried memory function was called"); };
-    fio_funcs_t table{};
-    table.mem_slot1 = table.mem_slot3 = table.mem_slot5 = carried;
+    table.mem_slot1 = table.mem_slot3 = table.mem_slot5 = [] { violation("a carried memory function was called"); };
     table.mem_alloc = [](auto... args) { return current().alloc(args...); };
     table.mem_free = [](auto... args) { return current().release(args...); };
     table.mem_copy = [](auto... args) { return current().copy(args...); };
@@ -99,53 +58,32 @@ fio_funcs_t FakeHost::funcs() const
     table.file_flush = [](auto... args) { return current().flush(args...); };
     table.file_seek = [](auto... args) { return current().seek(args..., false); };
     table.file_tell = [](auto... args) { return static_cast<int32_t>(current().tell(args..., false)); };
-    if (m_only_32)
-        return table;
     table.file_seek64 = [](auto... args) { return current().seek(args..., true); };
     table.file_tell64 = [](auto... args) { return current().tell(args..., true); };
+    if (m_only_32)
+        std::tie(table.file_seek64, table.file_tell64) = std::pair(nullptr, nullptr);
+}
+
+flvd_init_t FakeHost::init(uint32_t options, uint32_t cache_size, uint32_t scan_read_size, const char* path) const
+{
+    flvd_init_t init;
+    std::memset(static_cast<void*>(&init), 0x5A, sizeof(init));
+    fill(init);
+    std::tie(init.file_name, init.options, init.cache_size, init.scan_read_size) =
+        std::tie(path, options, cache_size, scan_read_size);
+    return init;
+}
+
+fio_funcs_t FakeHost::funcs() const
+{
+    fio_funcs_t table{};
+    fill(table);
     return table;
-}
-
-void FakeHost::fail_nothing()
-{
-    m_faults = {};
-    m_shortened = {};
-    m_fail_call = 0;
-    m_read_limit = UINT32_MAX;
-}
-
-void FakeHost::reset_calls()
-{
-    m_calls = {};
-    m_failable_calls = 0;
-    m_bytes_read = 0;
-    m_log.clear();
 }
 
 void FakeHost::start_log(bool memory)
 {
-    m_logging = true;
-    m_log_memory = memory;
-    m_log.clear();
-}
-
-size_t FakeHost::live_bytes() const
-{
-    size_t sum = 0;
-    for (const auto& [block, size] : m_blocks)
-        sum += size;
-    return sum;
-}
-
-size_t FakeHost::open_handles() const
-{
-    return static_cast<size_t>(
-        std::count_if(m_handles.begin(), m_handles.end(), [](const auto& handle) { return handle->open; }));
-}
-
-static bool CanFail(HostFn fn)
-{
-    return fn != HostFn::Free && fn != HostFn::Copy && fn != HostFn::Set && fn != HostFn::Eof && fn != HostFn::Close;
+    std::tie(m_logging, m_log_memory, m_log) = std::tuple(true, memory, "");
 }
 
 // Counts the call. False: it has to fail.
@@ -153,18 +91,18 @@ bool FakeHost::begin(HostFn fn)
 {
     if (on_call)
         on_call(fn);
-    const uint64_t number = ++m_calls[index(fn)];
-    if (!CanFail(fn))
-        return true;
-    const auto& [first, last] = m_faults[index(fn)];
-    return ++m_failable_calls != m_fail_call && (number < first || number > last);
+    const uint64_t number = ++m_counts.calls[index(fn)];
+    if (fn == HostFn::Free || fn == HostFn::Copy || fn == HostFn::Set || fn == HostFn::Eof || fn == HostFn::Close)
+        return true; // these cannot
+    const auto& [first, last] = m_faults.failing[index(fn)];
+    return ++m_counts.failable != m_faults.call && (number < first || number > last);
 }
 
 uint32_t FakeHost::limited(HostFn fn, uint32_t count) const
 {
-    const auto& [nth, bytes] = m_shortened[index(fn)];
-    const uint32_t most = nth == m_calls[index(fn)] ? bytes : UINT32_MAX;
-    return std::min({count, most, fn == HostFn::Read ? m_read_limit : UINT32_MAX});
+    const auto& [nth, bytes] = m_faults.shortened[index(fn)];
+    count = nth == calls(fn) ? std::min(count, bytes) : count;
+    return fn == HostFn::Read ? std::min(count, m_faults.read_limit) : count;
 }
 
 void FakeHost::log(bool wanted, const char* name, const std::string& arguments, const std::string& result)
@@ -173,13 +111,13 @@ void FakeHost::log(bool wanted, const char* name, const std::string& arguments, 
         m_log += (m_log.empty() ? "" : " ") + std::string(name) + "(" + arguments + ")=" + result;
 }
 
-FakeHost::Handle* FakeHost::handle(void* pointer)
+FakeHost::Handle& FakeHost::handle(void* pointer)
 {
     for (auto handle = m_handles.rbegin(); handle != m_handles.rend(); ++handle) // the newest are in use
         if (handle->get() == pointer && (*handle)->open)
-            return handle->get();
+            return **handle;
     violation("use of a handle that is not open");
-    return nullptr;
+    return m_none;
 }
 
 // Memory that begins in one of the blocks has to end in it. Memory of others is not known here.
@@ -205,6 +143,7 @@ void* FakeHost::alloc(uint32_t size)
         return nullptr;
     std::memset(memory, FRESH_MEMORY, size);
     m_blocks[static_cast<uint8_t*>(memory)] = size;
+    m_live_bytes += size;
     return memory;
 }
 
@@ -215,13 +154,12 @@ void FakeHost::release(void* memory)
     if (memory == nullptr)
         return;
     const auto block = m_blocks.find(static_cast<uint8_t*>(memory));
-    if (block == m_blocks.end()) {
-        violation("release of memory that is not held");
-        return;
-    }
+    if (block == m_blocks.end())
+        return violation("release of memory that is not held");
     if (on_release)
         on_release(memory, block->second);
     std::memset(memory, RELEASED_MEMORY, block->second);
+    m_live_bytes -= block->second;
     m_blocks.erase(block);
     std::free(memory);
 }
@@ -258,28 +196,28 @@ void* FakeHost::open(const char* path, const char* mode)
     if (!logged("open", std::string(path) + "," + mode, allowed && file != m_files.end()))
         return nullptr;
     m_handles.push_back(std::make_unique<Handle>(Handle{file->second}));
+    ++m_open_handles;
     return m_handles.back().get();
 }
 
 int32_t FakeHost::close(void* pointer)
 {
     begin(HostFn::Close);
-    Handle* const closing = handle(pointer);
-    if (closing != nullptr)
-        closing->open = false;
-    return logged("close", "", closing != nullptr ? 0 : -1);
+    m_open_handles -= std::exchange(handle(pointer).open, false) ? 1u : 0u;
+    return logged("close", "", 0);
 }
 
 int32_t FakeHost::eof(void* pointer)
 {
     begin(HostFn::Eof);
-    const Handle* const asked = handle(pointer);
-    return logged("eof", "", asked != nullptr && asked->eof ? 1 : 0);
+    return logged("eof", "", handle(pointer).eof ? 1 : 0);
 }
 
 int32_t FakeHost::flush(void* pointer)
 {
-    return logged("flush", "", begin(HostFn::Flush) && handle(pointer) != nullptr ? 0 : -1);
+    const bool allowed = begin(HostFn::Flush);
+    handle(pointer);
+    return logged("flush", "", allowed ? 0 : -1);
 }
 
 void FakeHost::fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count)
@@ -294,7 +232,7 @@ void FakeHost::fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count
 }
 
 // The handle of a read or write.
-FakeHost::Handle* FakeHost::transfer(const char* what, const void* buffer, uint32_t size, uint32_t count, void* pointer)
+FakeHost::Handle& FakeHost::transfer(const char* what, const void* buffer, uint32_t size, uint32_t count, void* pointer)
 {
     if (size != 1)
         violation(std::string(what) + " elements of size " + std::to_string(size));
@@ -306,58 +244,53 @@ FakeHost::Handle* FakeHost::transfer(const char* what, const void* buffer, uint3
 uint32_t FakeHost::read(void* buffer, uint32_t size, uint32_t count, void* pointer)
 {
     const bool allowed = begin(HostFn::Read);
-    Handle* const from = transfer("read of", buffer, size, count, pointer);
+    Handle& from = transfer("read of", buffer, size, count, pointer);
     uint32_t got = 0;
-    if (allowed && from != nullptr && !from->eof) {
-        const int64_t left = std::max<int64_t>(from->file->visible - from->pos, 0);
+    if (allowed && !from.eof) {
+        const int64_t left = std::max<int64_t>(from.file->visible - from.pos, 0);
         got = limited(HostFn::Read, static_cast<uint32_t>(std::min<int64_t>(left, count)));
-        fetch(*from->file, from->pos, static_cast<uint8_t*>(buffer), got);
-        from->pos += got;
-        from->eof = left < count && got == left;
+        fetch(*from.file, from.pos, static_cast<uint8_t*>(buffer), got);
+        from.pos += got;
+        from.eof = left < count && got == left;
     }
-    m_bytes_read += got;
+    m_counts.bytes_read += got;
     return logged("read", std::to_string(count), got);
 }
 
 uint32_t FakeHost::write(const void* buffer, uint32_t size, uint32_t count, void* pointer)
 {
     const bool allowed = begin(HostFn::Write);
-    Handle* const to = transfer("write of", buffer, size, count, pointer);
-    uint32_t done = 0;
-    if (allowed && to != nullptr) {
-        File& file = *to->file;
-        Bytes& data = file.extents.at(0);
-        done = limited(HostFn::Write, count);
-        data.resize(std::max(data.size(), static_cast<size_t>(to->pos) + done));
-        std::copy_n(static_cast<const uint8_t*>(buffer), done, data.begin() + static_cast<std::ptrdiff_t>(to->pos));
-        to->pos += done;
-        file.size = file.visible = static_cast<int64_t>(data.size());
+    Handle& to = transfer("write of", buffer, size, count, pointer);
+    const uint32_t done = allowed ? limited(HostFn::Write, count) : 0;
+    if (done != 0) {
+        Bytes& data = to.file->extents[0];
+        data.resize(std::max(data.size(), static_cast<size_t>(to.pos) + done));
+        std::copy_n(static_cast<const uint8_t*>(buffer), done, data.begin() + static_cast<std::ptrdiff_t>(to.pos));
+        to.pos += done;
+        to.file->size = to.file->visible = static_cast<int64_t>(data.size());
     }
     return logged("write", std::to_string(count), done);
 }
 
 int32_t FakeHost::seek(void* pointer, int64_t offset, int32_t whence, bool wide)
 {
-    const bool allowed = begin(HostFn::Seek);
-    Handle* const moved = handle(pointer);
+    bool done = begin(HostFn::Seek);
+    Handle& moved = handle(pointer);
+    const int64_t bases[] = {0, moved.pos, moved.file->visible};
     int64_t target = -1;
-    if (allowed && moved != nullptr && whence >= FIO_SEEK_SET && whence <= FIO_SEEK_END) {
-        const int64_t base = whence == FIO_SEEK_SET ? 0 : whence == FIO_SEEK_CUR ? moved->pos : moved->file->visible;
-        if (__builtin_add_overflow(base, offset, &target) || (!wide && target > INT32_MAX))
-            target = -1;
-    }
-    if (target >= 0)
-        std::tie(moved->pos, moved->eof) = std::pair(target, false);
+    done = done && whence >= FIO_SEEK_SET && whence <= FIO_SEEK_END &&
+           !__builtin_add_overflow(bases[whence], offset, &target) && target >= 0 && (wide || target <= INT32_MAX);
+    if (done)
+        std::tie(moved.pos, moved.eof) = std::pair(target, false);
     const std::string arguments = std::to_string(offset) + "," + std::to_string(whence);
-    return logged(wide ? "seek64" : "seek", arguments, target >= 0 ? 0 : -1);
+    return logged(wide ? "seek64" : "seek", arguments, done ? 0 : -1);
 }
 
 int64_t FakeHost::tell(void* pointer, bool wide)
 {
     const bool allowed = begin(HostFn::Tell);
-    const Handle* const asked = handle(pointer);
-    const bool works = allowed && asked != nullptr && (wide || asked->pos <= INT32_MAX);
-    return logged(wide ? "tell64" : "tell", "", works ? asked->pos : -1);
+    const int64_t position = handle(pointer).pos;
+    return logged(wide ? "tell64" : "tell", "", allowed && (wide || position <= INT32_MAX) ? position : -1);
 }
 
 } // namespace flvd_test

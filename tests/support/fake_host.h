@@ -19,6 +19,7 @@
 #include <map>
 #include <memory>
 #include <string>
+#include <tuple>
 
 namespace flvd_test {
 
@@ -27,14 +28,14 @@ enum class HostFn { Alloc, Free, Copy, Set, Open, Close, Read, Write, Seek, Tell
 
 class FakeHost {
 public:
-    FakeHost();
+    FakeHost() { m_current = this; }
     /** A host with one file, "a.flv". */
-    explicit FakeHost(Bytes file);
+    explicit FakeHost(Bytes file) : FakeHost() { add_file(DEFAULT_FILE, std::move(file)); }
     virtual ~FakeHost();
     FakeHost(const FakeHost&) = delete;
     FakeHost& operator=(const FakeHost&) = delete;
 
-    static FakeHost& current();
+    static FakeHost& current() { return *m_current; }
     using ViolationHandler = void (*)(const std::string& what);
     static void set_violation_handler(ViolationHandler handler) { m_handler = handler; }
 
@@ -70,16 +71,16 @@ public:
     /* -- faults. Calls are numbered from 1, from the construction or the last reset_calls() on. */
 
     /** The nth call of `fn` fails: null, -1, 0 bytes, 0 elements. */
-    void fail_nth(HostFn fn, uint64_t n) { m_faults[index(fn)] = {n, n}; }
+    void fail_nth(HostFn fn, uint64_t n) { m_faults.failing[index(fn)] = {n, n}; }
     /** The nth call of `fn` and all later ones fail. */
-    void fail_from(HostFn fn, uint64_t n) { m_faults[index(fn)] = {n, UINT64_MAX}; }
+    void fail_from(HostFn fn, uint64_t n) { m_faults.failing[index(fn)] = {n, UINT64_MAX}; }
     /** The nth call of a function that can fail (alloc, open, read, write, seek, tell, flush) fails. */
-    void fail_nth_call(uint64_t n) { m_fail_call = n; }
-    void fail_nothing();
+    void fail_nth_call(uint64_t n) { m_faults.call = n; }
+    void fail_nothing() { m_faults = {}; }
     /** The nth read or write moves at most k bytes. */
-    void shorten_nth(HostFn fn, uint64_t n, uint32_t k) { m_shortened[index(fn)] = {n, k}; }
+    void shorten_nth(HostFn fn, uint64_t n, uint32_t k) { m_faults.shortened[index(fn)] = {n, k}; }
     /** Every read moves at most k bytes. */
-    void limit_reads(uint32_t k) { m_read_limit = k; }
+    void limit_reads(uint32_t k) { m_faults.read_limit = k; }
     /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
     /** Called with every block that is given back, while it still holds what it held. */
@@ -87,16 +88,16 @@ public:
 
     /* -- what happened */
 
-    uint64_t calls(HostFn fn) const { return m_calls[index(fn)]; }
+    uint64_t calls(HostFn fn) const { return m_counts.calls[index(fn)]; }
     /** Calls of functions that can fail. */
-    uint64_t failable_calls() const { return m_failable_calls; }
+    uint64_t failable_calls() const { return m_counts.failable; }
     /** Reads, writes, seeks and tells. */
     uint64_t io_calls() const
     {
         return calls(HostFn::Read) + calls(HostFn::Write) + calls(HostFn::Seek) + calls(HostFn::Tell);
     }
-    uint64_t bytes_read() const { return m_bytes_read; }
-    void reset_calls();
+    uint64_t bytes_read() const { return m_counts.bytes_read; }
+    void reset_calls() { std::tie(m_counts, m_log) = std::pair(Counts{}, ""); }
     /** Starts a log of all file calls (of memory calls too with `memory`). */
     void start_log(bool memory = false);
     /**
@@ -113,8 +114,8 @@ public:
         return held != m_blocks.end() ? held->second : 0;
     }
     size_t live_blocks() const { return m_blocks.size(); }
-    size_t live_bytes() const;
-    size_t open_handles() const;
+    size_t live_bytes() const { return m_live_bytes; }
+    size_t open_handles() const { return m_open_handles; }
     /** All file_open modes so far, successful or not. */
     const std::vector<std::string>& open_modes() const { return m_open_modes; }
 
@@ -139,6 +140,17 @@ private:
         bool open = true;
     };
     static constexpr size_t FN_COUNT = static_cast<size_t>(HostFn::Count);
+    template <class Value> using OfEach = std::array<Value, FN_COUNT>;
+    struct Counts {
+        OfEach<uint64_t> calls{};
+        uint64_t failable = 0, bytes_read = 0;
+    };
+    struct Faults {
+        OfEach<std::pair<uint64_t, uint64_t>> failing{}; // first and last call that fails
+        OfEach<std::pair<uint64_t, uint32_t>> shortened{};
+        uint64_t call = 0;
+        uint32_t read_limit = UINT32_MAX;
+    };
     static size_t index(HostFn fn) { return static_cast<size_t>(fn); }
 
     static void violation(const std::string& what);
@@ -150,9 +162,10 @@ private:
         log(m_logging, name, arguments, std::to_string(result));
         return result;
     }
-    Handle* handle(void* pointer);
+    template <class Table> void fill(Table& table) const;
+    Handle& handle(void* pointer);
     void check_range(const char* what, const void* pointer, uint32_t count);
-    Handle* transfer(const char* what, const void* buffer, uint32_t size, uint32_t count, void* pointer);
+    Handle& transfer(const char* what, const void* buffer, uint32_t size, uint32_t count, void* pointer);
 
     void* copy(void* destination, const void* source, uint32_t count);
     void* set(void* destination, int value, uint32_t count);
@@ -163,21 +176,17 @@ private:
     static void fetch(const File& file, int64_t pos, uint8_t* out, uint32_t count);
 
     static inline ViolationHandler m_handler = nullptr;
-    FakeHost* m_previous;
+    static inline FakeHost* m_current = nullptr;
+    FakeHost* const m_previous = m_current;
     std::map<std::string, std::shared_ptr<File>> m_files;
     std::vector<std::unique_ptr<Handle>> m_handles;
     std::map<const uint8_t*, uint32_t> m_blocks;
-    std::array<uint64_t, FN_COUNT> m_calls{};
-    std::array<std::pair<uint64_t, uint64_t>, FN_COUNT> m_faults{}; // first and last call that fails
-    std::array<std::pair<uint64_t, uint32_t>, FN_COUNT> m_shortened{};
+    size_t m_live_bytes = 0, m_open_handles = 0;
+    Counts m_counts;
+    Faults m_faults;
     std::vector<std::string> m_open_modes;
-    uint64_t m_failable_calls = 0;
-    uint64_t m_fail_call = 0;
-    uint64_t m_bytes_read = 0;
-    uint32_t m_read_limit = UINT32_MAX;
-    bool m_only_32 = false;
-    bool m_logging = false;
-    bool m_log_memory = false;
+    Handle m_none = {std::make_shared<File>(), 0, false, false}; // what stands for a handle that is not open
+    bool m_only_32 = false, m_logging = false, m_log_memory = false;
     std::string m_log;
 };
 

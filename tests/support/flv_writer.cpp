@@ -6,15 +6,12 @@
 
 namespace flvd_test {
 
-void Put(Bytes& out, uint64_t value, int bytes)
+Bytes BigEndian(uint64_t value, int bytes)
 {
+    Bytes out;
     while (bytes-- > 0)
         out.push_back(static_cast<uint8_t>(value >> (8 * bytes)));
-}
-
-void Append(Bytes& out, const Bytes& more)
-{
-    out.insert(out.end(), more.begin(), more.end());
+    return out;
 }
 
 Bytes Concat(std::initializer_list<Bytes> parts)
@@ -41,11 +38,9 @@ Bytes Noise(size_t size, uint32_t seed)
 BitWriter& BitWriter::u(int bits, uint32_t value)
 {
     while (bits-- > 0) {
-        if (m_free == 0) {
+        if (m_free == 0)
             m_bytes.push_back(0);
-            m_free = 8;
-        }
-        --m_free;
+        m_free = (m_free + 7) % 8;
         m_bytes.back() = static_cast<uint8_t>(m_bytes.back() | ((value >> bits & 1u) << m_free));
     }
     return *this;
@@ -67,47 +62,34 @@ BitWriter& BitWriter::se(int32_t value)
 
 namespace amf {
 
-static Bytes Marked(uint8_t marker, uint64_t number, int bytes)
-{
-    Bytes out{marker};
-    Put(out, number, bytes);
-    return out;
-}
-
 Bytes Text(uint8_t marker, int length_bytes, const std::string& text)
 {
-    Bytes out = Marked(marker, text.size(), length_bytes);
-    out.insert(out.end(), text.begin(), text.end());
-    return out;
+    return Concat({{marker}, BigEndian(text.size(), length_bytes), Bytes(text.begin(), text.end())});
 }
 
 Bytes Number(double value)
 {
     uint64_t bits = 0;
     std::memcpy(&bits, &value, sizeof(bits));
-    return Marked(0, bits, 8);
+    return Concat({{0}, BigEndian(bits, 8)});
 }
 
 Bytes Properties(const std::vector<Property>& properties)
 {
     Bytes out;
-    for (const auto& [name, value] : properties) {
-        Put(out, name.size(), 2);
-        out.insert(out.end(), name.begin(), name.end());
-        Append(out, value);
-    }
-    Put(out, 9, 3);
-    return out;
+    for (const auto& [name, value] : properties)
+        Append(out, Concat({BigEndian(name.size(), 2), Bytes(name.begin(), name.end()), value}));
+    return Concat({out, {0, 0, 9}});
 }
 
 Bytes EcmaArray(const std::vector<Property>& properties, std::optional<uint32_t> count)
 {
-    return Concat({Marked(8, count.value_or(static_cast<uint32_t>(properties.size())), 4), Properties(properties)});
+    return Concat({{8}, BigEndian(count.value_or(properties.size()), 4), Properties(properties)});
 }
 
 Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count)
 {
-    Bytes out = Marked(10, count.value_or(static_cast<uint32_t>(elements.size())), 4);
+    Bytes out = Concat({{10}, BigEndian(count.value_or(elements.size()), 4)});
     for (const Bytes& element : elements)
         Append(out, element);
     return out;
@@ -124,34 +106,19 @@ Bytes NumberArray(const std::vector<double>& numbers)
 
 Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms, uint8_t packet_type)
 {
-    Bytes out{static_cast<uint8_t>(key ? 0x17 : 0x27), packet_type};
-    Put(out, static_cast<uint32_t>(composition_ms), 3);
-    Append(out, payload);
-    return out;
-}
-
-static void PutParameterSets(Bytes& out, const std::vector<Bytes>& sets)
-{
-    for (const Bytes& set : sets) {
-        Put(out, set.size(), 2);
-        Append(out, set);
-    }
+    const auto first = static_cast<uint8_t>(key ? 0x17 : 0x27);
+    return Concat({{first, packet_type}, BigEndian(static_cast<uint32_t>(composition_ms), 3), payload});
 }
 
 Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps)
 {
     Bytes out{1, 0x42, 0xC0, 0x28, 0xFF, static_cast<uint8_t>(0xE0 | sps.size())};
-    PutParameterSets(out, sps);
+    for (const Bytes& set : sps)
+        Append(out, Concat({BigEndian(set.size(), 2), set}));
     out.push_back(static_cast<uint8_t>(pps.size()));
-    PutParameterSets(out, pps);
+    for (const Bytes& set : pps)
+        Append(out, Concat({BigEndian(set.size(), 2), set}));
     return out;
-}
-
-Bytes Filled(Bytes head, size_t size)
-{
-    if (size > head.size())
-        Append(head, Noise(size - head.size()));
-    return head;
 }
 
 Bytes H263Picture(uint32_t size_code, uint32_t width, uint32_t height, size_t size)
@@ -169,11 +136,6 @@ Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust, size
 {
     const Bytes offset_to_alpha = alpha ? Bytes{0, 0, 100} : Bytes{};
     return Filled(Concat({{adjust}, offset_to_alpha, {0x00, 0x46, rows, columns, rows, columns}}), size);
-}
-
-bool operator==(const Frame& a, const Frame& b)
-{
-    return a.stream == b.stream && a.timestamp == b.timestamp && a.data == b.data;
 }
 
 void PrintTo(const Frame& frame, std::ostream* out)
@@ -217,62 +179,45 @@ Frames Flv::frames(uint32_t streams, uint32_t first) const
     return out;
 }
 
-FlvBuilder& FlvBuilder::add(Tag tag)
-{
-    m_tags.push_back(std::move(tag));
-    return *this;
-}
-
 FlvBuilder& FlvBuilder::indexed_metadata(std::vector<amf::Property> properties, IndexHook hook)
 {
-    m_index_tag = m_tags.size();
-    m_index_properties = std::move(properties);
-    m_index_hook = std::move(hook);
+    m_index = {m_tags.size(), std::move(properties), std::move(hook)};
     return script({});
 }
 
 Bytes FlvBuilder::index_data(const std::vector<Tag>& tags) const
 {
-    std::vector<double> times;
-    std::vector<double> positions;
-    for (const Tag& tag : tags) {
-        if (!tag.is_keyframe())
-            continue;
-        times.push_back(tag.timestamp / 1000.0);
-        positions.push_back(static_cast<double>(tag.offset));
-    }
-    if (m_index_hook)
-        m_index_hook(times, positions);
-    std::vector<amf::Property> properties = m_index_properties;
+    std::vector<double> times, positions;
+    for (const Tag& tag : tags)
+        if (tag.is_keyframe()) {
+            times.push_back(tag.timestamp / 1000.0);
+            positions.push_back(static_cast<double>(tag.offset));
+        }
+    if (m_index.hook)
+        m_index.hook(times, positions);
+    std::vector<amf::Property> properties = m_index.properties;
     properties.emplace_back(
         "keyframes", amf::Object({{"times", amf::NumberArray(times)}, {"filepositions", amf::NumberArray(positions)}}));
     return amf::OnMetaData(properties);
 }
 
-static void PutTag(Bytes& out, Tag& tag)
-{
-    const uint32_t size = static_cast<uint32_t>(tag.data.size());
-    tag.offset = static_cast<int64_t>(out.size());
-    Put(out, tag.type, 1);
-    Put(out, tag.data_size.value_or(size), 3);
-    Put(out, tag.timestamp, 3);
-    Put(out, tag.timestamp >> 24, 1);
-    Put(out, tag.stream_id, 3);
-    Append(out, tag.data);
-    Put(out, tag.back_pointer.value_or(size + 11), 4);
-}
-
 Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
 {
-    Flv flv;
-    flv.bytes = Concat({m_prefix, {'F', 'L', 'V', 1, m_flags}});
-    Put(flv.bytes, m_data_offset, 4);
+    Flv flv{Concat({m_prefix, {'F', 'L', 'V', 1, m_flags}, BigEndian(m_data_offset, 4)}), std::move(tags)};
     if (flv.bytes.size() < m_data_offset && m_data_offset < 0x10000)
         flv.bytes.resize(m_data_offset);
     Put(flv.bytes, 0, 4);
-    for (Tag& tag : tags)
-        PutTag(flv.bytes, tag);
-    flv.tags = std::move(tags);
+    for (Tag& tag : flv.tags) {
+        const size_t size = tag.data.size();
+        tag.offset = static_cast<int64_t>(flv.bytes.size());
+        Append(flv.bytes, Concat({{tag.type},
+                                  BigEndian(tag.data_size.value_or(size), 3),
+                                  BigEndian(tag.timestamp, 3),
+                                  BigEndian(tag.timestamp >> 24, 1),
+                                  BigEndian(tag.stream_id, 3)}));
+        Append(flv.bytes, tag.data);
+        Put(flv.bytes, tag.back_pointer.value_or(size + 11), 4);
+    }
     return flv;
 }
 
@@ -280,10 +225,9 @@ Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
 Flv FlvBuilder::build() const
 {
     std::vector<Tag> tags = m_tags;
-    if (m_index_tag) {
-        tags[*m_index_tag].data = index_data(tags);
+    for (int pass = 0; pass < 2 && m_index.tag < tags.size(); ++pass) {
+        tags[m_index.tag].data = index_data(tags);
         tags = lay_out(std::move(tags)).tags;
-        tags[*m_index_tag].data = index_data(tags);
     }
     return lay_out(std::move(tags));
 }
@@ -296,22 +240,18 @@ Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint3
     return builder.build();
 }
 
-static void AddConfigurations(FlvBuilder& builder, const ChainOptions& options)
+Flv MakeChain(const ChainOptions& options)
 {
+    FlvBuilder builder(static_cast<uint8_t>((options.video ? 1 : 0) | (options.audio ? 4 : 0)));
+    const std::vector<amf::Property> size = {{"width", amf::Number(320)}, {"height", amf::Number(240)}};
     if (options.index)
-        builder.indexed_metadata({{"width", amf::Number(320)}, {"height", amf::Number(240)}});
+        builder.indexed_metadata(size);
     else if (options.metadata)
-        builder.metadata({{"width", amf::Number(320)}, {"height", amf::Number(240)}, {"framerate", amf::Number(25)}});
+        builder.metadata({size[0], size[1], {"framerate", amf::Number(25)}});
     if (options.video)
         builder.video(options.first_ts, AvcConfig(SmallAvcRecord()));
     if (options.audio)
         builder.audio(options.first_ts, AacConfig({0x12, 0x10}));
-}
-
-Flv MakeChain(const ChainOptions& options)
-{
-    FlvBuilder builder(static_cast<uint8_t>((options.video ? 1 : 0) | (options.audio ? 4 : 0)));
-    AddConfigurations(builder, options);
     uint32_t sounds = 0;
     for (uint32_t picture = 0; picture < options.pictures; ++picture) {
         const bool key = picture % options.gop == 0;

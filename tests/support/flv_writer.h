@@ -5,11 +5,13 @@
  */
 #pragma once
 
+#include <algorithm>
 #include <cstdint>
 #include <functional>
 #include <iosfwd>
 #include <optional>
 #include <string>
+#include <tuple>
 #include <utility>
 #include <vector>
 
@@ -17,9 +19,10 @@ namespace flvd_test {
 
 using Bytes = std::vector<uint8_t>;
 
-/** Appends the low `bytes` bytes of `value`, big-endian. */
-void Put(Bytes& out, uint64_t value, int bytes);
-void Append(Bytes& out, const Bytes& more);
+/** The low `bytes` bytes of `value`. */
+Bytes BigEndian(uint64_t value, int bytes);
+inline const auto Append = [](Bytes& out, const Bytes& more) { out.insert(out.end(), more.begin(), more.end()); };
+inline const auto Put = [](Bytes& out, uint64_t value, int bytes) { Append(out, BigEndian(value, bytes)); };
 Bytes Concat(std::initializer_list<Bytes> parts);
 /** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
@@ -81,7 +84,9 @@ inline const auto SmallAvcRecord = [] {
     return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
 };
 /** A payload that begins so and goes on with noise. */
-Bytes Filled(Bytes head, size_t size);
+inline const auto Filled = [](const Bytes& head, size_t size) {
+    return Concat({head, Noise(std::max(size, head.size()) - head.size())});
+};
 /** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
 inline const auto Mp3Frame = [](size_t size = 200) { return Filled({0xFF, 0xFB, 0x90, 0x64}, size); };
 /** Sorenson H.263 picture header; size_code 0 and 1 carry width and height, 2 to 6 a fixed size. */
@@ -89,13 +94,8 @@ Bytes H263Picture(uint32_t size_code, uint32_t width = 0, uint32_t height = 0, s
 /** VP6 intra picture of profile 3 showing columns x rows macroblocks; `adjust` is cropped from width, height. */
 Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust = 0, size_t size = 200);
 
-constexpr uint8_t SOUND_MP3 = 0x2F;
-constexpr uint8_t SOUND_PCM = 0x3E;
-constexpr uint8_t SOUND_SPEEX = 0xB2;
-constexpr uint8_t CODEC_H263 = 2;
-constexpr uint8_t CODEC_SCREEN = 3;
-constexpr uint8_t CODEC_VP6 = 4;
-constexpr uint8_t CODEC_VP6A = 5;
+constexpr uint8_t SOUND_MP3 = 0x2F, SOUND_PCM = 0x3E, SOUND_SPEEX = 0xB2;
+constexpr uint8_t CODEC_H263 = 2, CODEC_SCREEN = 3, CODEC_VP6 = 4, CODEC_VP6A = 5;
 
 /** A delivered frame, or one that is expected to be. */
 struct Frame {
@@ -104,7 +104,10 @@ struct Frame {
     Bytes data;
 };
 using Frames = std::vector<Frame>;
-bool operator==(const Frame& a, const Frame& b);
+inline bool operator==(const Frame& a, const Frame& b)
+{
+    return std::tie(a.stream, a.timestamp, a.data) == std::tie(b.stream, b.timestamp, b.data);
+}
 void PrintTo(const Frame& frame, std::ostream* out);
 
 /** One tag as it is to be written. */
@@ -165,7 +168,11 @@ public:
     {
     }
 
-    FlvBuilder& add(Tag tag);
+    FlvBuilder& add(Tag tag)
+    {
+        m_tags.push_back(std::move(tag));
+        return *this;
+    }
     FlvBuilder& video(uint32_t timestamp, Bytes data) { return add({9, timestamp, std::move(data)}); }
     FlvBuilder& audio(uint32_t timestamp, Bytes data) { return add({8, timestamp, std::move(data)}); }
     FlvBuilder& script(Bytes data, uint32_t timestamp = 0) { return add({18, timestamp, std::move(data)}); }
@@ -184,9 +191,11 @@ private:
     uint32_t m_data_offset;
     Bytes m_prefix;
     std::vector<Tag> m_tags;
-    std::optional<size_t> m_index_tag;
-    std::vector<amf::Property> m_index_properties;
-    IndexHook m_index_hook;
+    struct Index {
+        size_t tag = SIZE_MAX;
+        std::vector<amf::Property> properties;
+        IndexHook hook;
+    } m_index;
 };
 
 /** A file of these tags; DataOffset leaves room for a file header of `header` bytes behind the prefix. */

@@ -8,51 +8,29 @@ namespace flvd_test {
 
 static constexpr uint32_t POISON = 0x5A5A5A5A;
 
-// Of one operation, result and code: the lines, each with the initials of the host functions that lead there.
+// Of one operation and result: codes, each with its lines and the initials of the host functions that lead there.
 struct Lines {
     Op op;
-    int32_t rc, code;
+    int32_t rc;
     const char* text;
 };
-static constexpr Lines LINES[] = {{Op::Open, -1, -4, "2335a"},
-                                  {Op::Open, -4, -5, "2386oa"},
-                                  {Op::Open, -4, -6, "2396oa"},
-                                  {Op::Open, -1, -7, "2413a"},
-                                  {Op::Open, -1, -1004, "2423st"},
-                                  {Op::Open, -1, -1002, "2434s 2458s"},
-                                  {Op::Open, -2, -10002, "2440s"},
-                                  {Op::Open, -1, -1005, "2465st"},
-                                  {Op::Open, -1, -2, "2496s"},
-                                  {Op::Inside, 0, -1, "226t 347t 364t 375t 479t"}, // the extent of a file
-                                  {Op::Inside, 0, -2, "241s 308s 338s 357s 405s 449s 503s"},
-                                  {Op::Inside, 0, -10001, "248t 486s 510t"},
-                                  {Op::Inside, 0, -10002, "659r 694r 741 781 818r 841 863 881 913"}, // codecs
-                                  {Op::Inside, 0, -3, "752a 924a"},
-                                  {Op::Inside, 0, -3001, "932"},
-                                  {Op::Inside, 0, -3002, "847 869 887 938"},
-                                  {Op::Inside, 0, -3003, "700 787"},
-                                  {Op::Inside, 0, -3004, "946"},
-                                  {Op::Inside, 0, 0, "2536a 2550a 2602a"}, // frames passed over
-                                  {Op::Inside, 0, -10002, "2521r 2540r 2554r 2579r 2606r"},
-                                  {Op::Frame, -1, -4007, "2638 2767"},
-                                  {Op::Frame, -1, -4002, "2651 2783"},
-                                  {Op::Frame, -1, -4003, "2661 2796"},
-                                  {Op::Frame, -1, -4004, "2667 2802"},
-                                  {Op::Frame, -2, -10002, "2737 2957"},
-                                  {Op::Frame, -1, -1, "2840t"},
-                                  {Op::Frame, -1, -2, "2830s 2859s 2881s 2899s 2921s 2933s 2945t"},
-                                  {Op::Seek, -1, -4007, "2982 3190"},
-                                  {Op::Seek, -1, -10003, "2987 3195"},
-                                  {Op::Seek, -1, -1, "3065t 3088t 3111t 3269t 3288t 3295t"},
-                                  {Op::Seek, -1, -2, "3045s 3252s 3299s"},
-                                  {Op::Seek, -1, -2000, "3072s 3095t 3118s 3276s"},
-                                  {Op::Seek, -2, -2003, "3161 3338"},
-                                  {Op::FrameSeek, -1, -1, "134t"},
-                                  {Op::FrameSeek, -1, -2, "140s 263s 290s 316s 335s 404s 432s 747s"},
-                                  {Op::FrameSeek, -1, -2006, "171t 231t 355 452 778t 817t"},
-                                  {Op::FrameSeek, -1, -2007, "325"},
-                                  {Op::FrameSeek, -1, -10002, "342 439"},
-                                  {Op::FrameSeek, -1, -10003, "844"}};
+static constexpr Lines LINES[] = {
+    {Op::Open, -1, "-4 2335a -7 2413a -1004 2423st -1002 2434s 2458s -1005 2465st -2 2496s"},
+    {Op::Open, -4, "-5 2386oa -6 2396oa"},
+    {Op::Open, -2, "-10002 2440s"},
+    {Op::Inside, 0,
+     "-1 226t 347t 364t 375t 479t -2 241s 308s 338s 357s 405s 449s 503s -10001 248t 486s 510t"}, // extent
+    {Op::Inside, 0, "-10002 659r 694r 741 781 818r 841 863 881 913 -3 752a 924a -3001 932"},     // codecs
+    {Op::Inside, 0, "-3002 847 869 887 938 -3003 700 787 -3004 946"},
+    {Op::Inside, 0, "0 2536a 2550a 2602a -10002 2521r 2540r 2554r 2579r 2606r"}, // frames; 0: passed over
+    {Op::Frame, -1, "-4007 2638 2767 -4002 2651 2783 -4003 2661 2796 -4004 2667 2802"},
+    {Op::Frame, -1, "-1 2840t -2 2830s 2859s 2881s 2899s 2921s 2933s 2945t"},
+    {Op::Frame, -2, "-10002 2737 2957"},
+    {Op::Seek, -1, "-4007 2982 3190 -10003 2987 3195 -1 3065t 3088t 3111t 3269t 3288t 3295t"},
+    {Op::Seek, -1, "-2 3045s 3252s 3299s -2000 3072s 3095t 3118s 3276s"},
+    {Op::Seek, -2, "-2003 3161 3338"},
+    {Op::FrameSeek, -1, "-1 134t -2 140s 263s 290s 316s 335s 404s 432s 747s -2006 171t 231t 355 452 778t 817t"},
+    {Op::FrameSeek, -1, "-2007 325 -10002 342 439 -10003 844"}};
 
 const std::vector<Place>& Places()
 {
@@ -60,9 +38,12 @@ const std::vector<Place>& Places()
         std::vector<Place> all;
         for (const Lines& lines : LINES) {
             std::istringstream in(lines.text);
+            int32_t code = 0;
             for (std::string word; in >> word;)
-                all.push_back({lines.op, lines.rc, lines.code, std::stoi(word),
-                               word.substr(word.find_last_of("0123456789") + 1)});
+                if (const int32_t number = std::stoi(word); number <= 0)
+                    code = number;
+                else
+                    all.push_back({lines.op, lines.rc, code, number, word.substr(std::to_string(number).size())});
         }
         return all;
     }();
@@ -96,12 +77,9 @@ FrameResult Session::frame(uint32_t stream)
     uint8_t* const buffer = m_user_buffer.empty() ? nullptr : m_user_buffer.data();
     const flvd_frame_request_t request{buffer, static_cast<uint32_t>(m_user_buffer.size()), stream};
     flvd_frame_t out{nullptr, POISON, POISON, POISON, {POISON, POISON}};
-    FrameResult result;
-    result.rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &out);
-    result.frame.stream = out.stream;
-    result.frame.timestamp = out.timestamp_ms;
-    if (result.rc == 0 && out.data != nullptr)
-        result.frame.data.assign(out.data, out.data + out.size);
+    FrameResult result = {QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &out), {}};
+    const bool delivered = result.rc == 0 && out.data != nullptr;
+    result.frame = {out.stream, out.timestamp_ms, delivered ? Bytes(out.data, out.data + out.size) : Bytes{}};
     return result;
 }
 
