@@ -7,8 +7,8 @@
 
 #include <cstring>
 
-constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62;
-constexpr uint32_t FLVD_WHOLE_CACHE = 0; // as a refill quantum: the capacity of the file's cache
+constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62; // a host that tells more has not told a position
+constexpr uint32_t FLVD_WHOLE_CACHE = 0;               // as a refill quantum: the capacity of the file's cache
 
 // Reads up to n bytes from the host. One that claims more than it was asked for has failed: nothing it says is
 // believed.
@@ -49,7 +49,7 @@ inline void FLVD_FioDropBits(fio_file_t* file)
 uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
 
 // __FLV_DMX__fioShowBytesByPtr, without a call when the bytes are cached: most of the work on a frame is peeks and
-// skips.
+// skips. When it returns 0 because the file is being written, the pointer is not to be used.
 [[gnu::always_inline]] inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
@@ -91,7 +91,7 @@ inline int64_t FLVD_FioTell(const fio_file_t* file)
     return FLVD_FioLogical(file, host);
 }
 
-// __FLV_DMX__fioSetCacheReadSize in the same way.
+// __FLV_DMX__fioSetCacheReadSize, for the guard below.
 inline bool FLVD_FioSetReadSize(fio_file_t* file, uint32_t size)
 {
     if (size > file->capacity)

@@ -89,6 +89,17 @@ constexpr flvd_meta_key_t g_flvd_metaKeyTable[] = {
 };
 static_assert(std::size(g_flvd_metaKeyTable) == FLVD_META_KEY_NONE + 1, "one entry a key, and the end");
 
+// What comparing four letters at a time takes for granted.
+constexpr bool FLVD_AreKeysLetters()
+{
+    for (const flvd_meta_key_t& key : g_flvd_metaKeyTable)
+        for (uint32_t i = 0; i < key.length; ++i)
+            if (key.length < 4 || key.name[i] < 'a' || key.name[i] > 'z')
+                return false;
+    return true;
+}
+static_assert(FLVD_AreKeysLetters(), "at least four small letters each");
+
 constexpr uint32_t FLVD_META_KEY_LENGTH_MAX = 21;
 
 // First entry of each length.
@@ -193,7 +204,7 @@ bool FLVD_KeepsIndex(const flvd_ctx_t* ctx)
 
 // Keys.
 
-// Four letters as small ones. What the bit makes a small letter was a letter.
+// Four bytes with letters made small. Other bytes change as well, but none becomes a letter that was not one.
 uint32_t FLVD_SmallLetters(const void* text)
 {
     uint32_t letters = 0;
@@ -211,6 +222,7 @@ bool FLVD_IsKey(const uint8_t* key, const flvd_meta_key_t& known)
     return i >= last && FLVD_SmallLetters(key + last) == FLVD_SmallLetters(known.name + last);
 }
 
+// Index of the key of this length, 1 or more; FLVD_META_KEY_NONE when there is none.
 uint32_t FLVD_FindKey(const uint8_t* key, uint32_t length)
 {
     if (length > FLVD_META_KEY_LENGTH_MAX)

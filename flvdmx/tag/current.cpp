@@ -56,10 +56,12 @@ int32_t FLVD_GetPlayedTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* in
     const int64_t start = FLVD_FioTell(file);
     if (start < position)
         return FLVD_ERR_NOT_FOUND;
-    if (large && !FLVD_CheckBehind(file, header.info.data_size))
-        return FLVD_SearchPastBadTag(ctx, file, info, wanted, start);
-    if (large && !FLVD_GoBackToTag(file, start))
-        return FLVD_ERR_NOT_FOUND;
+    if (large) {
+        if (!FLVD_CheckBehind(file, header.info.data_size))
+            return FLVD_SearchPastBadTag(ctx, file, info, wanted, start);
+        if (!FLVD_GoBackToTag(file, start))
+            return FLVD_ERR_NOT_FOUND;
+    }
     *info = header.info;
     return 0;
 }

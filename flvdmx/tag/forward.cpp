@@ -285,6 +285,7 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 
 } // namespace
 
+// Neither is inlined: a sound tag in the cache is played without them, and with few registers to save.
 [[gnu::noinline]] int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
                                           bool verify, int64_t position)
 {

@@ -143,7 +143,8 @@ inline bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted)
 bool FLVD_PassBackPointer(fio_file_t* file, uint32_t data_size);
 
 // Moves behind a tag's data and looks at its back-pointer. The tag is mostly gone back to, which empties the cache, so
-// no more is read here than needed.
+// no more is read here than needed; a reader with a narrow quantum keeps it: it steps from tag to tag, and on from
+// here.
 bool FLVD_CheckBehind(fio_file_t* file, uint32_t data_size);
 
 // Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
@@ -166,7 +167,8 @@ int32_t FLVD_GetPlayedTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* in
 int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, bool verify,
                         int64_t position);
 
-// The same in careful mode when the tag there was looked behind and its back-pointer disagreed.
+// The same in careful mode behind a tag whose back-pointer disagreed: `position` is that tag's start, the reader stands
+// behind its data.
 int32_t FLVD_SearchPastBadTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
                               int64_t position);
 
