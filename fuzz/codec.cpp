@@ -38,29 +38,23 @@ void run_audio(Input& input)
     require(same_bytes(info, flvd_audio_info_t{}), "an audio header that changed something else");
 }
 
-// Appends parameter sets with start codes. False when the record ends before them.
-bool append_sets(const Bytes& record, uint32_t count, size_t* at, Bytes* sets)
-{
-    for (; count != 0; --count) {
-        const size_t left = record.size() - *at;
-        const size_t length = left >= 2 ? read_be(record, *at, 2) : left;
-        if (length + 2 > left)
-            return false;
-        const uint8_t* const begin = record.data() + *at + 2;
-        Append(*sets, Concat({{0, 0, 0, 1}, Bytes(begin, begin + length)}));
-        *at += 2 + length;
-    }
-    return true;
-}
-
+// With start codes; nothing when the record ends before them.
 Bytes parameter_sets(const Bytes& record)
 {
     Bytes sets;
-    size_t at = 6;
-    if (record.size() < 7 || record[0] != 1 || !append_sets(record, record[5] & 0x1Fu, &at, &sets))
-        return {};
-    const uint32_t pictures = at < record.size() ? record[at++] : UINT32_MAX;
-    return pictures != UINT32_MAX && append_sets(record, pictures, &at, &sets) ? sets : Bytes{};
+    size_t at = 5;
+    for (const uint8_t mask : {uint8_t{0x1F}, uint8_t{0xFF}}) {
+        if (record.size() < std::max<size_t>(at + 1, 7) || record[0] != 1)
+            return {};
+        for (int32_t count = record[at++] & mask; count > 0; --count) {
+            const size_t begin = at + 2;
+            at = begin <= record.size() ? begin + read_be(record, at, 2) : begin;
+            if (at > record.size())
+                return {};
+            Append(sets, Concat({{0, 0, 0, 1}, Bytes(record.data() + begin, record.data() + at)}));
+        }
+    }
+    return sets;
 }
 
 void judge_picture(int32_t codec, const Bytes& data)

@@ -5,10 +5,6 @@
 
 namespace flvd_fuzz {
 
-// The library's frame buffer is the same block in all sessions: to allocate it costs more than the rest of a session.
-static constexpr uint32_t FRAME_BUFFER_SIZE = 512000;
-static const auto g_frame_buffer = std::make_unique<uint8_t[]>(FRAME_BUFFER_SIZE);
-
 void require(bool holds, const char* what)
 {
     if (holds)
@@ -46,22 +42,6 @@ bool Host::refuses(uint64_t effort)
     if (m_lies != 0)
         m_patience -= std::min(effort, m_patience);
     return refused;
-}
-
-void* Host::alloc(uint32_t size)
-{
-    void* const memory = FakeHost::alloc(size == FRAME_BUFFER_SIZE ? 1 : size);
-    if (size != FRAME_BUFFER_SIZE || memory == nullptr || std::exchange(m_frame_buffer_held, true))
-        return memory;
-    FakeHost::release(memory);
-    return g_frame_buffer.get();
-}
-
-void Host::release(void* memory)
-{
-    if (memory != g_frame_buffer.get())
-        return FakeHost::release(memory);
-    require(std::exchange(m_frame_buffer_held, false), "a frame buffer that is released twice");
 }
 
 int32_t Host::eof(void* handle)
@@ -107,7 +87,7 @@ int64_t Host::position(const fio_file_t* reader)
 
 void Host::require_clean() const
 {
-    require(live_blocks() == 0 && !m_frame_buffer_held, "memory that was not released");
+    require(live_blocks() == 0, "memory that was not released");
     require(open_handles() == 0, "a file that was not closed");
 }
 

@@ -84,8 +84,6 @@ public:
 private:
     bool lies(Lie lie) const { return (m_lies >> static_cast<uint32_t>(lie) & 1u) != 0; }
     bool refuses(uint64_t effort);
-    void* alloc(uint32_t size) override;
-    void release(void* memory) override;
     int32_t eof(void* handle) override;
     uint32_t read(void* buffer, uint32_t size, uint32_t count, void* handle) override;
     int32_t seek(void* handle, int64_t offset, int32_t whence, bool wide) override;
@@ -93,7 +91,6 @@ private:
 
     uint32_t m_lies = 0;
     uint64_t m_patience = UINT64_MAX, m_calls_left = UINT64_MAX;
-    bool m_frame_buffer_held = false;
 };
 
 /** Whether two records hold the same bytes. */

@@ -54,8 +54,7 @@ public:
         case 2:
             return seek((input.word() - 2000) * (argument > 13 ? 32768 : 1), input.byte());
         case 3: // an open file only grows
-            return m_ctx == nullptr ? m_host.set_visible(input.word())
-                                    : static_cast<void>(m_host.grow(1 + input.word()));
+            return m_host.set_visible(input.word() + (m_ctx != nullptr ? 1 + m_host.visible() : 0));
         case 4:
             return m_host.fail_nth_call(m_host.failable_calls() + 1 + input.byte());
         case 5:
@@ -147,7 +146,6 @@ private:
     }
 
     // Where delivery goes on: a growing file's tag that waits to be tried again is gone back to first.
-
     int64_t place(const fio_file_t* reader)
     {
         const int64_t saved = reader == m_ctx->main_reader ? m_ctx->saved_main_pos : m_ctx->saved_audio_pos;
@@ -155,7 +153,6 @@ private:
     }
 
     // While calls fail the way over the back-pointer may have failed too: then the tag may be anywhere.
-
     void judge_frame(const flvd_frame_t& frame, int64_t behind) const
     {
         require(m_buffer.empty() || (frame.data == m_buffer.data() && frame.size <= m_buffer.size()), "another buffer");
@@ -167,7 +164,6 @@ private:
     }
 
     // Whether the file holds this frame, as the data of a tag of its kind, size and time that ends there.
-
     bool is_tag_of(const flvd_frame_t& frame, int64_t end) const
     {
         const int64_t start = end - frame.size;

@@ -2,15 +2,12 @@
 
 #include "support/report.h"
 
-#include <random>
-
 using namespace flvd_test;
 
 namespace {
 
 constexpr uint32_t CACHE = 64;
 constexpr uint32_t UPDATE_BINARY = FIO_MODE_READ | FIO_MODE_WRITE | FIO_MODE_BINARY;
-constexpr uint32_t REFUSED = 0xFFFFFFFF;
 
 // Byte n of most files holds n, so a value tells where it came from.
 Bytes Part(size_t from, size_t to)
@@ -53,12 +50,6 @@ public:
         EXPECT_EQ(bytes == nullptr, file->state == FIO_STATE_WRITE); // untouched when refused
         return Bytes(bytes, bytes + got);
     }
-    Bytes copy(uint32_t n) const
-    {
-        Bytes out(n);
-        out.resize(__FLV_DMX__fioShowBytesByCopy(out.data(), n, file));
-        return out;
-    }
     // The whole elements read, as bytes.
     Bytes read(uint32_t count, uint32_t size = 1) const
     {
@@ -73,7 +64,6 @@ public:
     uint32_t skip(uint32_t n) const { return __FLV_DMX__fioSkipBytes(n, file); }
     int32_t seek(int64_t to, int32_t whence = FIO_SEEK_SET) const { return __FLV_DMX__fioSeek64(file, to, whence); }
     int64_t tell() const { return __FLV_DMX__fioTell64(file); }
-    int32_t eof() const { return __FLV_DMX__fioIsEof(file); }
     int32_t flush() const { return __FLV_DMX__fioFlush(file); }
     int32_t quantum(uint32_t size) const { return __FLV_DMX__fioSetCacheReadSize(file, size); }
     int32_t close() { return __FLV_DMX__fioClose(std::exchange(file, nullptr)); }
@@ -106,18 +96,12 @@ TEST(FioOpen, TurnsModeBitsIntoModeStrings)
     }
 }
 
-TEST(FioOpen, TakesTheExtraWithOverreadOnlyAndLeavesNothingBehindWhenItFails)
+TEST(FioOpen, TakesTheExtraWithOverreadOnly)
 {
     for (const uint32_t extra : {0u, 32u}) {
         const Cached f({CACHE, extra != 0 ? 1 : 0, 32});
         EXPECT_EQ(f.host.live_bytes(), sizeof(fio_file_t) + CACHE + extra);
         EXPECT_EQ(f.file->overread_extra, extra);
-    }
-    for (uint64_t call = 1; call <= 3; ++call) { // open, object, cache
-        FakeHost host(Part(0, 10));
-        host.fail_nth_call(call);
-        EXPECT_EQ(Open(host, {}), nullptr);
-        EXPECT_EQ(host.calls(HostFn::Alloc), call - 1);
     }
     FakeHost host(Part(0, 10));
     EXPECT_EQ(Open(host, {0xFFFFFFF0, 1, 0x20}), nullptr); // the sum does not fit 32 bits
@@ -127,31 +111,23 @@ TEST(FioPeek, RefillsByTheLargerOfRequestAndQuantum)
 {
     Cached f;
     EXPECT_EQ(f.told(f.peek(4)), "0..4: read(64)=64");
-    EXPECT_EQ(f.told(f.peek(65)), "0..64: "); // never more than the cache holds
     f.skip(10);
-    EXPECT_EQ(f.told(f.copy(54)), "10..64: ");
     EXPECT_EQ(f.told(f.peek(55)), "10..65: read(10)=10"); // moved to the front, then filled up
     for (const uint32_t size : {CACHE + 1, CACHE, 16u})
         EXPECT_EQ(f.quantum(size), size <= CACHE ? 1 : 0);
     f.skip(60);
-    EXPECT_EQ(f.told(f.copy(5)), "70..75: read(12)=12"); // 4 bytes held, 16 is the least
-    EXPECT_EQ(f.told(f.peek(20)), "70..90: read(4)=4");
-    EXPECT_EQ(f.quantum(0), 1);
-    EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(f.file), CACHE);
+    EXPECT_EQ(f.told(f.peek(5)), "70..75: read(12)=12"); // 4 bytes held, 16 is the least
     f.seek(190);
-    EXPECT_EQ(f.told(f.peek(20)), "190..200: seek64(190,0)=0 read(64)=10"); // once, though it was short
-    EXPECT_EQ(f.told(f.eof()), "0: ");
+    EXPECT_EQ(f.told(f.peek(20)), "190..200: seek64(190,0)=0 read(20)=10"); // once, though it was short
+    EXPECT_EQ(f.told(__FLV_DMX__fioIsEof(f.file)), "0: ");
     f.skip(10);
-    EXPECT_EQ(f.told(f.eof()), "1: eof()=1");
+    EXPECT_EQ(f.told(__FLV_DMX__fioIsEof(f.file)), "1: eof()=1");
 
     Cached over({CACHE, 1, 32}); // asks for the whole request behind the cached bytes
     over.peek(60);
     over.skip(60);
     EXPECT_EQ(over.told(over.peek(10)), "60..70: read(64)=64 read(64)=64");
     EXPECT_EQ(over.told(over.peek(100)), "60..156: read(28)=28"); // clamped to 96; 28 free
-    over.seek(0);
-    over.quantum(1);
-    EXPECT_EQ(over.told(over.read(3)), "0..3: seek64(0,0)=0 read(1)=1 read(1)=1 read(1)=1");
 }
 
 TEST(FioSeek, StaysInTheCacheOnlyForShortStepsForward)
@@ -161,20 +137,15 @@ TEST(FioSeek, StaysInTheCacheOnlyForShortStepsForward)
     EXPECT_EQ(f.told(f.seek(63, FIO_SEEK_CUR)), "0: read(64)=64");
     EXPECT_EQ(f.told(f.seek(1, FIO_SEEK_CUR)), "0: seek64(0,1)=0"); // to the end of the cached bytes
     f.peek(1);
-    EXPECT_EQ(f.told(f.seek(-1, FIO_SEEK_CUR)), "0: read(64)=64 seek64(-65,1)=0");
-    f.peek(1);
-    for (const int32_t unknown : {3, -1}) // nothing is lost
-        EXPECT_EQ(f.seek(0, unknown), -1);
-    f.host.take_log();
-    EXPECT_EQ(f.told(__FLV_DMX__fioSeek(f.file, -64, FIO_SEEK_CUR)), "-1: seek(-128,1)=-1");
-    EXPECT_EQ(f.tell(), 127); // failed: the cache is empty all the same
-    f.peek(1);
-    EXPECT_EQ(f.skip(64), 64u); // a skip may go to the end
-    EXPECT_EQ(f.told(f.skip(100)), "100: tell64()=127 read(64)=64 seek64(100,1)=0");
+    EXPECT_EQ(f.seek(0, 3), -1); // nothing is lost
+    EXPECT_EQ(f.told(__FLV_DMX__fioSeek(f.file, -65, FIO_SEEK_CUR)), "-1: read(64)=64 seek(-129,1)=-1");
+    EXPECT_EQ(f.tell(), 128); // failed: the cache is empty all the same
     f.seek(0);
     f.peek(1);
+    EXPECT_EQ(f.told(f.skip(64)), "64: tell64()=128 seek64(0,0)=0 read(64)=64"); // a skip may go to the end
+    f.peek(1);
     f.host.fail_from(HostFn::Seek, 1);
-    EXPECT_EQ(f.told(f.skip(100)), "64: seek64(0,0)=0 read(64)=64 seek64(36,1)=-1");
+    EXPECT_EQ(f.told(f.skip(100)), "64: read(64)=64 seek64(36,1)=-1");
     EXPECT_EQ(f.file->count, 0u);
 }
 
@@ -203,19 +174,15 @@ TEST(FioSeek, HandsWidePositionsToTheWideFunctionsOnly)
 
 TEST(FioRead, TakesTheCachedBytesThenTheCheapestWay)
 {
-    // Bytes made visible before, by a quantum of that size, which then is 16; bytes to read; cached bytes afterwards,
-    // and copies out of the cache.
+    // Where from; bytes made visible by a quantum of that size, which then is 16; bytes to read; cached bytes
+    // afterwards, and copies out of the cache.
     const std::tuple<OpenArgs, int64_t, uint32_t, uint32_t, const char*, uint32_t, uint32_t> cases[] = {
-        {{}, 0, 20, 0, "0..0: ", 20, 0},
         {{}, 0, 20, 19, "0..19: ", 1, 1},
-        {{}, 0, 20, 20, "0..20: read(16)=16", 16, 1},
         {{}, 0, 20, 35, "0..35: read(16)=16", 1, 2},
         {{}, 0, 20, 36, "0..36: read(16)=16", 0, 1}, // the rest is a quantum: straight to the destination
-        {{}, 0, 0, 70, "0..70: read(70)=70", 0, 0},
         {{}, 0, 0, 0, "0..0: read(16)=16", 16, 0},
         {OVERREAD, 0, 0, 15, "0..15: read(16)=16", 1, 1},
         {OVERREAD, 0, 0, 32, "0..32: read(16)=16 read(16)=16", 0, 1}, // the last quantum goes through the cache
-        {OVERREAD, 0, 0, 40, "0..40: read(16)=16 read(16)=16 read(16)=16", 8, 1},
         {OVERREAD, 180, 0, 40, "180..200: read(16)=16 read(16)=4 read(16)=0", 0, 0},
         {OVERREAD, 164, 0, 40, "164..200: read(16)=16 read(16)=16 read(16)=4", 0, 1}};
     for (const auto& [args, start, cached, total, told, held, copies] : cases) {
@@ -235,6 +202,8 @@ TEST(FioRead, CountsWholeElementsAndBelievesNoCountTooLarge)
     Cached f({}, Part(0, 10));
     EXPECT_EQ(f.read(1, 4), Part(0, 4));
     EXPECT_EQ(f.read(5, 4), Part(4, 8)); // 6 bytes were left
+    __FLV_DMX__fiodbgReset();
+    EXPECT_EQ(__FLV_DMX__fiodbgReadBytes(), 0u); // this build counts nothing
     f.seek(2);
     uint8_t byte = 77;
     f.host.take_log();
@@ -245,6 +214,8 @@ TEST(FioRead, CountsWholeElementsAndBelievesNoCountTooLarge)
     }
     EXPECT_EQ(byte, 77);
     EXPECT_EQ(f.told(f.peek(1)), "2..3: read(64)=8");
+    EXPECT_EQ(__FLV_DMX__fioShowBytesByCopy(&byte, 1, f.file), 1u);
+    EXPECT_EQ(byte, 2);
 
     fio_funcs_t boaster = f.host.funcs(); // claims more than it was asked for: not believed
     boaster.file_read = [](void*, uint32_t, uint32_t count, void*) { return count + 1000; };
@@ -267,11 +238,25 @@ TEST(FioWrite, CollectsUntilTheCacheWouldBeFull)
     EXPECT_EQ(f.told(f.write(Part(56, 72))), "16: write(16)=16");               // as a whole cache
     f.write(Part(72, 76));
     EXPECT_EQ(f.peek(4), Bytes{}); // no way to the bytes behind
-    EXPECT_EQ(f.skip(4), REFUSED);
-    EXPECT_EQ(f.eof(), 0);
+    uint8_t byte = 0;
+    EXPECT_EQ(__FLV_DMX__fioShowBytesByCopy(&byte, 1, f.file), 0u);
+    EXPECT_EQ(f.skip(4), 0xFFFFFFFF);
+    EXPECT_EQ(__FLV_DMX__fioIsEof(f.file), 0);
     EXPECT_EQ(f.told(f.flush()), "0: write(4)=4 flush()=0");
     EXPECT_EQ(f.told(f.flush()), "0: flush()=0");
-    EXPECT_EQ(f.host.contents(), Part(0, 76));
+}
+
+TEST(FioWrite, IsFlushedBeforeReadingSeekingAndClosing)
+{
+    Cached f(NEW_FILE);
+    f.write(Part(0, 10));
+    EXPECT_EQ(f.told(f.seek(2)), "0: write(10)=10 flush()=0 seek64(2,0)=0");
+    EXPECT_EQ(f.told(f.peek(3)), "2..5: read(16)=8");
+    EXPECT_EQ(f.told(f.write(Part(10, 12))), "2: flush()=0"); // drops the read-ahead where the host stands
+    EXPECT_EQ(f.told(f.read(5)), "0..0: write(2)=2 flush()=0 read(16)=0");
+    f.write(Part(12, 14));
+    EXPECT_EQ(f.told(f.close()), "0: flush()=0 write(2)=2 flush()=0 close()=0");
+    EXPECT_EQ(f.host.contents(), Part(0, 14));
 }
 
 TEST(FioWrite, KeepsWhatAShortWriteLeft)
@@ -293,19 +278,6 @@ TEST(FioWrite, KeepsWhatAShortWriteLeft)
     EXPECT_EQ(f.file->count, 0u);
     f.host.fail_from(HostFn::Flush, 1);
     EXPECT_EQ(f.flush(), -1);
-}
-
-TEST(FioWrite, IsFlushedBeforeReadingSeekingAndClosing)
-{
-    Cached f(NEW_FILE);
-    f.write(Part(0, 10));
-    EXPECT_EQ(f.told(f.seek(2)), "0: write(10)=10 flush()=0 seek64(2,0)=0");
-    EXPECT_EQ(f.told(f.peek(3)), "2..5: read(16)=8");
-    EXPECT_EQ(f.told(f.write(Part(10, 12))), "2: flush()=0"); // drops the read-ahead where the host stands
-    EXPECT_EQ(f.told(f.read(5)), "0..0: write(2)=2 flush()=0 read(16)=0");
-    f.write(Part(12, 14));
-    EXPECT_EQ(f.told(f.close()), "0: flush()=0 write(2)=2 flush()=0 close()=0");
-    EXPECT_EQ(f.host.contents(), Part(0, 14));
 }
 
 TEST(BitReader, IsEmptiedByByteLevelAccess)
@@ -338,44 +310,23 @@ TEST(BitReader, IsEmptiedByByteLevelAccess)
     EXPECT_EQ(std::pair(f.file->bit_skip_pending, f.file->bits_left), std::pair(0, 60));
 }
 
-TEST(BitReader, AgreesWithPlainBits)
+TEST(BitReader, TakesFieldsOfUpTo32Bits)
 {
-    const Bytes data = Noise(120);
-    const auto bits_at = [&](size_t at, uint32_t n) {
-        uint32_t value = 0;
-        for (size_t i = at; i < at + n; ++i)
-            value = value << 1 | (i / 8 < data.size() ? uint32_t{data[i / 8]} >> (7 - i % 8) & 1u : 0u);
-        return value;
-    };
-    std::mt19937 random(3);
-    for (const uint32_t cache : {8u, 13u, 4096u}) {
-        const Cached f({cache}, data);
-        size_t at = 0;
-        for (uint32_t i = 0; i < 6000; ++i) {
-            if (i % 30 == 0) {
-                at = random() % 124 * 8;
-                f.seek(static_cast<int64_t>(at / 8));
-                EXPECT_EQ(__FLV_DMX__bitInit(f.file), 1);
-            }
-            auto n = static_cast<uint32_t>(random() % 33);
-            const uint32_t value = bits_at(at, n);
-            ASSERT_EQ(__FLV_DMX__bitShowUBits(f.file, n), value);
-            ASSERT_EQ(__FLV_DMX__bitShowSBits(f.file, n), value); // no sign
-            ASSERT_EQ(__FLV_DMX__bitShowBit(f.file), bits_at(at, 1));
-            ASSERT_EQ(__FLV_DMX__bitShowUBits(f.file, 40), bits_at(at, 32)); // no field is longer
-            const auto what = random() % 6;
-            if (what < 2)
-                ASSERT_EQ((what == 0 ? __FLV_DMX__bitGetUBits : __FLV_DMX__bitGetSBits)(f.file, n), value);
-            else if (what == 2)
-                ASSERT_EQ(__FLV_DMX__bitGetBit(f.file), bits_at(at, n = 1));
-            else if (what == 3)
-                f.peek(std::exchange(n, 0) % 8);
-            else
-                (what == 4 ? __FLV_DMX__bitSkipBits : __FLV_DMX__bitSkipBitsLong)(f.file, n *= what == 4 ? 1 : 3);
-            at += n;
-            ASSERT_EQ(f.tell(), static_cast<int64_t>(at + 7) / 8); // a byte is consumed with its first bit
-            ASSERT_GT(f.file->bits_left, 32);
-        }
+    const Cached f({13});
+    EXPECT_EQ(__FLV_DMX__bitInit(f.file), 1);
+    EXPECT_EQ(__FLV_DMX__bitGetUBits(f.file, 14), 0u);
+    EXPECT_EQ(__FLV_DMX__bitShowBit(f.file), 0u);
+    EXPECT_EQ(__FLV_DMX__bitGetBit(f.file) + __FLV_DMX__bitGetBit(f.file), 1u);
+    for (const uint32_t n : {32u, 33u, 40u})
+        EXPECT_EQ(__FLV_DMX__bitShowUBits(f.file, n), 0x02030405u);
+    f.seek(0x80);
+    __FLV_DMX__bitInit(f.file);
+    EXPECT_EQ(__FLV_DMX__bitShowSBits(f.file, 4), 8u); // no sign
+    EXPECT_EQ(__FLV_DMX__bitGetSBits(f.file, 4), 8u);
+    EXPECT_EQ(f.tell(), 0x81); // a byte is consumed with its first bit
+    for (uint32_t n = 1; n <= 32; ++n) {
+        __FLV_DMX__bitSkipBits(f.file, n);
+        EXPECT_GT(f.file->bits_left, 32);
     }
 }
 

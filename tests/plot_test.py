@@ -21,20 +21,18 @@ class Plot(Case):
         return xml.etree.ElementTree.fromstring(text)
 
     @staticmethod
-    def texts(root, kind):
-        return [t.text for t in root.iter(f"{SVG}text") if t.get("class") == kind]
-
-    @staticmethod
-    def paths(root, kind):
-        return [p.get("d") for p in root.iter(f"{SVG}path") if p.get("class") == kind]
+    def of(root, kind):
+        """The texts or paths of a class."""
+        found = [e.text or e.get("d") for e in root.iter() if e.get("class") == kind]
+        return [content for content in found if content]
 
     def bits(self, root, kind, seconds):
         """The area under a line, by the labels of its axis."""
         texts = (t for t in root.iter(f"{SVG}text") if t.get("class") == "tick left")
         ticks = [(float(t.get("y")) - 4, float(t.text)) for t in texts]
-        unit = UNITS[re.search(r"\((.*)\)", self.texts(root, "heading")[0])[1]]
+        unit = UNITS[re.search(r"\((.*)\)", self.of(root, "heading")[0])[1]]
         scale = (ticks[1][1] - ticks[0][1]) / (ticks[1][0] - ticks[0][0]) * unit
-        steps = [(float(y), float(x)) for y, x in re.findall(r"V([\d.]+)H([\d.]+)", *self.paths(root, f"area-{kind}"))]
+        steps = [(float(y), float(x)) for y, x in re.findall(r"V([\d.]+)H([\d.]+)", *self.of(root, f"area-{kind}"))]
         starts = [LEFT, *(x for _, x in steps)]
         return sum((y - ticks[0][0]) * scale * (x - start) for (y, x), start in zip(steps, starts)) * seconds / WIDTH
 
@@ -43,14 +41,14 @@ class Plot(Case):
             data, expected = sample_bytes(name), Expected(name)
             with self.subTest(name):
                 root = self.plot(f"{name}.flv", data)
-                marks = re.findall(r"M([\d.]+)", "".join(self.paths(root, "keyframe")[:1]))
+                marks = re.findall(r"M([\d.]+)", "".join(self.of(root, "keyframe")[:1]))
                 self.assertEqual(len(marks), len(expected.keyframes))
                 for (time_ms, *_), found in zip(expected.keyframes, marks):
                     share = max(time_ms, 0) / expected.last
                     self.assertAlmostEqual(float(found), LEFT + WIDTH * share, delta=0.02 * WIDTH)
-                legend, streams = self.texts(root, "legend"), len(expected.streams)
+                legend, streams = self.of(root, "legend"), len(expected.streams)
                 self.assertEqual(legend.count("video") + legend.count("audio"), 2 * streams)
-                self.assertEqual(len(self.texts(root, "heading")), 1 + streams if streams > 1 else 2)
+                self.assertEqual(len(self.of(root, "heading")), 1 + streams if streams > 1 else 2)
                 for kind in expected.streams:
                     code = {"audio": 8, "video": 9}[kind]
                     size = sum(len(tag) - 15 for tag in split_tags(data)[1] if tag[0] == code)
@@ -63,22 +61,22 @@ class Plot(Case):
                 (1, "0.0 s", "1.0 s"), (9, "0 s", "9 s"), (50, "0 s", "50 s"), (300, "0:00", "5:00"),
                 (5400, "0:00:00", "1:30:00"), (10800, "0:00:00", "3:00:00"), (2000000, "0:00:00", None)):
             times = [max(i - 1, 0) * seconds * 1000 // (len(frames) - 2) for i in range(len(frames))]
-            stamps = [t.to_bytes(4, "big") for t in times]
-            root = self.plot("long.flv", header + b"".join(
-                tag[:4] + stamp[1:] + stamp[:1] + tag[8:] for tag, stamp in zip(frames, stamps)))
-            labels = self.texts(root, "tick mid")
+            stamps = [(t & 0xFFFFFF).to_bytes(3, "big") + bytes([t >> 24]) for t in times]
+            tags = (tag[:4] + stamp + tag[8:] for tag, stamp in zip(frames, stamps))
+            root = self.plot("long.flv", header + b"".join(tags))
+            labels = self.of(root, "tick mid")
             labels = labels[:len(labels) // 2]  # of the first diagram
             self.assertTrue(5 <= len(labels) <= 13, labels)
             self.assertEqual((labels[0], labels[-1]), (first, last or labels[-1]))
-            self.assertTrue(10 <= self.paths(root, "video")[0].count("H") <= 201)
+            self.assertTrue(10 <= self.of(root, "video")[0].count("H") <= 201)
 
     def test_interleaving_shows_streams_that_are_apart(self):
-        lead = self.texts(self.plot("apart.flv", APART), "tick left")[-4:]
+        lead = self.of(self.plot("apart.flv", APART), "tick left")[-4:]
         self.assertLessEqual(min(map(float, lead)), -2)  # seconds
 
     def test_any_name(self):
         root = self.plot("a<b>&\"c\udcff.flv", sample_bytes("aac_only"))
-        self.assertEqual(self.texts(root, "title")[0], 'a<b>&"c\ufffd.flv')
+        self.assertEqual(self.of(root, "title")[0], 'a<b>&"c\ufffd.flv')
 
 
 if __name__ == "__main__":

@@ -82,7 +82,7 @@ def sound_file(path):
     tags, found = media_tags(path.read_bytes()), probe(path)
     assert [int(p["pos"]) for p in found["packets"]] == list(tags), path
     duration = round(float(found["format"].get("duration", 0)) * 1000)
-    packets = {int(p["pos"]): packet_line(p, tags[int(p["pos"])]) for p in found["packets"]}
+    packets = {pos: packet_line(p, tags[pos]) for pos, p in zip(tags, found["packets"])}
     return duration, [stream_line(s) for s in found["streams"]], packets
 
 
@@ -94,11 +94,10 @@ def decoded(kind, path, *demuxer):
     return [line.split(",")[-1].strip() for line in lines if line[0] != "#"]
 
 
-def extracted(tool, path, codecs, folder):
-    kept = folder / "kept.flv"
+def extracted(tool, path, folder):
+    kept, out = folder / "kept.flv", folder / "out"
     kept.write_bytes(b"".join([path.read_bytes()[:13], *kept_tags(path).values()]))
-    for kind, codec in codecs.items():
-        out = folder / "out"
+    for kind, codec in ((s["codec_type"], s["codec_name"]) for s in probe(path)["streams"]):
         subprocess.run([tool, "extract", "--stream", kind, path, "-o", out], check=True, capture_output=True)
         if codec in DEMUXERS:
             frames = decoded(kind, kept)
@@ -108,15 +107,6 @@ def extracted(tool, path, codecs, folder):
         yield f"{path.stem} {kind} {hashlib.sha256(out.read_bytes()).hexdigest()}\n"
 
 
-def write_extracted(tool):
-    lines = []
-    for path in SAMPLES:
-        codecs = {s["codec_type"]: s["codec_name"] for s in probe(path)["streams"]}
-        with tempfile.TemporaryDirectory() as folder:
-            lines += extracted(tool, path, codecs, pathlib.Path(folder))
-    (HERE / "expected" / "extract.txt").write_text("".join(lines))
-
-
 def main():
     for path in SAMPLES:
         broken = path.stem in BROKEN
@@ -124,8 +114,10 @@ def main():
         lines = [f"file size={path.stat().st_size} duration_ms={0 if broken else duration}", *streams,
                  *(packets[pos] for pos in kept_tags(path) if pos in packets)]
         (HERE / "expected" / f"{path.stem}.txt").write_text("\n".join(lines) + "\n")
-    if len(sys.argv) > 1:
-        write_extracted(sys.argv[1])
+    for tool in sys.argv[1:]:
+        with tempfile.TemporaryDirectory() as folder:
+            lines = [line for path in SAMPLES for line in extracted(tool, path, pathlib.Path(folder))]
+        (HERE / "expected" / "extract.txt").write_text("".join(lines))
 
 
 if __name__ == "__main__":

@@ -120,8 +120,6 @@ public:
     const std::vector<std::string>& open_modes() const { return m_open_modes; }
 
 protected:
-    virtual void* alloc(uint32_t size);
-    virtual void release(void* memory);
     virtual int32_t eof(void* pointer);
     virtual uint32_t read(void* buffer, uint32_t size, uint32_t count, void* pointer);
     virtual int32_t seek(void* pointer, int64_t offset, int32_t whence, bool wide);
@@ -167,6 +165,8 @@ private:
     void check_range(const char* what, const void* pointer, uint32_t count);
     Handle& transfer(const char* what, const void* buffer, uint32_t size, uint32_t count, void* pointer);
 
+    void* alloc(uint32_t size);
+    void release(void* memory);
     void* copy(void* destination, const void* source, uint32_t count);
     void* set(void* destination, int value, uint32_t count);
     void* open(const char* path, const char* mode);

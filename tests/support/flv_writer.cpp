@@ -62,9 +62,18 @@ BitWriter& BitWriter::se(int32_t value)
 
 namespace amf {
 
-Bytes Text(uint8_t marker, int length_bytes, const std::string& text)
+static Bytes Text(const std::string& text, int length_bytes)
 {
-    return Concat({{marker}, BigEndian(text.size(), length_bytes), Bytes(text.begin(), text.end())});
+    return Concat({BigEndian(text.size(), length_bytes), Bytes(text.begin(), text.end())});
+}
+
+// With their end marker.
+static Bytes Properties(const std::vector<Property>& properties)
+{
+    Bytes out;
+    for (const auto& [name, value] : properties)
+        Append(out, Concat({Text(name, 2), value}));
+    return Concat({out, {0, 0, 9}});
 }
 
 Bytes Number(double value)
@@ -74,17 +83,24 @@ Bytes Number(double value)
     return Concat({{0}, BigEndian(bits, 8)});
 }
 
-Bytes Properties(const std::vector<Property>& properties)
+Bytes String(const std::string& text)
 {
-    Bytes out;
-    for (const auto& [name, value] : properties)
-        Append(out, Concat({BigEndian(name.size(), 2), Bytes(name.begin(), name.end()), value}));
-    return Concat({out, {0, 0, 9}});
+    return Concat({{2}, Text(text, 2)});
 }
 
-Bytes EcmaArray(const std::vector<Property>& properties, std::optional<uint32_t> count)
+Bytes LongString(const std::string& text)
 {
-    return Concat({{8}, BigEndian(count.value_or(properties.size()), 4), Properties(properties)});
+    return Concat({{12}, Text(text, 4)});
+}
+
+Bytes Object(const std::vector<Property>& properties)
+{
+    return Concat({{3}, Properties(properties)});
+}
+
+Bytes OnMetaData(const std::vector<Property>& properties)
+{
+    return Concat({String("onMetaData"), {8}, BigEndian(properties.size(), 4), Properties(properties)});
 }
 
 Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count)
@@ -121,14 +137,26 @@ Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps)
     return out;
 }
 
+Bytes SmallAvcRecord()
+{
+    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
+}
+
+// A payload that begins so and goes on with noise.
+static Bytes Filled(const Bytes& head, size_t size)
+{
+    return Concat({head, Noise(std::max(size, head.size()) - head.size())});
+}
+
+Bytes Mp3Frame(size_t size)
+{
+    return Filled({0xFF, 0xFB, 0x90, 0x64}, size);
+}
+
 Bytes H263Picture(uint32_t size_code, uint32_t width, uint32_t height, size_t size)
 {
-    BitWriter head;
-    head.u(17, 1).u(5, 0).u(8, 1).u(3, size_code);
-    if (size_code < 2) {
-        const int bits = size_code == 0 ? 8 : 16;
-        head.u(bits, width).u(bits, height);
-    }
+    const int bits = size_code == 0 ? 8 : size_code == 1 ? 16 : 0;
+    const BitWriter head = BitWriter().u(17, 1).u(5, 0).u(8, 1).u(3, size_code).u(bits, width).u(bits, height);
     return Filled(head.bytes(), size);
 }
 
@@ -145,18 +173,16 @@ void PrintTo(const Frame& frame, std::ostream* out)
 
 size_t Tag::codec_bytes() const
 {
-    if (type == 9)
-        return !data.empty() && (data[0] & 15) == 7 ? 5 : 1;
-    return !data.empty() && data[0] >> 4 == 10 ? 2 : 1;
+    const uint8_t first = data.empty() ? uint8_t{0} : data[0];
+    const bool packets = type == 9 ? first % 16 == 7 : first / 16 == 10;
+    return !packets ? 1 : type == 9 ? 5 : 2;
 }
 
 bool Tag::is_frame() const
 {
-    if ((type != 8 && type != 9) || data.size() < codec_bytes())
-        return false;
-    if (codec_bytes() == 5)
-        return (data[1] & 0xFD) != 0;
-    return codec_bytes() == 1 || data[1] != 0;
+    const size_t header = codec_bytes();
+    const bool media = (type == 8 || type == 9) && data.size() >= header;
+    return media && (header == 1 || (data[1] != 0 && (header == 2 || data[1] != 2)));
 }
 
 uint32_t Flv::first_ts() const
@@ -212,11 +238,10 @@ Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
         tag.offset = static_cast<int64_t>(flv.bytes.size());
         Append(flv.bytes, Concat({{tag.type},
                                   BigEndian(tag.data_size.value_or(size), 3),
-                                  BigEndian(tag.timestamp, 3),
-                                  BigEndian(tag.timestamp >> 24, 1),
-                                  BigEndian(tag.stream_id, 3)}));
-        Append(flv.bytes, tag.data);
-        Put(flv.bytes, tag.back_pointer.value_or(size + 11), 4);
+                                  BigEndian(uint64_t{tag.timestamp} << 8 | tag.timestamp >> 24, 4),
+                                  BigEndian(tag.stream_id, 3),
+                                  tag.data,
+                                  BigEndian(tag.back_pointer.value_or(size + 11), 4)}));
     }
     return flv;
 }
@@ -224,12 +249,12 @@ Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
 // Numbers of AMF0 have a fixed size, so the index does not change the layout once it has its entries.
 Flv FlvBuilder::build() const
 {
-    std::vector<Tag> tags = m_tags;
-    for (int pass = 0; pass < 2 && m_index.tag < tags.size(); ++pass) {
-        tags[m_index.tag].data = index_data(tags);
-        tags = lay_out(std::move(tags)).tags;
+    Flv flv = lay_out(m_tags);
+    for (int pass = 0; pass < 2 && m_index.tag < m_tags.size(); ++pass) {
+        flv.tags[m_index.tag].data = index_data(flv.tags);
+        flv = lay_out(std::move(flv.tags));
     }
-    return lay_out(std::move(tags));
+    return flv;
 }
 
 Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
@@ -243,20 +268,19 @@ Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint3
 Flv MakeChain(const ChainOptions& options)
 {
     FlvBuilder builder(static_cast<uint8_t>((options.video ? 1 : 0) | (options.audio ? 4 : 0)));
-    const std::vector<amf::Property> size = {{"width", amf::Number(320)}, {"height", amf::Number(240)}};
+    const amf::Property width{"width", amf::Number(320)}, height{"height", amf::Number(240)};
     if (options.index)
-        builder.indexed_metadata(size);
+        builder.indexed_metadata({width, height});
     else if (options.metadata)
-        builder.metadata({size[0], size[1], {"framerate", amf::Number(25)}});
+        builder.metadata({width, height, {"framerate", amf::Number(25)}});
     if (options.video)
         builder.video(options.first_ts, AvcConfig(SmallAvcRecord()));
     if (options.audio)
         builder.audio(options.first_ts, AacConfig({0x12, 0x10}));
-    uint32_t sounds = 0;
-    for (uint32_t picture = 0; picture < options.pictures; ++picture) {
-        const bool key = picture % options.gop == 0;
+    for (uint32_t picture = 0, sounds = 0; picture < options.pictures; ++picture) {
+        const Bytes data = AvcNalu(picture % options.gop == 0, Noise(300 + picture * 37 % 101, picture));
         if (options.video)
-            builder.video(options.first_ts + picture * 40, AvcNalu(key, Noise(300 + picture * 37 % 101, picture)));
+            builder.video(options.first_ts + picture * 40, data);
         for (; options.audio && sounds * 23 < (picture + 1) * 40; ++sounds)
             builder.audio(options.first_ts + sounds * 23, AacRaw(Noise(80 + sounds * 13 % 29, 1000 + sounds)));
     }

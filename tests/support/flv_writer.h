@@ -21,8 +21,14 @@ using Bytes = std::vector<uint8_t>;
 
 /** The low `bytes` bytes of `value`. */
 Bytes BigEndian(uint64_t value, int bytes);
-inline const auto Append = [](Bytes& out, const Bytes& more) { out.insert(out.end(), more.begin(), more.end()); };
-inline const auto Put = [](Bytes& out, uint64_t value, int bytes) { Append(out, BigEndian(value, bytes)); };
+inline void Append(Bytes& out, const Bytes& more)
+{
+    out.insert(out.end(), more.begin(), more.end());
+}
+inline void Put(Bytes& out, uint64_t value, int bytes)
+{
+    Append(out, BigEndian(value, bytes));
+}
 Bytes Concat(std::initializer_list<Bytes> parts);
 /** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
@@ -46,49 +52,53 @@ namespace amf {
 using Property = std::pair<std::string, Bytes>;
 
 Bytes Number(double value);
-Bytes Text(uint8_t marker, int length_bytes, const std::string& text);
-inline const auto String = [](const std::string& text) { return Text(2, 2, text); };
-inline const auto LongString = [](const std::string& text) { return Text(12, 4, text); };
-/** With their end marker, without type marker. */
-Bytes Properties(const std::vector<Property>& properties);
-inline const auto Object = [](const std::vector<Property>& all) { return Concat({{3}, Properties(all)}); };
-/** `count` defaults to the number of properties. */
-Bytes EcmaArray(const std::vector<Property>& properties, std::optional<uint32_t> count = {});
+Bytes String(const std::string& text);
+Bytes LongString(const std::string& text);
+Bytes Object(const std::vector<Property>& properties);
+/** `count` defaults to the number of elements. */
 Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count = {});
 Bytes NumberArray(const std::vector<double>& numbers);
 /** The string "onMetaData" and an ECMA array. */
-inline const auto OnMetaData = [](const std::vector<Property>& properties) {
-    return Concat({String("onMetaData"), EcmaArray(properties)});
-};
+Bytes OnMetaData(const std::vector<Property>& properties);
 } // namespace amf
 
 /* Tag data (what follows the 11-byte tag header), codec header bytes included. */
 
-inline const auto VideoData = [](uint8_t frame_type, uint8_t codec, const Bytes& payload) {
-    return Concat({{static_cast<uint8_t>(frame_type << 4 | codec)}, payload});
-};
-inline const auto AudioData = [](uint8_t header, const Bytes& payload) { return Concat({{header}, payload}); };
-inline const auto AvcConfig = [](const Bytes& record) { return Concat({{0x17, 0, 0, 0, 0}, record}); };
-inline const auto AvcEnd = [] { return Bytes{0x17, 2, 0, 0, 0}; };
+inline Bytes AudioData(uint8_t header, const Bytes& payload)
+{
+    return Concat({{header}, payload});
+}
+inline Bytes VideoData(uint32_t frame_type, uint8_t codec, const Bytes& payload)
+{
+    return AudioData(static_cast<uint8_t>(frame_type << 4 | codec), payload);
+}
 Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms = 0, uint8_t packet_type = 1);
+inline Bytes AvcConfig(const Bytes& record)
+{
+    return AvcNalu(true, record, 0, 0);
+}
+inline Bytes AvcEnd()
+{
+    return AvcNalu(true, {}, 0, 2);
+}
 /* header: SoundFormat 10 with rate, size and type bits; 0xAF in every usual file. */
-inline const auto AacConfig = [](const Bytes& config, uint8_t header = 0xAF) { return Concat({{header, 0}, config}); };
-inline const auto AacRaw = [](const Bytes& payload, uint8_t header = 0xAF) { return Concat({{header, 1}, payload}); };
+inline Bytes AacConfig(const Bytes& config, uint8_t header = 0xAF)
+{
+    return Concat({{header, 0}, config});
+}
+inline Bytes AacRaw(const Bytes& payload, uint8_t header = 0xAF)
+{
+    return Concat({{header, 1}, payload});
+}
 
 /* Codec payloads, behind the codec header bytes. */
 
 /** AVCDecoderConfigurationRecord with the given parameter sets. */
 Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
 /** A record of one baseline parameter set, 320 x 240. */
-inline const auto SmallAvcRecord = [] {
-    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
-};
-/** A payload that begins so and goes on with noise. */
-inline const auto Filled = [](const Bytes& head, size_t size) {
-    return Concat({head, Noise(std::max(size, head.size()) - head.size())});
-};
+Bytes SmallAvcRecord();
 /** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
-inline const auto Mp3Frame = [](size_t size = 200) { return Filled({0xFF, 0xFB, 0x90, 0x64}, size); };
+Bytes Mp3Frame(size_t size = 200);
 /** Sorenson H.263 picture header; size_code 0 and 1 carry width and height, 2 to 6 a fixed size. */
 Bytes H263Picture(uint32_t size_code, uint32_t width = 0, uint32_t height = 0, size_t size = 200);
 /** VP6 intra picture of profile 3 showing columns x rows macroblocks; `adjust` is cropped from width, height. */
@@ -131,7 +141,7 @@ struct Tag {
     uint32_t stream() const { return type == 9 ? 1u : 2u; }
 };
 
-/* Tags of noise, and the configurations in front of them. */
+/* Tags of noise, and the configurations in front of them. The makers are objects: a test hands them on as they are. */
 
 inline const auto Screen = [](uint32_t ts, size_t size = 60) {
     return Tag{9, ts, VideoData(1, CODEC_SCREEN, Noise(size))};

@@ -1,6 +1,5 @@
 #include "session.h"
 
-#include <algorithm>
 #include <sstream>
 #include <tuple>
 
@@ -52,10 +51,10 @@ const std::vector<Place>& Places()
 
 bool IsListed(Op op, int32_t rc, int32_t code, int32_t line)
 {
-    const auto same = [&](const Place& place) {
-        return std::tie(place.op, place.rc, place.code, place.line) == std::tie(op, rc, code, line);
-    };
-    return std::any_of(Places().begin(), Places().end(), same);
+    for (const Place& place : Places())
+        if (std::tie(place.op, place.rc, place.code, place.line) == std::tie(op, rc, code, line))
+            return true;
+    return false;
 }
 
 Session::Session(FakeHost& host, const OpenOptions& options)
