@@ -68,11 +68,13 @@ int OpenDescriptor(const char* path, const char* mode)
     return -1;
 }
 
-size_t ReadAtLeast(int descriptor, void* buffer, size_t least, size_t most, bool* end)
+size_t ReadAtLeast(int descriptor, int64_t from, void* buffer, size_t least, size_t most, bool* end)
 {
     size_t done = 0;
     while (done < least) {
-        const ssize_t got = read(descriptor, static_cast<char*>(buffer) + done, most - done);
+        auto* const to = static_cast<char*>(buffer) + done;
+        const ssize_t got = from == FROM_HERE ? read(descriptor, to, most - done)
+                                              : pread(descriptor, to, most - done, from + static_cast<int64_t>(done));
         if (got < 0 && errno == EINTR)
             continue;
         if (got == 0)

@@ -29,7 +29,7 @@ struct PosixFiles {
 
     static size_t Read(Handle* file, void* buffer, size_t wanted)
     {
-        return flvd_host::ReadAtLeast(file->descriptor, buffer, wanted, wanted, &file->end);
+        return flvd_host::ReadAtLeast(file->descriptor, flvd_host::FROM_HERE, buffer, wanted, wanted, &file->end);
     }
 
     static size_t Write(Handle* file, const void* buffer, size_t count)

@@ -1,9 +1,8 @@
 // Host functions over POSIX descriptors with a window over each file.
 //
-// The position that the library sees is a number here; the descriptor is moved only in front of a read that does not go
-// on where it stands.
+// The position that the library sees is a number here; the descriptor moves by reading, and only where a read goes on.
 #ifndef _FILE_OFFSET_BITS
-#define _FILE_OFFSET_BITS 64 // lseek takes and gives 64 bits on 32-bit systems too
+#define _FILE_OFFSET_BITS 64 // pread and lseek take 64 bits on 32-bit systems too
 #endif
 
 #include "flvdmx/window_host.h"
@@ -19,9 +18,10 @@
 
 namespace {
 
-static_assert(sizeof(off_t) == sizeof(int64_t), "lseek must reach beyond 2 GiB");
+static_assert(sizeof(off_t) == sizeof(int64_t), "places beyond 2 GiB must be reached");
 
 constexpr size_t WINDOW = FLVD_WINDOW_HOST_SIZE;
+constexpr size_t BACK_POINTER = 4;
 
 struct WindowFile {
     int descriptor;
@@ -33,15 +33,12 @@ struct WindowFile {
     char window[WINDOW];
 };
 
-// Reads from a place of the file on.
+// Reads from a place of the file on, with one system call: where the descriptor stands elsewhere, it stays.
 size_t ReadAt(WindowFile* file, int64_t from, void* buffer, size_t least, size_t most)
 {
-    if (from != file->descriptor_at) {
-        if (lseek(file->descriptor, from, SEEK_SET) < 0)
-            return 0;
-        file->descriptor_at = from;
-    }
-    const size_t got = flvd_host::ReadAtLeast(file->descriptor, buffer, least, most, &file->end);
+    if (from != file->descriptor_at)
+        return flvd_host::ReadAtLeast(file->descriptor, from, buffer, least, most, &file->end);
+    const size_t got = flvd_host::ReadAtLeast(file->descriptor, flvd_host::FROM_HERE, buffer, least, most, &file->end);
     file->descriptor_at += static_cast<int64_t>(got);
     return got;
 }
@@ -85,7 +82,8 @@ struct WindowFiles {
 
     static int Close(Handle* file) { return flvd_host::CloseHandle(file); }
 
-    // What does not fit half a window goes straight to the library.
+    // What does not fit half a window goes straight to the library. So does the back-pointer behind a tag that is
+    // larger than the library's cache: it comes back to the tag, and finds the window there.
     static size_t Read(Handle* file, void* buffer, size_t wanted)
     {
         auto* const to = static_cast<char*>(buffer);
@@ -93,7 +91,8 @@ struct WindowFiles {
         const size_t rest = wanted - done;
         if (rest == 0)
             return done;
-        if (rest < WINDOW / 2) {
+        const bool behind = wanted <= BACK_POINTER && file->position > file->start;
+        if (rest < WINDOW / 2 && !behind) {
             MoveWindow(file, rest);
             return done + TakeFromWindow(file, to + done, rest);
         }
