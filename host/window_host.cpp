@@ -91,7 +91,7 @@ struct WindowFiles {
         const size_t rest = wanted - done;
         if (rest == 0)
             return done;
-        const bool behind = wanted <= BACK_POINTER && file->position > file->start;
+        const bool behind = wanted <= BACK_POINTER && file->position > file->start + static_cast<int64_t>(file->count);
         if (rest < WINDOW / 2 && !behind) {
             MoveWindow(file, rest);
             return done + TakeFromWindow(file, to + done, rest);
