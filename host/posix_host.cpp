@@ -20,7 +20,9 @@ static_assert(sizeof(off_t) == sizeof(int64_t), "lseek must reach beyond 2 GiB")
 struct PosixFiles {
     struct Handle {
         int descriptor;
-        bool end; // a read met the end of the file and no seek followed
+        bool end;         // a read met the end of the file and no seek followed
+        bool known;       // `position` is: the library asks twice a frame, and a system call costs more than a frame
+        int64_t position; // of the descriptor, counted since it was last told
     };
 
     static Handle* Open(const char* path, const char* mode) { return flvd_host::OpenHandle<Handle>(path, mode); }
@@ -29,11 +31,15 @@ struct PosixFiles {
 
     static size_t Read(Handle* file, void* buffer, size_t wanted)
     {
-        return flvd_host::ReadAtLeast(file->descriptor, flvd_host::FROM_HERE, buffer, wanted, wanted, &file->end);
+        const size_t got =
+            flvd_host::ReadAtLeast(file->descriptor, flvd_host::FROM_HERE, buffer, wanted, wanted, &file->end);
+        file->position += static_cast<int64_t>(got);
+        return got;
     }
 
     static size_t Write(Handle* file, const void* buffer, size_t count)
     {
+        file->known = false; // a file that is appended to is written at its end
         size_t done = 0;
         while (done < count) {
             const ssize_t put = write(file->descriptor, static_cast<const char*>(buffer) + done, count - done);
@@ -48,15 +54,27 @@ struct PosixFiles {
 
     static int Seek(Handle* file, int64_t offset, int whence)
     {
-        if (lseek(file->descriptor, offset, whence) < 0)
+        if (!Place(file, offset, whence))
             return -1;
         file->end = false;
         return 0;
     }
 
-    static int64_t Tell(Handle* file) { return lseek(file->descriptor, 0, SEEK_CUR); }
+    static int64_t Tell(Handle* file) { return file->known || Place(file, 0, SEEK_CUR) ? file->position : -1; }
     static bool AtEnd(const Handle* file) { return file->end; }
     static int Flush(Handle*) { return 0; } // nothing waits here
+
+private:
+    // Moves the descriptor. False when it cannot stand there, or nowhere, as that of a pipe: it is where it was.
+    static bool Place(Handle* file, int64_t offset, int whence)
+    {
+        const int64_t position = lseek(file->descriptor, offset, whence);
+        if (position < 0)
+            return false;
+        file->position = position;
+        file->known = true;
+        return true;
+    }
 };
 
 } // namespace

@@ -28,6 +28,7 @@ struct WindowFile {
     bool end;              // a read met the end of the file and no seek followed
     int64_t position;      // what the library sees
     int64_t descriptor_at; // where the descriptor stands
+    int64_t file_end;      // where it was when the library last asked for it
     int64_t start;         // of the window in the file
     size_t count;          // bytes in it
     char window[WINDOW];
@@ -56,16 +57,24 @@ size_t TakeFromWindow(WindowFile* file, char* buffer, size_t wanted)
     return n;
 }
 
-// Puts the window where the position is, at its start, or in its middle when it lies before the old window: the library
-// steps backward too. At least `wanted` bytes, fewer than half a window, are there behind the position unless the file
-// ends.
+// True where the library steps backward: before the window, and from the end of the file.
+bool IsWayBack(const WindowFile* file)
+{
+    const int64_t left = file->file_end - file->position;
+    return file->position < file->start || (left > 0 && left < static_cast<int64_t>(WINDOW / 2));
+}
+
+// Puts the window where the position is, at its start, or in its middle on a way back. At least `wanted` bytes, fewer
+// than half a window, are there behind the position unless the file ends; where nothing is, the window stays.
 void MoveWindow(WindowFile* file, size_t wanted)
 {
-    const bool back = file->position < file->start;
-    const int64_t before = back ? std::min(file->position, static_cast<int64_t>(WINDOW / 2)) : 0;
-    file->count = 0;
-    file->start = file->position - before;
-    file->count = ReadAt(file, file->start, file->window, static_cast<size_t>(before) + wanted, WINDOW);
+    const int64_t before = IsWayBack(file) ? std::min(file->position, static_cast<int64_t>(WINDOW / 2)) : 0;
+    const int64_t start = file->position - before;
+    const size_t got = ReadAt(file, start, file->window, static_cast<size_t>(before) + wanted, WINDOW);
+    if (got == 0)
+        return;
+    file->start = start;
+    file->count = got;
 }
 
 struct WindowFiles {
@@ -109,6 +118,7 @@ struct WindowFiles {
             if (base < 0)
                 return -1;
             file->descriptor_at = base;
+            file->file_end = base;
         }
         const int64_t target = flvd_host::Target(base, offset);
         if (target < 0)

@@ -126,6 +126,18 @@ TEST_P(FileHost, FillsARequestFromAPipe)
     writer.join();
 }
 
+// Appending moves the position to behind what was written, wherever it was.
+TEST_P(FileHost, TellsWhereAnAppendEnded)
+{
+    t.file_close(handle);
+    handle = t.file_open(file.c_str(), GetParam() == "window" ? "rb" : "a+b"); // a window only reads
+    ASSERT_EQ(t.file_seek64(handle, 100, 0), 0);
+    EXPECT_EQ(read(5), bytes.substr(100, 5));
+    const uint32_t put = t.file_write("more", 1, 4, handle);
+    EXPECT_EQ(put, GetParam() == "window" ? 0 : 4);
+    EXPECT_EQ(t.file_tell64(handle), put == 0 ? 105 : SIZE + 4);
+}
+
 INSTANTIATE_TEST_SUITE_P(Kit, FileHost, testing::Values("stdio", "posix", "window"));
 INSTANTIATE_TEST_SUITE_P(Kit, Host, testing::Values("stdio", "posix", "window", "memory"));
 
