@@ -37,6 +37,19 @@ inline int64_t Target(int64_t base, int64_t offset)
     return offset <= INT64_MAX - base && base + offset >= 0 ? base + offset : -1; // base is no negative number
 }
 
+/**
+ * Where a file stands, counted from what the system said last: the library asks twice a frame, and the system takes
+ * longer to answer than the library for the frame. Zeroed, it is not known.
+ */
+struct CountedPosition {
+    bool known;
+    int64_t at;
+
+    void Learn(int64_t told) { *this = {told >= 0, told}; }
+    void Forget() { known = false; }
+    void Pass(size_t bytes) { at += static_cast<int64_t>(bytes); }
+};
+
 /** Zeroed memory for a handle of a trivial type, or null. */
 template <typename Handle> Handle* NewHandle()
 {

@@ -20,9 +20,8 @@ static_assert(sizeof(off_t) == sizeof(int64_t), "lseek must reach beyond 2 GiB")
 struct PosixFiles {
     struct Handle {
         int descriptor;
-        bool end;         // a read met the end of the file and no seek followed
-        bool known;       // `position` is: the library asks twice a frame, and a system call costs more than a frame
-        int64_t position; // of the descriptor, counted since it was last told
+        bool end; // a read met the end of the file and no seek followed
+        flvd_host::CountedPosition position;
     };
 
     static Handle* Open(const char* path, const char* mode) { return flvd_host::OpenHandle<Handle>(path, mode); }
@@ -33,13 +32,13 @@ struct PosixFiles {
     {
         const size_t got =
             flvd_host::ReadAtLeast(file->descriptor, flvd_host::FROM_HERE, buffer, wanted, wanted, &file->end);
-        file->position += static_cast<int64_t>(got);
+        file->position.Pass(got);
         return got;
     }
 
     static size_t Write(Handle* file, const void* buffer, size_t count)
     {
-        file->known = false; // a file that is appended to is written at its end
+        file->position.Forget(); // a file that is appended to is written at its end
         size_t done = 0;
         while (done < count) {
             const ssize_t put = write(file->descriptor, static_cast<const char*>(buffer) + done, count - done);
@@ -54,27 +53,23 @@ struct PosixFiles {
 
     static int Seek(Handle* file, int64_t offset, int whence)
     {
-        if (!Place(file, offset, whence))
+        const int64_t position = lseek(file->descriptor, offset, whence);
+        if (position < 0)
             return -1;
+        file->position.Learn(position);
         file->end = false;
         return 0;
     }
 
-    static int64_t Tell(Handle* file) { return file->known || Place(file, 0, SEEK_CUR) ? file->position : -1; }
+    static int64_t Tell(Handle* file)
+    {
+        if (!file->position.known)
+            file->position.Learn(lseek(file->descriptor, 0, SEEK_CUR));
+        return file->position.at;
+    }
+
     static bool AtEnd(const Handle* file) { return file->end; }
     static int Flush(Handle*) { return 0; } // nothing waits here
-
-private:
-    // Moves the descriptor. False when it cannot stand there, or nowhere, as that of a pipe: it is where it was.
-    static bool Place(Handle* file, int64_t offset, int whence)
-    {
-        const int64_t position = lseek(file->descriptor, offset, whence);
-        if (position < 0)
-            return false;
-        file->position = position;
-        file->known = true;
-        return true;
-    }
 };
 
 } // namespace

@@ -25,20 +25,26 @@ bool IsDirectory(std::FILE* file)
 }
 
 struct StdioFiles {
-    using Handle = std::FILE;
+    struct Handle {
+        std::FILE* stream;
+        flvd_host::CountedPosition position;
+    };
 
     static Handle* Open(const char* path, const char* mode)
     {
-        std::FILE* const file = std::fopen(path, mode);
-        flvd_host::SetOpenError(file == nullptr ? errno : 0);
-        if (file == nullptr)
+        std::FILE* const stream = std::fopen(path, mode);
+        flvd_host::SetOpenError(stream == nullptr ? errno : 0);
+        if (stream == nullptr)
             return nullptr;
-        if (IsDirectory(file)) {
-            std::fclose(file);
-            flvd_host::SetOpenError(EISDIR);
+        const bool directory = IsDirectory(stream);
+        auto* const file = directory ? nullptr : flvd_host::NewHandle<Handle>();
+        if (file == nullptr) {
+            flvd_host::SetOpenError(directory ? EISDIR : ENOMEM);
+            std::fclose(stream);
             return nullptr;
         }
-        std::setvbuf(file, nullptr, _IONBF, 0);
+        std::setvbuf(stream, nullptr, _IONBF, 0);
+        file->stream = stream;
         return file;
     }
 
@@ -48,20 +54,43 @@ struct StdioFiles {
         size_t done = 0;
         while (done < wanted) {
             errno = 0;
-            done += std::fread(static_cast<char*>(buffer) + done, 1, wanted - done, file);
+            done += std::fread(static_cast<char*>(buffer) + done, 1, wanted - done, file->stream);
             if (done < wanted && errno != EINTR)
                 break;
-            std::clearerr(file);
+            std::clearerr(file->stream);
         }
+        file->position.Pass(done);
         return done;
     }
 
-    static size_t Write(Handle* file, const void* buffer, size_t count) { return std::fwrite(buffer, 1, count, file); }
-    static int Seek(Handle* file, int64_t offset, int whence) { return fseeko(file, offset, whence); }
-    static int64_t Tell(Handle* file) { return ftello(file); }
-    static bool AtEnd(const Handle* file) { return std::feof(const_cast<Handle*>(file)) != 0; }
-    static int Flush(Handle* file) { return std::fflush(file); }
-    static int Close(Handle* file) { return std::fclose(file); }
+    static size_t Write(Handle* file, const void* buffer, size_t count)
+    {
+        file->position.Forget(); // a file that is appended to is written at its end
+        return std::fwrite(buffer, 1, count, file->stream);
+    }
+
+    static int Seek(Handle* file, int64_t offset, int whence)
+    {
+        file->position.Forget();
+        return fseeko(file->stream, offset, whence);
+    }
+
+    static int64_t Tell(Handle* file)
+    {
+        if (!file->position.known)
+            file->position.Learn(ftello(file->stream));
+        return file->position.at;
+    }
+
+    static bool AtEnd(const Handle* file) { return std::feof(file->stream) != 0; }
+    static int Flush(Handle* file) { return std::fflush(file->stream); }
+
+    static int Close(Handle* file)
+    {
+        std::FILE* const stream = file->stream;
+        std::free(file);
+        return std::fclose(stream);
+    }
 };
 
 } // namespace

@@ -79,7 +79,7 @@ uint32_t FLVD_SpsByte(int32_t index)
 
 // The next bits, from four bytes: 25 of them are exact at any position, low bits may be 0. In the second case at least
 // the fourth byte is behind the end, and reads as 0.
-uint32_t FLVD_SpsWindow()
+inline uint32_t FLVD_SpsWindow()
 {
     const int32_t byte = g_flvd_spsBits.bit_pos >> 3;
     const uint32_t window = byte <= g_flvd_spsSize - 4

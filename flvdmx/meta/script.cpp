@@ -147,21 +147,21 @@ double FLVD_SlotNumber(const flvd_script_state_t* state)
 
 // Reading. Each function fails when fewer bytes are left, and counts what it consumed.
 
-const uint8_t* FLVD_ScriptPeek(flvd_ctx_t* ctx, uint32_t n)
+inline const uint8_t* FLVD_ScriptPeek(flvd_ctx_t* ctx, uint32_t n)
 {
     const uint8_t* bytes = nullptr;
     return FLVD_FioPeek(&bytes, n, ctx->cur_reader) == n ? bytes : nullptr;
 }
 
 // Consumes peeked bytes; they stay in the cache.
-void FLVD_ScriptConsume(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
+inline void FLVD_ScriptConsume(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
 {
     FLVD_FioDropBits(ctx->cur_reader);
     FLVD_FioConsume(ctx->cur_reader, n);
     state->consumed += n;
 }
 
-const uint8_t* FLVD_ScriptTake(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
+inline const uint8_t* FLVD_ScriptTake(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
 {
     const uint8_t* const bytes = FLVD_ScriptPeek(ctx, n);
     if (bytes != nullptr)

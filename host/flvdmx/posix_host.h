@@ -1,6 +1,7 @@
 /*
- * Host over POSIX descriptors: open, read, lseek, close. One system call for each call of the library, nothing cached
- * beside the library's own cache: what a file holds now is what is read, which suits files that are being written.
+ * Host over POSIX descriptors: open, read, lseek, close. One system call for each read and seek of the library, nothing
+ * cached beside the library's own cache: what a file holds now is what is read, which suits files that are being
+ * written.
  *
  * Usable from C11 and C++17; link flvdmx-host, which needs the C library alone.
  */
