@@ -106,10 +106,10 @@ def cost_rows(cost):
         met = paid["reads"] <= 10 and paid["bytes"] <= 12 * 1024
         yield row(f"open `{medium}`", "≤ 10 reads, 12 KiB", f"{paid['reads']} reads, {paid['bytes']} bytes", met)
     for name in HOSTILE:
-        paid = cost[name]
-        met = paid["open"]["seconds"] <= 2 and paid.get("request", {}).get("seconds", 0) <= 3
-        figures = f"{paid['open']['seconds']:.2f} s, {paid.get('request', {}).get('seconds', 0):.2f} s"
-        yield row(f"`{name}`: processor time of opening, of the longest request", "≤ 2 s, ≤ 3 s", figures, met)
+        for host, paid in (("C streams", cost[name]), ("window", cost[name]["window"])):
+            opening, request = (paid.get(what, {}).get("seconds", 0) for what in ("open", "request"))
+            what = f"`{name}`, {host}: processor time of opening, of the longest request"
+            yield row(what, "≤ 2 s, ≤ 3 s", f"{opening:.2f} s, {request:.2f} s", opening <= 2 and request <= 3)
 
 
 def figure_rows(figures, bounds, unit):
