@@ -1,10 +1,9 @@
 #!/usr/bin/env python3
-"""Instructions of the library itself, host and C library left out: instructions.py PROGRAM SAMPLE FOLDER [--json].
+"""Instructions of the library itself, host and C library left out: instructions.py PROGRAM SAMPLE FOLDER.
 
 Fails when one of the bounds is passed. PROGRAM is flvdmx-own, SAMPLE the file whose open is counted.
 """
 
-import json
 import os
 import subprocess
 import sys
@@ -58,7 +57,8 @@ def count(program, path, function, folder):
     return own_instructions(profile), int(done.stdout)
 
 
-def measure(program, sample, folder):
+def measure(program, opens, folder):
+    """Instructions of a small frame, a large frame, and of the open of each of the files, by name."""
     os.makedirs(folder, exist_ok=True)
     figures = {}
     for name, frames, size in (("small", SMALL_FRAMES, SMALL_SIZE), ("large", LARGE_FRAMES, LARGE_SIZE)):
@@ -68,15 +68,14 @@ def measure(program, sample, folder):
         if played != frames:
             sys.exit(f"{name}: {played} frames played of {frames}")
         figures[name + " frame"] = round(total / frames, 1)
-    figures["open"], _ = count(program, sample, "OpenFile", folder)
+    for name, path in opens.items():
+        figures[name], _ = count(program, path, "OpenFile", folder)
     return figures
 
 
 def main():
-    figures = measure(*sys.argv[1:4])
-    if "--json" in sys.argv:
-        print(json.dumps(figures))
-        return
+    program, sample, folder = sys.argv[1:4]
+    figures = measure(program, {"open": sample}, folder)
     for name, figure in figures.items():
         print(f"{name}: {figure} instructions, at most {BOUNDS[name]}")
     if any(not 0 < figure <= BOUNDS[name] for name, figure in figures.items()):
