@@ -1,13 +1,11 @@
-#!/usr/bin/env python3
 """`flvdmx extract`: what comes out has once been decoded to the same pictures and sound by an independent decoder."""
 import hashlib
 import os
 import pty
 import subprocess
 import time
-import unittest
 
-from tool_test import DATA, SAMPLES, TOOL, Case, Expected, run, sample, sample_bytes, split_tags
+from tool_test import DATA, SAMPLES, TOOL, WARNINGS, Case, Expected, sample, sample_bytes, split_tags
 
 HASHES = {tuple(names): sha for *names, sha in map(str.split, (DATA / "expected" / "extract.txt").open())}
 START = b"\0\0\0\1"
@@ -30,12 +28,10 @@ def sha(path):
 
 
 class Extract(Case):
-    def extract(self, data, *arguments, stderr="", code=0):
+    def extract(self, data, **outcome):
         path = self.write("in.flv", data)
-        result = run("extract", path, "-o", path.parent / "out", *arguments)
-        self.assertEqual(result.returncode, code, result.stderr)
-        self.assertRegex(result.stderr, stderr or r"\A\Z")
-        return (path.parent / "out").read_bytes() if code == 0 else path.parent / "out"
+        self.tool("extract", path, "-o", path.parent / "out", **outcome)
+        return path.parent / "out"
 
     def test_every_sample(self):
         for name in SAMPLES:
@@ -44,10 +40,9 @@ class Extract(Case):
             folder = self.write("base", b"").parent
             for out, base in (("a", "a.{}" if len(codecs) > 1 else "a"), (".", name + ".{}")):
                 with self.subTest(name=name, out=out):
-                    result = run("extract", sample(name), "-o", folder / out)
-                    self.assertEqual((result.returncode, result.stdout), (0, ""))
-                    raw = [kind for kind in codecs if extensions[kind] == kind]
-                    self.assertEqual(result.stderr.count(" is written raw"), len(raw))
+                    raw = ".* is written raw.*\n" * sum(extensions[kind] == kind for kind in codecs)
+                    told = WARNINGS.get(name, raw)
+                    self.assertEqual(self.tool("extract", sample(name), "-o", folder / out, stderr=told), "")
                     for kind, extension in extensions.items():
                         self.assertEqual(sha(folder / base.format(extension)), HASHES[name, kind])
 
@@ -81,10 +76,10 @@ class Extract(Case):
                     lengths = b"".join(len(unit).to_bytes(size, "big") + unit for unit in units)
                     made.append(retag(tag, tag[11:16] + lengths + damage.get(i, b"")))
                     wanted += b"".join(START + unit for unit in units)
-                stderr = "configuration is damaged; the one before" if 5 in changes else ""
+                stderr = ".*configuration is damaged; the one before.*\n" if 5 in changes else ""
                 if damage:
-                    stderr = f"NAL units that do not fit their frame in {len(damage)} frames, .* at byte {place}, "
-                self.assertEqual(self.extract(b"".join(made), stderr=stderr), wanted)
+                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames.* at byte {place}, .*\n"
+                self.assertEqual(self.extract(b"".join(made), stderr=stderr).read_bytes(), wanted)
 
     def test_refused(self):
         data = sample_bytes("aac_only")
@@ -92,20 +87,17 @@ class Extract(Case):
         for bits, words in ((0x2A88, "object type 21 cannot"),  # the core of HE-AAC
                             (0x1788, "explicit sampling frequency"), (0x1688, "frequency index 13"),
                             (0x1280, "configuration 0 cannot")):
-            with self.subTest(bits):
-                changed = data[:config] + bits.to_bytes(2, "big") + data[config + 2:]
-                self.assertFalse(self.extract(changed, stderr=words, code=1).exists())
+            changed = data[:config] + bits.to_bytes(2, "big") + data[config + 2:]
+            self.assertFalse(self.extract(changed, code=1, stderr=f".*{words}.*\n").exists())
 
     def test_output_that_cannot_be_written(self):
         copy = self.write("copy.flv", sample_bytes("aac_only"))
         for command in ("extract", "plot"):
             for out, words in ((copy.parent / "none" / "out", "none/out: No such file"), ("/dev/full", "No space left"),
                                (copy, "is the file to be read")):
-                result = run(command, copy, "-o", out)
-                self.assertEqual((result.returncode, len(result.stderr.splitlines())), (1, 1))
-                self.assertIn(words, result.stderr)
+                self.tool(command, copy, "-o", out, code=1, stderr=f".*{words}.*\n")
         self.assertEqual(copy.read_bytes(), sample_bytes("aac_only"))
-        self.assertEqual(run("extract", "--stream", "video", copy, "-o", copy.parent / "x").returncode, 1)
+        self.tool("extract", "--stream", "video", copy, "-o", copy.parent / "x", code=1, stderr=".+\n")
 
     def test_bar_appears_after_a_second(self):
         folder = self.write("any", b"").parent
@@ -118,7 +110,3 @@ class Extract(Case):
             shown = self.shown(terminal)
         self.assertEqual(process.returncode, 0)
         self.assertRegex(shown, rb"\A\r\x1b\[K\S+aac_only.flv \[#* *\] +\d+%.*\r\x1b\[K\Z")
-
-
-if __name__ == "__main__":
-    unittest.main()

@@ -1,10 +1,8 @@
-#!/usr/bin/env python3
 """`flvdmx plot`: the drawing read back."""
 import re
-import unittest
 import xml.etree.ElementTree
 
-from tool_test import APART, SAMPLES, Case, Expected, run, sample_bytes, split_tags
+from tool_test import APART, SAMPLES, Case, Expected, sample_bytes, split_tags
 
 SVG = "{http://www.w3.org/2000/svg}"
 UNITS = {"bit/s": 1, "kbit/s": 1e3, "Mbit/s": 1e6}
@@ -14,8 +12,7 @@ LEFT, WIDTH = 90, 920  # of the diagrams
 class Plot(Case):
     def plot(self, name, data):
         path = self.write(name, data)
-        result = run("plot", path, "-o", path.parent / "out.svg")
-        self.assertEqual((result.returncode, result.stdout), (0, ""))
+        self.assertEqual(self.tool("plot", path, "-o", path.parent / "out.svg"), "")
         text = (path.parent / "out.svg").read_text()
         self.assertNotRegex(text, r"\b(nan|inf)\b")
         return xml.etree.ElementTree.fromstring(text)
@@ -23,8 +20,7 @@ class Plot(Case):
     @staticmethod
     def of(root, kind):
         """The texts or paths of a class."""
-        found = [e.text or e.get("d") for e in root.iter() if e.get("class") == kind]
-        return [content for content in found if content]
+        return [content for e in root.iter() if e.get("class") == kind and (content := e.text or e.get("d"))]
 
     def bits(self, root, kind, seconds):
         """The area under a line, by the labels of its axis."""
@@ -77,7 +73,3 @@ class Plot(Case):
     def test_any_name(self):
         root = self.plot("a<b>&\"c\udcff.flv", sample_bytes("aac_only"))
         self.assertEqual(self.of(root, "title")[0], 'a<b>&"c\ufffd.flv')
-
-
-if __name__ == "__main__":
-    unittest.main()
