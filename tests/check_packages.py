@@ -9,22 +9,20 @@ import sys
 import tempfile
 
 cpack, build, version, triplet = sys.argv[1:]
+HOSTS = ("memory", "posix", "stdio", "window")
 ARCHITECTURES = {"x86_64-linux-gnu": "amd64", "arm-linux-gnueabihf": "armhf"}
-LIB = f"usr/lib/{triplet}"
-DEV = "usr/include/flvdmx"
-DOC = "usr/share/doc/flvdmx"
+LIB, DEV, DOC = f"usr/lib/{triplet}", "usr/include/flvdmx", "usr/share/doc/flvdmx"
 EXPECTED = {
     "libflvdmx1": ("libs", "same", {"libc6"}, {f"{LIB}/libflvdmx.so.1", f"{LIB}/libflvdmx.so.1.0.0"}),
     "libflvdmx-dev": ("libdevel", "same", {f"libflvdmx1 (= {version}-1)"}, {
-        f"{DEV}/flvdmx.h", f"{DEV}/flvdmx.hpp", f"{DEV}/memory_host.h", f"{DEV}/posix_host.h", f"{DEV}/stdio_host.h",
-        f"{DEV}/window_host.h", f"{LIB}/libflvdmx.so", f"{LIB}/libflvdmx-host.a", f"{LIB}/pkgconfig/flvdmx.pc",
-        f"{LIB}/pkgconfig/flvdmx-host.pc", f"{LIB}/cmake/flvdmx/flvdmxConfig.cmake",
-        f"{LIB}/cmake/flvdmx/flvdmxConfigVersion.cmake", f"{LIB}/cmake/flvdmx/flvdmxTargets.cmake",
-        f"{LIB}/cmake/flvdmx/flvdmxTargets-release.cmake", "usr/share/man/man3/QVX_FLV_DMX.3.gz",
+        f"{DEV}/flvdmx.h", f"{DEV}/flvdmx.hpp", *(f"{DEV}/{name}_host.h" for name in HOSTS), f"{LIB}/libflvdmx.so",
+        f"{LIB}/libflvdmx-host.a", *(f"{LIB}/pkgconfig/{name}.pc" for name in ("flvdmx", "flvdmx-host")),
+        *(f"{LIB}/cmake/flvdmx/flvdmx{name}.cmake" for name in (
+            "Config", "ConfigVersion", "Targets", "Targets-release")), "usr/share/man/man3/QVX_FLV_DMX.3.gz",
         *(f"{DOC}/docs/{name}.md" for name in ("host-guide", "damage")),
         *(f"{DOC}/examples/{name}" for name in ("list.c", "copy_frames.c", "seek.cpp")),
-        *(f"{DOC}/host/{name}" for name in ("adapter.h", "descriptor.h", "descriptor.cpp", "memory_host.cpp",
-                                            "posix_host.cpp", "stdio_host.cpp", "window_host.cpp"))}),
+        *(f"{DOC}/host/{name}" for name in ("adapter.h", "descriptor.h", "descriptor.cpp")),
+        *(f"{DOC}/host/{name}_host.cpp" for name in HOSTS)}),
     "flvdmx-tools": ("video", "foreign", {f"libflvdmx1 (>= {version})", "libc6", "libstdc++6"}, {
         "usr/bin/flvdmx", "usr/share/man/man1/flvdmx.1.gz", "usr/share/bash-completion/completions/flvdmx"}),
 }

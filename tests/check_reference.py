@@ -12,13 +12,9 @@ import xml.etree.ElementTree
 doxygen, doxyfile, output = sys.argv[1:]
 subprocess.run([doxygen, doxyfile], check=True, env={**os.environ, "FLVDMX_DOCS": output, "FLVDMX_VERSION": ""})
 
-count = 0
-undocumented = []
-for path in pathlib.Path(output, "xml").glob("*.xml"):
-    for value in xml.etree.ElementTree.parse(path).iter("enumvalue"):
-        count += 1
-        texts = [value.find(tag) for tag in ("briefdescription", "detaileddescription")]
-        if not any("".join(text.itertext()).strip() for text in texts):
-            undocumented.append(value.findtext("name"))
-assert count > 50, count  # there are enumerators to look at
+values = [value for path in pathlib.Path(output, "xml").glob("*.xml")
+          for value in xml.etree.ElementTree.parse(path).iter("enumvalue")]
+assert len(values) > 50, len(values)  # there are enumerators to look at
+undocumented = [value.findtext("name") for value in values if not any(
+    "".join(value.find(tag).itertext()).strip() for tag in ("briefdescription", "detaileddescription"))]
 assert not undocumented, undocumented

@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
 """Compares what the library exports and imports with what it is allowed to.
 
-usage: check_symbols.py --nm NM --readelf READELF --header HEADER --map MAP --absent TEXT LIBRARY
+usage: check_symbols.py NM READELF HEADER MAP ABSENT LIBRARY
 
 Exports: the names in the version script, which must be the FLVD_API declarations of the public header.
 Imports: the memory functions that a compiler may call on its own, and the toolchain's start-up symbols.
@@ -14,37 +14,35 @@ import sys
 
 from differences import differences
 
-*words, library = sys.argv[1:]
-options = dict(zip(words[::2], words[1::2]))
+nm, readelf, header, version_script, absent, library = sys.argv[1:]
 SONAME, LIBC = ("SONAME", "libflvdmx.so.1"), ("NEEDED", "libc.so.6")
 ALLOWED_IMPORTS = {"memcpy", "memmove", "memset", "memcmp", "__cxa_finalize", "__gmon_start__",
                    "_ITM_deregisterTMCloneTable", "_ITM_registerTMCloneTable"}
 
 
 def output(program, *arguments):
-    command = [options[program], *arguments, library]
-    return subprocess.run(command, check=True, stdout=subprocess.PIPE, text=True).stdout
+    return subprocess.run([program, *arguments, library], check=True, stdout=subprocess.PIPE, text=True).stdout
 
 
-def read(option):
-    return re.sub(r"/\*.*?\*/", " ", pathlib.Path(options[option]).read_text(encoding="utf-8"), flags=re.DOTALL)
+def read(path):
+    return re.sub(r"/\*.*?\*/", " ", pathlib.Path(path).read_text(encoding="utf-8"), flags=re.DOTALL)
 
 
 def symbols(which):
-    return [line.split()[-1].split("@")[0] for line in output("--nm", "-D", which).splitlines()]
+    return [line.split()[-1].split("@")[0] for line in output(nm, "-D", which).splitlines()]
 
 
 # The identifier before the parameter list, or the last one of a variable.
-declarations = re.findall(r"^FLVD_API\b([^;]*);", read("--header"), re.M)
+declarations = re.findall(r"^FLVD_API\b([^;]*);", read(header), re.M)
 declared = [re.findall(r"\w+", text.split("(")[0])[-1] for text in declarations]
-script = re.findall(r"(\w+)\s*;", re.search(r"global:(.*)local:\s*\*\s*;", read("--map"), re.DOTALL)[1])
+script = re.findall(r"(\w+)\s*;", re.search(r"global:(.*)local:\s*\*\s*;", read(version_script), re.DOTALL)[1])
 exports, imports = symbols("--defined-only"), symbols("--undefined-only")
-dynamic = re.findall(r"\((NEEDED|SONAME|RPATH|RUNPATH)\).*\[(.*)\]", output("--readelf", "-W", "-d"))
+dynamic = re.findall(r"\((NEEDED|SONAME|RPATH|RUNPATH)\).*\[(.*)\]", output(readelf, "-W", "-d"))
 
 faults = differences("version script", script, declared) + differences("exports", exports, script)
 faults += differences("imports", ALLOWED_IMPORTS | set(imports), ALLOWED_IMPORTS)
 faults += differences("dynamic section", {LIBC, *dynamic}, {LIBC, SONAME})
-if options["--absent"].encode() in pathlib.Path(library).read_bytes():
-    faults.append(f"{options['--absent']} stands in the library")
+if absent.encode() in pathlib.Path(library).read_bytes():
+    faults.append(f"{absent} stands in the library")
 print(*faults, f"{len(exports)} exports, {len(imports)} imports, {len(faults)} faults", sep="\n")
 sys.exit(1 if faults or not exports else 0)
