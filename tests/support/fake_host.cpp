@@ -1,10 +1,8 @@
 #include "fake_host.h"
 
-#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <tuple>
 
 namespace flvd_test {
 
@@ -81,11 +79,6 @@ fio_funcs_t FakeHost::funcs() const
     return table;
 }
 
-void FakeHost::start_log(bool memory)
-{
-    std::tie(m_logging, m_log_memory, m_log) = std::tuple(true, memory, "");
-}
-
 // Counts the call. False: it has to fail.
 bool FakeHost::begin(HostFn fn)
 {
@@ -101,8 +94,7 @@ bool FakeHost::begin(HostFn fn)
 uint32_t FakeHost::limited(HostFn fn, uint32_t count) const
 {
     const auto& [nth, bytes] = m_faults.shortened[index(fn)];
-    count = nth == calls(fn) ? std::min(count, bytes) : count;
-    return fn == HostFn::Read ? std::min(count, m_faults.read_limit) : count;
+    return nth == calls(fn) || nth == EACH ? std::min(count, bytes) : count;
 }
 
 void FakeHost::log(bool wanted, const char* name, const std::string& arguments, const std::string& result)
@@ -113,9 +105,9 @@ void FakeHost::log(bool wanted, const char* name, const std::string& arguments, 
 
 FakeHost::Handle& FakeHost::handle(void* pointer)
 {
-    for (auto handle = m_handles.rbegin(); handle != m_handles.rend(); ++handle) // the newest are in use
-        if (handle->get() == pointer && (*handle)->open)
-            return **handle;
+    const auto handle = m_handles.find(pointer);
+    if (handle != m_handles.end())
+        return handle->second;
     violation("use of a handle that is not open");
     return m_none;
 }
@@ -123,15 +115,15 @@ FakeHost::Handle& FakeHost::handle(void* pointer)
 // Memory that begins in one of the blocks has to end in it. Memory of others is not known here.
 void FakeHost::check_range(const char* what, const void* pointer, uint32_t count)
 {
-    const uint8_t* const begin = static_cast<const uint8_t*>(pointer);
-    auto block = m_blocks.upper_bound(begin);
-    if (block == m_blocks.begin())
+    const auto* const begin = static_cast<const uint8_t*>(pointer);
+    const auto behind = m_blocks.upper_bound(begin);
+    if (behind == m_blocks.begin())
         return;
-    --block;
-    const size_t offset = static_cast<size_t>(begin - block->first);
-    if (offset < block->second && count > block->second - offset)
+    const auto& [block, size] = *std::prev(behind);
+    const auto offset = static_cast<size_t>(begin - block);
+    if (offset < size && count > size - offset)
         violation(std::string(what) + " " + std::to_string(count) + " bytes at " + std::to_string(offset) + " of " +
-                  std::to_string(block->second));
+                  std::to_string(size));
 }
 
 void* FakeHost::alloc(uint32_t size)
@@ -195,15 +187,16 @@ void* FakeHost::open(const char* path, const char* mode)
     const auto file = m_files.find(path);
     if (!logged("open", std::string(path) + "," + mode, allowed && file != m_files.end()))
         return nullptr;
-    m_handles.push_back(std::make_unique<Handle>(Handle{file->second}));
-    ++m_open_handles;
-    return m_handles.back().get();
+    void* const pointer = &m_pointers.emplace_back();
+    m_handles[pointer].file = file->second;
+    return pointer;
 }
 
 int32_t FakeHost::close(void* pointer)
 {
     begin(HostFn::Close);
-    m_open_handles -= std::exchange(handle(pointer).open, false) ? 1u : 0u;
+    handle(pointer);
+    m_handles.erase(pointer);
     return logged("close", "", 0);
 }
 

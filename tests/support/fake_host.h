@@ -15,6 +15,7 @@
 
 #include <algorithm>
 #include <array>
+#include <deque>
 #include <functional>
 #include <map>
 #include <memory>
@@ -80,7 +81,7 @@ public:
     /** The nth read or write moves at most k bytes. */
     void shorten_nth(HostFn fn, uint64_t n, uint32_t k) { m_faults.shortened[index(fn)] = {n, k}; }
     /** Every read moves at most k bytes. */
-    void limit_reads(uint32_t k) { m_faults.read_limit = k; }
+    void limit_reads(uint32_t k) { m_faults.shortened[index(HostFn::Read)] = {EACH, k}; }
     /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
     /** Called with every block that is given back, while it still holds what it held. */
@@ -99,7 +100,7 @@ public:
     uint64_t bytes_read() const { return m_counts.bytes_read; }
     void reset_calls() { std::tie(m_counts, m_log) = std::pair(Counts{}, ""); }
     /** Starts a log of all file calls (of memory calls too with `memory`). */
-    void start_log(bool memory = false);
+    void start_log(bool memory = false) { std::tie(m_logging, m_log_memory, m_log) = std::tuple(true, memory, ""); }
     /**
      * The log so far, emptied. Entries are separated by a blank, each `name(arguments)=result`: open(a.flv,rb)=1
      * read(4096)=100 write(8)=8 seek(10,1)=0 seek64(10,0)=0 tell()=5 tell64()=5 eof()=1 flush()=0 close()=0
@@ -115,7 +116,7 @@ public:
     }
     size_t live_blocks() const { return m_blocks.size(); }
     size_t live_bytes() const { return m_live_bytes; }
-    size_t open_handles() const { return m_open_handles; }
+    size_t open_handles() const { return m_handles.size(); }
     /** All file_open modes so far, successful or not. */
     const std::vector<std::string>& open_modes() const { return m_open_modes; }
 
@@ -135,10 +136,9 @@ private:
         std::shared_ptr<File> file;
         int64_t pos = 0;
         bool eof = false;
-        bool open = true;
     };
-    static constexpr size_t FN_COUNT = static_cast<size_t>(HostFn::Count);
-    template <class Value> using OfEach = std::array<Value, FN_COUNT>;
+    static constexpr uint64_t EACH = UINT64_MAX; // of the calls
+    template <class Value> using OfEach = std::array<Value, static_cast<size_t>(HostFn::Count)>;
     struct Counts {
         OfEach<uint64_t> calls{};
         uint64_t failable = 0, bytes_read = 0;
@@ -147,7 +147,6 @@ private:
         OfEach<std::pair<uint64_t, uint64_t>> failing{}; // first and last call that fails
         OfEach<std::pair<uint64_t, uint32_t>> shortened{};
         uint64_t call = 0;
-        uint32_t read_limit = UINT32_MAX;
     };
     static size_t index(HostFn fn) { return static_cast<size_t>(fn); }
 
@@ -179,13 +178,14 @@ private:
     static inline FakeHost* m_current = nullptr;
     FakeHost* const m_previous = m_current;
     std::map<std::string, std::shared_ptr<File>> m_files;
-    std::vector<std::unique_ptr<Handle>> m_handles;
+    std::map<const void*, Handle> m_handles;
+    std::deque<uint8_t> m_pointers; // one for each handle ever, so that a closed one is never taken for another
     std::map<const uint8_t*, uint32_t> m_blocks;
-    size_t m_live_bytes = 0, m_open_handles = 0;
+    size_t m_live_bytes = 0;
     Counts m_counts;
     Faults m_faults;
     std::vector<std::string> m_open_modes;
-    Handle m_none = {std::make_shared<File>(), 0, false, false}; // what stands for a handle that is not open
+    Handle m_none = {std::make_shared<File>()}; // what stands for a handle that is not open
     bool m_only_32 = false, m_logging = false, m_log_memory = false;
     std::string m_log;
 };
