@@ -1,6 +1,5 @@
 #include "flv_writer.h"
 
-#include <algorithm>
 #include <cstring>
 #include <ostream>
 
@@ -14,7 +13,7 @@ Bytes BigEndian(uint64_t value, int bytes)
     return out;
 }
 
-Bytes Concat(std::initializer_list<Bytes> parts)
+Bytes Concat(const std::vector<Bytes>& parts)
 {
     Bytes out;
     for (const Bytes& part : parts)
@@ -35,7 +34,7 @@ Bytes Noise(size_t size, uint32_t seed)
     return out;
 }
 
-BitWriter& BitWriter::u(int bits, uint32_t value)
+BitWriter& BitWriter::u(int bits, uint64_t value)
 {
     while (bits-- > 0) {
         if (m_free == 0)
@@ -48,11 +47,10 @@ BitWriter& BitWriter::u(int bits, uint32_t value)
 
 BitWriter& BitWriter::ue(uint32_t value)
 {
-    int length = 0;
-    while ((uint64_t{value} + 1) >> (length + 1) != 0)
-        ++length;
-    u(length, 0);
-    return u(1, 1).u(length, static_cast<uint32_t>(uint64_t{value} + 1));
+    int zeros = 0;
+    while ((uint64_t{value} + 1) >> (zeros + 1) != 0)
+        ++zeros;
+    return u(zeros, 0).u(zeros + 1, uint64_t{value} + 1);
 }
 
 BitWriter& BitWriter::se(int32_t value)
@@ -105,10 +103,7 @@ Bytes OnMetaData(const std::vector<Property>& properties)
 
 Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count)
 {
-    Bytes out = Concat({{10}, BigEndian(count.value_or(elements.size()), 4)});
-    for (const Bytes& element : elements)
-        Append(out, element);
-    return out;
+    return Concat({{10}, BigEndian(count.value_or(elements.size()), 4), Concat(elements)});
 }
 
 Bytes NumberArray(const std::vector<double>& numbers)
@@ -259,10 +254,7 @@ Flv FlvBuilder::build() const
 
 Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
 {
-    FlvBuilder builder(flags, static_cast<uint32_t>(prefix.size()) + header, prefix);
-    for (const Tag& tag : tags)
-        builder.add(tag);
-    return builder.build();
+    return FlvBuilder(flags, static_cast<uint32_t>(prefix.size()) + header, prefix, tags).build();
 }
 
 Flv MakeChain(const ChainOptions& options)

@@ -29,14 +29,14 @@ inline void Put(Bytes& out, uint64_t value, int bytes)
 {
     Append(out, BigEndian(value, bytes));
 }
-Bytes Concat(std::initializer_list<Bytes> parts);
+Bytes Concat(const std::vector<Bytes>& parts);
 /** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
 
 /** Most significant bit first. */
 class BitWriter {
 public:
-    BitWriter& u(int bits, uint32_t value);
+    BitWriter& u(int bits, uint64_t value);
     BitWriter& ue(uint32_t value);
     BitWriter& se(int32_t value);
     /** The bytes so far, the last one filled up with zero bits. */
@@ -173,8 +173,8 @@ using IndexHook = std::function<void(std::vector<double>& times, std::vector<dou
 class FlvBuilder {
 public:
     /** flags: of the file header (1 video, 4 audio); data_offset: as written; prefix: in front of the file header. */
-    explicit FlvBuilder(uint8_t flags = 5, uint32_t data_offset = 9, Bytes prefix = {})
-        : m_flags(flags), m_data_offset(data_offset), m_prefix(std::move(prefix))
+    explicit FlvBuilder(uint8_t flags = 5, uint32_t data_offset = 9, Bytes prefix = {}, std::vector<Tag> tags = {})
+        : m_flags(flags), m_data_offset(data_offset), m_prefix(std::move(prefix)), m_tags(std::move(tags))
     {
     }
 

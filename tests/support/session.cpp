@@ -1,7 +1,6 @@
 #include "session.h"
 
 #include <sstream>
-#include <tuple>
 
 namespace flvd_test {
 
@@ -87,11 +86,6 @@ int32_t Session::seek(int32_t time, uint32_t mode, int32_t* reached)
     const flvd_seek_request_t request{time, mode};
     int32_t ignored = 0;
     return QVX_FLV_DMX(FLVD_OP_SEEK, &m_ctx, &request, reached != nullptr ? reached : &ignored);
-}
-
-int32_t Session::last_error()
-{
-    return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr);
 }
 
 int32_t Session::close()

@@ -54,7 +54,7 @@ public:
     /** stream: looked at with FLVD_OPT_SEPARATE_AUDIO_READER only. */
     FrameResult frame(uint32_t stream = 0);
     int32_t seek(int32_t time, uint32_t mode, int32_t* reached = nullptr);
-    int32_t last_error();
+    int32_t last_error() { return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr); }
     /** Line of the last failure: the instance's, or the global one after a failed open. */
     int32_t error_line() const { return m_ctx != nullptr ? m_ctx->error_line : g_flvd_lErrorLine; }
     /** The last failure is one that such an operation may have. */
