@@ -12,7 +12,7 @@ namespace {
 uint32_t find_mpeg(const Bytes& data)
 {
     for (size_t at = 0; at + 4 <= data.size(); ++at) {
-        const uint32_t header = read_be(data, at, 4);
+        const uint32_t header = read_be(data.data() + at, 4);
         const bool reserved = (header >> 19u & 3u) == 1 || (header >> 17u & 3u) == 0 || (header >> 10u & 3u) == 3;
         if (header >> 21u == 0x7FF && !reserved)
             return header;
@@ -48,7 +48,7 @@ Bytes parameter_sets(const Bytes& record)
             return {};
         for (int32_t count = record[at++] & mask; count > 0; --count) {
             const size_t begin = at + 2;
-            at = begin <= record.size() ? begin + read_be(record, at, 2) : begin;
+            at = begin <= record.size() ? begin + read_be(record.data() + at, 2) : begin;
             if (at > record.size())
                 return {};
             Append(sets, Concat({{0, 0, 0, 1}, Bytes(record.data() + begin, record.data() + at)}));

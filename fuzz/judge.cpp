@@ -91,10 +91,10 @@ void Host::require_clean() const
     require(open_handles() == 0, "a file that was not closed");
 }
 
-uint32_t read_be(const Bytes& bytes, size_t position, size_t count)
+uint32_t read_be(const uint8_t* bytes, size_t count)
 {
     uint32_t value = 0;
-    for (size_t i = position; i < position + count; ++i)
+    for (size_t i = 0; i < count; ++i)
         value = value << 8 | bytes[i];
     return value;
 }
@@ -103,9 +103,9 @@ bool read_tag(const Bytes& file, int64_t position, FileTag* tag)
 {
     if (position < 0 || position + 13 > static_cast<int64_t>(file.size()))
         return false;
-    const auto at = static_cast<size_t>(position);
-    const uint32_t timestamp = read_be(file, at + 4, 3) | uint32_t{file[at + 7]} << 24;
-    *tag = {file[at], read_be(file, at + 1, 3), timestamp, read_be(file, at + 8, 3), file[at + 11], file[at + 12]};
+    const uint8_t* const at = file.data() + position;
+    const uint32_t timestamp = read_be(at + 4, 3) | uint32_t{at[7]} << 24;
+    *tag = {at[0], read_be(at + 1, 3), timestamp, read_be(at + 8, 3), at[11], at[12]};
     return true;
 }
 

@@ -6,9 +6,6 @@
 
 #include "support/fake_host.h"
 
-#include <algorithm>
-#include <array>
-
 namespace flvd_fuzz {
 
 using namespace flvd_test;
@@ -106,7 +103,7 @@ struct FileTag {
     bool video() const { return type == FLVD_TAG_TYPE_VIDEO; }
     bool keyframe() const { return first / 16 == 1 || first / 16 == 4; }
 };
-uint32_t read_be(const Bytes& bytes, size_t position, size_t count);
+uint32_t read_be(const uint8_t* bytes, size_t count);
 /** False when fewer than 13 bytes are there. */
 bool read_tag(const Bytes& file, int64_t position, FileTag* tag);
 

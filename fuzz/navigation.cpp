@@ -129,10 +129,8 @@ private:
         return {FLVD_ERR_AT_FIRST_TAG, 0, {}};
     }
 
-    uint32_t back_pointer(int64_t position) const // 0 when it is not there
-    {
-        return position + 4 <= m_host.visible() ? read_be(m_file, static_cast<size_t>(position), 4) : 0;
-    }
+    // 0 when it is not there.
+    uint32_t back_pointer(int64_t at) const { return at + 4 <= m_host.visible() ? read_be(m_file.data() + at, 4) : 0; }
     uint32_t ceiling() const { return m_ctx.last_ts != 0 ? m_ctx.last_ts : UINT32_MAX; }
     bool of_stream(const FileTag& tag) const
     {

@@ -28,14 +28,8 @@ public:
     }
 
 private:
-    uint32_t left(uint32_t n) const
-    {
-        return static_cast<uint32_t>(std::clamp<int64_t>(m_host.visible() - m_position, 0, n));
-    }
-    bool holds(const uint8_t* bytes, uint32_t n) const
-    {
-        return n == 0 || std::equal(bytes, bytes + n, m_data.begin() + static_cast<std::ptrdiff_t>(m_position));
-    }
+    int64_t left(int64_t n) const { return std::clamp<int64_t>(m_host.visible() - m_position, 0, n); }
+    bool holds(const uint8_t* b, int64_t n) const { return n == 0 || std::equal(b, b + n, m_data.data() + m_position); }
     void move_to(int64_t position)
     {
         m_position = position;
@@ -48,10 +42,11 @@ private:
         switch (code % 8) {
         case 0: {
             const uint32_t got = __FLV_DMX__fioShowBytesByPtr(&bytes, n, m_file);
-            return require(got == std::min(left(n), m_room) && holds(bytes, got), "peeked bytes");
+            return require(got == std::min<int64_t>(left(n), m_room) && holds(bytes, got), "peeked bytes");
         }
         case 1: {
-            const uint32_t element = 1 + code / 64u, expected = left(n * element);
+            const uint32_t element = 1 + code / 64u;
+            const int64_t expected = left(n * element);
             Bytes copy(size_t{n} * element);
             const uint32_t got = __FLV_DMX__fioRead(copy.data(), element, n, m_file);
             require(got == expected / element && holds(copy.data(), expected), "read bytes");
