@@ -20,10 +20,9 @@ struct ExpectedPacket {
     uint32_t timestamp = 0; /**< of the tag, ms */
     uint32_t size = 0;
     uint32_t crc = 0;
-    bool key = false;
 };
-/** Compares all that a delivered frame shows: stream, size, timestamp from `first_ts` on, CRC-32. */
-bool SameFrame(const ExpectedPacket& packet, const Frame& frame, uint32_t first_ts = 0);
+/** Compares all that a delivered frame shows when the first timestamp is 0: stream, timestamp, size, CRC-32. */
+bool SameFrame(const ExpectedPacket& packet, const Frame& frame);
 
 struct Expected {
     int64_t file_size = 0;

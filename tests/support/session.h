@@ -48,8 +48,7 @@ public:
     int32_t open_rc() const { return m_open_rc; }
     const flvd_open_info_t& info() const { return m_info; }
     /** Null after a failed open and after close(). */
-    const flvd_ctx_t* ctx() const { return m_ctx; }
-    flvd_ctx_t* ctx() { return m_ctx; }
+    flvd_ctx_t* ctx() const { return m_ctx; }
 
     /** stream: looked at with FLVD_OPT_SEPARATE_AUDIO_READER only. */
     FrameResult frame(uint32_t stream = 0);
