@@ -136,6 +136,7 @@ class Check(Case):
                 self.assertEqual((many.returncode, many.stdout, many.stderr), (1, alone.stdout, alone.stderr))
         documents = json.loads(alone.stdout)["files"]
         self.assertEqual([document["file"] for document in documents], list(map(str, files)))
+        self.assertEqual([d["error"]["code"] for d in documents if d.get("error")], [-5, -1004] * 3)
         ruined = documents[-1]  # not listed whole
         self.assertEqual((ruined["counts"], len(ruined["findings"]), ruined["unlisted"]), ({"gap": 1500}, 1000, 500))
         text = self.tool("check", sample("aac_only"), "--jobs", 9)
