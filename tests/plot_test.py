@@ -4,7 +4,6 @@ import xml.etree.ElementTree
 
 from tool_test import APART, SAMPLES, Case, Expected, sample_bytes, split_tags
 
-SVG = "{http://www.w3.org/2000/svg}"
 UNITS = {"bit/s": 1, "kbit/s": 1e3, "Mbit/s": 1e6}
 LEFT, WIDTH = 90, 920  # of the diagrams
 
@@ -24,8 +23,7 @@ class Plot(Case):
 
     def bits(self, root, kind, seconds):
         """The area under a line, by the labels of its axis."""
-        texts = (t for t in root.iter(f"{SVG}text") if t.get("class") == "tick left")
-        ticks = [(float(t.get("y")) - 4, float(t.text)) for t in texts]
+        ticks = [(float(e.get("y")) - 4, float(e.text)) for e in root.iter() if e.get("class") == "tick left"]
         unit = UNITS[re.search(r"\((.*)\)", self.of(root, "heading")[0])[1]]
         scale = (ticks[1][1] - ticks[0][1]) / (ticks[1][0] - ticks[0][0]) * unit
         steps = [(float(y), float(x)) for y, x in re.findall(r"V([\d.]+)H([\d.]+)", *self.of(root, f"area-{kind}"))]
@@ -58,8 +56,8 @@ class Plot(Case):
                 (5400, "0:00:00", "1:30:00"), (10800, "0:00:00", "3:00:00"), (2000000, "0:00:00", None)):
             times = [max(i - 1, 0) * seconds * 1000 // (len(frames) - 2) for i in range(len(frames))]
             stamps = [(t & 0xFFFFFF).to_bytes(3, "big") + bytes([t >> 24]) for t in times]
-            tags = (tag[:4] + stamp + tag[8:] for tag, stamp in zip(frames, stamps))
-            root = self.plot("long.flv", header + b"".join(tags))
+            tags = [tag[:4] + stamp + tag[8:] for tag, stamp in zip(frames, stamps)]
+            root = self.plot("long.flv", b"".join([header, *tags]))
             labels = self.of(root, "tick mid")
             labels = labels[:len(labels) // 2]  # of the first diagram
             self.assertTrue(5 <= len(labels) <= 13, labels)
