@@ -88,15 +88,12 @@ bool Play(FakeHost& host, const OpenOptions& open, const Sample& sample, bool ex
 
 TEST(Samples, DeliverWhatTheProberFound)
 {
-    const std::pair<uint32_t, uint32_t> modes[] = {
-        {0, 0},           {0, 1024}, {0, 1031},  {0, 1 << 20}, {SEPARATE, 0},
-        {SEPARATE, 1024}, {USER, 0}, {INDEX, 0}, {GROWING, 0}, {GROWING | SEPARATE, 1024}};
-    for (const auto& [options, cache] : modes) // the size of the cache
-        for (const Sample& sample : Samples())
-            for (const bool only_32 : {false, true}) {
+    for (const uint32_t options : {0u, SEPARATE, USER, INDEX, GROWING, GROWING | SEPARATE})
+        for (const uint32_t cache : {0u, 1024u, 1031u, 1u << 20})
+            for (const Sample& sample : Samples()) {
                 SCOPED_TRACE(sample.name + " with " + std::to_string(options) + ", " + std::to_string(cache));
                 FakeHost host(sample.bytes);
-                if (only_32)
+                if (cache == 1031)
                     host.use_32_bit_only();
                 const bool exact = sample.name != "damaged" || (options & GROWING) == 0;
                 EXPECT_TRUE(Play(host, {options, false, cache}, sample, exact));
