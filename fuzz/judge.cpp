@@ -85,12 +85,6 @@ int64_t Host::position(const fio_file_t* reader)
     return reader->state == FIO_STATE_READ ? host - reader->count : host + reader->count;
 }
 
-void Host::require_clean() const
-{
-    require(live_blocks() == 0, "memory that was not released");
-    require(open_handles() == 0, "a file that was not closed");
-}
-
 uint32_t read_be(const uint8_t* bytes, size_t count)
 {
     uint32_t value = 0;

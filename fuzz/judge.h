@@ -6,6 +6,9 @@
 
 #include "support/fake_host.h"
 
+#include <algorithm>
+#include <array>
+
 namespace flvd_fuzz {
 
 using namespace flvd_test;
@@ -76,7 +79,7 @@ public:
     void begin(uint64_t calls) { m_calls_left = calls; }
     /** Where a reader really stands. */
     int64_t position(const fio_file_t* reader);
-    void require_clean() const;
+    void require_clean() const { require(live_blocks() + open_handles() == 0, "memory or a file that was kept"); }
 
 private:
     bool lies(Lie lie) const { return (m_lies >> static_cast<uint32_t>(lie) & 1u) != 0; }

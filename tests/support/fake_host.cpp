@@ -1,8 +1,10 @@
 #include "fake_host.h"
 
+#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <tuple>
 
 namespace flvd_test {
 

@@ -1,5 +1,6 @@
 #include "flv_writer.h"
 
+#include <algorithm>
 #include <cstring>
 #include <ostream>
 
@@ -51,11 +52,6 @@ BitWriter& BitWriter::ue(uint32_t value)
     while ((uint64_t{value} + 1) >> (zeros + 1) != 0)
         ++zeros;
     return u(zeros, 0).u(zeros + 1, uint64_t{value} + 1);
-}
-
-BitWriter& BitWriter::se(int32_t value)
-{
-    return ue(value > 0 ? static_cast<uint32_t>(value) * 2 - 1 : static_cast<uint32_t>(-int64_t{value}) * 2);
 }
 
 namespace amf {

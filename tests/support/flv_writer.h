@@ -38,7 +38,7 @@ class BitWriter {
 public:
     BitWriter& u(int bits, uint64_t value);
     BitWriter& ue(uint32_t value);
-    BitWriter& se(int32_t value);
+    BitWriter& se(int64_t value) { return ue(static_cast<uint32_t>(value > 0 ? 2 * value - 1 : -2 * value)); }
     /** The bytes so far, the last one filled up with zero bits. */
     Bytes bytes() const { return m_bytes; }
 

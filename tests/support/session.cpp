@@ -1,6 +1,7 @@
 #include "session.h"
 
 #include <sstream>
+#include <tuple>
 
 namespace flvd_test {
 
