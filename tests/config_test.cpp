@@ -314,7 +314,7 @@ TEST(ScriptValue, IsBounded)
     Expect("[1 " + deep + high, "-1");
     Expect("< width: 320 >", "-1", 0, 12); // a value begins inside or not at all
     Expect("< width: 320 >", "0 width 320", 0, 13);
-    Expect("{ a: %5 } 1", "0", 0, 16);                                           // more consumed than counted
+    Expect("{ a: %5 } 1", "0", 0, 16);              // more consumed than counted
     Expect(keys + "< width: 320 >", "0 width 320"); // an empty key counts nothing
     Expect("< a: %5 width: 320 b: { c: %6 height: 240 } >", "0 width 320 height 240");
     // A long string that is itself the largest value: what holds it is too large.

@@ -13,8 +13,6 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t BACK = FLVD_SEEK_BACKWARD, FORTH = FLVD_SEEK_FORWARD, REL = FLVD_SEEK_RELATIVE;
-constexpr uint32_t RETRY = FLVD_SEEK_RETRY_BACKWARD, AT_END = FLVD_SEEK_TO_END_ON_MISS;
 constexpr uint32_t BEFORE = 1, AFTER = 0;      // directions of a frame seek
 constexpr uint32_t SMALL = 1024;               // a cache below LARGE tags, which then cost host calls of their own
 constexpr size_t LARGE = 3000, GROWN = 600000; // GROWN is above the first frame buffer

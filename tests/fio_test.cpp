@@ -312,18 +312,13 @@ TEST(BitReader, IsEmptiedByByteLevelAccess)
 
 TEST(BitReader, TakesFieldsOfUpTo32Bits)
 {
-    const Cached f({13});
-    EXPECT_EQ(__FLV_DMX__bitInit(f.file), 1);
-    EXPECT_EQ(__FLV_DMX__bitGetUBits(f.file, 14), 0u);
-    EXPECT_EQ(__FLV_DMX__bitShowBit(f.file), 0u);
-    EXPECT_EQ(__FLV_DMX__bitGetBit(f.file) + __FLV_DMX__bitGetBit(f.file), 1u);
-    for (const uint32_t n : {32u, 33u, 40u})
-        EXPECT_EQ(__FLV_DMX__bitShowUBits(f.file, n), 0x02030405u);
-    f.seek(0x80);
+    const Cached f({}, Part(0x80, 200));
     __FLV_DMX__bitInit(f.file);
     EXPECT_EQ(__FLV_DMX__bitShowSBits(f.file, 4), 8u); // no sign
-    EXPECT_EQ(__FLV_DMX__bitGetSBits(f.file, 4), 8u);
-    EXPECT_EQ(f.tell(), 0x81); // a byte is consumed with its first bit
+    EXPECT_EQ(__FLV_DMX__bitGetSBits(f.file, 4) + __FLV_DMX__bitShowBit(f.file) + __FLV_DMX__bitGetBit(f.file), 8u);
+    __FLV_DMX__bitSkipBits(f.file, 3);
+    for (const uint32_t n : {32u, 33u, 40u})
+        EXPECT_EQ(__FLV_DMX__bitShowUBits(f.file, n), 0x81828384u);
     for (uint32_t n = 1; n <= 32; ++n) {
         __FLV_DMX__bitSkipBits(f.file, n);
         EXPECT_GT(f.file->bits_left, 32);

@@ -122,21 +122,20 @@ TEST(Failures, OfDelivery)
         return File({g_meta, config, frame(0, 5000), frame(40), frame(80)}).bytes;
     };
     const int end = static_cast<int>(g_chain.frames().size()) + 1;
-    std::vector<Failure> failures = {{"end", g_chain.bytes, {}, {-2, -10002, 2737}, end},
-                                     {"growing: end", g_chain.bytes, {GROWING}, {-2, -10002, 2957}, end},
-                                     {"no room for AVC", large(g_avc, Nalu), Buffer(1000), {0, 0, 2602}, 1},
-                                     {"no room for AAC", large(g_aac, Raw), Buffer(1000), {0, 0, 2536}, 1},
-                                     {"no room for PCM", large(Pcm(0), Pcm), Buffer(1000), {0, 0, 2550}, 2}};
-    for (const bool growing : {false, true}) {
-        const uint32_t options = growing ? GROWING | SEPARATE : SEPARATE;
-        const auto line = [growing](int32_t complete, int32_t other) { return growing ? other : complete; };
-        failures.push_back({"info", sound, {options, true}, {-1, -4007, line(2638, 2767)}, 1, AUDIO});
-        failures.push_back({"no video", sound, {options}, {-1, -4002, line(2651, 2783)}, 1, VIDEO});
-        failures.push_back({"no audio", pictures, {options}, {-1, -4003, line(2661, 2796)}, 1, AUDIO});
-        failures.push_back({"stream 0", sound, {options}, {-1, -4004, line(2667, 2802)}, 1, 0});
-        failures.push_back({"stream 3", sound, {options}, {-1, -4004, line(2667, 2802)}, 1, 3});
-    }
-    ExpectFailures(failures);
+    ExpectFailures({{"end", g_chain.bytes, {}, {-2, -10002, 2737}, end},
+                    {"growing: end", g_chain.bytes, {GROWING}, {-2, -10002, 2957}, end},
+                    {"no room for AVC", large(g_avc, Nalu), Buffer(1000), {0, 0, 2602}, 1},
+                    {"no room for AAC", large(g_aac, Raw), Buffer(1000), {0, 0, 2536}, 1},
+                    {"no room for PCM", large(Pcm(0), Pcm), Buffer(1000), {0, 0, 2550}, 2},
+                    {"info", sound, {SEPARATE, true}, {-1, -4007, 2638}, 1, AUDIO},
+                    {"no video", sound, {SEPARATE}, {-1, -4002, 2651}, 1, VIDEO},
+                    {"no audio", pictures, {SEPARATE}, {-1, -4003, 2661}, 1, AUDIO},
+                    {"stream 0", sound, {SEPARATE}, {-1, -4004, 2667}, 1, 0},
+                    {"stream 3", sound, {SEPARATE}, {-1, -4004, 2667}, 1, 3},
+                    {"growing: info", sound, {GROWING | SEPARATE, true}, {-1, -4007, 2767}, 1, AUDIO},
+                    {"growing: no video", sound, {GROWING | SEPARATE}, {-1, -4002, 2783}, 1, VIDEO},
+                    {"growing: no audio", pictures, {GROWING | SEPARATE}, {-1, -4003, 2796}, 1, AUDIO},
+                    {"growing: stream 3", sound, {GROWING | SEPARATE}, {-1, -4004, 2802}, 1, 3}});
 }
 
 TEST(Open, BoundsTheSizesOfTheInitialisationBlock)

@@ -4,8 +4,6 @@
 #include "support/report.h"
 #include "support/session.h"
 
-#include <sstream>
-
 using namespace flvd_test;
 
 namespace {
@@ -13,17 +11,14 @@ namespace {
 // What the nth call of some order of frames and seeks comes to.
 std::string Step(Session& session, uint32_t n)
 {
-    std::ostringstream out;
     int32_t reached = -1;
-    if (n % 7 == 6) {
-        const auto time = static_cast<int32_t>(n * 61 % 900);
-        out << session.seek(time, n % 2 == 0 ? FLVD_SEEK_BACKWARD : FLVD_SEEK_FORWARD, &reached) << " at " << reached;
-    } else {
-        const FrameResult result = session.frame(1 + n % 2);
-        out << result.rc << ' ' << testing::PrintToString(result.frame) << testing::PrintToString(result.frame.data);
-    }
-    out << ' ' << session.last_error() << '/' << session.error_line();
-    return out.str();
+    FrameResult result;
+    if (n % 7 == 6)
+        result.rc = session.seek(static_cast<int32_t>(n * 61 % 900), n % 2 == 0 ? BACK : FORTH, &reached);
+    else
+        result = session.frame(1 + n % 2);
+    return testing::PrintToString(
+        std::tuple(result.rc, reached, result.frame, result.frame.data, session.last_error(), session.error_line()));
 }
 
 TEST(Instances, DoNotDisturbEachOther)

@@ -7,6 +7,8 @@ namespace flvd_test {
 
 constexpr uint32_t SEPARATE = FLVD_OPT_SEPARATE_AUDIO_READER, USER = FLVD_OPT_USER_BUFFER;
 constexpr uint32_t GROWING = FLVD_OPT_PROGRESSIVE, INDEX = FLVD_OPT_INDEX_IN_MEMORY;
+constexpr uint32_t BACK = FLVD_SEEK_BACKWARD, FORTH = FLVD_SEEK_FORWARD, REL = FLVD_SEEK_RELATIVE;
+constexpr uint32_t RETRY = FLVD_SEEK_RETRY_BACKWARD, AT_END = FLVD_SEEK_TO_END_ON_MISS;
 constexpr uint32_t VIDEO = FLVD_STREAM_VIDEO, AUDIO = FLVD_STREAM_AUDIO, BOTH = VIDEO | AUDIO;
 
 /** What may fail: opening, a frame, a time seek, a frame seek; and what opening or a frame records besides. */
