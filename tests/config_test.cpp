@@ -81,15 +81,11 @@ TEST(AudioConfig, OfMpegAudio)
     for (uint32_t i = 0; i < 1 << 15; ++i) { // all that follows the synchronisation and matters
         const uint32_t version = i >> 13, layer = i >> 11 & 3, bit_rate = i >> 6 & 15, rate = i >> 4 & 3, mode = i & 3;
         const uint32_t row = version == 3 ? (3 - layer) & 3 : layer == 3 ? 3 : 4;
-        const Audio audio{0,
-                          sample_rates[rate] >> shifts[version],
-                          mode == 3 ? 1 : 2,
-                          layer == 2 ? 0x50 : 0x55,
-                          bit_rates[row][bit_rate],
-                          16};
-        Bytes header;
-        Put(header, 0xFFE00009 | i << 6, 4);
-        EXPECT_EQ(ParseAudio(2, header), version != 1 && layer != 0 && rate != 3 ? audio : NO_AUDIO) << i;
+        const uint32_t channels = mode == 3 ? 1 : 2, tag = layer == 2 ? 0x50 : 0x55;
+        const Audio audio{0, sample_rates[rate] >> shifts[version], channels, tag, bit_rates[row][bit_rate], 16};
+        EXPECT_EQ(ParseAudio(2, BigEndian(0xFFE00009 | i << 6, 4)),
+                  version != 1 && layer != 0 && rate != 3 ? audio : NO_AUDIO)
+            << i;
     }
 }
 
