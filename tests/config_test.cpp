@@ -369,6 +369,26 @@ TEST(KeyframeIndex, CountsWhatBothArraysHave)
     Expect("{ keyframes: { times: [2 1 2 filepositions: [2 5 6 } times: [1 1 }", "0 entries 1 T 114 P 152"); // none now
 }
 
+TEST(KeyframeIndex, DecidesHowToSeekAndTheLastTime)
+{
+    const auto expect = [](const std::string& indices, uint32_t method, uint32_t last, uint32_t options = 0) {
+        FakeHost host(FlvBuilder(4).script(Amf("'onMetaData < " + indices + " >")).add(Pcm(5)).build().bytes);
+        const Session session(host, {options});
+        EXPECT_EQ(std::pair(session.ctx()->seek_method, session.ctx()->last_keyframe_ms), std::pair(method, last));
+    };
+    expect("keyframes: { times: [3 1 2 'text filepositions: [3 13 2 2 }", FLVD_SEEK_BY_INDEX, 2000);
+    expect("keyframes: { times: [3 'text 1 2 filepositions: [3 13 2 2 }", FLVD_SEEK_BY_INDEX, 0);
+    expect("keyframes: { times: [3 1 'text 2 filepositions: [3 13 'text 2 }", FLVD_SEEK_BY_INDEX, 1000);
+    expect("keyframes: { filepositions: [3 13 2 2 }", FLVD_SEEK_BY_SCAN, 0);
+    const std::string two =
+        "keyframes: { times: [1 1 filepositions: [3 13 2 2 } keyframes: { filepositions: [3 13 2 2 }";
+    expect(two, FLVD_SEEK_BY_INDEX, 1000, INDEX);
+    const Bytes at_end = Amf("'onMetaData < keyframes: { times: [9 1 1 1 1 1 1 1 1 1 filepositions: [9 13 2 2 } >");
+    FakeHost host(FlvBuilder(4).add(Pcm(5)).script(at_end).build().bytes);
+    EXPECT_EQ(Session(host).open_rc(), -1); // it ends with the file
+    EXPECT_EQ(g_flvd_lLastError, FLVD_ERR_EXTENT);
+}
+
 TEST(KeyframeArrays, HoldWhatCanBeStored)
 {
     constexpr uint32_t endless = 0xFFFFFFF0;

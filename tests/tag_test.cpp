@@ -262,28 +262,4 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
     }
 }
 
-TEST(Extent, TakesTheLastTimeThatAnIndexHas)
-{
-    const Bytes one = amf::Number(1), two = amf::Number(2), text = amf::String("a text");
-    const auto index = [&](const std::vector<Bytes>& times, const Bytes& second, std::optional<uint32_t> count = {}) {
-        std::vector<amf::Property> arrays{{"filepositions", amf::StrictArray({amf::Number(13), second, two}, count)}};
-        if (!times.empty())
-            arrays.insert(arrays.begin(), {"times", amf::StrictArray(times)});
-        return amf::Property("keyframes", amf::Object(arrays));
-    };
-    const auto extent = [](const std::vector<amf::Property>& properties, uint32_t options = 0) {
-        const Extent all = Probe(FlvBuilder(4).metadata(properties).add(Sound()).build().bytes, {options});
-        return std::pair(std::get<2>(all), std::get<4>(all));
-    };
-    using Last = std::pair<uint32_t, uint32_t>;
-    EXPECT_EQ(extent({index({one, two, text}, two)}), Last(FLVD_SEEK_BY_INDEX, 2000));
-    EXPECT_EQ(extent({index({text, one, two}, two)}), Last(FLVD_SEEK_BY_INDEX, 0));
-    EXPECT_EQ(extent({index({one, text, two}, text)}), Last(FLVD_SEEK_BY_INDEX, 1000));
-    EXPECT_EQ(extent({index({}, two)}), Last(FLVD_SEEK_BY_SCAN, 0));
-    EXPECT_EQ(extent({index({one}, two), index({}, two)}, INDEX), Last(FLVD_SEEK_BY_INDEX, 1000));
-    FakeHost host(FlvBuilder(4).add(Sound()).metadata({index(std::vector<Bytes>(9, one), two, 9)}).build().bytes);
-    EXPECT_EQ(Session(host).open_rc(), -1); // the index ends with the file
-    EXPECT_EQ(g_flvd_lLastError, FLVD_ERR_EXTENT);
-}
-
 } // namespace
