@@ -35,7 +35,7 @@ void run_audio(Input& input)
         info.sample_rate = info.channels = 0;
     if (header != 0)
         info.sample_size = info.format_tag = info.data_rate = 0;
-    require(same_bytes(info, flvd_audio_info_t{}), "an audio header that changed something else");
+    require(bytes_of(info) == Bytes(sizeof info), "an audio header that changed something else");
 }
 
 // With start codes; nothing when the record ends before them.
@@ -67,7 +67,7 @@ void judge_picture(int32_t codec, const Bytes& data)
         info.width = info.height = 0;
     if (rc == 0 && codec == 7)
         std::memset(info.fourcc, 0, sizeof info.fourcc);
-    require(same_bytes(info, flvd_video_info_t{}), "a picture header that changed something else");
+    require(bytes_of(info) == Bytes(sizeof info), "a picture header that changed something else");
 }
 
 // The control bytes are the codec of a picture header and the room for the parameter sets.

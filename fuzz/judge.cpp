@@ -13,6 +13,12 @@ void require(bool holds, const char* what)
     std::abort();
 }
 
+Bytes copy_of(const void* begin, size_t size)
+{
+    const auto* const first = static_cast<const uint8_t*>(begin);
+    return Bytes(first, first + size);
+}
+
 Input::Input(const uint8_t* data, size_t size)
 {
     if (size == 0)

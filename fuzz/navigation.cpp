@@ -70,7 +70,7 @@ private:
         require(rc == expected.rc, "another result");
         const FileTag& tag = expected.tag;
         const flvd_tag_info_t described{tag.type, tag.size, tag.timestamp, tag.stream_id};
-        require(same_bytes(info, rc == 0 ? described : UNTOUCHED), "another record");
+        require(bytes_of(info) == bytes_of(rc == 0 ? described : UNTOUCHED), "another record");
         require(rc != 0 || m_host.position(m_reader) == expected.position, "another place");
     }
     void judge_find(int64_t from, uint32_t limit)

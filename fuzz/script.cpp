@@ -8,12 +8,6 @@ namespace {
 
 constexpr size_t START = 24; // of the payload in the file
 
-template <class Element> void append_bytes(Bytes* out, const Element* begin, size_t count)
-{
-    const auto* const first = reinterpret_cast<const uint8_t*>(begin);
-    out->insert(out->end(), first, first + count * sizeof(Element));
-}
-
 // What a payload sets in an instance as the probing has it when it meets the script tag.
 Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length)
 {
@@ -35,18 +29,15 @@ Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length
     require(arrays.times_count <= length && arrays.positions_count <= length, "an array larger than the payload");
     const bool kept = (options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
     require(kept || arrays.times_ms == nullptr, "an index in memory that was not asked for");
-    Bytes values;
-    append_bytes(&values, &rc, 1);
-    append_bytes(&values, arrays.times_ms, arrays.times_count);
-    append_bytes(&values, arrays.positions, arrays.positions_count);
+    const Bytes values = Concat({bytes_of(rc), copy_of(arrays.times_ms, arrays.times_count * sizeof *arrays.times_ms),
+                                 copy_of(arrays.positions, arrays.positions_count * sizeof *arrays.positions)});
     init.mem_free(arrays.times_ms);
     init.mem_free(arrays.positions);
     __FLV_DMX__fioClose(ctx.cur_reader);
     ctx.cur_reader = nullptr;
     ctx.keyframe_arrays.times_ms = nullptr;
     ctx.keyframe_arrays.positions = nullptr;
-    append_bytes(&values, &ctx, 1);
-    return values;
+    return Concat({values, bytes_of(ctx)});
 }
 
 void run(Input& input)

@@ -8,8 +8,6 @@
 #include "judge.h"
 
 #include <cstring>
-#include <functional>
-#include <numeric>
 
 using namespace flvd_fuzz;
 
@@ -20,20 +18,6 @@ constexpr uint64_t PATIENCE = 2000; // of most hosts that lie: they may lead thr
 constexpr uint64_t BUDGETS = 30'000'000; // calls that a patient one may cost
 constexpr uint8_t POISON = 0x5A;
 constexpr std::array<uint32_t, 8> CACHES = {0, 1024, 1, 1500, 65536, 4096, 16000, 0xFFFFFFFF};
-
-flvd_frame_t filled(uint8_t value)
-{
-    flvd_frame_t frame;
-    std::memset(&frame, value, sizeof frame);
-    return frame;
-}
-
-// Reads it all, so that a sanitizer sees what is not there.
-template <class Element> void touch(const Element* begin, size_t count)
-{
-    const volatile Element sum = std::accumulate(begin, begin + count, Element{0}, std::bit_xor<>());
-    static_cast<void>(sum);
-}
 
 class Run {
 public:
@@ -112,7 +96,8 @@ public:
         const bool separate = has(SEPARATE) && m_ctx->opened_for_info == 0;
         const fio_file_t* const reader = separate && stream == AUDIO ? m_ctx->audio_reader : m_ctx->main_reader;
         const flvd_frame_request_t request{m_buffer.data(), static_cast<uint32_t>(m_buffer.size()), stream};
-        flvd_frame_t frame = filled(POISON);
+        flvd_frame_t frame;
+        std::memset(&frame, POISON, sizeof frame);
         begin();
         const int64_t before = place(reader);
         const int32_t rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &frame);
@@ -123,7 +108,7 @@ public:
         }
         require(IsListed(Op::Frame, rc, m_ctx->error, m_ctx->error_line), "a failure that no frame has");
         const bool refused = m_ctx->error <= FLVD_ERR_NO_VIDEO && m_ctx->error >= FLVD_ERR_INFO_ONLY;
-        require(same_bytes(frame, filled(refused ? POISON : 0)), "the record of a failed request");
+        require(bytes_of(frame) == Bytes(sizeof frame, refused ? POISON : 0), "the record of a failed request");
     }
 
 private:
@@ -132,15 +117,16 @@ private:
     void judge_opened(const flvd_open_info_t& info) const
     {
         const bool video = (m_ctx->streams & FLVD_STREAM_VIDEO) != 0, audio = (m_ctx->streams & FLVD_STREAM_AUDIO) != 0;
+        const auto& arrays = m_ctx->keyframe_arrays;
         require(video || audio, "no stream");
         require(info.has_video == (video ? 1u : 0u) && info.has_audio == (audio ? 1u : 0u), "streams");
         require(info.file_info == &m_ctx->file_info, "the record of the file");
         require(info.video_info == (video ? &m_ctx->video_info : nullptr), "the record of video");
         require(info.audio_info == (audio ? &m_ctx->audio_info : nullptr), "the record of audio");
-        touch(m_ctx->video_info.config, m_ctx->video_info.config_size);
-        touch(m_ctx->audio_info.config, m_ctx->audio_info.config_size);
-        touch(m_ctx->keyframe_arrays.times_ms, m_ctx->keyframe_arrays.times_count);
-        touch(m_ctx->keyframe_arrays.positions, m_ctx->keyframe_arrays.positions_count);
+        copy_of(m_ctx->video_info.config, m_ctx->video_info.config_size);
+        copy_of(m_ctx->audio_info.config, m_ctx->audio_info.config_size);
+        copy_of(arrays.times_ms, arrays.times_count * sizeof *arrays.times_ms);
+        copy_of(arrays.positions, arrays.positions_count * sizeof *arrays.positions);
         require(m_lied || m_faulty || has(FLVD_OPT_PROGRESSIVE) || m_ctx->data_end <= m_host.visible(),
                 "the end of the data");
     }
@@ -156,7 +142,7 @@ private:
     void judge_frame(const flvd_frame_t& frame, int64_t behind) const
     {
         require(m_buffer.empty() || (frame.data == m_buffer.data() && frame.size <= m_buffer.size()), "another buffer");
-        touch(frame.data, frame.size);
+        copy_of(frame.data, frame.size);
         behind = m_faulty ? m_host.visible() : behind;
         while (m_faulty && behind > 0 && !is_tag_of(frame, behind))
             --behind;
