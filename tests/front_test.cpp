@@ -228,7 +228,9 @@ TEST(Probing, FindsStreamsAndTimes)
         FakeHost host(c.file.bytes);
         Session session(host, {c.options});
         ASSERT_TRUE(session.opened());
-        const flvd_file_info_t& file = *session.info().file_info;
+        const flvd_open_info_t& info = session.info();
+        const flvd_file_info_t& file = *info.file_info;
+        EXPECT_EQ(std::tie(info.video_config, info.audio_config), std::tie(info.video_info, info.audio_info));
         const flvd_ctx_t* const ctx = session.ctx();
         EXPECT_EQ(std::tie(ctx->streams, ctx->first_ts, file.duration_ms, file.seek_method),
                   std::tie(c.streams, c.first_ts, c.duration, c.method));

@@ -197,14 +197,7 @@ const OpenOptions QUICK{0, true};
 
 // Pictures every 40 ms, each second one a keyframe, sound up to 782 ms.
 const ChainOptions CHAIN = {true, true, false, false, 20, 2};
-Flv Indexed(const IndexHook& hook)
-{
-    FlvBuilder builder;
-    builder.indexed_metadata({}, hook);
-    for (const Tag& tag : MakeChain(CHAIN).tags)
-        builder.add(tag);
-    return builder.build();
-}
+const auto Indexed = [](const IndexHook& hook) { return MakeChain({true, true, true, true, 20, 2, 0, hook}); };
 
 TEST(Extent, EndsWithTheLastTag)
 {

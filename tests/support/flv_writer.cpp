@@ -258,7 +258,7 @@ Flv MakeChain(const ChainOptions& options)
     FlvBuilder builder(static_cast<uint8_t>((options.video ? 1 : 0) | (options.audio ? 4 : 0)));
     const amf::Property width{"width", amf::Number(320)}, height{"height", amf::Number(240)};
     if (options.index)
-        builder.indexed_metadata({width, height});
+        builder.indexed_metadata({width, height}, options.hook);
     else if (options.metadata)
         builder.metadata({width, height, {"framerate", amf::Number(25)}});
     if (options.video)

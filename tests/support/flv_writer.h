@@ -223,6 +223,7 @@ struct ChainOptions {
     uint32_t pictures = 20; /**< 40 ms each */
     uint32_t gop = 5;
     uint32_t first_ts = 0; /**< of configuration packets and the first frames */
+    IndexHook hook = {};   /**< of the index */
 };
 Flv MakeChain(const ChainOptions& options = {});
 
