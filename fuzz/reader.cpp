@@ -46,7 +46,7 @@ private:
         }
         case 1: {
             const uint32_t element = 1 + code / 64u;
-            const int64_t expected = left(n * element);
+            const int64_t expected = left(int64_t{n} * element);
             Bytes copy(size_t{n} * element);
             const uint32_t got = __FLV_DMX__fioRead(copy.data(), element, n, m_file);
             require(got == expected / element && holds(copy.data(), expected), "read bytes");
