@@ -280,6 +280,21 @@ TEST(Delivery, GivesThePayloadsBehindTheCodecBytes)
     }
 }
 
+TEST(Delivery, GoesBackWhenItCannotPassDamage)
+{
+    // The second request seeks over a configuration, and then by its size in the damage.
+    const Flv flv = File({g_avc, Nalu(0), {9, 9, AvcConfig(Noise(5000))}});
+    for (const bool nor_back : {false, true}) {
+        FakeHost host(Concat({flv.bytes, Bytes(3u << 20)}));
+        Session session(host, {GROWING});
+        ASSERT_EQ(session.frame().rc, 0);
+        host.reset_calls();
+        nor_back ? host.fail_from(HostFn::Seek, 2) : host.fail_nth(HostFn::Seek, 2);
+        const int32_t rc = session.frame().rc;
+        EXPECT_EQ(std::tuple(rc, session.error_line()), nor_back ? std::tuple(-1, 2945) : std::tuple(-2, 2957));
+    }
+}
+
 TEST(Delivery, KeepsItsPlaceBehindManyTagsOfTheOtherStream)
 {
     std::vector<Tag> tags(4100, Pcm(9));
