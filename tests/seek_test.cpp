@@ -78,7 +78,7 @@ struct Player {
 
     bool has(uint32_t option) const { return (session.ctx()->options & option) != 0; }
     // The reader that seeks: the two are one without the option.
-    fio_file_t* reader() { return m.stream == VIDEO ? session.ctx()->main_reader : session.ctx()->audio_reader; }
+    fio_file_t* reader() const { return m.stream == VIDEO ? session.ctx()->main_reader : session.ctx()->audio_reader; }
 
     // The first frame at or behind a place.
     size_t at(int64_t pos) const
