@@ -22,6 +22,7 @@ static_assert(sizeof(off_t) == sizeof(int64_t), "places beyond 2 GiB must be rea
 
 constexpr size_t WINDOW = FLVD_WINDOW_HOST_SIZE;
 constexpr size_t BACK_POINTER = 4;
+constexpr size_t BETWEEN_LARGE = WINDOW / 4; // read behind a large tag: what stands before the next one is short
 
 struct WindowFile {
     int descriptor;
@@ -29,6 +30,7 @@ struct WindowFile {
     int64_t position;      // what the library sees
     int64_t descriptor_at; // where the descriptor stands
     int64_t file_end;      // where it was when the library last asked for it
+    bool large;            // the last read did not go through the window
     int64_t start;         // of the window in the file
     size_t count;          // bytes in it
     char window[WINDOW];
@@ -70,7 +72,9 @@ void MoveWindow(WindowFile* file, size_t wanted)
 {
     const int64_t before = IsWayBack(file) ? std::min(file->position, static_cast<int64_t>(WINDOW / 2)) : 0;
     const int64_t start = file->position - before;
-    const size_t got = ReadAt(file, start, file->window, static_cast<size_t>(before) + wanted, WINDOW);
+    const auto least = static_cast<size_t>(before) + wanted;
+    const size_t got = ReadAt(file, start, file->window, least, file->large ? std::max(least, BETWEEN_LARGE) : WINDOW);
+    file->large = false;
     if (got == 0)
         return;
     file->start = start;
@@ -107,6 +111,7 @@ struct WindowFiles {
         }
         const size_t got = ReadAt(file, file->position, to + done, rest, rest);
         file->position += static_cast<int64_t>(got);
+        file->large = !behind;
         return done + got;
     }
 
