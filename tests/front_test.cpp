@@ -143,6 +143,7 @@ TEST(Failures, OfDelivery)
                     {"growing: info", sound, {GROWING | SEPARATE, true}, {-1, -4007, 2767}, 1, AUDIO},
                     {"growing: no video", sound, {GROWING | SEPARATE}, {-1, -4002, 2783}, 1, VIDEO},
                     {"growing: no audio", pictures, {GROWING | SEPARATE}, {-1, -4003, 2796}, 1, AUDIO},
+                    {"growing: stream 0", sound, {GROWING | SEPARATE}, {-1, -4004, 2802}, 1, 0},
                     {"growing: stream 3", sound, {GROWING | SEPARATE}, {-1, -4004, 2802}, 1, 3}});
 }
 
@@ -217,6 +218,7 @@ TEST(Probing, FindsStreamsAndTimes)
         {"growing", File({g_avc, Nalu(40), Nalu(90)}, 1), GROWING, 1, 0, 0, 0},
         {"larger header", behind({}, 12), 0, 3, 0, 9, 2},
         {"signature behind its own beginning", behind({'F', 'L'}, 12), 0, 3, 0, 9, 2},
+        {"signature behind a few bytes", behind(Noise(5), 12), 0, 3, 0, 9, 2},
         {"signature behind a cache", behind(Noise(5000), 12), 0, 3, 0, 9, 2},
         {"signature behind the first MiB", far, 0, 3, 0, 9, 2},
         {"growing behind a script", File({script, g_avc, Nalu(40), Nalu(90)}, 1), GROWING, 1, 0, 0, 0},
@@ -230,8 +232,12 @@ TEST(Probing, FindsStreamsAndTimes)
         ASSERT_TRUE(session.opened());
         const flvd_open_info_t& info = session.info();
         const flvd_file_info_t& file = *info.file_info;
-        EXPECT_EQ(std::tie(info.video_config, info.audio_config), std::tie(info.video_info, info.audio_info));
         const flvd_ctx_t* const ctx = session.ctx();
+        const auto* const video = (c.streams & FLVD_STREAM_VIDEO) != 0 ? &ctx->video_info : nullptr;
+        const auto* const audio = (c.streams & FLVD_STREAM_AUDIO) != 0 ? &ctx->audio_info : nullptr;
+        EXPECT_EQ(std::tie(info.video_info, info.video_config, info.audio_info, info.audio_config),
+                  std::tuple(video, video, audio, audio));
+        EXPECT_EQ(info.has_video + 2 * info.has_audio, c.streams);
         EXPECT_EQ(std::tie(ctx->streams, ctx->first_ts, file.duration_ms, file.seek_method),
                   std::tie(c.streams, c.first_ts, c.duration, c.method));
         EXPECT_EQ(file.file_size, c.options != 0 ? 0 : host.visible());

@@ -50,6 +50,7 @@ protected:
     flvd_init_t t{};
     const Bytes noise = Noise(SIZE);
     const std::string bytes = {noise.begin(), noise.end()};
+    // mkdtemp takes the six letters for its own, so that tests that run at the same time do not meet.
     const std::string folder = mkdtemp((testing::TempDir() + "host.XXXXXX").data()), file = folder + "/file";
     flvd_memory_file_t memory = {file.c_str(), bytes.data(), SIZE, nullptr};
     void* handle = nullptr;
