@@ -14,24 +14,6 @@ namespace {
 
 constexpr uint32_t OLD = 77; // what stands in a field before
 
-// Bits from words: n/b is n in b bits, n is ue(n), +n and -n are se(n); k*word is the word k times.
-Bytes Bits(const std::string& text)
-{
-    BitWriter out;
-    std::istringstream in(text);
-    for (std::string word; in >> word;) {
-        const size_t star = word.find('*'), slash = word.find('/');
-        const std::string number = word.substr(star + 1); // all of it when there is no star
-        const bool is_signed = number[0] == '+' || number[0] == '-';
-        const auto n = std::stoll(number);
-        for (int times = star != std::string::npos ? std::stoi(word) : 1; times != 0; --times)
-            slash != std::string::npos ? out.u(std::stoi(word.substr(slash + 1)), static_cast<uint32_t>(n))
-            : is_signed                ? out.se(static_cast<int32_t>(n))
-                                       : out.ue(static_cast<uint32_t>(n));
-    }
-    return out.bytes();
-}
-
 // Result, sample rate, channels, format tag, data rate, sample size.
 using Audio = std::tuple<int32_t, uint32_t, uint32_t, uint32_t, uint32_t, uint32_t>;
 constexpr Audio NO_AUDIO{-1, OLD, OLD, OLD, OLD, OLD};
@@ -202,34 +184,6 @@ TEST(StreamProbe, DescribesTheFirstTag)
                                   "VP6A 320x240 0", "SCR2 0x0 0", " 0x0 206",       " 0x0 0"};
     for (size_t codec = 0; codec < std::size(codecs); ++codec)
         EXPECT_EQ(Probe(9, {VideoData(1, static_cast<uint8_t>(codec), any)}), codecs[codec]);
-}
-
-// AMF0 from words: numbers, nan among them; 'text; "long string; { key: value … } object; < key: value … > ECMA array;
-// [3 and the three elements; %byte.byte… as they are; ! a long string that fails right behind its length. Nothing need
-// match.
-Bytes Amf(const std::string& text)
-{
-    const std::map<std::string, Bytes> marks = {
-        {"{", {3}}, {"<", {8, 0, 0, 0, 9}}, {"}", {0, 0, 9}}, {">", {0, 0, 9}}, {"!", {12, 0x7F, 0xFF, 0xFF, 0xFB}}};
-    Bytes out;
-    std::istringstream in(text);
-    for (std::string word; in >> word;) {
-        const std::string rest = word.substr(1);
-        if (marks.count(word) != 0)
-            Append(out, marks.at(word));
-        else if (word.back() == ':')
-            Append(out, Concat({BigEndian(rest.size(), 2), Bytes(word.begin(), word.end() - 1)}));
-        else if (word[0] == '\'' || word[0] == '"')
-            Append(out, word[0] == '"' ? amf::LongString(rest) : amf::String(rest));
-        else if (word[0] == '[')
-            Append(out, amf::StrictArray({}, static_cast<uint32_t>(std::stoul(rest))));
-        else if (word[0] != '%')
-            Append(out, amf::Number(std::stod(word)));
-        else
-            for (size_t at = 0; at != std::string::npos; at = word.find('.', at + 1))
-                Put(out, std::stoul(word.substr(at + 1)), 1);
-    }
-    return out;
 }
 
 // Reads script data behind the tags of a file: `length` bytes, 0 for all. Told are the result, and what is not 0 in

@@ -46,7 +46,7 @@ public:
     Course(const Scenario& scenario, const OpenOptions& open, const Fault& fault, Seen* seen)
         : m_scenario(scenario), m_fault(fault), m_seen(*seen), m_host(scenario.flv.bytes), m_open(open)
     {
-        for (const uint32_t stream : (open.options & SEPARATE) != 0 ? std::vector{VIDEO, AUDIO} : std::vector{BOTH}) {
+        for (const uint32_t stream : Streams(open.options)) {
             Frames& frames = m_due[stream].first;
             for (const Frame& frame : scenario.flv.frames(stream, 0))
                 if ((open.options & USER) == 0 || frame.data.size() <= open.user_buffer_size)
@@ -252,7 +252,7 @@ std::vector<Scenario> Scenarios()
         {"information", indexed, {open(0, 0, true), open(SEPARATE, 0, true)}, {{500, BACK}}},
         {"metadata at the end", File(last.tags), {open(0), open(INDEX)}, seeks},
         {"damaged", damaged, {open(0), open(SEPARATE)}, seeks},
-        {"bytes behind", Cut(indexed, static_cast<int64_t>(indexed.bytes.size()) + 50), {open(0)}},
+        {"bytes behind", Cut(indexed, indexed.size() + 50), {open(0)}},
         {"cut in a keyframe", Cut(indexed, second_key + 20), {open(0), open(INDEX)}},
         {"cut behind it", Cut(indexed, second_key + 900), {open(INDEX)}},
         {"first tags", File({mp3(0), Screen(0, LARGE), mp3(9), Screen(9), Screen(40), Screen(80)}), {open(0, SMALL)}},

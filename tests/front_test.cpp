@@ -192,7 +192,7 @@ TEST(Probing, FindsStreamsAndTimes)
         uint32_t options, streams, first_ts, duration, method;
     };
     const Tag bad_avc = Video(0, AvcConfig(Bytes(9, 0xFF)));
-    const Tag script = {18, 0, amf::OnMetaData({{"text", amf::String(std::string(224, 'x'))}})};
+    const Tag script = {18, 0, OnMetaData("text: 'x^224")};
     ASSERT_EQ(script.data.size() + 11, 0x109u); // a back-pointer that passes for a video tag
     const auto behind = [](const Bytes& prefix, uint32_t header) {
         return File({Pcm(0), Screen(5), Pcm(9)}, 5, prefix, header);
@@ -274,8 +274,7 @@ TEST(Delivery, GivesThePayloadsBehindTheCodecBytes)
             SCOPED_TRACE(std::to_string(&flv - files) + " with mode " + std::to_string(&mode - modes));
             FakeHost host(flv.bytes);
             Session session(host, mode);
-            const bool apart = (mode.options & SEPARATE) != 0;
-            for (const uint32_t stream : apart ? std::vector{VIDEO, AUDIO} : std::vector{BOTH}) {
+            for (const uint32_t stream : Streams(mode.options)) {
                 int32_t rc = 0;
                 EXPECT_EQ(play(session, stream, &rc), flv.frames(stream));
                 EXPECT_EQ(rc, (session.ctx()->streams & stream) != 0 ? -2 : -1);

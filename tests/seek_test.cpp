@@ -56,17 +56,6 @@ struct Media {
     }
 };
 
-Flv Sample(const std::string& name)
-{
-    Flv flv{ReadSample(name + ".flv"), {}};
-    for (const ExpectedPacket& packet : ReadExpected(name).packets) {
-        const uint8_t *const begin = flv.bytes.data() + packet.pos, *const data = begin + 11;
-        const Bytes all(data, data + (begin[1] << 16 | begin[2] << 8 | begin[3]));
-        flv.tags.push_back({*begin, packet.timestamp, all, {}, {}, 0, packet.pos});
-    }
-    return flv;
-}
-
 // Plays and seeks, comparing every result with what the media's lists ask for.
 struct Player {
     const Media& m;
@@ -213,10 +202,11 @@ Flv Configured()
 
 TEST(Seek, LandsAsTheListsSay)
 {
-    std::vector<Media> all = {Media(Sample("avc_aac_index"), 23), Media(WithoutIndex(Sample("avc_aac_index")))};
+    std::vector<Media> all = {Media(ReadExpected("avc_aac_index"), 23),
+                              Media(WithoutIndex(ReadExpected("avc_aac_index")))};
     for (const char* sample :
          {"avc_aac", "avc_bframes_aac", "avc_only", "h263_mp3", "screen", "damaged", "truncated", "aac_only"})
-        all.emplace_back(Sample(sample));
+        all.emplace_back(ReadExpected(sample));
     for (const Flv& flv : {Configured(), Chain(1000, false), Chain(1000, true), Chain(3000000000, false),
                            Chain(3000000000, true), Chain(1000, false, false), Chain(0, true)})
         all.emplace_back(flv);
@@ -229,23 +219,20 @@ TEST(Seek, LandsAsTheListsSay)
             }
 }
 
-using amf::NumberArray;
-
 TEST(Seek, TellsWhatItReachedOrWhereItFailed)
 {
     const Flv scan = Chain(0, false), index = Chain(0, true), audio = Chain(0, false, false);
     const Flv one = Chain(0, true, true, 50, 50);
     FlvBuilder builder;
-    builder.indexed_metadata({}, [](auto& t, auto& p) { t[2] = 1.4, t[3] = 1.6015, t[4] = 1.8, p[4] = 1e9; });
+    builder.indexed_metadata("", [](auto& t, auto& p) { t[2] = 1.4, t[3] = 1.6015, t[4] = 1.8, p[4] = 1e9; });
     builder.add(g_avc).add(Nalu(0)).add(Nalu(200)).add(Nalu(400)).add(Nalu(600)).add(Nalu(2000));
     const Flv lying = builder.build();
     // "times" and "filepositions", or the other way round, of which the second has more entries than there are.
-    const auto uneven = [](const char* two, const Bytes& numbers, const char* five, const Bytes& more) {
-        const Tag meta{18, 0, amf::OnMetaData({{two, numbers}, {"keyframes", amf::Object({{five, more}})}})};
-        return File({meta, Screen(0)}, 1);
+    const auto uneven = [](const std::string& two, const std::string& five) {
+        return File({{18, 0, OnMetaData(two + " keyframes: { " + five + " }")}, Screen(0)}, 1);
     };
-    const Flv times = uneven("times", NumberArray({0, 0}), "filepositions", NumberArray({13, 13, 1e9, 1e9, 1e9}));
-    const Flv places = uneven("filepositions", NumberArray({13, 13}), "times", NumberArray({0, 0.2, 0.4, 0.6, 0.8}));
+    const Flv times = uneven("times: [2 0 0", "filepositions: [5 13 13 1e9 1e9 1e9");
+    const Flv places = uneven("filepositions: [2 13 13", "times: [5 0 0.2 0.4 0.6 0.8");
     const auto hide = [](FlvBuilder hidden, const auto& tag) { // all tags of one stream are later than the file's end
         for (uint32_t time = 1538; time <= 1978; time += 40)
             hidden.add(tag(time, 60));
@@ -340,7 +327,7 @@ TEST(Seek, BeyondFourGiB)
     constexpr int64_t SECOND = PICTURE + 36;
     int64_t head = 0;
     FlvBuilder builder;
-    builder.indexed_metadata({}, [&head](auto& times, auto& positions) {
+    builder.indexed_metadata("", [&head](auto& times, auto& positions) {
         for (uint32_t i = 0; i < SECONDS; i += 3) {
             times.push_back(i);
             positions.push_back(static_cast<double>(head + i * SECOND));

@@ -78,7 +78,7 @@ Bytes operator+(const Bytes& front, const Tag& tag)
 
 TEST(TagKinds, AreReportedInBothDirections)
 {
-    const Bytes script = amf::Number(1);
+    const Bytes script = Amf("1");
     FlvBuilder builder;
     builder.script(script).add(g_avc).add(g_aac).add(Picture()).video(1, AvcNalu(false, Noise(60))).add(Sound());
     builder.video(2, Concat({{0x27, 0, 0, 0, 0}, Noise(70)})); // a sequence header in an inter frame
@@ -202,12 +202,11 @@ const auto Indexed = [](const IndexHook& hook) { return MakeChain({true, true, t
 TEST(Extent, EndsWithTheLastTag)
 {
     const Flv flv = MakeChain(CHAIN);
-    const auto size = static_cast<int64_t>(flv.bytes.size());
     const auto behind = [&flv](const Bytes& more) { return Concat({flv.bytes, more}); };
     for (const Bytes& more : {Bytes(), Bytes(100, 0xEE), Bad(3 * MIB / BAD_SIZE)})
-        EXPECT_EQ(Probe(behind(more)), Extent(size, 782, FLVD_SEEK_BY_SCAN, 0, 0));
-    EXPECT_EQ(Probe(behind(Bytes(15, 0xEE)), QUICK), Extent(size, 782, FLVD_SEEK_NONE, 0, 0));
-    EXPECT_EQ(Probe(behind(Bytes(16, 0xEE)), QUICK), Extent(size + 16, 0, FLVD_SEEK_NONE, 0, 0));
+        EXPECT_EQ(Probe(behind(more)), Extent(flv.size(), 782, FLVD_SEEK_BY_SCAN, 0, 0));
+    EXPECT_EQ(Probe(behind(Bytes(15, 0xEE)), QUICK), Extent(flv.size(), 782, FLVD_SEEK_NONE, 0, 0));
+    EXPECT_EQ(Probe(behind(Bytes(16, 0xEE)), QUICK), Extent(flv.size() + 16, 0, FLVD_SEEK_NONE, 0, 0));
     const Bytes half = File(std::vector(20, Sound(100000)), 4).bytes + Sound();
     EXPECT_EQ(Probe(Concat({half, Zeros(3 * MIB)})), Extent(half.size(), 5, FLVD_SEEK_BY_SCAN, 0, 0));
     for (uint64_t nth = 255; nth < 275; ++nth) { // a seek of the tail, of the halving or of the last places
@@ -235,23 +234,23 @@ TEST(Extent, TakesTheLargestTimeOfTheLastTags)
 TEST(Extent, TrimsAKeyframeIndexToTheData)
 {
     const Flv flv = Indexed({});
-    const auto size = static_cast<int64_t>(flv.bytes.size());
     const auto cut = [&flv](size_t tag) { // 20 bytes into it
         return Bytes(flv.bytes.data(), flv.bytes.data() + flv.tags[tag].offset + 20);
     };
     const Bytes cut_key = cut(31), cut_picture = cut(34);
     const Bytes last = Indexed([](auto&, auto& at) { at.back() = -5; }).bytes; // no matter: all entries are inside
-    const Bytes astray = Indexed([&](auto&, auto& at) { at[3] = static_cast<double>(size) + 24, at[4] = 1e12; }).bytes;
+    const Bytes astray =
+        Indexed([&](auto&, auto& at) { at[3] = static_cast<double>(flv.size()) + 24, at[4] = 1e12; }).bytes;
     // Neither the last position inside the file nor the bytes behind its tags lead to a tag.
     const Bytes no_step = Concat({astray, Bytes(20, 0xEE), {0, 0, 0, 7, 0xEE}});
     for (const uint32_t options : {INDEX, 0u}) {
         const auto extent = [options](const Bytes& file) { return Probe(file, {options}); };
         for (const Bytes& whole : {flv.bytes, last})
-            EXPECT_EQ(extent(whole), Extent(size, 782, FLVD_SEEK_BY_INDEX, 10, 720));
+            EXPECT_EQ(extent(whole), Extent(flv.size(), 782, FLVD_SEEK_BY_INDEX, 10, 720));
         // One entry behind the end stays.
         EXPECT_EQ(extent(cut_picture), Extent(cut_picture.size() - 20, 437, FLVD_SEEK_BY_INDEX, 7, 480));
         EXPECT_EQ(extent(cut_key), Extent(cut_key.size() - 20, 391, FLVD_SEEK_BY_INDEX, 6, 400));
-        EXPECT_EQ(extent(no_step), Extent(size, 782, FLVD_SEEK_BY_INDEX, 4, 240));
+        EXPECT_EQ(extent(no_step), Extent(flv.size(), 782, FLVD_SEEK_BY_INDEX, 4, 240));
     }
 }
 

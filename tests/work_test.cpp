@@ -94,7 +94,7 @@ WorkCase ManyTags(const char* name, bool pictures, size_t size, bool index, Cost
     constexpr uint64_t count = 500;
     FlvBuilder builder;
     if (index)
-        builder.indexed_metadata({}, [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; });
+        builder.indexed_metadata("", [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; });
     for (uint32_t i = 0; i < count; ++i) {
         if (pictures)
             builder.add(Screen(2 * i, 20));
@@ -111,7 +111,7 @@ WorkCase ManyTags(const char* name, bool pictures, size_t size, bool index, Cost
  */
 WorkCase Metadata(const char* name, const Bytes& head, const Bytes& pattern, uint32_t options = 0)
 {
-    const Bytes payload = Concat({amf::String("onMetaData"), head, Repeat(pattern, MIB)});
+    const Bytes payload = Concat({Amf("'onMetaData"), head, Repeat(pattern, MIB)});
     const Bytes file = Concat({FlvBuilder().script(payload).build().bytes, Tags(MakeChain())});
     const Cost pass = Forward(file.size()), script = Forward(2 * payload.size()) + Cost{payload.size() / 8, 0};
     return {name, file, options, CACHE, script + 4 * pass, pass, 3 * pass};
@@ -204,7 +204,7 @@ TEST(Work, CostsSoMuchOnSoundFiles)
         EXPECT_EQ(session.seek(4200, FLVD_SEEK_BACKWARD, &reached), 0);
         EXPECT_EQ(reached, 4000);
     };
-    const Bytes meta = g_meta.data, long_text = amf::String(std::string(5000, 'x')); // which leads estimates astray
+    const Bytes meta = g_meta.data, long_text = Amf("'x^5000"); // which leads estimates astray
     const struct {
         const char* name;
         size_t size;
@@ -226,7 +226,7 @@ TEST(Work, CostsSoMuchOnSoundFiles)
         SCOPED_TRACE(c.name);
         FlvBuilder builder(1);
         if (c.script.empty())
-            builder.indexed_metadata({});
+            builder.indexed_metadata("");
         else
             builder.script(c.script);
         builder.add(g_avc);

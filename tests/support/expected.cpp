@@ -36,7 +36,7 @@ static Bytes FromHex(const std::string& text)
 Expected ReadExpected(const std::string& name)
 {
     std::ifstream in = OpenData("expected/" + name + ".txt");
-    Expected out;
+    Expected out{{ReadSample(name + ".flv"), {}}, name, {}};
     for (std::string text, kind; std::getline(in, text);) {
         std::istringstream line(text);
         std::map<std::string, std::string> fields;
@@ -46,21 +46,19 @@ Expected ReadExpected(const std::string& name)
         const auto number = [&fields](const char* key, int base = 10) {
             return static_cast<uint32_t>(std::stoul(fields.at(key), nullptr, base));
         };
-        const uint32_t stream = fields["kind"] == "video" ? 1 : 2;
-        if (kind == "file")
-            out.file_size = number("size");
-        else if (kind == "stream")
-            out.streams.push_back({stream, number("width"), number("rate"), FromHex(fields.at("extradata"))});
-        else if (kind == "packet")
-            out.packets.push_back({stream, number("pos"), number("dts"), number("size"), number("crc", 16)});
+        if (kind == "stream")
+            out.streams.push_back({fields["kind"] == "video" ? 1u : 2u, number("width"), number("rate"),
+                                   FromHex(fields.at("extradata"))});
+        if (kind != "packet")
+            continue;
+        const uint8_t* const at = &out.bytes.at(number("pos"));
+        const Bytes data(at + 11, at + 11 + (at[1] << 16 | at[2] << 8 | at[3]));
+        const Tag& tag = out.tags.emplace_back(Tag{*at, number("dts"), data, {}, {}, 0, number("pos")});
+        const size_t size = number("size");
+        if (data.size() != tag.codec_bytes() + size || tool::Crc32(&data[tag.codec_bytes()], size) != number("crc", 16))
+            throw std::runtime_error(name + ": another packet at " + fields["pos"]);
     }
     return out;
-}
-
-bool SameFrame(const ExpectedPacket& packet, const Frame& frame)
-{
-    return packet.stream == frame.stream && packet.timestamp == frame.timestamp && packet.size == frame.data.size() &&
-           packet.crc == tool::Crc32(frame.data.data(), frame.data.size());
 }
 
 } // namespace flvd_test

@@ -14,23 +14,13 @@ struct ExpectedStream {
     Bytes extradata;
 };
 
-struct ExpectedPacket {
-    uint32_t stream = 0;
-    int64_t pos = 0;        /**< of the tag */
-    uint32_t timestamp = 0; /**< of the tag, ms */
-    uint32_t size = 0;
-    uint32_t crc = 0;
-};
-/** Compares all that a delivered frame shows when the first timestamp is 0: stream, timestamp, size, CRC-32. */
-bool SameFrame(const ExpectedPacket& packet, const Frame& frame);
-
-struct Expected {
-    int64_t file_size = 0;
+/** A sample file; its tags are those that carry the packets, which have been compared with them. */
+struct Expected : Flv {
+    std::string name;
     std::vector<ExpectedStream> streams;
-    std::vector<ExpectedPacket> packets; /**< in file order */
 };
 
-/** expected/NAME.txt; throws when it cannot be read. */
+/** NAME.flv and expected/NAME.txt; throws when they cannot be read or do not agree. */
 Expected ReadExpected(const std::string& name);
 
 } // namespace flvd_test

@@ -1,8 +1,11 @@
 #include "flv_writer.h"
 
 #include <algorithm>
+#include <bitset>
 #include <cstring>
-#include <ostream>
+#include <iomanip>
+#include <map>
+#include <sstream>
 
 namespace flvd_test {
 
@@ -35,81 +38,68 @@ Bytes Noise(size_t size, uint32_t seed)
     return out;
 }
 
-BitWriter& BitWriter::u(int bits, uint64_t value)
+Bytes Bits(const std::string& words)
 {
-    while (bits-- > 0) {
-        if (m_free == 0)
-            m_bytes.push_back(0);
-        m_free = (m_free + 7) % 8;
-        m_bytes.back() = static_cast<uint8_t>(m_bytes.back() | ((value >> bits & 1u) << m_free));
+    const auto binary = [](int64_t n) { return std::bitset<64>(static_cast<uint64_t>(n)).to_string(); };
+    std::string bits;
+    std::istringstream in(words);
+    for (std::string word; in >> word;) {
+        const size_t star = word.find('*'), slash = word.find('/');
+        const std::string number = word.substr(star + 1); // all of it when there is no star
+        const bool is_signed = number[0] == '+' || number[0] == '-';
+        const int64_t n = std::stoll(number);
+        std::string code = binary(!is_signed ? n + 1 : n > 0 ? 2 * n : 1 - 2 * n);
+        code.erase(0, code.find('1')).insert(0, code.size() - 1, '0');
+        if (slash != std::string::npos)
+            code = binary(n).substr(64 - std::stoul(word.substr(slash + 1)));
+        for (int times = star != std::string::npos ? std::stoi(word) : 1; times != 0; --times)
+            bits += code;
     }
-    return *this;
-}
-
-BitWriter& BitWriter::ue(uint32_t value)
-{
-    int zeros = 0;
-    while ((uint64_t{value} + 1) >> (zeros + 1) != 0)
-        ++zeros;
-    return u(zeros, 0).u(zeros + 1, uint64_t{value} + 1);
-}
-
-namespace amf {
-
-static Bytes Text(const std::string& text, int length_bytes)
-{
-    return Concat({BigEndian(text.size(), length_bytes), Bytes(text.begin(), text.end())});
-}
-
-// With their end marker.
-static Bytes Properties(const std::vector<Property>& properties)
-{
     Bytes out;
-    for (const auto& [name, value] : properties)
-        Append(out, Concat({Text(name, 2), value}));
-    return Concat({out, {0, 0, 9}});
+    bits.append(7, '0');
+    for (size_t at = 0; at + 8 <= bits.size(); at += 8)
+        out.push_back(static_cast<uint8_t>(std::bitset<8>(bits, at, 8).to_ulong()));
+    return out;
 }
 
-Bytes Number(double value)
+static Bytes Number(double value)
 {
     uint64_t bits = 0;
     std::memcpy(&bits, &value, sizeof(bits));
     return Concat({{0}, BigEndian(bits, 8)});
 }
 
-Bytes String(const std::string& text)
+Bytes Amf(const std::string& words)
 {
-    return Concat({{2}, Text(text, 2)});
+    const std::map<std::string, Bytes> marks = {
+        {"{", {3}}, {"<", {8, 0, 0, 0, 9}}, {"}", {0, 0, 9}}, {">", {0, 0, 9}}, {"!", {12, 0x7F, 0xFF, 0xFF, 0xFB}}};
+    Bytes out;
+    std::istringstream in(words);
+    for (std::string word; in >> word;) {
+        size_t digits = 0;
+        if (const size_t at = word.find('^'); at != std::string::npos) {
+            const size_t count = std::stoul(word.substr(at + 1), &digits);
+            word.replace(at, digits + 1, count - 1, word[at - 1]);
+        }
+        const Bytes text(word.begin() + 1, word.end()), key(word.begin(), word.end() - 1);
+        if (marks.count(word) != 0)
+            Append(out, marks.at(word));
+        else if (word.back() == ':')
+            Append(out, Concat({BigEndian(key.size(), 2), key}));
+        else if (word[0] == '\'')
+            Append(out, Concat({{2}, BigEndian(text.size(), 2), text}));
+        else if (word[0] == '"')
+            Append(out, Concat({{12}, BigEndian(text.size(), 4), text}));
+        else if (word[0] == '[')
+            Append(out, Concat({{10}, BigEndian(std::stoul(word.substr(1)), 4)}));
+        else if (word[0] != '%')
+            Append(out, Number(std::stod(word)));
+        else
+            for (size_t at = 0; at != std::string::npos; at = word.find('.', at + 1))
+                Put(out, std::stoul(word.substr(at + 1)), 1);
+    }
+    return out;
 }
-
-Bytes LongString(const std::string& text)
-{
-    return Concat({{12}, Text(text, 4)});
-}
-
-Bytes Object(const std::vector<Property>& properties)
-{
-    return Concat({{3}, Properties(properties)});
-}
-
-Bytes OnMetaData(const std::vector<Property>& properties)
-{
-    return Concat({String("onMetaData"), {8}, BigEndian(properties.size(), 4), Properties(properties)});
-}
-
-Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count)
-{
-    return Concat({{10}, BigEndian(count.value_or(elements.size()), 4), Concat(elements)});
-}
-
-Bytes NumberArray(const std::vector<double>& numbers)
-{
-    std::vector<Bytes> elements(numbers.size());
-    std::transform(numbers.begin(), numbers.end(), elements.begin(), Number);
-    return StrictArray(elements);
-}
-
-} // namespace amf
 
 Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms, uint8_t packet_type)
 {
@@ -146,9 +136,9 @@ Bytes Mp3Frame(size_t size)
 
 Bytes H263Picture(uint32_t size_code, uint32_t width, uint32_t height, size_t size)
 {
-    const int bits = size_code == 0 ? 8 : size_code == 1 ? 16 : 0;
-    const BitWriter head = BitWriter().u(17, 1).u(5, 0).u(8, 1).u(3, size_code).u(bits, width).u(bits, height);
-    return Filled(head.bytes(), size);
+    const std::string bits = size_code == 0 ? "/8 " : size_code == 1 ? "/16 " : "/0 ";
+    const std::string sizes = std::to_string(width) + bits + std::to_string(height) + bits;
+    return Filled(Bits("1/17 0/5 1/8 " + std::to_string(size_code) + "/3 " + sizes), size);
 }
 
 Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust, size_t size)
@@ -196,9 +186,9 @@ Frames Flv::frames(uint32_t streams, uint32_t first) const
     return out;
 }
 
-FlvBuilder& FlvBuilder::indexed_metadata(std::vector<amf::Property> properties, IndexHook hook)
+FlvBuilder& FlvBuilder::indexed_metadata(const std::string& properties, IndexHook hook)
 {
-    m_index = {m_tags.size(), std::move(properties), std::move(hook)};
+    m_index = {m_tags.size(), properties, std::move(hook)};
     return script({});
 }
 
@@ -212,10 +202,16 @@ Bytes FlvBuilder::index_data(const std::vector<Tag>& tags) const
         }
     if (m_index.hook)
         m_index.hook(times, positions);
-    std::vector<amf::Property> properties = m_index.properties;
-    properties.emplace_back(
-        "keyframes", amf::Object({{"times", amf::NumberArray(times)}, {"filepositions", amf::NumberArray(positions)}}));
-    return amf::OnMetaData(properties);
+    std::ostringstream words;
+    words << std::setprecision(17) << m_index.properties << " keyframes: { ";
+    for (const auto& [key, numbers] : {std::pair("times: [", times), {"filepositions: [", positions}}) {
+        words << key << numbers.size();
+        for (const double number : numbers)
+            words << ' ' << number;
+        words << ' ';
+    }
+    words << '}';
+    return OnMetaData(words.str());
 }
 
 Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
@@ -256,11 +252,10 @@ Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint3
 Flv MakeChain(const ChainOptions& options)
 {
     FlvBuilder builder(static_cast<uint8_t>((options.video ? 1 : 0) | (options.audio ? 4 : 0)));
-    const amf::Property width{"width", amf::Number(320)}, height{"height", amf::Number(240)};
     if (options.index)
-        builder.indexed_metadata({width, height}, options.hook);
+        builder.indexed_metadata("width: 320 height: 240", options.hook);
     else if (options.metadata)
-        builder.metadata({width, height, {"framerate", amf::Number(25)}});
+        builder.metadata("width: 320 height: 240 framerate: 25");
     if (options.video)
         builder.video(options.first_ts, AvcConfig(SmallAvcRecord()));
     if (options.audio)

@@ -33,34 +33,23 @@ Bytes Concat(const std::vector<Bytes>& parts);
 /** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
 
-/** Most significant bit first. */
-class BitWriter {
-public:
-    BitWriter& u(int bits, uint64_t value);
-    BitWriter& ue(uint32_t value);
-    BitWriter& se(int64_t value) { return ue(static_cast<uint32_t>(value > 0 ? 2 * value - 1 : -2 * value)); }
-    /** The bytes so far, the last one filled up with zero bits. */
-    Bytes bytes() const { return m_bytes; }
+/**
+ * Bits from words: n/b is n in b bits, n is ue(n), +n and -n are se(n); k*word is the word k times. Most significant
+ * bit first, the last byte filled up with zero bits.
+ */
+Bytes Bits(const std::string& words);
 
-private:
-    Bytes m_bytes;
-    int m_free = 0;
-};
-
-/** AMF0 values, type marker included. */
-namespace amf {
-using Property = std::pair<std::string, Bytes>;
-
-Bytes Number(double value);
-Bytes String(const std::string& text);
-Bytes LongString(const std::string& text);
-Bytes Object(const std::vector<Property>& properties);
-/** `count` defaults to the number of elements. */
-Bytes StrictArray(const std::vector<Bytes>& elements, std::optional<uint32_t> count = {});
-Bytes NumberArray(const std::vector<double>& numbers);
-/** The string "onMetaData" and an ECMA array. */
-Bytes OnMetaData(const std::vector<Property>& properties);
-} // namespace amf
+/**
+ * AMF0 values from words: numbers, nan among them; 'text; "long string; { key: value ... } object; < key: value ... >
+ * ECMA array; [3 and the three elements; %byte.byte... as they are; ! a long string that fails right behind its length.
+ * c^n is the character n times. Nothing need match.
+ */
+Bytes Amf(const std::string& words);
+/** The string "onMetaData" and an ECMA array of these keys and values. */
+inline Bytes OnMetaData(const std::string& properties)
+{
+    return Amf("'onMetaData < " + properties + " >");
+}
 
 /* Tag data (what follows the 11-byte tag header), codec header bytes included. */
 
@@ -152,12 +141,14 @@ inline const auto Raw = [](uint32_t ts, size_t size = 60) { return Tag{8, ts, Aa
 inline const Tag g_avc = {9, 0, AvcConfig(SmallAvcRecord())};
 /** Its back-pointer passes for a script tag. */
 inline const Tag g_aac = {8, 0, AacConfig({0x12, 0x10, 0x56, 0xE5, 0x00})};
-inline const Tag g_meta = {18, 0, amf::OnMetaData({{"width", amf::Number(320)}})};
+inline const Tag g_meta = {18, 0, OnMetaData("width: 320")};
 
 /** A file as built. */
 struct Flv {
     Bytes bytes;
     std::vector<Tag> tags; /**< in file order, with their offsets */
+
+    int64_t size() const { return static_cast<int64_t>(bytes.size()); }
 
     /** Smallest timestamp among the frames: what the library takes as first_ts when all frames count. */
     uint32_t first_ts() const;
@@ -187,9 +178,9 @@ public:
     FlvBuilder& audio(uint32_t timestamp, Bytes data) { return add({8, timestamp, std::move(data)}); }
     FlvBuilder& script(Bytes data, uint32_t timestamp = 0) { return add({18, timestamp, std::move(data)}); }
     /** onMetaData without keyframe index. */
-    FlvBuilder& metadata(const std::vector<amf::Property>& properties) { return script(amf::OnMetaData(properties)); }
+    FlvBuilder& metadata(const std::string& properties) { return script(OnMetaData(properties)); }
     /** onMetaData with "keyframes" behind the given properties: every keyframe of the file, at its real place. */
-    FlvBuilder& indexed_metadata(std::vector<amf::Property> properties, IndexHook hook = {});
+    FlvBuilder& indexed_metadata(const std::string& properties, IndexHook hook = {});
 
     Flv build() const;
 
@@ -203,7 +194,7 @@ private:
     std::vector<Tag> m_tags;
     struct Index {
         size_t tag = SIZE_MAX;
-        std::vector<amf::Property> properties;
+        std::string properties;
         IndexHook hook;
     } m_index;
 };

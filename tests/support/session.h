@@ -11,6 +11,12 @@ constexpr uint32_t BACK = FLVD_SEEK_BACKWARD, FORTH = FLVD_SEEK_FORWARD, REL = F
 constexpr uint32_t RETRY = FLVD_SEEK_RETRY_BACKWARD, AT_END = FLVD_SEEK_TO_END_ON_MISS;
 constexpr uint32_t VIDEO = FLVD_STREAM_VIDEO, AUDIO = FLVD_STREAM_AUDIO, BOTH = VIDEO | AUDIO;
 
+/** The streams to ask for, one after the other, of a file that is opened so. */
+inline std::vector<uint32_t> Streams(uint32_t options)
+{
+    return (options & SEPARATE) != 0 ? std::vector{VIDEO, AUDIO} : std::vector{BOTH};
+}
+
 /** What may fail: opening, a frame, a time seek, a frame seek; and what opening or a frame records besides. */
 enum class Op { Open, Frame, Seek, FrameSeek, Inside };
 
