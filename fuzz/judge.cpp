@@ -34,13 +34,6 @@ Host::Host(Bytes file) : FakeHost(std::move(file))
     on_call = [this](HostFn) { require(m_calls_left-- != 0, "more host calls than an operation may cost"); };
 }
 
-fio_file_t* Host::open_reader(uint32_t cache_size, uint32_t overread_extra) const
-{
-    const fio_funcs_t table = funcs();
-    __FLV_DMX__fioSetFunc(&table);
-    return __FLV_DMX__fioOpen(DEFAULT_FILE, FIO_MODE_READ, cache_size, overread_extra != 0 ? 1 : 0, overread_extra);
-}
-
 // Honest work is no effort.
 bool Host::refuses(uint64_t effort)
 {

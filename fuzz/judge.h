@@ -70,8 +70,6 @@ enum class Lie : uint8_t {
 class Host : public FakeHost {
 public:
     explicit Host(Bytes file);
-    /** The library's file layer gets this host's functions and opens the file. */
-    fio_file_t* open_reader(uint32_t cache_size, uint32_t overread_extra = 0) const;
     /** Tells these lies (bits 1 << Lie) from now on, until `patience` calls or KiB read are used up; then it refuses.
      */
     void lie(uint32_t lies, uint64_t patience) { std::tie(m_lies, m_patience) = std::tie(lies, patience); }

@@ -30,7 +30,7 @@ public:
         m_ctx.video_codec_filter = (bits & 4u) != 0 ? input.byte() : ANY_CODEC;
         m_ctx.audio_format_filter = (bits & 8u) != 0 ? input.byte() : ANY_CODEC;
         m_ctx.cache_size = 1024u + (bits >> 4u) * 300u;
-        m_reader = m_host.open_reader(m_ctx.cache_size);
+        m_reader = m_host.open_reader({m_ctx.cache_size});
     }
     ~Navigation() { __FLV_DMX__fioClose(m_reader); }
 

@@ -14,7 +14,7 @@ public:
     explicit Reader(Input& input) : m_host(input.payload()), m_data(m_host.contents())
     {
         const uint32_t extra = input.byte() % 32u;
-        m_file = m_host.open_reader(1u + input.byte() % 64u, extra);
+        m_file = m_host.open_reader({1u + input.byte() % 64u, extra != 0 ? 1 : 0, extra});
         m_room = m_file->capacity + extra;
     }
     ~Reader() { __FLV_DMX__fioClose(m_file); }

@@ -15,7 +15,7 @@ Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length
     flvd_ctx_t ctx{};
     ctx.options = options;
     ctx.file_size = host.visible();
-    ctx.cur_reader = host.open_reader(cache_size);
+    ctx.cur_reader = host.open_reader({cache_size});
     FLVD_SetCallbackforMeta(&init);
     __FLV_DMX__fioSeek64(ctx.cur_reader, START, FIO_SEEK_SET);
     host.begin(2000 + 30 * host.contents().size());

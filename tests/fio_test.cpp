@@ -18,25 +18,14 @@ Bytes Part(size_t from, size_t to)
     return bytes;
 }
 
-struct OpenArgs {
-    uint32_t cache = CACHE;
-    int32_t overread = 0;
-    uint32_t extra = 0, mode = UPDATE_BINARY;
-};
-constexpr OpenArgs NEW_FILE = {16, 0, 0, UPDATE_BINARY | FIO_MODE_TRUNCATE}, OVERREAD = {CACHE, 1, 16};
-
-fio_file_t* Open(const FakeHost& host, const OpenArgs& args)
-{
-    const fio_funcs_t funcs = host.funcs();
-    __FLV_DMX__fioSetFunc(&funcs);
-    return __FLV_DMX__fioOpen("a.flv", args.mode, args.cache, args.overread, args.extra);
-}
+constexpr ReaderOptions UPDATE = {CACHE, 0, 0, UPDATE_BINARY}, OVERREAD = {CACHE, 1, 16};
+constexpr ReaderOptions NEW_FILE = {16, 0, 0, UPDATE_BINARY | FIO_MODE_TRUNCATE};
 
 // A host with an open file, and short names for the calls; the log starts behind the opening.
 class Cached {
 public:
-    explicit Cached(const OpenArgs& args = {}, Bytes contents = Part(0, 200))
-        : host(std::move(contents)), file(Open(host, args))
+    explicit Cached(const ReaderOptions& options = UPDATE, Bytes contents = Part(0, 200))
+        : host(std::move(contents)), file(host.open_reader(options))
     {
         host.start_log();
     }
@@ -91,7 +80,7 @@ TEST(FioOpen, TurnsModeBitsIntoModeStrings)
         {0x61, ""},    {0x70, ""},    {0x71, ""},     {0x310, ""},   {0x331, ""},    {0x200, ""}};
     for (const auto& [mode, text] : cases) {
         FakeHost host(Part(0, 10));
-        EXPECT_EQ(__FLV_DMX__fioClose(Open(host, {CACHE, 0, 0, mode})), 0);
+        EXPECT_EQ(__FLV_DMX__fioClose(host.open_reader({CACHE, 0, 0, mode})), 0);
         EXPECT_EQ(host.open_modes(), std::vector<std::string>(*text != '\0' ? 1 : 0, text)) << mode;
     }
 }
@@ -104,7 +93,7 @@ TEST(FioOpen, TakesTheExtraWithOverreadOnly)
         EXPECT_EQ(f.file->overread_extra, extra);
     }
     FakeHost host(Part(0, 10));
-    EXPECT_EQ(Open(host, {0xFFFFFFF0, 1, 0x20}), nullptr); // the sum does not fit 32 bits
+    EXPECT_EQ(host.open_reader({0xFFFFFFF0, 1, 0x20}), nullptr); // the sum does not fit 32 bits
 }
 
 TEST(FioPeek, RefillsByTheLargerOfRequestAndQuantum)
@@ -176,17 +165,17 @@ TEST(FioRead, TakesTheCachedBytesThenTheCheapestWay)
 {
     // Where from; bytes made visible by a quantum of that size, which then is 16; bytes to read; cached bytes
     // afterwards, and copies out of the cache.
-    const std::tuple<OpenArgs, int64_t, uint32_t, uint32_t, const char*, uint32_t, uint32_t> cases[] = {
-        {{}, 0, 20, 19, "0..19: ", 1, 1},
-        {{}, 0, 20, 35, "0..35: read(16)=16", 1, 2},
-        {{}, 0, 20, 36, "0..36: read(16)=16", 0, 1}, // the rest is a quantum: straight to the destination
-        {{}, 0, 0, 0, "0..0: read(16)=16", 16, 0},
+    const std::tuple<ReaderOptions, int64_t, uint32_t, uint32_t, const char*, uint32_t, uint32_t> cases[] = {
+        {UPDATE, 0, 20, 19, "0..19: ", 1, 1},
+        {UPDATE, 0, 20, 35, "0..35: read(16)=16", 1, 2},
+        {UPDATE, 0, 20, 36, "0..36: read(16)=16", 0, 1}, // the rest is a quantum: straight to the destination
+        {UPDATE, 0, 0, 0, "0..0: read(16)=16", 16, 0},
         {OVERREAD, 0, 0, 15, "0..15: read(16)=16", 1, 1},
         {OVERREAD, 0, 0, 32, "0..32: read(16)=16 read(16)=16", 0, 1}, // the last quantum goes through the cache
         {OVERREAD, 180, 0, 40, "180..200: read(16)=16 read(16)=4 read(16)=0", 0, 0},
         {OVERREAD, 164, 0, 40, "164..200: read(16)=16 read(16)=16 read(16)=4", 0, 1}};
-    for (const auto& [args, start, cached, total, told, held, copies] : cases) {
-        Cached f(args);
+    for (const auto& [options, start, cached, total, told, held, copies] : cases) {
+        Cached f(options);
         f.seek(start);
         f.quantum(cached);
         f.peek(cached);
@@ -199,7 +188,7 @@ TEST(FioRead, TakesTheCachedBytesThenTheCheapestWay)
 
 TEST(FioRead, CountsWholeElementsAndBelievesNoCountTooLarge)
 {
-    Cached f({}, Part(0, 10));
+    Cached f(UPDATE, Part(0, 10));
     EXPECT_EQ(f.read(1, 4), Part(0, 4));
     EXPECT_EQ(f.read(5, 4), Part(4, 8)); // 6 bytes were left
     __FLV_DMX__fiodbgReset();
@@ -312,7 +301,7 @@ TEST(BitReader, IsEmptiedByByteLevelAccess)
 
 TEST(BitReader, TakesFieldsOfUpTo32Bits)
 {
-    const Cached f({}, Part(0x80, 200));
+    const Cached f(UPDATE, Part(0x80, 200));
     __FLV_DMX__bitInit(f.file);
     EXPECT_EQ(__FLV_DMX__bitShowSBits(f.file, 4), 8u); // no sign
     EXPECT_EQ(__FLV_DMX__bitGetSBits(f.file, 4) + __FLV_DMX__bitShowBit(f.file) + __FLV_DMX__bitGetBit(f.file), 8u);

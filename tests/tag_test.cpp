@@ -31,11 +31,9 @@ struct Reader {
     flvd_tag_info_t info{};
     uint32_t kind = 0;
 
-    explicit Reader(const Bytes& bytes, uint32_t cache = CACHE, uint32_t quantum = 0) : host(bytes)
+    explicit Reader(const Bytes& bytes, uint32_t cache = CACHE, uint32_t quantum = 0)
+        : host(bytes), file(host.open_reader({cache}))
     {
-        const fio_funcs_t funcs = host.funcs();
-        __FLV_DMX__fioSetFunc(&funcs);
-        file = __FLV_DMX__fioOpen(FakeHost::DEFAULT_FILE, FIO_MODE_READ | FIO_MODE_BINARY, cache, 0, 0);
         __FLV_DMX__fioSetCacheReadSize(file, quantum);
         ctx.cache_size = cache;
         ctx.data_offset = static_cast<int32_t>(DATA_OFFSET);

@@ -81,6 +81,13 @@ fio_funcs_t FakeHost::funcs() const
     return table;
 }
 
+fio_file_t* FakeHost::open_reader(const ReaderOptions& options) const
+{
+    const fio_funcs_t table = funcs();
+    __FLV_DMX__fioSetFunc(&table);
+    return __FLV_DMX__fioOpen(DEFAULT_FILE, options.mode, options.cache_size, options.overread, options.extra);
+}
+
 // Counts the call. False: it has to fail.
 bool FakeHost::begin(HostFn fn)
 {

@@ -27,6 +27,14 @@ namespace flvd_test {
 /** Seek and Tell stand for the 32- and the 64-bit function; in the log they differ. */
 enum class HostFn { Alloc, Free, Copy, Set, Open, Close, Read, Write, Seek, Tell, Eof, Flush, Count };
 
+/** How the library's file layer opens a file. */
+struct ReaderOptions {
+    uint32_t cache_size;
+    int32_t overread = 0;
+    uint32_t extra = 0;
+    uint32_t mode = FIO_MODE_READ | FIO_MODE_BINARY;
+};
+
 class FakeHost {
 public:
     FakeHost() { m_current = this; }
@@ -68,6 +76,9 @@ public:
     fio_funcs_t funcs() const;
     /** Leaves out the 64-bit functions; the 32-bit ones then fail behind 2 GiB. Set before init() or funcs(). */
     void use_32_bit_only() { m_only_32 = true; }
+
+    /** The library's file layer gets this host's functions and opens the file, for the caller to close. */
+    fio_file_t* open_reader(const ReaderOptions& options) const;
 
     /* -- faults. Calls are numbered from 1, from the construction or the last reset_calls() on. */
 
