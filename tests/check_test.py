@@ -3,7 +3,8 @@ import json
 import struct
 import subprocess
 
-from tool_test import AVC_BYTES, DATA, HEADER, SAMPLES, TAGS, TOOL, Case, run, sample, sample_bytes, split_tags
+from flv import split_tags
+from tool_test import AVC_BYTES, DATA, HEADER, SAMPLES, TAGS, TOOL, Case, run, sample, sample_bytes
 
 INDEXED = sample_bytes("avc_aac_index")
 POSITIONS, TIMES = (INDEXED.index(key) + len(key) for key in (b"filepositions\x0a", b"times\x0a"))  # of the counts

@@ -3,12 +3,12 @@
 #include "support/report.h"
 #include "support/session.h"
 
+#include <fstream>
 #include <numeric>
 #include <set>
 #include <sstream>
 
 using namespace flvd_test;
-using namespace std::string_literals;
 
 namespace {
 
@@ -227,21 +227,20 @@ void Expect(const std::string& text, const std::string& told, uint32_t options =
     EXPECT_EQ(out.str(), told) << text;
 }
 
-const std::string g_long(256, 'k'); // a key of that length is not looked up
-
-TEST(ScriptValue, IsConsumedByItsType)
+TEST(ScriptData, SetsWhatTheTableSays)
 {
-    const std::string t255(255, 't'), t64k(65535, 't'), date = "%11.0.0.0.0.0.0.0.0.0.0";
-    for (const std::string& value :
-         {"1"s, "%1.1"s, "%7.0.7"s, date, "%4.0.2.9.9"s, "'"s, "\""s, "{ }"s, "{ a: 1 b: { } }"s, "< >"s, "[0"s,
-          "[4 1 { } 'x < a: %1.0 >"s, "'" + t255, "'" + g_long, "'" + t64k, "\"" + t64k,
-          "{ a: %1.1.0 %0.1.2.3.4.5.6.7"s, "< a: %1.1.0 %0.1.2.3.4.5.6.7"s}) // an empty key ends it unconsumed
-        Expect(value + " < width: 320 >", "0 width 320");
-    for (const std::string nothing :
-         {"%5", "%6", "%9", "%13", "%14", "%17", "%255", "!", "< a: ! >", "{ a: ! }", "[1 !"}) {
-        Expect(nothing + " < width: 320 >", "-1"); // ends the parse
-        Expect("'onMetaData < height: 240 > " + nothing + " < width: 320 >", "0 height 240");
-    }
+    // The first column: options, and the length of the payload, 0 for all.
+    const std::map<std::string, std::pair<uint32_t, uint32_t>> opens = {
+        {"-", {0, 0}}, {"index", {INDEX, 0}}, {"growing", {GROWING, 0}}, {"index, endless", {INDEX, 0xFFFFFFF0}}};
+    std::ifstream table(FLVDMX_TEST_DATA "/script_data.txt");
+    size_t rows = 0;
+    for (std::string row; std::getline(table, row);)
+        if (const size_t bar = row.find(" | "), last = row.rfind(" | "); bar < last && row[0] != '#') {
+            const auto& [options, length] = opens.at(row.substr(0, bar));
+            Expect(row.substr(bar + 3, last - bar - 3), row.substr(last + 3), options, length);
+            ++rows;
+        }
+    EXPECT_EQ(rows, 98u);
 }
 
 TEST(ScriptValue, EndsWhenTheHostFails)
@@ -259,74 +258,18 @@ TEST(ScriptValue, IsBounded)
         deep += "[1 ";
         keys += "{ a: %1.1.0 %0.1.2.3.4.5.6.7 ";
     }
-    const std::string after = ".0.1.97 ! < width: 320 >";
     Expect(deep + high + deep + "< height: 240 >", "0 width 320 height 240");
     Expect("[1 " + deep + high, "-1");
     Expect("< width: 320 >", "-1", 0, 12); // a value begins inside or not at all
     Expect("< width: 320 >", "0 width 320", 0, 13);
     Expect("{ a: %5 } 1", "0", 0, 16);              // more consumed than counted
     Expect(keys + "< width: 320 >", "0 width 320"); // an empty key counts nothing
-    Expect("< a: %5 width: 320 b: { c: %6 height: 240 } >", "0 width 320 height 240");
-    // A long string that is itself the largest value: what holds it is too large.
-    Expect("'onMetaData < width: 320 a: %12.127.255.255.250 >", "0 width 320");
-    // An array of two ends with a failed ECMA array, but not with a failed object.
-    Expect("[2 %8.0.0.0.0" + after, "-1");
-    Expect("[2 %3" + after, "0 width 320");
-}
-
-TEST(ScriptKey, TakesTheNumberIntoItsField)
-{
-    Expect("< WIDTH: 320.9 Height: 240 fRAMErate: 29.97 audiodelay: 1.001 audiodatarate: 128.7 audiosamplerate: "
-           "44100 audiosamplesize: 16 duration: 5 lasttimestamp: 6 totalduration: 7 other: 8 "
-           "lastkeyframelocation: 5e9 lastkeyframetimestamp: 2.5 filesize: 5e9 >",
-           "0 width 320 height 240 rate 29970 delay 1000 kbits 128 hertz 44100 bits 16 key at 5000000000 key ms "
-           "2500 and 2500 size 4294967295");
-    Expect("< width: -5 height: nan framerate: -1e300 audiodelay: -0.5 >", "0");
-    Expect("< width: 1e300 height: 4294967296 framerate: 1e7 audiosamplesize: 4294967295 >",
-           "0 width 4294967295 height 4294967295 rate 4294967295 bits 4294967295");
-    Expect("< filesize: 100 filesize: 100 >", "0 size 100");
-    Expect("< filesize: 100 filesize: 101 >", "0 size 100 shorter 1");
-    Expect("[1 { x: < y: [1 { width: 7 } > }", "0 width 7");
-    Expect("< duration: 12.5 width: 'abc >", "0 width 12");
-    for (const std::string& key :
-         {"widt"s, "widths"s, "xidth"s, g_long, "wid\0h"s, "width\0"s, std::string(22, 'w'), std::string(255, 'w')})
-        Expect("< " + key + ": 55 height: 66 >", "0 height 66");
-}
-
-TEST(ScriptKey, TakesWhatTheSlotHolds)
-{
-    const auto expect = [](const std::string& value, const std::string& told) {
-        // 2^52: the lowest bytes of such a double are its units.
-        Expect("< duration: 4503599627370496 lastkeyframelocation: " + value + " height: 9 >", told);
-    };
-    const std::string short_key(255, 'k');
-    for (const std::string value : {"'abc", "%5", "%11.0.0.0.0.0.0.0.0.0.1", "{ }", "{ other: 1 }", "\""})
-        expect(value, "0 height 9 key at 4503599627370496");
-    expect("{ " + short_key + ": 4 }", "0 height 9 key at 4503599627370496");
-    expect("{ " + g_long + ": 4 }", "0 height 9 key at 4");
-    expect("{ " + g_long + ": ! }", "0 key at 4503599627370496"); // a failed object's end marker ends what encloses it
-    expect("%1.5", "0 height 9 key at 4503599627370501");
-    expect("%7.1.2", "0 height 9 key at 4503599627370754");
-    expect("[2 4503599627370497 3", "0 height 9 key at 3");
-    expect("{ width: 4 }", "0 width 4 height 9"); // the inner key takes the place of the outer one
-}
-
-TEST(KeyframeIndex, CountsWhatBothArraysHave)
-{
-    // Offsets are those of the first elements, 89 bytes into the file.
-    Expect("{ keyframes: { times: [4 1 2 3 4 filepositions: [3 5 6 7 } }", "0 entries 3 T 114 P 170");
-    Expect("{ keyframes: { times: [3 1 2 3 filepositions: [4 5 6 7 8 } }", "0 entries 3 T 114 P 161");
-    Expect("{ KeyFrames: { Times: [4 1 2 3 4 } }", "0 entries 4 T 114");
-    Expect("{ times: [3 1 2 3 filepositions: [4 5 6 7 8 }", "0");
-    Expect("{ keyframes: 1 }", "0 entries 4294967295");
-    Expect("{ a: [2 1 2 keyframes: { times: 1 filepositions: [1 5 } }", "0 T 140 P 164");
-    Expect("{ keyframes: { times: [2 1 2 filepositions: [2 5 6 } times: [1 1 }", "0 entries 1 T 114 P 152"); // none now
 }
 
 TEST(KeyframeIndex, DecidesHowToSeekAndTheLastTime)
 {
     const auto expect = [](const std::string& indices, uint32_t method, uint32_t last, uint32_t options = 0) {
-        FakeHost host(FlvBuilder(4).script(Amf("'onMetaData < " + indices + " >")).add(Pcm(5)).build().bytes);
+        FakeHost host(FlvBuilder(4).metadata(indices).add(Pcm(5)).build().bytes);
         const Session session(host, {options});
         EXPECT_EQ(std::pair(session.ctx()->seek_method, session.ctx()->last_keyframe_ms), std::pair(method, last));
     };
@@ -337,38 +280,10 @@ TEST(KeyframeIndex, DecidesHowToSeekAndTheLastTime)
     const std::string two =
         "keyframes: { times: [1 1 filepositions: [3 13 2 2 } keyframes: { filepositions: [3 13 2 2 }";
     expect(two, FLVD_SEEK_BY_INDEX, 1000, INDEX);
-    const Bytes at_end = Amf("'onMetaData < keyframes: { times: [9 1 1 1 1 1 1 1 1 1 filepositions: [9 13 2 2 } >");
-    FakeHost host(FlvBuilder(4).add(Pcm(5)).script(at_end).build().bytes);
+    const std::string at_end = "keyframes: { times: [9 1 1 1 1 1 1 1 1 1 filepositions: [9 13 2 2 }";
+    FakeHost host(FlvBuilder(4).add(Pcm(5)).metadata(at_end).build().bytes);
     EXPECT_EQ(Session(host).open_rc(), -1); // it ends with the file
     EXPECT_EQ(g_flvd_lLastError, FLVD_ERR_EXTENT);
-}
-
-TEST(KeyframeArrays, HoldWhatCanBeStored)
-{
-    constexpr uint32_t endless = 0xFFFFFFF0;
-    Expect("{ times: [3 0 2.5 5 filepositions: [3 13 5000 9000 }",
-           "0 allocated 2 times 0,2500,5000 positions 13,5000,9000", INDEX);
-    Expect("{ times: [1 2 filepositions: [1 3 }", "0 allocated 2 times 2000 positions 3", GROWING);
-    Expect("{ times: [4 1.001 -5 nan 1e300 filepositions: [4 -5.9 nan 1e300 -1e300 }",
-           "0 allocated 2 times 1000,0,0,4294967295 positions -5,0,9223372036854775807,-9223372036854775808", INDEX);
-    Expect("[2 1 2", "0", INDEX);
-    Expect("{ times: [4 1 'x %5 2 }", "0 allocated 1 times 1000,1000,1000,2000", INDEX);
-    Expect("{ times: [4 1 1 ! 1 }", "-1 allocated 1 times 1000,1000,0,0", INDEX); // cut short
-    Expect("{ filepositions: [3 1 ! 1 }", "-1 allocated 1 positions 1,0,0", INDEX);
-    Expect("{ times: [4 1 { times: [1 7 } 1 1 }", "0 allocated 2 times 7000", INDEX); // replaced by its own element
-    Expect("{ times: [3 1 { times: [4 7 8 9 9 } 5 }", "0 allocated 2 times 7000,9000,5000,9000", INDEX);
-    Expect("{ filepositions: [4 1 { filepositions: [1 7 } 2 3 }", "0 allocated 2 positions 7", INDEX);
-    // A count that lies: more elements than bytes that follow, more bytes than can be counted.
-    Expect("< times: [5 %5.5.5.5.5", "-1 allocated 1 times 0,0,0,0,0", INDEX);
-    Expect("< times: [6 %5.5.5.5.5", "-1", INDEX);
-    Expect("< filepositions: [5 %5.5.5.5.5", "-1 allocated 1 positions 0,0,0,0,0", INDEX);
-    Expect("< filepositions: [6 %5.5.5.5.5", "-1", INDEX);
-    Expect("< times: [1073741823 !", "-1 allocated 1", INDEX, endless);
-    Expect("< times: [1073741824 !", "-1", INDEX, endless);
-    Expect("< filepositions: [536870911 !", "-1 allocated 1", INDEX, endless);
-    Expect("< filepositions: [536870912 !", "-1", INDEX, endless);
-    // Each claims the rest of the payload: more than twice the payload is too many.
-    Expect("{ times: [66 { times: [53 { times: [40 '" + std::string(37, 't'), "-1 allocated 2", INDEX);
 }
 
 } // namespace

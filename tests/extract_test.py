@@ -5,15 +5,11 @@ import pty
 import subprocess
 import time
 
-from tool_test import DATA, SAMPLES, TOOL, WARNINGS, Case, Expected, sample, sample_bytes, split_tags
+from flv import retag, split_tags
+from tool_test import DATA, SAMPLES, TOOL, WARNINGS, Case, Expected, sample, sample_bytes
 
 HASHES = {tuple(names): sha for *names, sha in map(str.split, (DATA / "expected" / "extract.txt").open())}
 START = b"\0\0\0\1"
-
-
-def retag(tag, payload):
-    """The tag with another payload and a back-pointer to match."""
-    return tag[:1] + len(payload).to_bytes(3, "big") + tag[4:11] + payload + (11 + len(payload)).to_bytes(4, "big")
 
 
 def nal_units(frame):

@@ -12,9 +12,7 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t SMALL = 1024;               // a cache below LARGE tags, which then cost host calls of their own
-constexpr size_t LARGE = 3000, GROWN = 600000; // GROWN is above the first frame buffer
-constexpr int64_t STEP = 601;                  // of a growing file
+constexpr int64_t STEP = 601; // of a growing file
 constexpr size_t UNKNOWN = SIZE_MAX;
 constexpr char INITIALS[] = "a   o rwst f"; // of HostFn
 

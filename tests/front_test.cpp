@@ -10,9 +10,7 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr size_t BUDGET = 102;                 // tags that a request or a probing handles
-constexpr uint32_t SMALL = 1024;               // a cache below LARGE tags, which then cost host calls of their own
-constexpr size_t LARGE = 3000, GROWN = 600000; // bytes; GROWN is above the first frame buffer
+constexpr size_t BUDGET = 102; // tags that a request or a probing handles
 constexpr uint32_t MIB = 0x100000;
 constexpr uint8_t SOUND_MP3_8K = 0xEF, SOUND_AAC = 0xAF;
 

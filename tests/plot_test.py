@@ -2,7 +2,8 @@
 import re
 import xml.etree.ElementTree
 
-from tool_test import APART, SAMPLES, Case, Expected, sample_bytes, split_tags
+from flv import split_tags
+from tool_test import APART, SAMPLES, Case, Expected, sample_bytes
 
 UNITS = {"bit/s": 1, "kbit/s": 1e3, "Mbit/s": 1e6}
 LEFT, WIDTH = 90, 920  # of the diagrams

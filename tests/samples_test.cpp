@@ -14,13 +14,6 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t USER_BYTES = 8192; // above every frame of the samples
-
-OpenOptions WithBuffer(uint32_t options, bool for_info = false, uint32_t cache_size = 0)
-{
-    return {options | USER, for_info, cache_size, 0, FakeHost::DEFAULT_FILE, USER_BYTES};
-}
-
 const std::vector<Expected>& Samples()
 {
     static const std::vector<Expected> samples = [] {
@@ -121,12 +114,9 @@ TEST(Samples, GrowByOneByteBetweenRequests)
 }
 
 // Taken in turn. The last one takes the longest: the library's own frame buffer is large.
-const OpenOptions g_variants[] = {WithBuffer(0),
-                                  WithBuffer(GROWING | SEPARATE),
-                                  WithBuffer(SEPARATE | INDEX, false, 1024),
-                                  WithBuffer(GROWING),
-                                  WithBuffer(0, true),
-                                  {SEPARATE}};
+const OpenOptions g_variants[] = {
+    {USER},    {USER | GROWING | SEPARATE}, {USER | SEPARATE | INDEX, false, 1024}, {USER | GROWING}, {USER, true},
+    {SEPARATE}};
 constexpr size_t VARIANTS = std::size(g_variants);
 
 TEST(Samples, CutAtEveryByteDeliverTheWholeTags)

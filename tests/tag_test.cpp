@@ -63,15 +63,9 @@ constexpr Step FORWARD[] = {&Reader::verify, &Reader::trust, &Reader::next};
 const auto Sound = [](size_t size = 100) { return Raw(5, size - 2); };
 const auto Picture = [](size_t size = 100) { return Nalu(5, size - 5); };
 const auto Zeros = [](int64_t count) { return Bytes(static_cast<size_t>(count)); };
-// As they stand in a file.
-Bytes Tags(const std::vector<Tag>& tags)
-{
-    const Bytes file = File(tags).bytes;
-    return {file.begin() + FIRST_TAG, file.end()};
-}
 Bytes operator+(const Bytes& front, const Tag& tag)
 {
-    return Concat({front, Tags({tag})});
+    return Concat({front, File({tag}).body()});
 }
 
 TEST(TagKinds, AreReportedInBothDirections)
@@ -121,7 +115,7 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
 // A sound tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
 const Tag BAD{8, 0, Bytes{0xAF, 1, 0xEE, 0xEE, 0xEE}, 0xEEEEEEEE};
 constexpr int64_t BAD_SIZE = 20, BAD_COST = BAD_SIZE - 1 + 64; // the distance to the next, and the penalty
-const auto Bad = [](int64_t count) { return Tags(std::vector(static_cast<size_t>(count), BAD)); };
+const auto Bad = [](int64_t count) { return File(std::vector(static_cast<size_t>(count), BAD)).body(); };
 
 TEST(Resynchronisation, CoversOneMiBInAll)
 {

@@ -15,6 +15,8 @@ import threading
 import time
 import unittest
 
+from flv import split_tags
+
 TOOL = os.environ["FLVDMX_TOOL"]
 DATA = pathlib.Path(os.environ["FLVDMX_TEST_DATA"])
 SAMPLES = sorted(path.stem for path in DATA.glob("*.flv"))
@@ -67,15 +69,6 @@ def json_frames(text):
 def milliseconds(text):
     hours, minutes, seconds = text.split(":")
     return round((int(hours) * 3600 + int(minutes) * 60 + float(seconds)) * 1000)
-
-
-def split_tags(data):
-    """The file header, and each tag with its back-pointer."""
-    header, position, tags = data[:13], 13, []
-    while position < len(data):
-        tags.append(data[position:position + 15 + int.from_bytes(data[position + 1:position + 4], "big")])
-        position += len(tags[-1])
-    return header, tags
 
 
 AVC, AVC_BYTES = Expected("avc_aac"), sample_bytes("avc_aac")

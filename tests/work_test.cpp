@@ -10,7 +10,8 @@ namespace {
 
 constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20, SEARCH_FALSE_HEADERS = MIB / 64, REQUEST_SEARCHES = 102, TAIL_CURSORS = MIB + 256;
-constexpr uint32_t FRAMES = 200, SMALL = 80, LARGE = 50000; // of sound files; the cache does not hold LARGE
+constexpr uint32_t FRAMES = 200, SMALL_FRAME = 80,
+                   LARGE_FRAME = 50000; // of sound files; the cache does not hold LARGE_FRAME
 
 struct Cost {
     uint64_t calls = 0, bytes = 0;
@@ -55,11 +56,6 @@ Bytes Repeat(const Bytes& pattern, size_t size)
         out[i] = pattern[i % pattern.size()];
     return out;
 }
-Bytes Tags(const Flv& flv)
-{
-    return {flv.bytes.begin() + 13, flv.bytes.end()};
-}
-
 /** Sound whose header byte is 8, the tag type: in a run of it every byte begins a plausible tag. */
 WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost pass)
 {
@@ -69,7 +65,7 @@ WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost p
             builder.audio(first_ts + 40 * i, AudioData(8, Noise(200)));
         return builder.build();
     };
-    const Bytes file = Concat({sounds(0).bytes, Repeat({8}, 600000), Tags(sounds(0x10000000))});
+    const Bytes file = Concat({sounds(0).bytes, Repeat({8}, 600000), sounds(0x10000000).body()});
     return {name, file, options, cache, 2 * pass, pass, 2 * pass};
 }
 
@@ -83,7 +79,7 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
 /** Sound alone at the end, behind bytes whose every fourth place leads back a little. */
 WorkCase Slide(const char* name, size_t size, uint64_t quantum)
 {
-    const Bytes file = Concat({MakeChain().bytes, Repeat({0, 0, 0, 15}, size), Tags(MakeChain({false, true}))});
+    const Bytes file = Concat({MakeChain().bytes, Repeat({0, 0, 0, 15}, size), MakeChain({false, true}).body()});
     const Cost pass = Forward(file.size()), back = Backward(size + 256, quantum);
     return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * quantum}, quantum};
 }
@@ -112,7 +108,7 @@ WorkCase ManyTags(const char* name, bool pictures, size_t size, bool index, Cost
 WorkCase Metadata(const char* name, const Bytes& head, const Bytes& pattern, uint32_t options = 0)
 {
     const Bytes payload = Concat({Amf("'onMetaData"), head, Repeat(pattern, MIB)});
-    const Bytes file = Concat({FlvBuilder().script(payload).build().bytes, Tags(MakeChain())});
+    const Bytes file = Concat({FlvBuilder().script(payload).build().bytes, MakeChain().body()});
     const Cost pass = Forward(file.size()), script = Forward(2 * payload.size()) + Cost{payload.size() / 8, 0};
     return {name, file, options, CACHE, script + 4 * pass, pass, 3 * pass};
 }
@@ -198,7 +194,7 @@ TEST(Work, CostsSoMuchOnSoundFiles)
 {
     const auto opened = [](Session&) {};
     const auto played = [](Session& session) { EXPECT_EQ(play(session).size(), FRAMES); };
-    const auto one = [](Session& session) { EXPECT_EQ(session.frame().frame.data.size(), LARGE); };
+    const auto one = [](Session& session) { EXPECT_EQ(session.frame().frame.data.size(), LARGE_FRAME); };
     const auto sought = [](Session& session) {
         int32_t reached = 0;
         EXPECT_EQ(session.seek(4200, FLVD_SEEK_BACKWARD, &reached), 0);
@@ -214,14 +210,20 @@ TEST(Work, CostsSoMuchOnSoundFiles)
         void (*act)(Session&);
         HostCalls calls;
     } cases[] = {
-        {"opening reads head and tail", SMALL, 0, meta, -1, opened, {6, 9, 14, 2 * CACHE + 40}},
-        {"large frames do not matter to it", LARGE, 0, meta, -1, opened, {7, 11, 14, 2 * CACHE + 44}},
-        {"small frames take whole caches and two positions", SMALL, 0, meta, 0, played, {5, 1, 2 * FRAMES + 4, 20095}},
-        {"a large frame is looked behind once", LARGE, 0, meta, 1, one, {4, 2, 2, LARGE + CACHE + 20}},
-        {"a seek by scanning begins near the time", SMALL, 0, long_text, 0, sought, {123, 84, 104, 5580}},
-        {"and in large frames", LARGE, 0, meta, 0, sought, {20, 15, 10, 24728}},
-        {"a seek by index in memory", SMALL, INDEX, {}, 0, sought, {1, 1, 1, CACHE}},
-        {"a seek by index in the file", SMALL, 0, {}, 0, sought, {3, 3, 1, 3 * CACHE}}};
+        {"opening reads head and tail", SMALL_FRAME, 0, meta, -1, opened, {6, 9, 14, 2 * CACHE + 40}},
+        {"large frames do not matter to it", LARGE_FRAME, 0, meta, -1, opened, {7, 11, 14, 2 * CACHE + 44}},
+        {"small frames take whole caches and two positions",
+         SMALL_FRAME,
+         0,
+         meta,
+         0,
+         played,
+         {5, 1, 2 * FRAMES + 4, 20095}},
+        {"a large frame is looked behind once", LARGE_FRAME, 0, meta, 1, one, {4, 2, 2, LARGE_FRAME + CACHE + 20}},
+        {"a seek by scanning begins near the time", SMALL_FRAME, 0, long_text, 0, sought, {123, 84, 104, 5580}},
+        {"and in large frames", LARGE_FRAME, 0, meta, 0, sought, {20, 15, 10, 24728}},
+        {"a seek by index in memory", SMALL_FRAME, INDEX, {}, 0, sought, {1, 1, 1, CACHE}},
+        {"a seek by index in the file", SMALL_FRAME, 0, {}, 0, sought, {3, 3, 1, 3 * CACHE}}};
     for (const auto& c : cases) {
         SCOPED_TRACE(c.name);
         FlvBuilder builder(1);

@@ -149,6 +149,8 @@ struct Flv {
     std::vector<Tag> tags; /**< in file order, with their offsets */
 
     int64_t size() const { return static_cast<int64_t>(bytes.size()); }
+    /** The tags without the file header, in front of which nothing stands. */
+    Bytes body() const { return {bytes.begin() + 13, bytes.end()}; }
 
     /** Smallest timestamp among the frames: what the library takes as first_ts when all frames count. */
     uint32_t first_ts() const;

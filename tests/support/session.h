@@ -11,6 +11,9 @@ constexpr uint32_t BACK = FLVD_SEEK_BACKWARD, FORTH = FLVD_SEEK_FORWARD, REL = F
 constexpr uint32_t RETRY = FLVD_SEEK_RETRY_BACKWARD, AT_END = FLVD_SEEK_TO_END_ON_MISS;
 constexpr uint32_t VIDEO = FLVD_STREAM_VIDEO, AUDIO = FLVD_STREAM_AUDIO, BOTH = VIDEO | AUDIO;
 
+constexpr uint32_t SMALL = 1024;               // a cache below LARGE tags, which then cost host calls of their own
+constexpr size_t LARGE = 3000, GROWN = 600000; // bytes; GROWN is above the first frame buffer
+
 /** The streams to ask for, one after the other, of a file that is opened so. */
 inline std::vector<uint32_t> Streams(uint32_t options)
 {
@@ -36,7 +39,7 @@ struct OpenOptions {
     uint32_t cache_size = 0;
     uint32_t scan_read_size = 0;
     const char* path = FakeHost::DEFAULT_FILE;
-    uint32_t user_buffer_size = 1u << 20; /**< with FLVD_OPT_USER_BUFFER: what each request offers */
+    uint32_t user_buffer_size = 8192; /**< with FLVD_OPT_USER_BUFFER: what each request offers */
 };
 
 struct FrameResult {
