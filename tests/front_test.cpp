@@ -255,7 +255,7 @@ TEST(Delivery, GivesThePayloadsBehindTheCodecBytes)
     const auto odd = [](uint8_t type) { return Video(50, AvcNalu(false, Noise(30), 0, type)); };
     const Flv files[] = {
         g_chain,
-        File({g_avc, Nalu(0), odd(3), odd(0xFF), odd(2), g_avc, Video(60, AvcEnd()), Nalu(80)}, 1),
+        File({g_avc, Nalu(0), odd(3), odd(0xFF), odd(2), g_avc, Video(60, g_avc_end), Nalu(80)}, 1),
         File({g_aac, Raw(0), Audio(23, {SOUND_AAC, 2, 7}), g_aac, Raw(46)}, 4),
         File({Audio(0, AudioData(SOUND_MP3, Mp3Frame())), Screen(0), Screen(20, 0), Audio(26, {SOUND_MP3, 1}),
               Screen(40)}),

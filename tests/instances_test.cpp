@@ -14,11 +14,9 @@ namespace {
 std::string Step(Session& session, uint32_t n)
 {
     int32_t reached = -1;
-    FrameResult result;
-    if (n % 7 == 6)
-        result.rc = session.seek(static_cast<int32_t>(n * 61 % 900), n % 2 == 0 ? BACK : FORTH, &reached);
-    else
-        result = session.frame(1 + n % 2);
+    const auto time = static_cast<int32_t>(n * 61 % 900);
+    const FrameResult result = n % 7 == 6 ? FrameResult{session.seek(time, n % 2 == 0 ? BACK : FORTH, &reached), {}}
+                                          : session.frame(1 + n % 2);
     return testing::PrintToString(
         std::tuple(result.rc, reached, result.frame, result.frame.data, session.last_error(), session.error_line()));
 }

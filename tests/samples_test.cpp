@@ -16,14 +16,11 @@ namespace {
 
 const std::vector<Expected>& Samples()
 {
-    static const std::vector<Expected> samples = [] {
-        std::vector<Expected> all;
-        for (const char* const name :
-             {"aac_only", "avc_aac", "avc_aac_index", "avc_bframes_aac", "avc_only", "h263_mp3", "mp3_only", "pcm_only",
-              "screen", "speex_only", "truncated", "damaged"})
-            all.push_back(ReadExpected(name));
-        return all;
-    }();
+    static const std::vector<Expected> samples = {
+        ReadExpected("aac_only"),        ReadExpected("avc_aac"),   ReadExpected("avc_aac_index"),
+        ReadExpected("avc_bframes_aac"), ReadExpected("avc_only"),  ReadExpected("h263_mp3"),
+        ReadExpected("mp3_only"),        ReadExpected("pcm_only"),  ReadExpected("screen"),
+        ReadExpected("speex_only"),      ReadExpected("truncated"), ReadExpected("damaged")};
     return samples;
 }
 

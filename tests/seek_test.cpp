@@ -190,13 +190,13 @@ Flv Configured()
     for (const Tag& tag : Chain(0, false, true, 60, 10).tags) {
         const uint32_t time = tag.timestamp;
         if (tag.type == 9 && time % 160 == 0)
-            tags.push_back({9, time, time % 200 == 0 ? g_avc.data : AvcEnd()});
+            tags.push_back({9, time, time % 200 == 0 ? g_avc.data : g_avc_end});
         if (tag.is_keyframe())
             tags.push_back({9, time, g_avc.data});
         if (tag.type == 9 ? time != 0 : time < 2000)
             tags.push_back(tag);
     }
-    tags.push_back({9, 2360, AvcEnd()});
+    tags.push_back({9, 2360, g_avc_end});
     return File(tags);
 }
 

@@ -76,7 +76,7 @@ TEST(TagKinds, AreReportedInBothDirections)
     builder.video(2, Concat({{0x27, 0, 0, 0, 0}, Noise(70)})); // a sequence header in an inter frame
     builder.video(3, Concat({{0x47, 1, 0, 0, 0}, Noise(80)})); // a generated keyframe
     builder.video(4, VideoData(1, CODEC_H263, Noise(90))).video(5, VideoData(2, CODEC_H263, Noise(40)));
-    const Flv flv = builder.audio(6, AudioData(SOUND_MP3, Noise(50))).video(7, AvcEnd()).script(script).build();
+    const Flv flv = builder.audio(6, AudioData(SOUND_MP3, Noise(50))).video(7, g_avc_end).script(script).build();
     constexpr uint32_t s = SCRIPT, k = KEY, vc = VIDEO | CONFIG, kc = KEY | CONFIG, ac = AUDIO | CONFIG;
     // The kinds reported when such tags are wanted, on the way forward and on the way backward.
     using Kinds = std::vector<uint32_t>;

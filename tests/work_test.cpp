@@ -10,8 +10,7 @@ namespace {
 
 constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20, SEARCH_FALSE_HEADERS = MIB / 64, REQUEST_SEARCHES = 102, TAIL_CURSORS = MIB + 256;
-constexpr uint32_t FRAMES = 200, SMALL_FRAME = 80,
-                   LARGE_FRAME = 50000; // of sound files; the cache does not hold LARGE_FRAME
+constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000; // of sound files; the cache does not hold BIG
 
 struct Cost {
     uint64_t calls = 0, bytes = 0;
@@ -56,6 +55,7 @@ Bytes Repeat(const Bytes& pattern, size_t size)
         out[i] = pattern[i % pattern.size()];
     return out;
 }
+
 /** Sound whose header byte is 8, the tag type: in a run of it every byte begins a plausible tag. */
 WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost pass)
 {
@@ -194,7 +194,7 @@ TEST(Work, CostsSoMuchOnSoundFiles)
 {
     const auto opened = [](Session&) {};
     const auto played = [](Session& session) { EXPECT_EQ(play(session).size(), FRAMES); };
-    const auto one = [](Session& session) { EXPECT_EQ(session.frame().frame.data.size(), LARGE_FRAME); };
+    const auto one = [](Session& session) { EXPECT_EQ(session.frame().frame.data.size(), BIG); };
     const auto sought = [](Session& session) {
         int32_t reached = 0;
         EXPECT_EQ(session.seek(4200, FLVD_SEEK_BACKWARD, &reached), 0);
@@ -210,20 +210,14 @@ TEST(Work, CostsSoMuchOnSoundFiles)
         void (*act)(Session&);
         HostCalls calls;
     } cases[] = {
-        {"opening reads head and tail", SMALL_FRAME, 0, meta, -1, opened, {6, 9, 14, 2 * CACHE + 40}},
-        {"large frames do not matter to it", LARGE_FRAME, 0, meta, -1, opened, {7, 11, 14, 2 * CACHE + 44}},
-        {"small frames take whole caches and two positions",
-         SMALL_FRAME,
-         0,
-         meta,
-         0,
-         played,
-         {5, 1, 2 * FRAMES + 4, 20095}},
-        {"a large frame is looked behind once", LARGE_FRAME, 0, meta, 1, one, {4, 2, 2, LARGE_FRAME + CACHE + 20}},
-        {"a seek by scanning begins near the time", SMALL_FRAME, 0, long_text, 0, sought, {123, 84, 104, 5580}},
-        {"and in large frames", LARGE_FRAME, 0, meta, 0, sought, {20, 15, 10, 24728}},
-        {"a seek by index in memory", SMALL_FRAME, INDEX, {}, 0, sought, {1, 1, 1, CACHE}},
-        {"a seek by index in the file", SMALL_FRAME, 0, {}, 0, sought, {3, 3, 1, 3 * CACHE}}};
+        {"opening reads head and tail", TINY, 0, meta, -1, opened, {6, 9, 14, 2 * CACHE + 40}},
+        {"large frames do not matter to it", BIG, 0, meta, -1, opened, {7, 11, 14, 2 * CACHE + 44}},
+        {"small frames take whole caches and two positions", TINY, 0, meta, 0, played, {5, 1, 2 * FRAMES + 4, 20095}},
+        {"a large frame is looked behind once", BIG, 0, meta, 1, one, {4, 2, 2, BIG + CACHE + 20}},
+        {"a seek by scanning begins near the time", TINY, 0, long_text, 0, sought, {123, 84, 104, 5580}},
+        {"and in large frames", BIG, 0, meta, 0, sought, {20, 15, 10, 24728}},
+        {"a seek by index in memory", TINY, INDEX, {}, 0, sought, {1, 1, 1, CACHE}},
+        {"a seek by index in the file", TINY, 0, {}, 0, sought, {3, 3, 1, 3 * CACHE}}};
     for (const auto& c : cases) {
         SCOPED_TRACE(c.name);
         FlvBuilder builder(1);

@@ -10,18 +10,12 @@
 
 namespace flvd_test {
 
-static std::ifstream OpenData(const std::string& name)
+static std::string ReadData(const std::string& name)
 {
     std::ifstream in(std::string(FLVDMX_TEST_DATA) + "/" + name, std::ios::binary);
     if (!in)
         throw std::runtime_error("cannot read " + name);
-    return in;
-}
-
-Bytes ReadSample(const std::string& name)
-{
-    std::ifstream in = OpenData(name);
-    return Bytes(std::istreambuf_iterator<char>(in), {});
+    return {std::istreambuf_iterator<char>(in), {}};
 }
 
 static Bytes FromHex(const std::string& text)
@@ -35,8 +29,9 @@ static Bytes FromHex(const std::string& text)
 // Each line is a kind and fields, key=value.
 Expected ReadExpected(const std::string& name)
 {
-    std::ifstream in = OpenData("expected/" + name + ".txt");
-    Expected out{{ReadSample(name + ".flv"), {}}, name, {}};
+    const std::string sample = ReadData(name + ".flv");
+    std::istringstream in(ReadData("expected/" + name + ".txt"));
+    Expected out{{Bytes(sample.begin(), sample.end()), {}}, name, {}};
     for (std::string text, kind; std::getline(in, text);) {
         std::istringstream line(text);
         std::map<std::string, std::string> fields;

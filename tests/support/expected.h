@@ -5,9 +5,6 @@
 
 namespace flvd_test {
 
-/** A whole file of tests/data; throws when it cannot be read. FLVDMX_TEST_DATA names the directory. */
-Bytes ReadSample(const std::string& name);
-
 struct ExpectedStream {
     uint32_t stream = 0; /**< 1 video, 2 audio */
     uint32_t width = 0, sample_rate = 0;
@@ -20,7 +17,7 @@ struct Expected : Flv {
     std::vector<ExpectedStream> streams;
 };
 
-/** NAME.flv and expected/NAME.txt; throws when they cannot be read or do not agree. */
+/** NAME.flv and expected/NAME.txt in FLVDMX_TEST_DATA; throws when they cannot be read or do not agree. */
 Expected ReadExpected(const std::string& name);
 
 } // namespace flvd_test

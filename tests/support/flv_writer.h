@@ -66,10 +66,7 @@ inline Bytes AvcConfig(const Bytes& record)
 {
     return AvcNalu(true, record, 0, 0);
 }
-inline Bytes AvcEnd()
-{
-    return AvcNalu(true, {}, 0, 2);
-}
+inline const Bytes g_avc_end = AvcNalu(true, {}, 0, 2);
 /* header: SoundFormat 10 with rate, size and type bits; 0xAF in every usual file. */
 inline Bytes AacConfig(const Bytes& config, uint8_t header = 0xAF)
 {
