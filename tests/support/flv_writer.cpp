@@ -49,7 +49,8 @@ Bytes Bits(const std::string& words)
         const bool is_signed = number[0] == '+' || number[0] == '-';
         const int64_t n = std::stoll(number);
         std::string code = binary(!is_signed ? n + 1 : n > 0 ? 2 * n : 1 - 2 * n);
-        code.erase(0, code.find('1')).insert(0, code.size() - 1, '0');
+        code.erase(0, code.find('1'));
+        code.insert(0, code.size() - 1, '0');
         if (slash != std::string::npos)
             code = binary(n).substr(64 - std::stoul(word.substr(slash + 1)));
         for (int times = star != std::string::npos ? std::stoi(word) : 1; times != 0; --times)
@@ -76,8 +77,8 @@ Bytes Amf(const std::string& words)
     Bytes out;
     std::istringstream in(words);
     for (std::string word; in >> word;) {
-        size_t digits = 0;
         if (const size_t at = word.find('^'); at != std::string::npos) {
+            size_t digits = 0;
             const size_t count = std::stoul(word.substr(at + 1), &digits);
             word.replace(at, digits + 1, count - 1, word[at - 1]);
         }
