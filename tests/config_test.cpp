@@ -4,6 +4,7 @@
 #include "support/session.h"
 
 #include <fstream>
+#include <numeric>
 #include <set>
 #include <sstream>
 
@@ -26,7 +27,8 @@ Audio ParseAudio(int32_t format, const Bytes& data)
 
 TEST(AudioConfig, OfAac)
 {
-    const auto expect = [](const std::string& bits, uint32_t rate, uint32_t channels) {
+    const auto expect = [](const std::vector<std::string>& parts, uint32_t rate, uint32_t channels) {
+        const std::string bits = std::accumulate(parts.begin(), parts.end(), std::string());
         EXPECT_EQ(ParseAudio(10, Bits(bits)), Audio(0, rate, channels, OLD, OLD, OLD)) << bits;
     };
     const uint32_t rates[] = {96000, 88200, 64000, 48000, 44100, 32000, 24000, 22050,
@@ -34,7 +36,7 @@ TEST(AudioConfig, OfAac)
     const uint32_t counts[] = {48, 1, 2, 3, 4, 5, 6, 8, 0, 0, 0, 0, 0, 0, 0, 0};
     for (uint32_t i = 0; i < 16; ++i) {
         const std::string index = std::to_string(i) + "/4 ", frequency = i < 15 ? index : "15/4 44100/24 ";
-        expect("2/5 " + frequency + index + "0/3 4294967295/32", rates[i], counts[i]);
+        expect({"2/5 ", frequency, index, "0/3 4294967295/32"}, rates[i], counts[i]);
     }
     // Channel configuration 0: a general type counts the elements of its program, here 2 + 4 + 1 + 1.
     const std::set<uint32_t> general{1, 2, 3, 4, 6, 7, 17, 19, 20, 21, 22, 23};
@@ -44,8 +46,8 @@ TEST(AudioConfig, OfAac)
         const uint32_t channels = general.count(type) != 0 ? 8 : 0;
         if (type == 5 || type == 31)
             continue;
-        expect(object + " 4/4 0/4" + (type % 2 != 0 ? core : no_core) + program, 44100, channels);
-        expect("5/5 7/4 0/4 15/4 16777215/24 " + object + core + program, 22050, channels); // the core's rate
+        expect({object, " 4/4 0/4", type % 2 != 0 ? core : no_core, program}, 44100, channels);
+        expect({"5/5 7/4 0/4 15/4 16777215/24 ", object, core, program}, 22050, channels); // the core's rate
     }
 }
 
