@@ -1,9 +1,10 @@
 // What a file tells of its streams: codec configuration from the first tags, and script data.
 
+#include "support/expected.h"
 #include "support/report.h"
 #include "support/session.h"
 
-#include <fstream>
+#include <map>
 #include <numeric>
 #include <set>
 #include <sstream>
@@ -71,70 +72,19 @@ TEST(AudioConfig, OfMpegAudio)
     }
 }
 
-using Video = std::tuple<int32_t, uint32_t, uint32_t>; // result, width, height
-constexpr Video NO_VIDEO{-1, OLD, OLD};
-Video ParseVideo(int32_t codec, const Bytes& data)
+TEST(VideoConfig, IsWhatTheTableSays)
 {
-    flvd_video_info_t info{};
-    info.width = info.height = OLD;
-    const int32_t rc = FLVD_ParseVideoHeader(codec, data.data(), static_cast<int32_t>(data.size()), &info);
-    EXPECT_EQ(std::string(info.fourcc, sizeof info.fourcc), rc == 0 && codec == 7 ? "H264" : std::string(4, '\0'));
-    return {rc, info.width, info.height};
-}
-
-TEST(VideoConfig, OfPictureHeaders)
-{
-    const Video sizes[] = {{0, 40, 30},  {0, 4000, 3000}, {0, 352, 288}, {0, 176, 144},
-                           {0, 128, 96}, {0, 320, 240},   {0, 160, 120}, {0, OLD, OLD}};
-    for (uint32_t code = 0; code < 8; ++code) {
-        const Bytes picture = H263Picture(code, code == 0 ? 40 : 4000, code == 0 ? 30 : 3000, 20);
-        EXPECT_EQ(ParseVideo(2, Concat({{0x11, 0, 0, 0x7F, 0}, picture})), sizes[code]);
+    for (const std::vector<std::string>& row : ReadTable("picture_headers.txt")) {
+        ASSERT_EQ(row.size(), 3u) << row[0];
+        const int32_t codec = std::stoi(row[0]);
+        const Bytes header = Bits(row[1]);
+        flvd_video_info_t info{};
+        info.width = info.height = OLD;
+        const int32_t rc = FLVD_ParseVideoHeader(codec, header.data(), static_cast<int32_t>(header.size()), &info);
+        const std::string size = std::to_string(info.width) + 'x' + std::to_string(info.height);
+        EXPECT_EQ(std::to_string(rc) + ' ' + size, row[2]) << row[1];
+        EXPECT_EQ(std::string(info.fourcc, 4), rc == 0 && codec == 7 ? "H264" : std::string(4, '\0'));
     }
-    const std::tuple<int32_t, Bytes, Video> cases[] = {
-        {2, {1, 2, 3, 0, 0, 0x80, 0, 0}, {0, 0, 0}}, // the last place for a start code
-        {2, {1, 2, 3, 4, 0, 0, 0x80, 0}, NO_VIDEO},
-        {4, {0x35, 0x7E, 0x46, 15, 20, 14, 19, 0}, {0, 301, 219}},
-        {4, {0x35, 0x7E, 0x46, 15, 20, 14, 0, 0}, {0, 0xFFFFFFFD, 219}}, // 3 cropped from nothing
-        {4, {0, 0, 0x40, 1, 2, 15, 20, 14, 19}, {0, 304, 224}},          // profile 0
-        {4, {0, 1, 0x46, 1, 2, 15, 20, 14, 19}, {0, 304, 224}},          // separated coefficients
-        {4, {0, 0x80, 0, 0, 0x80, 15, 20, 14, 19}, NO_VIDEO},            // inter frames
-        {5, {0, 0x80, 0, 0, 0x80, 15, 20, 14, 19}, NO_VIDEO},
-        {5, {0, 0x80, 0xFF, 0xFF, 0, 0x46, 15, 20, 14, 19}, {0, 304, 224}}};
-    for (const auto& [codec, data, size] : cases)
-        EXPECT_EQ(ParseVideo(codec, data), size) << testing::PrintToString(data);
-}
-
-TEST(SequenceParameterSet, GivesThePictureSize)
-{
-    const auto size = [](const Bytes& set) { return ParseVideo(7, Concat({{0, 0, 0, 1}, set})); };
-    const Bytes behind_another{0x68, 0xCE, 0x3C, 0x80, 0, 0, 1, 0x07, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4};
-    EXPECT_EQ(size(behind_another), Video(0, 320, 240));
-    EXPECT_EQ(size({0x68, 0xCE, 0x3C, 0x80, 0, 0, 1, 0x67}), NO_VIDEO);
-    EXPECT_EQ(size({0x67, 0x42, 0, 0}), Video(0, 0, 0)); // what is missing reads as zeros
-    // Its profile, then from the identifier on, from the picture order type on, from the width on.
-    const auto fields = [&size](const std::string& profile, const std::string& id = "0", const std::string& order = "2",
-                                const std::string& rest = "19 14 3/2 1/1 1 2 3 4") {
-        return size(Concat({{0x67}, Bits(profile + "/8 0/16 " + id + " 4 " + order + " 1 1/1 " + rest + " 255/8")}));
-    };
-    const auto high = [](uint32_t chroma, const std::string& lists = "0/1") {
-        return "0 " + std::to_string(chroma) + (chroma == 3 ? " 1/1" : "") + " 2 2 1/1 " + lists;
-    };
-    const Video cropped[] = {{0, 317, 233}, {0, 314, 226}, {0, 314, 233}, {0, 317, 233}, {0, 317, 233}};
-    for (uint32_t chroma = 0; chroma < 5; ++chroma)
-        for (const char* const profile : {"100", "110", "122", "144"})
-            EXPECT_EQ(fields(profile, high(chroma)), cropped[chroma]);
-    for (const char* const profile : {"0", "44", "66", "77", "83", "86", "88", "118", "128", "244"})
-        EXPECT_EQ(fields(profile), cropped[1]);
-    EXPECT_EQ(fields("100", high(2), "2", "19 14 0/1 1/1 0/1 1/1 1 2 3 4"), Video(0, 314, 480 - 2 * 7));
-    // Scaling lists: whole ones, absent ones, and those that end early, one by wrapping round.
-    const std::string lists = "1/1 1/1 16*+3 0/1 1/1 -8 1/1 +248 1/1 +2 -10 1/1 16*+3 1/1 64*+3 0/1";
-    EXPECT_EQ(fields("100", high(1, lists)), cropped[1]);
-    for (const char* const order : {"0 4", "1 0/1 -3 +5 0", "1 0/1 -3 +5 255 255*-9"})
-        EXPECT_EQ(fields("66", "0", order), cropped[1]);
-    EXPECT_EQ(fields("66", "0", "1 0/1 -3 +5 256 256*-9"), NO_VIDEO);
-    for (const char* const id : {"0/31 1/1 5/31", "0/32", "1/7 32/6"}) // the longest code, one too long, 00 00 03
-        EXPECT_EQ(fields("66", id), cropped[1]);
-    EXPECT_EQ(fields("66", "0", "2", "0/32 14 3/2 0/1"), Video(0, 0, 240));
 }
 
 // What an open learns of the stream of some tags of a type: code, sizes, bytes of its configuration.
@@ -232,15 +182,11 @@ TEST(ScriptData, SetsWhatTheTableSays)
     // The first column: options, and the length of the payload, 0 for all.
     const std::map<std::string, std::pair<uint32_t, uint32_t>> opens = {
         {"-", {0, 0}}, {"index", {INDEX, 0}}, {"growing", {GROWING, 0}}, {"index, endless", {INDEX, 0xFFFFFFF0}}};
-    std::ifstream table(FLVDMX_TEST_DATA "/script_data.txt");
-    size_t rows = 0;
-    for (std::string row; std::getline(table, row);)
-        if (const size_t bar = row.find(" | "), last = row.rfind(" | "); bar < last && row[0] != '#') {
-            const auto& [options, length] = opens.at(row.substr(0, bar));
-            Expect(row.substr(bar + 3, last - bar - 3), row.substr(last + 3), options, length);
-            ++rows;
-        }
-    EXPECT_EQ(rows, 98u);
+    for (const std::vector<std::string>& row : ReadTable("script_data.txt")) {
+        ASSERT_EQ(row.size(), 3u) << row[0];
+        const auto& [options, length] = opens.at(row[0]);
+        Expect(row[1], row[2], options, length);
+    }
 }
 
 TEST(ScriptValue, EndsWhenTheHostFails)

@@ -98,7 +98,7 @@ TEST(Failures, OfCodecProbes)
          {"AAC without room", audio({SOUND_AAC}), {}, {0, -3, 752}},
          {"growing: MP3 8 kHz data", growing(mp3_8k, 13), {GROWING}, cut_short(781)},
          {"MP3 8 kHz header", audio(AudioData(SOUND_MP3_8K, no_frame_header)), {}, {0, -3003, 787}},
-         {"H.263 data", video(coded(CODEC_H263, H263Picture(2, 0, 0, 50))), {}, {0, -10002, 841}},
+         {"H.263 data", video(coded(CODEC_H263, H263Picture(2, 50))), {}, {0, -10002, 841}},
          {"growing: H.263 data", growing(Video(0, coded(CODEC_H263, H263Picture(2))), 127), {GROWING}, cut_short(841)},
          {"H.263 header", video(coded(CODEC_H263, blank)), {}, {0, -3002, 847}},
          {"VP6 data", video(coded(CODEC_VP6, Vp6Picture(false, 4, 3, 0, 50))), {}, {0, -10002, 863}},

@@ -10,11 +10,16 @@
 
 namespace flvd_test {
 
+static void Require(bool holds, const std::string& otherwise)
+{
+    if (!holds)
+        throw std::runtime_error(otherwise);
+}
+
 static std::string ReadData(const std::string& name)
 {
     std::ifstream in(std::string(FLVDMX_TEST_DATA) + "/" + name, std::ios::binary);
-    if (!in)
-        throw std::runtime_error("cannot read " + name);
+    Require(in.good(), "cannot read " + name);
     return {std::istreambuf_iterator<char>(in), {}};
 }
 
@@ -41,19 +46,42 @@ Expected ReadExpected(const std::string& name)
         const auto number = [&fields](const char* key, int base = 10) {
             return static_cast<uint32_t>(std::stoul(fields.at(key), nullptr, base));
         };
+        const bool video = fields["kind"] == "video";
         if (kind == "stream")
-            out.streams.push_back({fields["kind"] == "video" ? 1u : 2u, number("width"), number("rate"),
-                                   FromHex(fields.at("extradata"))});
+            out.streams.push_back({video ? 1u : 2u, number("width"), number("rate"), FromHex(fields.at("extradata"))});
+        if (kind == "file")
+            Require(number("size") == out.bytes.size(), name + " has another size");
         if (kind != "packet")
             continue;
-        const uint8_t* const at = &out.bytes.at(number("pos"));
-        const Bytes data(at + 11, at + 11 + (at[1] << 16 | at[2] << 8 | at[3]));
-        const Tag& tag = out.tags.emplace_back(Tag{*at, number("dts"), data, {}, {}, 0, number("pos")});
-        const size_t size = number("size");
-        if (data.size() != tag.codec_bytes() + size || tool::Crc32(&data[tag.codec_bytes()], size) != number("crc", 16))
-            throw std::runtime_error(name + ": another packet at " + fields["pos"]);
+        const size_t pos = number("pos"), size = number("size");
+        const uint8_t* const at = &out.bytes.at(pos + 14) - 14; // header and back-pointer are there
+        const auto length = static_cast<size_t>(at[1] << 16 | at[2] << 8 | at[3]);
+        const uint8_t* const end = &out.bytes.at(pos + 14 + length) - 3;
+        const Bytes data(at + 11, end);
+        const Tag tag{*at, number("dts"), data, {}, {}, 0, static_cast<int64_t>(pos)};
+        Require(tag.type == (video ? 9 : 8) && data.size() == tag.codec_bytes() + size &&
+                    tool::Crc32(&data[tag.codec_bytes()], size) == number("crc", 16),
+                name + ": another packet at " + fields["pos"]);
+        out.tags.push_back(tag);
     }
     return out;
+}
+
+std::vector<std::vector<std::string>> ReadTable(const std::string& name)
+{
+    std::vector<std::vector<std::string>> rows;
+    std::istringstream in(ReadData(name));
+    for (std::string line; std::getline(in, line);) {
+        if (line.empty() || line[0] == '#')
+            continue;
+        auto& row = rows.emplace_back();
+        for (size_t at = 0, bar = 0; bar != std::string::npos; at = bar + 3) {
+            bar = line.find(" | ", at);
+            row.push_back(line.substr(at, bar - at));
+        }
+    }
+    Require(!rows.empty(), name + " has no rows");
+    return rows;
 }
 
 } // namespace flvd_test

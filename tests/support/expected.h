@@ -1,4 +1,4 @@
-/* Expected results of the sample files, as tests/data/make_expected.py writes them. */
+/* What tests/data holds: sample files with their expected results, as make_expected.py writes them, and tables. */
 #pragma once
 
 #include "flv_writer.h"
@@ -19,5 +19,9 @@ struct Expected : Flv {
 
 /** NAME.flv and expected/NAME.txt in FLVDMX_TEST_DATA; throws when they cannot be read or do not agree. */
 Expected ReadExpected(const std::string& name);
+
+/** The rows of a table, split at " | ". Empty lines and lines that begin with # are none. Throws when there is no row.
+ */
+std::vector<std::vector<std::string>> ReadTable(const std::string& name);
 
 } // namespace flvd_test

@@ -47,7 +47,7 @@ Bytes Bits(const std::string& words)
         const size_t star = word.find('*'), slash = word.find('/');
         const std::string number = word.substr(star + 1); // all of it when there is no star
         const bool is_signed = number[0] == '+' || number[0] == '-';
-        const int64_t n = std::stoll(number);
+        const int64_t n = std::stoll(number, nullptr, 0);
         std::string code = binary(!is_signed ? n + 1 : n > 0 ? 2 * n : 1 - 2 * n);
         code.erase(0, code.find('1'));
         code.insert(0, code.size() - 1, '0');
@@ -135,11 +135,9 @@ Bytes Mp3Frame(size_t size)
     return Filled({0xFF, 0xFB, 0x90, 0x64}, size);
 }
 
-Bytes H263Picture(uint32_t size_code, uint32_t width, uint32_t height, size_t size)
+Bytes H263Picture(uint32_t size_code, size_t size)
 {
-    const std::string bits = size_code == 0 ? "/8 " : size_code == 1 ? "/16 " : "/0 ";
-    const std::string sizes = std::to_string(width) + bits + std::to_string(height) + bits;
-    return Filled(Bits("1/17 0/5 1/8 " + std::to_string(size_code) + "/3 " + sizes), size);
+    return Filled(Bits("1/17 0/5 1/8 " + std::to_string(size_code) + "/3"), size);
 }
 
 Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust, size_t size)

@@ -34,8 +34,8 @@ Bytes Concat(const std::vector<Bytes>& parts);
 Bytes Noise(size_t size, uint32_t seed = 1);
 
 /**
- * Bits from words: n/b is n in b bits, n is ue(n), +n and -n are se(n); k*word is the word k times. Most significant
- * bit first, the last byte filled up with zero bits.
+ * Bits from words: n/b is n, decimal or 0x.., in b bits, n is ue(n), +n and -n are se(n); k*word is the word k times.
+ * Most significant bit first, the last byte filled up with zero bits.
  */
 Bytes Bits(const std::string& words);
 
@@ -85,8 +85,8 @@ Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
 Bytes SmallAvcRecord();
 /** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
 Bytes Mp3Frame(size_t size = 200);
-/** Sorenson H.263 picture header; size_code 0 and 1 carry width and height, 2 to 6 a fixed size. */
-Bytes H263Picture(uint32_t size_code, uint32_t width = 0, uint32_t height = 0, size_t size = 200);
+/** Sorenson H.263 picture header; size_code 2 to 6: a fixed size. */
+Bytes H263Picture(uint32_t size_code, size_t size = 200);
 /** VP6 intra picture of profile 3 showing columns x rows macroblocks; `adjust` is cropped from width, height. */
 Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust = 0, size_t size = 200);
 
