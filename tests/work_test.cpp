@@ -36,7 +36,7 @@ Cost Forward(uint64_t bytes, uint64_t false_headers = 0, uint64_t cache = CACHE)
 /** Going backward, byte by byte. */
 Cost Backward(uint64_t bytes, uint64_t quantum = NARROW)
 {
-    return bytes * Cost{4, 2 * quantum};
+    return bytes * Cost{4, 2 * std::max(quantum, NARROW)};
 }
 
 struct WorkCase {
@@ -76,11 +76,12 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
     return {name, file, options, CACHE, open, Forward(file.size()), Forward(2 * file.size())};
 }
 
-/** Sound alone at the end, behind bytes whose every fourth place leads back a little. */
-WorkCase Slide(const char* name, size_t size, uint64_t quantum)
+/** Sound alone at the end, behind bytes whose every fourth place leads back a little; that several times. */
+WorkCase Slide(const char* name, size_t size, uint64_t quantum, uint64_t times = 1)
 {
-    const Bytes file = Concat({MakeChain().bytes, Repeat({0, 0, 0, 15}, size), MakeChain({false, true}).body()});
-    const Cost pass = Forward(file.size()), back = Backward(size + 256, quantum);
+    const Bytes stretch = Concat({Repeat({0, 0, 0, 15}, size), MakeChain({false, true}).body()});
+    const Bytes file = Concat({MakeChain().bytes, Repeat(stretch, times * stretch.size())});
+    const Cost pass = Forward(file.size()), back = times * Backward(size + 256, quantum);
     return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * quantum}, quantum};
 }
 
@@ -123,12 +124,14 @@ std::vector<WorkCase> Cases()
     return {
         FalseHeaders("false headers", 0, CACHE, Forward(700000, 600000)),
         FalseHeaders("false headers, two readers", SEPARATE, CACHE, Forward(700000, 600000)),
+        FalseHeaders("false headers, larger cache", 0, CACHE * NARROW, Forward(700000, 600000, CACHE * NARROW)),
         FalseHeaders("false headers in the cache", 0, BIG_CACHE, in_cache),
         FalseHeaders("false headers, growing", GROWING, CACHE, Forward(700000)),
         Tail("zeros", {0}, 3 * MIB),
         Tail("zeros, growing", {0}, 3 * MIB, GROWING),
         Tail("small distances", {0, 0, 0, 15}, 2 * MIB),
-        Slide("slide", 300000, NARROW),
+        Slide("slide", 300000, NARROW, 4),
+        Slide("slide by reads of a byte", 30000, 1),
         Slide("slide by wide reads", 30000, CACHE),
         ManyTags("sound alone", false, 100, false, TAG),
         ManyTags("large tags", true, CACHE, false, LARGE_TAG),
