@@ -283,6 +283,18 @@ TEST(Delivery, GivesThePayloadsBehindTheCodecBytes)
     }
 }
 
+TEST(Delivery, GoesOnInAFileThatGrowsTagByTag)
+{
+    FakeHost host(g_chain.bytes);
+    size_t tag = 3; // behind metadata and configurations
+    host.set_visible(g_chain.tags[tag].end());
+    Session session(host, {GROWING});
+    for (; tag < g_chain.tags.size(); ++tag) {
+        host.set_visible(g_chain.tags[tag].end());
+        EXPECT_EQ(session.frame().rc, 0) << tag; // at once, though the host was at the end
+    }
+}
+
 TEST(Delivery, GoesBackWhenItCannotPassDamage)
 {
     // The second request seeks over a configuration, and then by its size in the damage.

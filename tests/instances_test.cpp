@@ -87,6 +87,11 @@ TEST(Instances, RefusesWhatItCannotServe)
     EXPECT_EQ(session.last_error(), -4006);
     EXPECT_EQ(session.error_line(), 3420);
 
+    Session user(host, {USER});
+    const flvd_frame_request_t no_buffer{nullptr, 100000, 0};
+    flvd_ctx_t* ctx = user.ctx();
+    EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_GET_FRAME, &ctx, &no_buffer, &frame), -2); // no frame fits
+
     FakeHost empty(Bytes{});
     const flvd_init_t empty_init = empty.init();
     EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_OPEN, &live, &empty_init, &info), -1);

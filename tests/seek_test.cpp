@@ -233,6 +233,8 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
     };
     const Flv times = uneven("times: [2 0 0", "filepositions: [5 13 13 1e9 1e9 1e9");
     const Flv places = uneven("filepositions: [2 13 13", "times: [5 0 0.2 0.4 0.6 0.8");
+    // There the file header reads as a tag of 0 ms.
+    const Flv in_header = MakeChain({true, true, true, true, 50, 5, 0, [](auto&, auto& p) { p[1] = 5; }});
     const auto hide = [](FlvBuilder hidden, const auto& tag) { // all tags of one stream are later than the file's end
         for (uint32_t time = 1538; time <= 1978; time += 40)
             hidden.add(tag(time, 60));
@@ -263,7 +265,8 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
                           {scan, ONE, VIDEO, 1950, AUTO, -101, 1978},     {index, ONE, AUDIO, 1979, BACK, 0, 1978},
                           {unseen, ONE, VIDEO, 1700, AUTO, -101, 1978},   {index, ONE, AUDIO, 1979, AUTO, 0, 1978},
                           {unheard, TWO, AUDIO, 1700, AUTO, 0, 1978},     {index, GROWING, AUDIO, 900, BACK, -1},
-                          {text, ONE, VIDEO, 1900, BACK, 0, 1400},        {lying, ONE, TIME, 700, BACK, 0, 200}};
+                          {text, ONE, VIDEO, 1900, BACK, 0, 1400},        {lying, ONE, TIME, 700, BACK, 0, 200},
+                          {in_header, ONE, VIDEO, 200, AUTO, 355},        {in_header, INDEX, VIDEO, 200, AUTO, 452}};
     for (const Case& c : cases) {
         SCOPED_TRACE(&c - cases);
         FakeHost host(c.flv.bytes);

@@ -156,9 +156,10 @@ TEST(PrevTag, SlidesBackOneMiBInAll)
 
 TEST(HostCalls, OfTheBackPointerCheck)
 {
-    const auto check = [](size_t size, uint32_t quantum, const std::string& log) {
+    const auto check = [](size_t size, uint32_t quantum, const std::string& log, uint32_t most = CACHE) {
         Reader r(Zeros(FIRST_TAG) + Sound(size) + Picture(), CACHE, quantum);
-        r.at(FIRST_TAG).host.start_log();
+        r.at(FIRST_TAG).host.limit_reads(most);
+        r.host.start_log();
         EXPECT_EQ(FLVD_GetCurrTagInfo(&r.ctx, r.file, &r.info, AUDIO, 1), 0);
         const std::string calls = r.host.take_log();
         EXPECT_EQ(calls.substr(0, log.size()), log);
@@ -170,6 +171,7 @@ TEST(HostCalls, OfTheBackPointerCheck)
     check(4081, 0, whole);
     check(4082, 0, whole + " read(1)=1 seek64(13,0)=0");
     check(5000, 0, whole + " seek64(915,1)=0 read(4)=4 seek64(13,0)=0");
+    check(100, 0, "tell64()=13 eof()=0 read(4096)=50 tell64()=63 read(4046)=50 read(3996)=50 seek64(13,0)=0", 50);
     check(100, 16, "tell64()=13 eof()=0 read(16)=16 tell64()=29 seek64(95,1)=0 read(16)=16 seek64(13,0)=0");
     check(100, 5, "tell64()=13 eof()=0 read(13)=13 tell64()=26 seek64(98,1)=0 read(5)=5 seek64(13,0)=0");
 }

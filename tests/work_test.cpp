@@ -25,6 +25,7 @@ Cost operator*(uint64_t n, Cost a)
 }
 
 constexpr Cost FALSE_HEADER = {6, 0}, TAG = {5, 0}, LARGE_TAG = {10, 2 * CACHE + NARROW}, WALKED_TAG = {12, 6 * NARROW};
+constexpr Cost AT_END = {5 * REQUEST_SEARCHES, 0};
 constexpr uint64_t FEW = 100; /**< tags that every file has */
 
 /** Going forward over so many bytes, of which some begin false headers, and over a few tags. */
@@ -175,6 +176,8 @@ void HoldAll(const WorkCase& c)
         all = all + Hold("request", Taken(host), request);
     }
     Hold("play", all, c.play);
+    session.frame(AUDIO);
+    Hold("request at the end", Taken(host), (c.options & GROWING) != 0 ? Forward(2 * MIB) : AT_END);
     for (const int32_t time : {100, 700, 0x10000000})
         for (const uint32_t mode : {uint32_t{FLVD_SEEK_FORWARD}, uint32_t{FLVD_SEEK_BACKWARD}}) {
             session.seek(time, mode);
