@@ -223,6 +223,7 @@ TEST(KeyframeIndex, DecidesHowToSeekAndTheLastTime)
     expect("keyframes: { times: [3 'text 1 2 filepositions: [3 13 2 2 }", FLVD_SEEK_BY_INDEX, 0);
     expect("keyframes: { times: [3 1 'text 2 filepositions: [3 13 'text 2 }", FLVD_SEEK_BY_INDEX, 1000);
     expect("keyframes: { filepositions: [3 13 2 2 }", FLVD_SEEK_BY_SCAN, 0);
+    expect("keyframes: { times: [3 1 2 3 }", FLVD_SEEK_BY_SCAN, 0);
     const std::string two =
         "keyframes: { times: [1 1 filepositions: [3 13 2 2 } keyframes: { filepositions: [3 13 2 2 }";
     expect(two, FLVD_SEEK_BY_INDEX, 1000, INDEX);
