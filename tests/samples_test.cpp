@@ -116,6 +116,7 @@ const OpenOptions g_variants[] = {
     {SEPARATE}};
 constexpr size_t VARIANTS = std::size(g_variants);
 
+// More than ten thousand opens and closes on one host, behind each of which nothing is left.
 TEST(Samples, CutAtEveryByteDeliverTheWholeTags)
 {
     for (const Expected& sample : Samples()) {

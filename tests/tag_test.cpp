@@ -150,6 +150,8 @@ TEST(PrevTag, SlidesBackOneMiBInAll)
     EXPECT_EQ(r.prev(VIDEO), Found(NOT_FOUND, 0, 0));
     Reader twice(Concat({Zeros(FIRST_TAG) + Sound(), Zeros(MIB - 1) + Picture(), {0}}), CACHE, 16);
     EXPECT_EQ(twice.at(twice.end).prev(AUDIO), Found(0, FIRST_TAG, AUDIO)); // the picture restores the budget
+    Reader just(Zeros(DATA_OFFSET + MIB + 4), CACHE, 16);
+    EXPECT_EQ(just.at(just.end).prev(ANY), Found(FLVD_ERR_AT_FIRST_TAG, 0, 0));
     Reader spent(Concat({Zeros(FIRST_TAG) + Sound(), Zeros(MIB)}), CACHE, 16);
     EXPECT_EQ(spent.at(spent.end).prev(ANY), Found(NOT_FOUND, 0, 0));
 }
