@@ -78,7 +78,7 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
 }
 
 /** Sound alone at the end, behind bytes whose every fourth place leads back a little; that several times. */
-WorkCase Slide(const char* name, size_t size, uint64_t quantum, uint64_t times = 1)
+WorkCase Slide(const char* name, size_t size, uint64_t quantum, size_t times = 1)
 {
     const Bytes stretch = Concat({Repeat({0, 0, 0, 15}, size), MakeChain({false, true}).body()});
     const Bytes file = Concat({MakeChain().bytes, Repeat(stretch, times * stretch.size())});
