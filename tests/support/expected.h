@@ -20,8 +20,7 @@ struct Expected : Flv {
 /** NAME.flv and expected/NAME.txt in FLVDMX_TEST_DATA; throws when they cannot be read or do not agree. */
 Expected ReadExpected(const std::string& name);
 
-/** The rows of a table, split at " | ". Empty lines and lines that begin with # are none. Throws when there is no row.
- */
+/** The rows of a table, split at " | "; empty lines and lines that begin with # are none. Throws without any row. */
 std::vector<std::vector<std::string>> ReadTable(const std::string& name);
 
 } // namespace flvd_test
