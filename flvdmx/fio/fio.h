@@ -5,6 +5,7 @@
 #include "flvdmx/fio/tables.h"
 #include "flvdmx/flvdmx.h"
 
+#include <algorithm>
 #include <cstring>
 
 constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62; // a host that tells more has not told a position
@@ -74,16 +75,19 @@ inline bool FLVD_FioAtEnd(fio_file_t* file)
     return file->count == 0 && __FLV_DMX__fioIsEof(file) != 0;
 }
 
-// Logical position from the host's; -1 when the query failed. A position that no file can have is a failed query:
-// adding sizes to positions never overflows.
+// Logical position from the host's. A position that no file can have is a failed query (-1), so that adding sizes to
+// positions never overflows; a negative one stays negative.
 inline int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
 {
-    if (static_cast<uint64_t>(host) > uint64_t{FIO_POSITION_MAX})
+    const bool reading = file->state == FIO_STATE_READ;
+    if (host < 0)
+        return reading ? std::max(host, INT64_MIN + file->count) - file->count : host;
+    if (host > FIO_POSITION_MAX)
         return -1;
-    return file->state == FIO_STATE_READ ? host - file->count : host + file->count;
+    return reading ? host - file->count : host + file->count;
 }
 
-// __FLV_DMX__fioTell64 for the playing path, which asks twice a frame.
+// __FLV_DMX__fioTell64 for the playing path, which asks twice per frame.
 inline int64_t FLVD_FioTell(const fio_file_t* file)
 {
     const int64_t host = g_flvd_fioFuncs.file_tell64 != nullptr ? g_flvd_fioFuncs.file_tell64(file->handle)
