@@ -27,7 +27,10 @@ int32_t FLVD_TranslateError(int32_t result, int32_t error)
 
 int32_t FLVD_Open(flvd_ctx_t** handle, const void* init, void* info, bool for_info)
 {
-    if (handle == nullptr || init == nullptr || info == nullptr)
+    if (handle == nullptr)
+        return FLVD_RET_FAILED;
+    *handle = nullptr;
+    if (init == nullptr || info == nullptr)
         return FLVD_RET_FAILED;
     *handle = FLVD_OpenInstance(static_cast<const flvd_init_t*>(init), static_cast<flvd_open_info_t*>(info), for_info);
     return *handle != nullptr ? 0 : FLVD_TranslateError(-1, g_flvd_lLastError);
