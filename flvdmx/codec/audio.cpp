@@ -12,7 +12,8 @@
 namespace {
 
 // How much of the tag is looked at.
-constexpr uint32_t FLVD_AUDIO_PEEK = 13; // tag header, audio byte and packet type
+constexpr uint32_t FLVD_AUDIO_PEEK = 12; // tag header and audio byte
+constexpr uint32_t FLVD_AAC_PEEK = 13;   // and packet type
 constexpr uint32_t FLVD_MP3_PEEK = 16;   // tag header, audio byte and one MPEG frame header
 
 constexpr uint32_t FLVD_SAMPLE_BITS = 16; // whatever SoundSize says: it is the size after decoding
@@ -165,8 +166,11 @@ int32_t FLVD_ProbeAacConfig(flvd_ctx_t* ctx, uint32_t data_size)
     return 0;
 }
 
-int32_t FLVD_ProbeAac(flvd_ctx_t* ctx, const uint8_t* tag)
+int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 {
+    const uint8_t* tag = nullptr;
+    if (__FLV_DMX__fioShowBytesByPtr(&tag, FLVD_AAC_PEEK, ctx->cur_reader) < FLVD_AAC_PEEK)
+        return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
     const bool sequence_header = tag[FLVD_PACKET_TYPE] == FLVD_PACKET_SEQUENCE_HEADER;
     const int32_t result = sequence_header ? FLVD_ProbeAacConfig(ctx, FLVD_GetBE24(tag + FLVD_DATA_SIZE_FIELD)) : 0;
     if (result == 0)
@@ -174,16 +178,16 @@ int32_t FLVD_ProbeAac(flvd_ctx_t* ctx, const uint8_t* tag)
     return result;
 }
 
-int32_t FLVD_ProbeSoundFormat(flvd_ctx_t* ctx, const uint8_t* tag)
+int32_t FLVD_ProbeSoundFormat(flvd_ctx_t* ctx, uint8_t audio_byte)
 {
-    const uint32_t format = uint32_t{tag[FLVD_CODEC_BYTE]} >> FLVD_SOUND_FORMAT_SHIFT;
+    const uint32_t format = uint32_t{audio_byte} >> FLVD_SOUND_FORMAT_SHIFT;
     switch (format) {
     case FLVD_SOUND_MP3:
         return FLVD_ProbeMp3(ctx, format, FLVD_SITE_MP3_DATA, FLVD_SITE_MP3_HEADER);
     case FLVD_SOUND_MP3_8KHZ:
         return FLVD_ProbeMp3(ctx, format, FLVD_SITE_MP3_8KHZ_DATA, FLVD_SITE_MP3_8KHZ_HEADER);
     case FLVD_SOUND_AAC:
-        return FLVD_ProbeAac(ctx, tag);
+        return FLVD_ProbeAac(ctx);
     default:
         ctx->audio_info.format_tag = 0;
         return 0;
@@ -217,7 +221,7 @@ int32_t FLVD_ProbeAudioTag(flvd_ctx_t* ctx)
     info.sample_rate = g_flvd_soundRate[audio_byte >> 2u & 3u];
     info.sample_size = FLVD_SAMPLE_BITS;
     info.channels = (audio_byte & 1u) != 0 ? 2 : 1;
-    const int32_t result = FLVD_ProbeSoundFormat(ctx, tag);
+    const int32_t result = FLVD_ProbeSoundFormat(ctx, audio_byte);
     if (result == 0)
         info.reserved2 = 0;
     return result;

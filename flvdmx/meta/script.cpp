@@ -603,8 +603,8 @@ void FLVD_SetCallbackforMeta(const flvd_init_t* init)
 int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length)
 {
     const int64_t start = __FLV_DMX__fioTell64(ctx->cur_reader);
-    if (start < 0 || length == 0) // passed all the same: what reads on is not to take the payload for tags
-        return __FLV_DMX__fioSkipBytes(length, ctx->cur_reader) == length ? -1 : FLVD_ERR_END_OF_DATA;
+    if (start < 0 || length == 0)
+        return -1;
     flvd_script_state_t state = {};
     state.pending_key = FLVD_META_KEY_NONE;
     state.length = length;
