@@ -40,43 +40,53 @@ struct flvd_times_t {
     fio_file_t* file;         // read from here, unless
     const uint32_t* times_ms; // they are in memory
     uint32_t count;
+    bool missing; // the element read last was not there at all
 };
 
-// Reads a number element of an AMF0 strict array. False when there is none; a number cut short is 0.
-bool FLVD_ReadNumberElement(fio_file_t* file, double* number)
+// An element of an AMF0 strict array: a number, which is 0.0 when its bytes are cut or missing, or none.
+enum class FlvdElement { Number, MissingNumber, NotANumber };
+
+FlvdElement FLVD_ReadNumberElement(fio_file_t* file, double* number)
 {
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, 1, file) < 1 || *bytes != FLVD_AMF_NUMBER)
-        return false;
+    const bool there = __FLV_DMX__fioShowBytesByPtr(&bytes, 1, file) == 1;
+    if (there && *bytes != FLVD_AMF_NUMBER)
+        return FlvdElement::NotANumber;
     __FLV_DMX__fioSkipBytes(1, file);
     const bool whole = __FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_AMF_NUMBER_SIZE, file) == FLVD_AMF_NUMBER_SIZE;
     *number = whole ? FLVD_GetDouble(bytes) : 0.0;
     __FLV_DMX__fioSkipBytes(FLVD_AMF_NUMBER_SIZE, file);
-    return true;
+    return there ? FlvdElement::Number : FlvdElement::MissingNumber;
 }
 
-// Time of entry i, the next one. False when the array ends there.
-bool FLVD_NextTime(const flvd_times_t& times, uint32_t i, uint32_t* time)
+// Time of entry *i, the next one. False when the array ends there. After two elements that are not there none of the
+// others is: the last one stands for them all, or a count that lies would cost a read for each.
+bool FLVD_NextTime(flvd_times_t* times, uint32_t* i, uint32_t* time)
 {
-    if (times.times_ms != nullptr) {
-        *time = times.times_ms[i];
+    if (times->times_ms != nullptr) {
+        *time = times->times_ms[*i];
         return true;
     }
     double seconds = 0.0;
-    if (!FLVD_ReadNumberElement(times.file, &seconds))
+    const FlvdElement element = FLVD_ReadNumberElement(times->file, &seconds);
+    if (element == FlvdElement::NotANumber)
         return false;
+    const bool missing = element == FlvdElement::MissingNumber;
+    if (missing && times->missing)
+        *i = times->count - 1;
+    times->missing = missing;
     *time = FLVD_SecondsToMs(seconds);
     return true;
 }
 
 // The choice rule of both kinds of index: the first entry at or above the target decides.
-flvd_choice_t FLVD_ChooseEntry(const flvd_times_t& times, uint32_t target, bool backward)
+flvd_choice_t FLVD_ChooseEntry(flvd_times_t times, uint32_t target, bool backward)
 {
     uint32_t before = 0;
     uint32_t i = 0;
     for (; i < times.count; ++i) {
         uint32_t time = 0;
-        if (!FLVD_NextTime(times, i, &time))
+        if (!FLVD_NextTime(&times, &i, &time))
             break; // the entries before it are the whole index
         const bool exact = time == target && i != 0;
         if (time >= target && (!backward || exact))
@@ -96,8 +106,8 @@ int32_t FLVD_RewindByIndex(flvd_ctx_t* ctx, uint32_t* result, flvd_site_t site)
     return FLVD_SeekToFirstTag(ctx, ctx->main_reader) == 0 ? 0 : FLVD_Fail(ctx, site);
 }
 
-// Moves to a keyframe's position and takes its timestamp, which must be near the index's: the only proof that the index
-// belongs to the file.
+// Moves to a keyframe's position and takes the timestamp there, which must be near the index's: the only proof that the
+// index belongs to the file.
 int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, uint32_t* result,
                          const flvd_index_sites_t& sites)
 {
@@ -107,8 +117,7 @@ int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, u
     if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_HEADER_SIZE, ctx->main_reader) < FLVD_TAG_HEADER_SIZE)
         return FLVD_Fail(ctx, sites.short_tag);
     const uint32_t timestamp = FLVD_TagTimestamp(bytes);
-    const bool in_header = position <= ctx->data_offset; // no tag, whatever its bytes say
-    if (in_header || FLVD_TimeDistance(timestamp, expected) > FLVD_INDEX_TOLERANCE_MS)
+    if (FLVD_TimeDistance(timestamp, expected) > FLVD_INDEX_TOLERANCE_MS)
         return FLVD_Fail(ctx, sites.tolerance);
     *result = timestamp;
     return 0;
@@ -125,7 +134,7 @@ uint32_t FLVD_EntriesInMemory(const flvd_ctx_t* ctx)
 
 int32_t FLVD_RunIndexSeekInMemory(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, bool backward)
 {
-    const flvd_times_t times = {nullptr, ctx->keyframe_arrays.times_ms, FLVD_EntriesInMemory(ctx)};
+    const flvd_times_t times = {nullptr, ctx->keyframe_arrays.times_ms, FLVD_EntriesInMemory(ctx), false};
     const flvd_choice_t choice = FLVD_ChooseEntry(times, target, backward);
     if (choice.what == FlvdChoice::Miss)
         return FLVD_ERR_END_OF_DATA;
@@ -143,13 +152,11 @@ bool FLVD_ReadEntryPosition(flvd_ctx_t* ctx, uint32_t entry, int64_t* position)
         FLVD_Record(ctx, FLVD_SITE_INDEX_POSITIONS_SEEK);
         return false;
     }
-    const uint8_t* marker = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&marker, 1, file) == 1 && *marker != FLVD_AMF_NUMBER) {
+    double number = 0.0;
+    if (FLVD_ReadNumberElement(file, &number) == FlvdElement::NotANumber) {
         FLVD_Record(ctx, FLVD_SITE_INDEX_POSITION_TYPE);
         return false;
     }
-    double number = 0.0;
-    FLVD_ReadNumberElement(file, &number); // behind the end of the file: position 0, which no keyframe has
     *position = FLVD_DoubleToI64(number);
     return true;
 }
@@ -160,7 +167,7 @@ int32_t FLVD_RunIndexSeekFromFile(flvd_ctx_t* ctx, uint32_t target, uint32_t* re
     const flvd_keyframe_index_t& index = ctx->keyframe_index;
     if (index.entry_count != 0 && __FLV_DMX__fioSeek64(file, index.times_offset, FIO_SEEK_SET) != 0)
         return FLVD_Fail(ctx, FLVD_SITE_INDEX_TIMES_SEEK);
-    const flvd_choice_t choice = FLVD_ChooseEntry({file, nullptr, index.entry_count}, target, backward);
+    const flvd_choice_t choice = FLVD_ChooseEntry({file, nullptr, index.entry_count, false}, target, backward);
     if (choice.what == FlvdChoice::Miss)
         return FLVD_ERR_END_OF_DATA;
     if (choice.what == FlvdChoice::Rewind)

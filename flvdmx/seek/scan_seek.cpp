@@ -26,6 +26,7 @@ struct flvd_scan_t {
     bool backward;
     bool audio;
     flvd_tag_info_t tag; // the tag reached last
+    uint32_t steps;      // of the last walk
 };
 
 int32_t FLVD_SeekBackward(flvd_scan_t* scan);
@@ -71,9 +72,10 @@ int32_t FLVD_Step(flvd_scan_t* scan, bool forward)
 // Walks until the target is reached or passed. 0, or the code of the step that failed.
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
-    for (bool stepped = false;; stepped = true) {
+    for (scan->steps = 0;;) {
         if (__FLV_DMX__fioIsEof(scan->file) != 0)
-            return stepped && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+            return scan->steps != 0 && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+        ++scan->steps;
         const int32_t code = FLVD_Step(scan, forward);
         if (code != 0)
             return code;
@@ -118,18 +120,11 @@ int32_t FLVD_SeekFromStart(flvd_scan_t* scan)
     return FLVD_SeekForward(scan);
 }
 
-// Stepping back reached the first tag.
-int32_t FLVD_SeekAtStart(flvd_scan_t* scan)
+// Answers after a backward walk that ended with this code.
+int32_t FLVD_EndBackwardWalk(flvd_scan_t* scan, int32_t code)
 {
-    return scan->backward ? FLVD_Rewind(scan) : FLVD_SeekFromStart(scan);
-}
-
-// Walks backward from the position and answers.
-int32_t FLVD_SeekBackward(flvd_scan_t* scan)
-{
-    int32_t code = FLVD_Walk(scan, false);
     if (code == FLVD_ERR_AT_FIRST_TAG)
-        return FLVD_SeekAtStart(scan);
+        return scan->backward ? FLVD_Rewind(scan) : FLVD_SeekFromStart(scan);
     if (code == 0 && !scan->backward && scan->tag.timestamp != scan->target) {
         code = FLVD_Walk(scan, true);
         if (code == FLVD_ERR_END_OF_DATA)
@@ -138,10 +133,18 @@ int32_t FLVD_SeekBackward(flvd_scan_t* scan)
     return code == 0 ? FLVD_Answer(scan) : FLVD_FailWalk(scan, code);
 }
 
+// Walks backward from the position and answers.
+int32_t FLVD_SeekBackward(flvd_scan_t* scan)
+{
+    return FLVD_EndBackwardWalk(scan, FLVD_Walk(scan, false));
+}
+
 int32_t FLVD_SeekFromEnd(flvd_scan_t* scan)
 {
     FLVD_StartAt(scan, scan->ctx->data_end);
-    return FLVD_SeekBackward(scan);
+    const int32_t code = FLVD_Walk(scan, false);
+    const bool after_last_tag = code == 0 && scan->steps == 1 && scan->tag.timestamp < scan->target;
+    return scan->audio && after_last_tag ? FLVD_SeekAtEnd(scan) : FLVD_EndBackwardWalk(scan, code);
 }
 
 // From the tag at the position. When it has the target's time without being the answer, the answer may lie on either
@@ -217,7 +220,7 @@ int32_t FLVD_SeekAfterVideo(flvd_scan_t* scan)
         return FLVD_Fail(scan->ctx, FLVD_SITE_AUDIO_FOLLOW_SEEK);
     const int32_t code = FLVD_FirstTag(scan, FLVD_TAG_AUDIO, FLVD_SITE_AUDIO_FIRST_STEP);
     if (code == FLVD_ERR_AT_FIRST_TAG)
-        return FLVD_SeekAtStart(scan);
+        return FLVD_Rewind(scan);
     if (code != 0)
         return code;
     return scan->tag.timestamp == scan->target ? FLVD_Answer(scan) : FLVD_SeekFromTag(scan);
@@ -247,20 +250,21 @@ int32_t FLVD_SeekAudioAlone(flvd_scan_t* scan)
 int32_t FLVD_RunVideoScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, uint32_t direction)
 {
     const bool backward = direction == FLVD_DIRECTION_BACKWARD;
-    flvd_scan_t scan = {ctx, ctx->main_reader, FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME, target, result, backward, false, {}};
+    flvd_scan_t scan = {ctx, ctx->main_reader, FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME, target, result, backward, false, {},
+                        0};
     const FLVD_ReadSizeGuard narrow(scan.file, ctx->scan_read_size, FLVD_WHOLE_CACHE);
     if (__FLV_DMX__fioSeek64(scan.file, FLVD_EstimatePosition(ctx, target), FIO_SEEK_SET) != 0)
         return FLVD_Fail(ctx, FLVD_SITE_VIDEO_ESTIMATE);
     const int32_t code = FLVD_FirstTag(&scan, FLVD_TAG_VIDEO, FLVD_SITE_VIDEO_FIRST_STEP);
     if (code == FLVD_ERR_AT_FIRST_TAG)
-        return FLVD_SeekAtStart(&scan);
+        return FLVD_Rewind(&scan);
     return code == 0 ? FLVD_SeekFromFirstTag(&scan) : code;
 }
 
 int32_t FLVD_RunAudioScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, uint32_t direction)
 {
     const bool backward = direction == FLVD_DIRECTION_BACKWARD;
-    flvd_scan_t scan = {ctx, ctx->audio_reader, FLVD_TAG_AUDIO, target, result, backward, true, {}};
+    flvd_scan_t scan = {ctx, ctx->audio_reader, FLVD_TAG_AUDIO, target, result, backward, true, {}, 0};
     const FLVD_ReadSizeGuard narrow(scan.file, ctx->scan_read_size, FLVD_WHOLE_CACHE);
     return FLVD_HasAudioReader(ctx) && FLVD_HasVideo(ctx) ? FLVD_SeekAfterVideo(&scan) : FLVD_SeekAudioAlone(&scan);
 }

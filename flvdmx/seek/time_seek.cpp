@@ -280,10 +280,7 @@ int32_t FLVD_RunSeek(flvd_time_seek_t seek, int32_t* result)
 
 int32_t FLVD_RunTimeSeek(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode)
 {
-    const flvd_time_seek_t seek = {ctx, &g_flvd_completeSites, time, mode, false, 0, FLVD_DIRECTION_FORWARD, 0};
-    if (!FLVD_IsByZero(seek))
-        FLVD_ForgetPositions(ctx); // a restore that failed may have left one
-    return FLVD_RunSeek(seek, result);
+    return FLVD_RunSeek({ctx, &g_flvd_completeSites, time, mode, false, 0, FLVD_DIRECTION_FORWARD, 0}, result);
 }
 
 int32_t FLVD_RunTimeSeekProgressive(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode)
