@@ -36,7 +36,7 @@ enum : uint32_t { FLVD_SOUND_MP3 = 2, FLVD_SOUND_AAC = 10, FLVD_SOUND_MP3_8KHZ =
 constexpr uint32_t FLVD_PACKET_SEQUENCE_HEADER = 0; // the codec configuration
 constexpr uint32_t FLVD_PACKET_END_OF_SEQUENCE = 2; // AVC only
 
-// Codec header bytes in front of a payload.
+// Codec header bytes before a frame.
 constexpr uint32_t FLVD_AVC_HEADER_SIZE = 5; // codec byte, packet type, CompositionTime
 constexpr uint32_t FLVD_AAC_HEADER_SIZE = 2; // codec byte, packet type
 constexpr uint32_t FLVD_CODEC_HEADER_SIZE = 1;
@@ -45,6 +45,19 @@ constexpr uint32_t FLVD_CODEC_HEADER_SIZE = 1;
 constexpr bool FLVD_IsPicturelessPacket(uint32_t packet_type)
 {
     return packet_type == FLVD_PACKET_SEQUENCE_HEADER || packet_type == FLVD_PACKET_END_OF_SEQUENCE;
+}
+
+// Codec header bytes before the frame of a media tag; 0 when the tag carries a configuration and no frame.
+constexpr uint32_t FLVD_CodecHeaderSize(bool video, uint32_t codec_byte, uint32_t packet_type)
+{
+    if (video) {
+        if ((codec_byte & FLVD_CODEC_ID_MASK) != FLVD_CODEC_AVC)
+            return FLVD_CODEC_HEADER_SIZE;
+        return FLVD_IsPicturelessPacket(packet_type) ? 0 : FLVD_AVC_HEADER_SIZE;
+    }
+    if (codec_byte >> FLVD_SOUND_FORMAT_SHIFT != FLVD_SOUND_AAC)
+        return FLVD_CODEC_HEADER_SIZE;
+    return packet_type == FLVD_PACKET_SEQUENCE_HEADER ? 0 : FLVD_AAC_HEADER_SIZE;
 }
 
 #endif

@@ -1,7 +1,7 @@
 // Frame delivery: the next wanted tag's payload, without its codec header bytes, in the frame buffer.
 //
-// A growing file has a variant of its own: a tag that is not yet whole in the file is taken back, by the position
-// saved in front of it, and tried again by the next request. Complete files pass such a tag over.
+// A growing file has a variant of its own: after a tag that is not yet whole in the file the reader goes back to the
+// position saved before it, and the next request tries again. A complete file skips such a tag.
 
 #include "flvdmx/front/front.h"
 
@@ -56,12 +56,11 @@ constexpr flvd_payload_sites_t g_flvd_soundSites = {
 
 // One request.
 struct flvd_delivery_t {
-    flvd_ctx_t* ctx;
-    fio_file_t* reader;
-    int64_t* saved; // growing file: position in front of the tag being delivered
-    uint32_t wanted;
+    flvd_frame_search_t search;
+    int64_t* saved; // growing file: position before the tag being delivered
     bool growing;
-    flvd_tag_info_t tag; // the last tag described
+    flvd_found_tag_t tag;  // the one being delivered
+    uint32_t passing_size; // data size of the last tag found, by which a place without tags is passed
 };
 
 const flvd_frame_sites_t& FLVD_FrameSites(const flvd_delivery_t& delivery)
@@ -69,8 +68,8 @@ const flvd_frame_sites_t& FLVD_FrameSites(const flvd_delivery_t& delivery)
     return delivery.growing ? g_flvd_growingSites : g_flvd_completeSites;
 }
 
-// What a tag led to: go on with the next, return 0, or return -1 as recorded.
-enum class FlvdTurn { Next, Delivered, Failed };
+// What a tag led to: go on with the next, return 0, return -1 as recorded, or search on: it was no tag.
+enum class FlvdTurn { Next, Delivered, Failed, NoTag };
 
 const flvd_payload_sites_t& FLVD_PayloadSites(uint32_t tag_type, uint8_t codec_byte)
 {
@@ -79,56 +78,46 @@ const flvd_payload_sites_t& FLVD_PayloadSites(uint32_t tag_type, uint8_t codec_b
     return uint32_t{codec_byte} >> FLVD_SOUND_FORMAT_SHIFT == FLVD_SOUND_AAC ? g_flvd_aacSites : g_flvd_soundSites;
 }
 
-// Codec header bytes in front of a frame, 0 for a configuration packet, which is no frame.
-inline uint32_t FLVD_CodecHeaderSize(uint32_t tag_type, const uint8_t* payload)
+// The codec header bytes of a tag in memory.
+inline uint32_t FLVD_CodecHeaderAt(const flvd_tag_info_t& tag, const uint8_t* bytes)
 {
-    const uint8_t packet_type = payload[1];
-    if (tag_type == FLVD_TAG_TYPE_VIDEO) {
-        if ((payload[0] & FLVD_CODEC_ID_MASK) != FLVD_CODEC_AVC)
-            return FLVD_CODEC_HEADER_SIZE;
-        return FLVD_IsPicturelessPacket(packet_type) ? 0 : FLVD_AVC_HEADER_SIZE;
-    }
-    if (uint32_t{payload[0]} >> FLVD_SOUND_FORMAT_SHIFT != FLVD_SOUND_AAC)
-        return FLVD_CODEC_HEADER_SIZE;
-    return packet_type == FLVD_PACKET_SEQUENCE_HEADER ? 0 : FLVD_AAC_HEADER_SIZE;
+    return FLVD_CodecHeaderSize(tag.type == FLVD_TAG_TYPE_VIDEO, bytes[FLVD_CODEC_BYTE], bytes[FLVD_PACKET_TYPE]);
 }
 
 FlvdTurn FLVD_FailRequest(const flvd_delivery_t& delivery, flvd_site_t site)
 {
-    FLVD_Record(delivery.ctx, site);
+    FLVD_Record(delivery.search.ctx, site);
     return FlvdTurn::Failed;
 }
 
 // Moves to the saved position, which is used up when that worked.
 bool FLVD_GoBack(const flvd_delivery_t& delivery)
 {
-    if (__FLV_DMX__fioSeek64(delivery.reader, *delivery.saved, FIO_SEEK_SET) != 0)
+    if (__FLV_DMX__fioSeek64(delivery.search.file, *delivery.saved, FIO_SEEK_SET) != 0)
         return false;
     *delivery.saved = 0;
     return true;
 }
 
-// A tag that is cut short: a growing file takes it back and ends the request, a complete file goes on behind it.
-FlvdTurn FLVD_GiveUpTag(const flvd_delivery_t& delivery, flvd_site_t rollback)
+// Growing file: the next request tries again from the saved position.
+FlvdTurn FLVD_RollBack(const flvd_delivery_t& delivery, flvd_site_t seek_failed)
 {
-    if (!delivery.growing)
-        return FlvdTurn::Next;
-    return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? FLVD_FrameSites(delivery).end : rollback);
+    return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? FLVD_FrameSites(delivery).end : seek_failed);
 }
 
-// A tag whose bytes are not there, although its header was.
-FlvdTurn FLVD_LoseTag(const flvd_delivery_t& delivery, flvd_site_t site, flvd_site_t rollback)
+// Leaves a tag that is cut short: a complete file goes on after it, a growing file rolls back.
+FlvdTurn FLVD_LeaveCutTag(const flvd_delivery_t& delivery, flvd_site_t seek_failed)
 {
-    FLVD_Record(delivery.ctx, site);
-    return FLVD_GiveUpTag(delivery, rollback);
+    return delivery.growing ? FLVD_RollBack(delivery, seek_failed) : FlvdTurn::Next;
 }
 
 // Passes the bytes that are left of a tag that is not delivered.
-FlvdTurn FLVD_PassBytes(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
+FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
 {
-    if (FLVD_FioSkip(left, delivery.reader) == left && FLVD_PassBackPointer(delivery.reader, delivery.tag.data_size))
+    fio_file_t* const reader = delivery.search.file;
+    if (FLVD_FioSkip(left, reader) == left && FLVD_PassBackPointer(reader, delivery.tag.info.data_size))
         return FlvdTurn::Next;
-    return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
+    return FLVD_LeaveCutTag(delivery, sites.rollback_back_pointer);
 }
 
 // Makes room for n bytes in the frame buffer, whose contents are lost. The caller's buffer cannot grow.
@@ -148,12 +137,12 @@ bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
 // Reports a frame of n bytes. The buffer may get them after that.
 void FLVD_Report(const flvd_delivery_t& delivery, uint32_t n, flvd_frame_t* frame)
 {
-    flvd_ctx_t* const ctx = delivery.ctx;
-    const bool video = delivery.tag.type == FLVD_TAG_TYPE_VIDEO;
+    flvd_ctx_t* const ctx = delivery.search.ctx;
+    const bool video = delivery.tag.info.type == FLVD_TAG_TYPE_VIDEO;
     frame->data = ctx->frame_buffer;
     frame->size = n;
     frame->stream = video ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
-    frame->timestamp_ms = delivery.tag.timestamp - ctx->first_ts;
+    frame->timestamp_ms = delivery.tag.info.timestamp - ctx->first_ts;
     (video ? ctx->last_video_ts : ctx->last_audio_ts) = frame->timestamp_ms;
     if (delivery.growing)
         *delivery.saved = 0;
@@ -163,15 +152,16 @@ void FLVD_Report(const flvd_delivery_t& delivery, uint32_t n, flvd_frame_t* fram
 // this is none: nothing is done then.
 bool FLVD_DeliverCached(const flvd_delivery_t& delivery, flvd_frame_t* frame)
 {
-    flvd_ctx_t* const ctx = delivery.ctx;
-    fio_file_t* const reader = delivery.reader;
-    const uint32_t size = delivery.tag.data_size + FLVD_TAG_OVERHEAD;
+    flvd_ctx_t* const ctx = delivery.search.ctx;
+    fio_file_t* const reader = delivery.search.file;
+    const flvd_tag_info_t& tag = delivery.tag.info;
+    const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size > reader->count || reader->state != FIO_STATE_READ)
         return false;
     const uint8_t* const bytes = reader->cache + reader->head;
-    const uint32_t header = FLVD_CodecHeaderSize(delivery.tag.type, bytes + FLVD_CODEC_BYTE);
-    const uint32_t n = delivery.tag.data_size - header;
-    if (header == 0 || delivery.tag.data_size <= header || n > ctx->frame_buffer_size)
+    const uint32_t header = FLVD_CodecHeaderAt(tag, bytes);
+    const uint32_t n = tag.data_size - header;
+    if (header == 0 || tag.data_size <= header || n > ctx->frame_buffer_size)
         return false;
     ctx->last_frame_size = n;
     FLVD_FioDropBits(reader);
@@ -181,23 +171,45 @@ bool FLVD_DeliverCached(const flvd_delivery_t& delivery, flvd_frame_t* frame)
     return true;
 }
 
+// The check of a tag whose payload came up short before it: its back-pointer may be there all the same, when a read
+// failed. Leaves the reader where the payload ended, after `got` of its n bytes.
+bool FLVD_CheckCutTag(const flvd_delivery_t& delivery, uint32_t got, uint32_t n)
+{
+    fio_file_t* const reader = delivery.search.file;
+    const flvd_found_tag_t& tag = delivery.tag;
+    const int64_t payload_end = tag.start + FLVD_TAG_HEADER_SIZE + tag.info.data_size - n + got;
+    if (__FLV_DMX__fioSeek64(reader, tag.start, FIO_SEEK_SET) != 0 || !FLVD_CheckPastData(reader, tag.info.data_size))
+        return false;
+    __FLV_DMX__fioSeek64(reader, payload_end, FIO_SEEK_SET); // when it fails, the next tag begins here
+    return true;
+}
+
 // Delivers the n bytes at which the reader stands.
 FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, uint32_t n, const flvd_payload_sites_t& sites,
                              flvd_frame_t* frame)
 {
-    flvd_ctx_t* const ctx = delivery.ctx;
+    flvd_ctx_t* const ctx = delivery.search.ctx;
+    fio_file_t* const reader = delivery.search.file;
+    const flvd_found_tag_t& tag = delivery.tag;
     if (!FLVD_MakeRoom(ctx, n)) {
         FLVD_Record(ctx, sites.no_room);
-        return FLVD_PassBytes(delivery, n, sites);
+        return FLVD_PassTag(delivery, n, sites);
     }
-    if (FLVD_FioReadBytes(delivery.reader, ctx->frame_buffer, n) < n)
-        return FLVD_LoseTag(delivery, sites.short_read, sites.rollback_payload);
-    ctx->last_frame_size = n;
+    const uint32_t got = FLVD_FioReadBytes(reader, ctx->frame_buffer, n);
+    if (got < n) {
+        if (!tag.checked && !FLVD_CheckCutTag(delivery, got, n))
+            return FlvdTurn::NoTag;
+        FLVD_Record(ctx, sites.short_read);
+        return FLVD_LeaveCutTag(delivery, sites.rollback_payload);
+    }
     const uint8_t* back_pointer = nullptr;
-    const uint32_t available = FLVD_FioPeek(&back_pointer, FLVD_BACK_POINTER_SIZE, delivery.reader);
-    if (delivery.growing && available < FLVD_BACK_POINTER_SIZE)
-        return FLVD_GiveUpTag(delivery, sites.rollback_back_pointer);
-    FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, delivery.reader);
+    const bool ended = FLVD_FioPeek(&back_pointer, FLVD_BACK_POINTER_SIZE, reader) < FLVD_BACK_POINTER_SIZE;
+    if (!tag.checked && (ended || !FLVD_IsBackPointer(back_pointer, tag.info.data_size)))
+        return FlvdTurn::NoTag;
+    ctx->last_frame_size = n;
+    if (ended && delivery.growing)
+        return FLVD_RollBack(delivery, sites.rollback_back_pointer);
+    FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, reader);
     FLVD_Report(delivery, n, frame);
     return FlvdTurn::Delivered;
 }
@@ -205,80 +217,101 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, uint32_t n, const 
 // Handles the media tag whose header the reader stands on, whatever of it is cached.
 [[gnu::noinline]] FlvdTurn FLVD_DeliverTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
 {
-    fio_file_t* const reader = delivery.reader;
-    const flvd_tag_info_t& tag = delivery.tag;
+    flvd_ctx_t* const ctx = delivery.search.ctx;
+    fio_file_t* const reader = delivery.search.file;
+    const flvd_tag_info_t& tag = delivery.tag.info;
     const uint8_t* bytes = nullptr;
     if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, reader) < FLVD_TAG_PEEK_SIZE) {
         const flvd_payload_sites_t& sites = FLVD_PayloadSites(tag.type, 0); // those of AAC are alike so far
         FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
-        return FLVD_LoseTag(delivery, sites.short_peek, sites.rollback_payload);
+        FLVD_Record(ctx, sites.short_peek);
+        return FLVD_LeaveCutTag(delivery, sites.rollback_payload);
     }
     const flvd_payload_sites_t& sites = FLVD_PayloadSites(tag.type, bytes[FLVD_CODEC_BYTE]);
-    const uint32_t header = FLVD_CodecHeaderSize(tag.type, bytes + FLVD_CODEC_BYTE);
+    const uint32_t header = FLVD_CodecHeaderAt(tag, bytes);
     if (header == 0 || tag.data_size < header)
-        return FLVD_PassBytes(delivery, FLVD_TAG_HEADER_SIZE + tag.data_size, sites);
+        return FLVD_PassTag(delivery, FLVD_TAG_HEADER_SIZE + tag.data_size, sites);
     const uint32_t headers = FLVD_TAG_HEADER_SIZE + header;
-    if (FLVD_FioSkip(headers, reader) != headers) // not all of them need be cached
-        return FLVD_LoseTag(delivery, sites.short_peek, sites.rollback_payload);
+    if (!delivery.tag.checked)
+        FLVD_FioPeek(&bytes, headers, reader); // so that the skip finds them: it would seek
+    if (FLVD_FioSkip(headers, reader) != headers) {
+        FLVD_Record(ctx, sites.short_peek);
+        return FLVD_LeaveCutTag(delivery, sites.rollback_payload);
+    }
     return FLVD_DeliverPayload(delivery, tag.data_size - header, sites, frame);
 }
 
-// Complete file: describes the next tag, or passes what is there by the size of the last one.
-FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
+// Complete file: no tag was found. Passes what is there by the size of the last one.
+FlvdTurn FLVD_PassPlace(const flvd_delivery_t& delivery)
 {
-    if (FLVD_FioAtEnd(delivery->reader))
-        return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
-    if (FLVD_GetPlayedTag(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted) == 0)
-        return FLVD_DeliverCached(*delivery, frame) ? FlvdTurn::Delivered : FLVD_DeliverTag(*delivery, frame);
-    const uint32_t skipped = FLVD_FioSkip(delivery->tag.data_size + FLVD_TAG_OVERHEAD, delivery->reader);
-    return skipped != 0 ? FlvdTurn::Next : FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
+    const bool checks_used_up = delivery.search.checks_left == 0;
+    if (checks_used_up || FLVD_FioSkip(delivery.passing_size + FLVD_TAG_OVERHEAD, delivery.search.file) == 0)
+        return FLVD_FailRequest(delivery, FLVD_FrameSites(delivery).end);
+    return FlvdTurn::Next;
 }
 
-// Saves the position in front of the next tag. At the end of what was there the seek clears the host's end flag: the
-// file may have grown since.
+FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
+{
+    flvd_frame_search_t* const search = &delivery->search;
+    if (FLVD_FioAtEnd(search->file))
+        return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
+    int32_t result = FLVD_FindFrameTag(search, &delivery->tag);
+    while (result == 0) {
+        const FlvdTurn turn =
+            FLVD_DeliverCached(*delivery, frame) ? FlvdTurn::Delivered : FLVD_DeliverTag(*delivery, frame);
+        if (turn != FlvdTurn::NoTag) {
+            delivery->passing_size = delivery->tag.info.data_size;
+            return turn;
+        }
+        result = FLVD_FindFrameTagAfterBad(search, &delivery->tag);
+    }
+    return FLVD_PassPlace(*delivery);
+}
+
+// Saves the position before the next tag. At the end of what was there the seek clears the host's end flag: the file
+// may have grown since.
 flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
 {
-    const bool at_end = FLVD_FioAtEnd(delivery.reader);
-    const int64_t position = __FLV_DMX__fioTell64(delivery.reader);
+    fio_file_t* const reader = delivery.search.file;
+    const bool at_end = FLVD_FioAtEnd(reader);
+    const int64_t position = __FLV_DMX__fioTell64(reader);
     if (position < 0)
         return FLVD_SITE_FRAME_POSITION;
     *delivery.saved = position;
-    const bool resumed = !at_end || __FLV_DMX__fioSeek64(delivery.reader, position, FIO_SEEK_SET) == 0;
+    const bool resumed = !at_end || __FLV_DMX__fioSeek64(reader, position, FIO_SEEK_SET) == 0;
     return resumed ? FLVD_SITE_NONE : FLVD_SITE_FRAME_RESUME;
 }
 
 [[gnu::noinline]] FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
+    flvd_frame_search_t& search = delivery->search;
     const flvd_site_t site = FLVD_SavePosition(*delivery);
     if (FLVD_IsFailure(site))
         return FLVD_FailRequest(*delivery, site);
-    const int32_t result = FLVD_GetCurrTagInfo(delivery->ctx, delivery->reader, &delivery->tag, delivery->wanted, 0);
+    const int32_t result = FLVD_GetCurrTagInfo(search.ctx, search.file, &delivery->tag.info, search.wanted, 0);
     if (result == 0)
         return FLVD_DeliverTag(*delivery, frame);
     if (result == FLVD_ERR_END_OF_DATA)
-        return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_END);
-    // A budget that is spent has moved the reader. Else a position query failed: going on would lead into the tag.
-    if (__FLV_DMX__fioTell64(delivery->reader) <= *delivery->saved)
-        return FLVD_FailRequest(*delivery, FLVD_GoBack(*delivery) ? FLVD_SITE_FRAME_POSITION : FLVD_SITE_ROLLBACK_SKIP);
-    const int64_t size = int64_t{delivery->tag.data_size} + FLVD_TAG_OVERHEAD;
-    if (__FLV_DMX__fioSeek64(delivery->reader, size, FIO_SEEK_CUR) != 0)
-        return FLVD_GiveUpTag(*delivery, FLVD_SITE_ROLLBACK_SKIP);
+        return FLVD_RollBack(*delivery, FLVD_SITE_ROLLBACK_END);
+    const int64_t size = int64_t{delivery->tag.info.data_size} + FLVD_TAG_OVERHEAD;
+    if (__FLV_DMX__fioSeek64(search.file, size, FIO_SEEK_CUR) != 0)
+        return FLVD_RollBack(*delivery, FLVD_SITE_ROLLBACK_SKIP);
     return FlvdTurn::Next;
 }
 
 // Chooses reader and tags by the request. Returns why it is refused.
 flvd_site_t FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
 {
-    flvd_ctx_t* const ctx = delivery->ctx;
+    flvd_ctx_t* const ctx = delivery->search.ctx;
     if (!FLVD_HasAudioReader(ctx))
         return FLVD_SITE_NONE;
     switch (stream) {
     case FLVD_STREAM_VIDEO:
-        delivery->wanted = FLVD_TAG_VIDEO;
+        delivery->search.wanted = FLVD_TAG_VIDEO;
         return FLVD_HasVideo(ctx) ? FLVD_SITE_NONE : FLVD_FrameSites(*delivery).no_video;
     case FLVD_STREAM_AUDIO:
-        delivery->wanted = FLVD_TAG_AUDIO;
-        delivery->reader = ctx->audio_reader;
+        delivery->search.wanted = FLVD_TAG_AUDIO;
+        delivery->search.file = ctx->audio_reader;
         delivery->saved = &ctx->saved_audio_pos;
         return FLVD_HasAudio(ctx) ? FLVD_SITE_NONE : FLVD_FrameSites(*delivery).no_audio;
     default:
@@ -310,7 +343,11 @@ FlvdTurn FLVD_Deliver(flvd_delivery_t* delivery, flvd_frame_t* frame)
 
 int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd_frame_t* frame)
 {
-    flvd_delivery_t delivery = {ctx, ctx->main_reader, &ctx->saved_main_pos, FLVD_TAG_MEDIA, FLVD_IsGrowing(ctx), {}};
+    flvd_delivery_t delivery = {{ctx, ctx->main_reader, FLVD_TAG_MEDIA, FLVD_FAILED_CHECKS_MAX},
+                                &ctx->saved_main_pos,
+                                FLVD_IsGrowing(ctx),
+                                {{}, 0, 0, true},
+                                0};
     if (ctx->opened_for_info != 0)
         return FLVD_Fail(ctx, FLVD_FrameSites(delivery).info_only);
     const flvd_site_t refused = FLVD_ChooseStream(&delivery, request->stream);

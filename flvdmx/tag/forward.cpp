@@ -8,10 +8,6 @@
 
 namespace {
 
-// A plausible header whose back-pointer disagrees costs this much of the budget beside the distance: without it a
-// file made of such headers would cost two seeks and two reads for each of its bytes.
-constexpr int32_t FLVD_BAD_TAG_COST = 64;
-
 // Bytes read at first by a resynchronisation that finds nothing cached, whatever the cache holds.
 constexpr uint32_t FLVD_FIRST_LOOK = 4096;
 
@@ -20,8 +16,9 @@ constexpr uint32_t FLVD_FIRST_LOOK = 4096;
 constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x1000;
 
 // Results inside a search, beside those of the navigation functions.
-constexpr int32_t FLVD_SEARCH_ON = 1;    // go on behind this tag
+constexpr int32_t FLVD_SEARCH_ON = 1;    // go on after this tag
 constexpr int32_t FLVD_BUDGET_SPENT = 2; // no tag within the budget
+constexpr int32_t FLVD_UNCHECKED = 3;    // as 0, but the back-pointer was not compared
 
 // One search for a tag, from one position query to its result.
 struct flvd_search_t {
@@ -29,16 +26,20 @@ struct flvd_search_t {
     fio_file_t* file;
     flvd_tag_rules_t rules;
     uint32_t wanted;
-    bool verify;      // careful: back-pointers count, and the position of every tag is taken
-    int32_t budget;   // bytes that resynchronisation may still cross
-    int64_t position; // the last position taken
-    bool data_ended;  // the last resynchronisation ran out of data, not out of budget
-    uint32_t passed;  // trusting mode: unwanted tags
+    bool verify;                      // careful: back-pointers count, and the position of every tag is taken
+    int32_t budget;                   // bytes that resynchronisation may still cross
+    int64_t position;                 // the last position taken
+    bool data_ended;                  // the last resynchronisation ran out of data, not out of budget
+    uint32_t passed;                  // trusting mode: unwanted tags
+    uint32_t* checks_left;            // back-pointer checks that may still fail
+    const flvd_frame_search_t* frame; // for a frame request: some tags are delivered before they are checked
 };
 
-flvd_search_t FLVD_Search(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted, bool verify, int64_t position)
+flvd_search_t FLVD_MakeSearch(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted, bool verify, int64_t position,
+                              uint32_t* checks_left)
 {
-    return {ctx, file, FLVD_TagRules(ctx), wanted, verify, FLVD_RESYNC_WINDOW, position, false, 0};
+    return {ctx,   file, FLVD_TagRules(ctx), wanted, verify, FLVD_RESYNC_WINDOW, position,
+            false, 0,    checks_left,        nullptr};
 }
 
 // Index of the first candidate among the starts of a window, or `starts` when there is none.
@@ -144,10 +145,10 @@ flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_i
         if (FLVD_FioPeek(&bytes, size, file) == first)
             return {exempt, true};
     }
-    return {FLVD_CheckBehind(file, tag.data_size) || exempt, false};
+    return {FLVD_CheckPastData(file, tag.data_size) || exempt, false};
 }
 
-// Behind a tag whose back-pointer disagrees: the search goes on one byte after the tag's start. False when the reader
+// After a tag whose back-pointer disagrees: the search goes on one byte after the tag's start. False when the reader
 // cannot be put there: no tag may be described where the reader does not stand.
 bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
 {
@@ -157,7 +158,7 @@ bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
     else if (__FLV_DMX__fioSeek64(search->file, next, FIO_SEEK_SET) != 0)
         return false;
     FLVD_ChargeScan(search, FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW), 0);
-    search->budget -= FLVD_BAD_TAG_COST;
+    --*search->checks_left;
     search->position = next;
     return true;
 }
@@ -181,10 +182,14 @@ int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header
 {
     if (!FLVD_TakePosition(search))
         return FLVD_ERR_NOT_FOUND;
+    if (search->frame != nullptr && FLVD_IsWantedTag(header, search->wanted) &&
+        FLVD_IsReadBeforeCheck(*search->frame, header))
+        return FLVD_UNCHECKED;
     const flvd_check_t check = FLVD_CheckBackPointer(search, header.info);
     if (!check.passed || !FLVD_IsWantedTag(header, search->wanted))
         return FLVD_StepOver(search, check, header.info) ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
-    return check.in_place || FLVD_GoBackToTag(search->file, search->position) ? 0 : FLVD_ERR_NOT_FOUND;
+    const bool on_tag = check.in_place || __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
+    return on_tag ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
 // Trusting mode: the header alone decides; an unwanted tag is passed by its size.
@@ -207,7 +212,7 @@ int32_t FLVD_SearchTag(flvd_search_t* search, flvd_tag_header_t* header)
     for (;;) {
         if (FLVD_FioAtEnd(search->file))
             return FLVD_ERR_END_OF_DATA;
-        if (search->budget <= 0)
+        if (search->budget <= 0 || *search->checks_left == 0)
             return FLVD_BUDGET_SPENT;
         if (!FLVD_PeekTagHeader(search->file, header))
             return FLVD_ERR_END_OF_DATA;
@@ -224,16 +229,24 @@ int32_t FLVD_SearchTag(flvd_search_t* search, flvd_tag_header_t* header)
     }
 }
 
-// Results of FLVD_GetCurrTagInfo.
-int32_t FLVD_RunSearch(flvd_search_t* search, flvd_tag_info_t* info)
+// The same with the results of FLVD_GetCurrTagInfo for a spent budget.
+int32_t FLVD_SearchHere(flvd_search_t* search, flvd_tag_header_t* header)
+{
+    const int32_t result = FLVD_SearchTag(search, header);
+    if (result != FLVD_BUDGET_SPENT)
+        return result;
+    return search->data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+}
+
+// The same for a frame request.
+int32_t FLVD_SearchFrameTag(flvd_search_t* search, flvd_found_tag_t* tag)
 {
     flvd_tag_header_t header;
-    const int32_t result = FLVD_SearchTag(search, &header);
-    if (result == FLVD_BUDGET_SPENT)
-        return search->data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
-    if (result == 0)
-        *info = header.info;
-    return result;
+    const int32_t result = FLVD_SearchHere(search, &header);
+    if (result != 0 && result != FLVD_UNCHECKED)
+        return result;
+    *tag = {header.info, search->position, search->budget, result == 0};
+    return 0;
 }
 
 uint32_t FLVD_VideoKind(const flvd_tag_header_t& header, uint32_t wanted)
@@ -285,25 +298,34 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 
 } // namespace
 
-// Neither is inlined: a sound tag in the cache is played without them, and with few registers to save.
-[[gnu::noinline]] int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
-                                          bool verify, int64_t position)
+// Neither is inlined: most frames are found without them, and with few registers to save.
+[[gnu::noinline]] int32_t FLVD_SearchForFrame(flvd_frame_search_t* frame, int64_t position, flvd_found_tag_t* tag)
 {
-    flvd_search_t search = FLVD_Search(ctx, file, wanted, verify, position);
-    return FLVD_RunSearch(&search, info);
+    flvd_search_t search = FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, true, position, &frame->checks_left);
+    search.frame = frame;
+    return FLVD_SearchFrameTag(&search, tag);
 }
 
-[[gnu::noinline]] int32_t FLVD_SearchPastBadTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info,
-                                                uint32_t wanted, int64_t position)
+[[gnu::noinline]] int32_t FLVD_FindFrameTagAfterBad(flvd_frame_search_t* frame, flvd_found_tag_t* tag)
 {
-    flvd_search_t search = FLVD_Search(ctx, file, wanted, true, position);
-    return FLVD_PassBadTag(&search, false) ? FLVD_RunSearch(&search, info) : FLVD_ERR_NOT_FOUND;
+    flvd_search_t search =
+        FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, true, tag->start, &frame->checks_left);
+    search.budget = tag->budget;
+    return FLVD_PassBadTag(&search, false) ? FLVD_SearchFrameTag(&search, tag) : FLVD_ERR_NOT_FOUND;
 }
 
 int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
 {
     const int64_t position = FLVD_StartOnTag(ctx, file);
-    return position >= 0 ? FLVD_SearchFrom(ctx, file, info, wanted, verify != 0, position) : FLVD_ERR_NOT_FOUND;
+    if (position < 0)
+        return FLVD_ERR_NOT_FOUND;
+    uint32_t checks_left = FLVD_FAILED_CHECKS_MAX;
+    flvd_search_t search = FLVD_MakeSearch(ctx, file, wanted, verify != 0, position, &checks_left);
+    flvd_tag_header_t header;
+    const int32_t result = FLVD_SearchHere(&search, &header);
+    if (result == 0)
+        *info = header.info;
+    return result;
 }
 
 int32_t FLVD_FindNextTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
@@ -319,7 +341,8 @@ int32_t FLVD_MoveToNextTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* i
     const int64_t position = __FLV_DMX__fioTell64(file);
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
-    flvd_search_t search = FLVD_Search(ctx, file, wanted, true, position);
+    uint32_t checks_left = FLVD_FAILED_CHECKS_MAX;
+    flvd_search_t search = FLVD_MakeSearch(ctx, file, wanted, true, position, &checks_left);
     flvd_tag_header_t header;
     int32_t result = FLVD_LeaveCurrentTag(&search);
     if (result == 0)

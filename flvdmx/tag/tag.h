@@ -18,6 +18,10 @@ constexpr uint32_t FLVD_ANY_CODEC = 0xFFFF; // filter value: no tag of that kind
 // Resynchronisation covers so many bytes before it gives up.
 constexpr int32_t FLVD_RESYNC_WINDOW = 0x100000;
 
+// So many back-pointer checks may fail in one search, and in all searches of one frame request together. A MiB of
+// random bytes has some 12,300 plausible headers; a file made of them would cost four host calls for each of its bytes.
+constexpr uint32_t FLVD_FAILED_CHECKS_MAX = 16384;
+
 constexpr uint32_t FLVD_TAG_MEDIA = FLVD_TAG_VIDEO | FLVD_TAG_AUDIO;
 constexpr uint32_t FLVD_TAG_ANY = FLVD_TAG_MEDIA | FLVD_TAG_SCRIPT;
 
@@ -142,13 +146,10 @@ inline bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted)
 // False when fewer than 4 bytes are there.
 bool FLVD_PassBackPointer(fio_file_t* file, uint32_t data_size);
 
-// Moves behind a tag's data and looks at its back-pointer. The tag is mostly gone back to, which empties the cache, so
-// no more is read here than needed; a reader with a narrow quantum keeps it: it steps from tag to tag, and on from
-// here.
-bool FLVD_CheckBehind(fio_file_t* file, uint32_t data_size);
-
-// Back onto a tag that was looked behind. Tried twice: from behind its data the caller would lose the next tag, too.
-bool FLVD_GoBackToTag(fio_file_t* file, int64_t position);
+// Moves from a tag's start past its data and compares the back-pointer there. The tag is mostly gone back to, which
+// empties the cache, so no more is read here than needed; a reader with a narrow quantum keeps it: it steps from tag to
+// tag, and on from here.
+bool FLVD_CheckPastData(fio_file_t* file, uint32_t data_size);
 
 // Takes the position a search begins at, and passes PreviousTagSize0 when the reader stands on it. Below 0: the query
 // failed.
@@ -160,17 +161,42 @@ inline int64_t FLVD_StartOnTag(const flvd_ctx_t* ctx, fio_file_t* file)
     return position;
 }
 
-// FLVD_GetCurrTagInfo in careful mode, with a short way for a tag that ends the search at once, as most do in playing.
-int32_t FLVD_GetPlayedTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted);
+// What a frame request is looking for.
+struct flvd_frame_search_t {
+    flvd_ctx_t* ctx;
+    fio_file_t* file;
+    uint32_t wanted;
+    uint32_t checks_left; // back-pointer checks that may still fail
+};
 
-// The search of FLVD_GetCurrTagInfo from a position that was taken; its results.
-int32_t FLVD_SearchFrom(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, bool verify,
-                        int64_t position);
+// A tag found for it. The reader stands on its header.
+struct flvd_found_tag_t {
+    flvd_tag_info_t info;
+    int64_t start;  // position of its header
+    int32_t budget; // bytes that resynchronisation could still cross from here on
+    bool checked;   // false: larger than the cache, its back-pointer is still to be compared
+};
 
-// The same in careful mode behind a tag whose back-pointer disagreed: `position` is that tag's start, the reader stands
-// behind its data.
-int32_t FLVD_SearchPastBadTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
-                              int64_t position);
+// True when a wanted tag is delivered before its back-pointer is checked: going there and coming back would cost two
+// seeks and an empty cache per frame. A frame that does not fit the buffer is checked first, so that no false header
+// makes the buffer grow, and so is every tag once a check has failed: a request reads one payload in vain at most.
+inline bool FLVD_IsReadBeforeCheck(const flvd_frame_search_t& search, const flvd_tag_header_t& header)
+{
+    const uint32_t codec_header = FLVD_CodecHeaderSize(header.IsVideo(), header.first, header.second);
+    return header.info.data_size + FLVD_TAG_OVERHEAD > search.file->capacity && codec_header != 0 &&
+           header.info.data_size - codec_header <= search.ctx->frame_buffer_size &&
+           search.checks_left == FLVD_FAILED_CHECKS_MAX;
+}
+
+// FLVD_GetCurrTagInfo in careful mode for a frame request, with a short way for a tag that ends the search at once, as
+// most do. Results as there.
+int32_t FLVD_FindFrameTag(flvd_frame_search_t* search, flvd_found_tag_t* tag);
+
+// The same after a tag that was found unchecked and whose back-pointer disagrees.
+int32_t FLVD_FindFrameTagAfterBad(flvd_frame_search_t* search, flvd_found_tag_t* tag);
+
+// The search of FLVD_FindFrameTag from a position that was taken.
+int32_t FLVD_SearchForFrame(flvd_frame_search_t* search, int64_t position, flvd_found_tag_t* tag);
 
 // Puts a reader in front of the first tag, on PreviousTagSize0. Returns the host's seek result.
 int32_t FLVD_SeekToFirstTag(const flvd_ctx_t* ctx, fio_file_t* file);
