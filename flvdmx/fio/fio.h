@@ -80,11 +80,11 @@ inline bool FLVD_FioAtEnd(fio_file_t* file)
 inline int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
 {
     const bool reading = file->state == FIO_STATE_READ;
-    if (host < 0)
-        return reading ? std::max(host, INT64_MIN + file->count) - file->count : host;
-    if (host > FIO_POSITION_MAX)
+    if (static_cast<uint64_t>(host) <= uint64_t{FIO_POSITION_MAX})
+        return reading ? host - file->count : host + file->count;
+    if (host >= 0)
         return -1;
-    return reading ? host - file->count : host + file->count;
+    return reading ? std::max(host, INT64_MIN + file->count) - file->count : host;
 }
 
 // __FLV_DMX__fioTell64 for the playing path, which asks twice per frame.

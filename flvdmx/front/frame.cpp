@@ -59,7 +59,6 @@ struct flvd_delivery_t {
     flvd_frame_search_t search;
     int64_t* saved; // growing file: position before the tag being delivered
     bool growing;
-    flvd_found_tag_t tag;  // the one being delivered
     uint32_t passing_size; // data size of the last tag found, by which a place without tags is passed
 };
 
@@ -71,17 +70,11 @@ const flvd_frame_sites_t& FLVD_FrameSites(const flvd_delivery_t& delivery)
 // What a tag led to: go on with the next, return 0, return -1 as recorded, or search on: it was no tag.
 enum class FlvdTurn { Next, Delivered, Failed, NoTag };
 
-const flvd_payload_sites_t& FLVD_PayloadSites(uint32_t tag_type, uint8_t codec_byte)
+const flvd_payload_sites_t& FLVD_PayloadSites(const flvd_found_tag_t& tag)
 {
-    if (tag_type == FLVD_TAG_TYPE_VIDEO)
+    if (tag.type == FLVD_TAG_TYPE_VIDEO)
         return g_flvd_videoSites;
-    return uint32_t{codec_byte} >> FLVD_SOUND_FORMAT_SHIFT == FLVD_SOUND_AAC ? g_flvd_aacSites : g_flvd_soundSites;
-}
-
-// The codec header bytes of a tag in memory.
-inline uint32_t FLVD_CodecHeaderAt(const flvd_tag_info_t& tag, const uint8_t* bytes)
-{
-    return FLVD_CodecHeaderSize(tag.type == FLVD_TAG_TYPE_VIDEO, bytes[FLVD_CODEC_BYTE], bytes[FLVD_PACKET_TYPE]);
+    return tag.codec_header == FLVD_AAC_HEADER_SIZE ? g_flvd_aacSites : g_flvd_soundSites;
 }
 
 FlvdTurn FLVD_FailRequest(const flvd_delivery_t& delivery, flvd_site_t site)
@@ -112,12 +105,12 @@ FlvdTurn FLVD_LeaveCutTag(const flvd_delivery_t& delivery, flvd_site_t seek_fail
 }
 
 // Passes the bytes that are left of a tag that is not delivered.
-FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, uint32_t left, const flvd_payload_sites_t& sites)
+FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t left)
 {
     fio_file_t* const reader = delivery.search.file;
-    if (FLVD_FioSkip(left, reader) == left && FLVD_PassBackPointer(reader, delivery.tag.info.data_size))
+    if (FLVD_FioSkip(left, reader) == left && FLVD_PassBackPointer(reader, tag.data_size))
         return FlvdTurn::Next;
-    return FLVD_LeaveCutTag(delivery, sites.rollback_back_pointer);
+    return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_back_pointer);
 }
 
 // Makes room for n bytes in the frame buffer, whose contents are lost. The caller's buffer cannot grow.
@@ -135,14 +128,14 @@ bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
 }
 
 // Reports a frame of n bytes. The buffer may get them after that.
-void FLVD_Report(const flvd_delivery_t& delivery, uint32_t n, flvd_frame_t* frame)
+void FLVD_Report(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t n, flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.search.ctx;
-    const bool video = delivery.tag.info.type == FLVD_TAG_TYPE_VIDEO;
+    const bool video = tag.type == FLVD_TAG_TYPE_VIDEO;
     frame->data = ctx->frame_buffer;
     frame->size = n;
     frame->stream = video ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
-    frame->timestamp_ms = delivery.tag.info.timestamp - ctx->first_ts;
+    frame->timestamp_ms = tag.timestamp - ctx->first_ts;
     (video ? ctx->last_video_ts : ctx->last_audio_ts) = frame->timestamp_ms;
     if (delivery.growing)
         *delivery.saved = 0;
@@ -150,95 +143,87 @@ void FLVD_Report(const flvd_delivery_t& delivery, uint32_t n, flvd_frame_t* fram
 
 // Delivers a frame that lies in the cache with its headers and back-pointer and fits the buffer, as most do. False when
 // this is none: nothing is done then.
-bool FLVD_DeliverCached(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+bool FLVD_DeliverCached(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.search.ctx;
     fio_file_t* const reader = delivery.search.file;
-    const flvd_tag_info_t& tag = delivery.tag.info;
     const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size > reader->count || reader->state != FIO_STATE_READ)
         return false;
-    const uint8_t* const bytes = reader->cache + reader->head;
-    const uint32_t header = FLVD_CodecHeaderAt(tag, bytes);
-    const uint32_t n = tag.data_size - header;
-    if (header == 0 || tag.data_size <= header || n > ctx->frame_buffer_size)
+    const uint32_t n = tag.data_size - tag.codec_header;
+    if (tag.codec_header == 0 || tag.data_size <= tag.codec_header || n > ctx->frame_buffer_size)
         return false;
+    const uint8_t* const payload = reader->cache + reader->head + FLVD_TAG_HEADER_SIZE + tag.codec_header;
     ctx->last_frame_size = n;
     FLVD_FioDropBits(reader);
     FLVD_FioConsume(reader, size); // first: nothing need be kept for after the copy; the bytes stay in the cache
-    FLVD_Report(delivery, n, frame);
-    g_flvd_fioFuncs.mem_copy(ctx->frame_buffer, bytes + FLVD_CODEC_BYTE + header, n);
+    FLVD_Report(delivery, tag, n, frame);
+    g_flvd_fioFuncs.mem_copy(ctx->frame_buffer, payload, n);
     return true;
 }
 
 // The check of a tag whose payload came up short before it: its back-pointer may be there all the same, when a read
-// failed. Leaves the reader where the payload ended, after `got` of its n bytes.
-bool FLVD_CheckCutTag(const flvd_delivery_t& delivery, uint32_t got, uint32_t n)
+// failed. Leaves the reader where the payload ended, after `got` bytes.
+bool FLVD_CheckCutTag(fio_file_t* reader, const flvd_found_tag_t& tag, uint32_t got)
 {
-    fio_file_t* const reader = delivery.search.file;
-    const flvd_found_tag_t& tag = delivery.tag;
-    const int64_t payload_end = tag.start + FLVD_TAG_HEADER_SIZE + tag.info.data_size - n + got;
-    if (__FLV_DMX__fioSeek64(reader, tag.start, FIO_SEEK_SET) != 0 || !FLVD_CheckPastData(reader, tag.info.data_size))
+    const int64_t payload_end = tag.start + FLVD_TAG_HEADER_SIZE + tag.codec_header + got;
+    if (__FLV_DMX__fioSeek64(reader, tag.start, FIO_SEEK_SET) != 0 || !FLVD_CheckPastData(reader, tag.data_size))
         return false;
     __FLV_DMX__fioSeek64(reader, payload_end, FIO_SEEK_SET); // when it fails, the next tag begins here
     return true;
 }
 
 // Delivers the n bytes at which the reader stands.
-FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, uint32_t n, const flvd_payload_sites_t& sites,
+FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t n,
                              flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.search.ctx;
     fio_file_t* const reader = delivery.search.file;
-    const flvd_found_tag_t& tag = delivery.tag;
     if (!FLVD_MakeRoom(ctx, n)) {
-        FLVD_Record(ctx, sites.no_room);
-        return FLVD_PassTag(delivery, n, sites);
+        FLVD_Record(ctx, FLVD_PayloadSites(tag).no_room);
+        return FLVD_PassTag(delivery, tag, n);
     }
     const uint32_t got = FLVD_FioReadBytes(reader, ctx->frame_buffer, n);
     if (got < n) {
-        if (!tag.checked && !FLVD_CheckCutTag(delivery, got, n))
+        if (!tag.checked && !FLVD_CheckCutTag(reader, tag, got))
             return FlvdTurn::NoTag;
-        FLVD_Record(ctx, sites.short_read);
-        return FLVD_LeaveCutTag(delivery, sites.rollback_payload);
+        FLVD_Record(ctx, FLVD_PayloadSites(tag).short_read);
+        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_payload);
     }
     const uint8_t* back_pointer = nullptr;
     const bool ended = FLVD_FioPeek(&back_pointer, FLVD_BACK_POINTER_SIZE, reader) < FLVD_BACK_POINTER_SIZE;
-    if (!tag.checked && (ended || !FLVD_IsBackPointer(back_pointer, tag.info.data_size)))
+    if (!tag.checked && (ended || !FLVD_IsBackPointer(back_pointer, tag.data_size)))
         return FlvdTurn::NoTag;
     ctx->last_frame_size = n;
     if (ended && delivery.growing)
-        return FLVD_RollBack(delivery, sites.rollback_back_pointer);
+        return FLVD_RollBack(delivery, FLVD_PayloadSites(tag).rollback_back_pointer);
     FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, reader);
-    FLVD_Report(delivery, n, frame);
+    FLVD_Report(delivery, tag, n, frame);
     return FlvdTurn::Delivered;
 }
 
 // Handles the media tag whose header the reader stands on, whatever of it is cached.
-[[gnu::noinline]] FlvdTurn FLVD_DeliverTag(const flvd_delivery_t& delivery, flvd_frame_t* frame)
+[[gnu::noinline]] FlvdTurn FLVD_DeliverTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag,
+                                           flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.search.ctx;
     fio_file_t* const reader = delivery.search.file;
-    const flvd_tag_info_t& tag = delivery.tag.info;
+    const uint32_t headers = FLVD_TAG_HEADER_SIZE + tag.codec_header;
     const uint8_t* bytes = nullptr;
-    if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, reader) < FLVD_TAG_PEEK_SIZE) {
-        const flvd_payload_sites_t& sites = FLVD_PayloadSites(tag.type, 0); // those of AAC are alike so far
-        FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
-        FLVD_Record(ctx, sites.short_peek);
-        return FLVD_LeaveCutTag(delivery, sites.rollback_payload);
-    }
-    const flvd_payload_sites_t& sites = FLVD_PayloadSites(tag.type, bytes[FLVD_CODEC_BYTE]);
-    const uint32_t header = FLVD_CodecHeaderAt(tag, bytes);
-    if (header == 0 || tag.data_size < header)
-        return FLVD_PassTag(delivery, FLVD_TAG_HEADER_SIZE + tag.data_size, sites);
-    const uint32_t headers = FLVD_TAG_HEADER_SIZE + header;
-    if (!delivery.tag.checked)
+    if (!tag.checked) {
         FLVD_FioPeek(&bytes, headers, reader); // so that the skip finds them: it would seek
-    if (FLVD_FioSkip(headers, reader) != headers) {
-        FLVD_Record(ctx, sites.short_peek);
-        return FLVD_LeaveCutTag(delivery, sites.rollback_payload);
+    } else if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, reader) < FLVD_TAG_PEEK_SIZE) {
+        FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
+        FLVD_Record(ctx, FLVD_PayloadSites(tag).short_peek);
+        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_payload);
     }
-    return FLVD_DeliverPayload(delivery, tag.data_size - header, sites, frame);
+    if (tag.codec_header == 0 || tag.data_size < tag.codec_header)
+        return FLVD_PassTag(delivery, tag, FLVD_TAG_HEADER_SIZE + tag.data_size);
+    if (FLVD_FioSkip(headers, reader) != headers) {
+        FLVD_Record(ctx, FLVD_PayloadSites(tag).short_peek);
+        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_payload);
+    }
+    return FLVD_DeliverPayload(delivery, tag, tag.data_size - tag.codec_header, frame);
 }
 
 // Complete file: no tag was found. Passes what is there by the size of the last one.
@@ -255,15 +240,17 @@ FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
     flvd_frame_search_t* const search = &delivery->search;
     if (FLVD_FioAtEnd(search->file))
         return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
-    int32_t result = FLVD_FindFrameTag(search, &delivery->tag);
+    flvd_found_tag_t tag;
+    int32_t result = FLVD_FindFrameTag(search, &tag);
     while (result == 0) {
-        const FlvdTurn turn =
-            FLVD_DeliverCached(*delivery, frame) ? FlvdTurn::Delivered : FLVD_DeliverTag(*delivery, frame);
+        if (FLVD_DeliverCached(*delivery, tag, frame))
+            return FlvdTurn::Delivered;
+        const FlvdTurn turn = FLVD_DeliverTag(*delivery, tag, frame);
         if (turn != FlvdTurn::NoTag) {
-            delivery->passing_size = delivery->tag.info.data_size;
+            delivery->passing_size = tag.data_size;
             return turn;
         }
-        result = FLVD_FindFrameTagAfterBad(search, &delivery->tag);
+        result = FLVD_FindFrameTagAfterBad(search, &tag);
     }
     return FLVD_PassPlace(*delivery);
 }
@@ -288,12 +275,17 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
     const flvd_site_t site = FLVD_SavePosition(*delivery);
     if (FLVD_IsFailure(site))
         return FLVD_FailRequest(*delivery, site);
-    const int32_t result = FLVD_GetCurrTagInfo(search.ctx, search.file, &delivery->tag.info, search.wanted, 0);
-    if (result == 0)
-        return FLVD_DeliverTag(*delivery, frame);
+    flvd_tag_info_t info;
+    const int32_t result = FLVD_GetCurrTagInfo(search.ctx, search.file, &info, search.wanted, 0);
+    if (result == 0) {
+        flvd_tag_header_t header;
+        FLVD_PeekTagHeader(search.file, &header); // it has just been looked at
+        delivery->passing_size = info.data_size;
+        return FLVD_DeliverTag(*delivery, FLVD_CheckedTag(header), frame);
+    }
     if (result == FLVD_ERR_END_OF_DATA)
         return FLVD_RollBack(*delivery, FLVD_SITE_ROLLBACK_END);
-    const int64_t size = int64_t{delivery->tag.info.data_size} + FLVD_TAG_OVERHEAD;
+    const int64_t size = int64_t{delivery->passing_size} + FLVD_TAG_OVERHEAD;
     if (__FLV_DMX__fioSeek64(search.file, size, FIO_SEEK_CUR) != 0)
         return FLVD_RollBack(*delivery, FLVD_SITE_ROLLBACK_SKIP);
     return FlvdTurn::Next;
@@ -343,11 +335,8 @@ FlvdTurn FLVD_Deliver(flvd_delivery_t* delivery, flvd_frame_t* frame)
 
 int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd_frame_t* frame)
 {
-    flvd_delivery_t delivery = {{ctx, ctx->main_reader, FLVD_TAG_MEDIA, FLVD_FAILED_CHECKS_MAX},
-                                &ctx->saved_main_pos,
-                                FLVD_IsGrowing(ctx),
-                                {{}, 0, 0, true},
-                                0};
+    flvd_delivery_t delivery = {
+        {ctx, ctx->main_reader, FLVD_TAG_MEDIA, FLVD_FAILED_CHECKS_MAX}, &ctx->saved_main_pos, FLVD_IsGrowing(ctx), 0};
     if (ctx->opened_for_info != 0)
         return FLVD_Fail(ctx, FLVD_FrameSites(delivery).info_only);
     const flvd_site_t refused = FLVD_ChooseStream(&delivery, request->stream);

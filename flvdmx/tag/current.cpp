@@ -44,12 +44,13 @@ int32_t FLVD_FindFrameTag(flvd_frame_search_t* search, flvd_found_tag_t* tag)
     flvd_tag_header_t header;
     if (!FLVD_IsNextWanted(*search, &header))
         return FLVD_SearchForFrame(search, position, tag);
-    const bool valid = FLVD_IsCachedAndValid(search->file, header.info.data_size);
-    if (!valid && !FLVD_IsReadBeforeCheck(*search, header))
+    *tag = FLVD_CheckedTag(header);
+    tag->checked = FLVD_IsCachedAndValid(search->file, tag->data_size);
+    if (!tag->checked && !FLVD_IsReadBeforeCheck(*search, *tag))
         return FLVD_SearchForFrame(search, position, tag);
-    const int64_t start = FLVD_FioTell(search->file);
-    if (start < position)
+    tag->start = FLVD_FioTell(search->file);
+    tag->budget = FLVD_RESYNC_WINDOW;
+    if (tag->start < position)
         return FLVD_ERR_NOT_FOUND;
-    *tag = {header.info, start, FLVD_RESYNC_WINDOW, valid};
     return 0;
 }

@@ -183,7 +183,7 @@ int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header
     if (!FLVD_TakePosition(search))
         return FLVD_ERR_NOT_FOUND;
     if (search->frame != nullptr && FLVD_IsWantedTag(header, search->wanted) &&
-        FLVD_IsReadBeforeCheck(*search->frame, header))
+        FLVD_IsReadBeforeCheck(*search->frame, FLVD_CheckedTag(header)))
         return FLVD_UNCHECKED;
     const flvd_check_t check = FLVD_CheckBackPointer(search, header.info);
     if (!check.passed || !FLVD_IsWantedTag(header, search->wanted))
@@ -245,7 +245,10 @@ int32_t FLVD_SearchFrameTag(flvd_search_t* search, flvd_found_tag_t* tag)
     const int32_t result = FLVD_SearchHere(search, &header);
     if (result != 0 && result != FLVD_UNCHECKED)
         return result;
-    *tag = {header.info, search->position, search->budget, result == 0};
+    *tag = FLVD_CheckedTag(header);
+    tag->checked = result == 0;
+    tag->start = search->position;
+    tag->budget = search->budget;
     return 0;
 }
 

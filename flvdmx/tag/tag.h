@@ -44,6 +44,7 @@ struct flvd_tag_header_t {
     }
     bool IsAvc() const { return CodecId() == FLVD_CODEC_AVC; }
     bool IsAac() const { return SoundFormat() == FLVD_SOUND_AAC; }
+    uint32_t CodecHeaderSize() const { return FLVD_CodecHeaderSize(IsVideo(), first, second); }
 };
 
 // What this file's headers must agree with, read from the instance once a call.
@@ -171,20 +172,27 @@ struct flvd_frame_search_t {
 
 // A tag found for it. The reader stands on its header.
 struct flvd_found_tag_t {
-    flvd_tag_info_t info;
-    int64_t start;  // position of its header
-    int32_t budget; // bytes that resynchronisation could still cross from here on
-    bool checked;   // false: larger than the cache, its back-pointer is still to be compared
+    uint32_t type;
+    uint32_t data_size;
+    uint32_t timestamp;
+    uint32_t codec_header; // bytes before the frame; 0: a configuration, no frame
+    bool checked;          // false: its back-pointer is still to be compared, and what goes on from there is this:
+    int64_t start;         // position of its header
+    int32_t budget;        // bytes that resynchronisation may still cross
 };
+
+inline flvd_found_tag_t FLVD_CheckedTag(const flvd_tag_header_t& header)
+{
+    return {header.info.type, header.info.data_size, header.info.timestamp, header.CodecHeaderSize(), true, 0, 0};
+}
 
 // True when a wanted tag is delivered before its back-pointer is checked: going there and coming back would cost two
 // seeks and an empty cache per frame. A frame that does not fit the buffer is checked first, so that no false header
 // makes the buffer grow, and so is every tag once a check has failed: a request reads one payload in vain at most.
-inline bool FLVD_IsReadBeforeCheck(const flvd_frame_search_t& search, const flvd_tag_header_t& header)
+inline bool FLVD_IsReadBeforeCheck(const flvd_frame_search_t& search, const flvd_found_tag_t& tag)
 {
-    const uint32_t codec_header = FLVD_CodecHeaderSize(header.IsVideo(), header.first, header.second);
-    return header.info.data_size + FLVD_TAG_OVERHEAD > search.file->capacity && codec_header != 0 &&
-           header.info.data_size - codec_header <= search.ctx->frame_buffer_size &&
+    return tag.data_size + FLVD_TAG_OVERHEAD > search.file->capacity && tag.codec_header != 0 &&
+           tag.data_size - tag.codec_header <= search.ctx->frame_buffer_size &&
            search.checks_left == FLVD_FAILED_CHECKS_MAX;
 }
 
