@@ -10,7 +10,6 @@ import sys
 from differences import differences
 
 ROOT = pathlib.Path(sys.argv[1])
-SITES = ("sites.h", "front/frame.cpp", "seek/frame_seek.cpp", "seek/time_seek.cpp")
 
 
 def read(name):
@@ -24,7 +23,8 @@ def find(pattern, text):
 
 _, guide_codes, guide_lines = re.split("### (?:Codes|Lines)", read("docs/host-guide.md"))
 codes = find(r"^    (FLVD_ERR_(?!NOT_FOUND|AT_FIRST_TAG|END_OF_DATA)\w+) = (-?\d+),? ", read("flvdmx/flvdmx.h"))
-sites = find(r"\{(FLVD_ERR_\w+), ([1-9]\d*)\}", "".join(read(f"flvdmx/{name}") for name in SITES))
+rows = re.findall(r"^FLVD_SITE\(\w+, \w+, (\w+), (\d+), (\d+)\)$", read("flvdmx/common/sites.def"), re.M)
+sites = [(code, int(line)) for code, *lines in rows for line in lines if line != "0"]
 told = re.findall(r"^\| (-?\d+) \| `(FLVD_ERR_\w+)` \| .* \| .* \|$", guide_codes, re.M)
 rows = re.findall(r"^\| ([\d, ]+) \| `(FLVD_ERR_\w+)` \| .* \|$", guide_lines, re.M)
 told_sites = [(name, int(line)) for lines, name in rows for line in lines.split(",")]

@@ -2,9 +2,9 @@
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
-#include "flvdmx/fio/bytes.h"
-#include "flvdmx/format.h"
-#include "flvdmx/sites.h"
+#include "flvdmx/common/bytes.h"
+#include "flvdmx/common/format.h"
+#include "flvdmx/common/sites.h"
 
 #include <algorithm>
 #include <iterator>

@@ -2,7 +2,7 @@
 // (ISO/IEC 14496-10, 7.3.2.1.1). Nothing of them is validated: a damaged set gives a damaged size.
 
 #include "flvdmx/codec/codec.h"
-#include "flvdmx/fio/bytes.h"
+#include "flvdmx/common/bytes.h"
 
 #include <cstring>
 

@@ -2,9 +2,9 @@
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
-#include "flvdmx/fio/bytes.h"
-#include "flvdmx/format.h"
-#include "flvdmx/sites.h"
+#include "flvdmx/common/bytes.h"
+#include "flvdmx/common/format.h"
+#include "flvdmx/common/sites.h"
 
 #include <cstring>
 #include <iterator>
@@ -141,7 +141,7 @@ int32_t FLVD_ProbeCodec(flvd_ctx_t* ctx, uint32_t codec, uint32_t packet_type, u
         return FLVD_ProbePicture(ctx, codec, "VP6A", FLVD_SITE_VP6A_DATA, FLVD_SITE_VP6A_HEADER);
     case FLVD_CODEC_AVC:
         return packet_type == FLVD_PACKET_SEQUENCE_HEADER ? FLVD_ProbeAvc(ctx, data_size)
-                                                          : FLVD_Fail(ctx, FLVD_SITE_AVC_NO_SEQ_HEADER);
+                                                          : FLVD_Fail(ctx, FLVD_SITE_AVC_NO_SEQUENCE_HEADER);
     default:
         FLVD_SetFourcc(ctx, "\0\0\0");
         return 0;

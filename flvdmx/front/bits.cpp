@@ -3,7 +3,7 @@
 //
 // A reader that another access has emptied (bits_left 0) goes on consuming the file's bytes and stays empty.
 
-#include "flvdmx/fio/bytes.h"
+#include "flvdmx/common/bytes.h"
 #include "flvdmx/fio/fio.h"
 
 #include <algorithm>

@@ -2,11 +2,8 @@
 
 #include "flvdmx/front/front.h"
 
-#include "flvdmx/instance.h"
+#include "flvdmx/common/instance.h"
 #include "flvdmx/seek/seek.h"
-
-int32_t g_flvd_lLastError;
-int32_t g_flvd_lErrorLine;
 
 namespace {
 
@@ -45,7 +42,7 @@ int32_t FLVD_OperateOnNothing(uint32_t operation)
     case FLVD_OP_GET_LAST_ERROR:
         return g_flvd_lLastError;
     default:
-        FLVD_RecordGlobal(FLVD_SITE_NO_INSTANCE);
+        FLVD_RecordGlobal(FLVD_SITE_NO_INSTANCE, false);
         return FLVD_RET_NO_INSTANCE;
     }
 }
@@ -85,18 +82,12 @@ int32_t FLVD_Operate(uint32_t operation, flvd_ctx_t* ctx, const void* arg1, void
     case FLVD_OP_GET_LAST_ERROR:
         return ctx->error;
     default:
-        FLVD_Record(ctx, FLVD_SITE_RESERVED_OP);
+        FLVD_Record(ctx, FLVD_SITE_RESERVED_OPERATION);
         return FLVD_RET_FAILED;
     }
 }
 
 } // namespace
-
-void FLVD_RecordGlobal(flvd_site_t site)
-{
-    g_flvd_lLastError = site.code;
-    g_flvd_lErrorLine = site.line;
-}
 
 int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2)
 {

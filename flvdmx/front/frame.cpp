@@ -5,54 +5,33 @@
 
 #include "flvdmx/front/front.h"
 
+#include "flvdmx/common/instance.h"
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/fio/tables.h"
-#include "flvdmx/instance.h"
 #include "flvdmx/tag/tag.h"
 
 namespace {
 
 constexpr uint32_t FLVD_FRAME_BUFFER_STEP = 16384; // the frame buffer grows to multiples of it
 
-// Failures that the two variants record at lines of their own.
-struct flvd_frame_sites_t {
-    flvd_site_t info_only;
-    flvd_site_t no_video;
-    flvd_site_t no_audio;
-    flvd_site_t bad_stream;
-    flvd_site_t end;
-};
-
-constexpr flvd_frame_sites_t g_flvd_completeSites = {
-    {FLVD_ERR_INFO_ONLY, 2638},  {FLVD_ERR_NO_VIDEO, 2651},   {FLVD_ERR_NO_AUDIO, 2661},
-    {FLVD_ERR_BAD_STREAM, 2667}, {FLVD_ERR_SHORT_DATA, 2737},
-};
-constexpr flvd_frame_sites_t g_flvd_growingSites = {
-    {FLVD_ERR_INFO_ONLY, 2767},  {FLVD_ERR_NO_VIDEO, 2783},   {FLVD_ERR_NO_AUDIO, 2796},
-    {FLVD_ERR_BAD_STREAM, 2802}, {FLVD_ERR_SHORT_DATA, 2957},
-};
-
 // Failures on one tag, by what it carries.
 struct flvd_payload_sites_t {
-    flvd_site_t short_peek;
-    flvd_site_t no_room; // code 0: the frame was passed over on purpose
-    flvd_site_t short_read;
-    flvd_site_t rollback_payload;
-    flvd_site_t rollback_back_pointer;
+    flvd_site_t headers_cut;
+    flvd_site_t no_room;
+    flvd_site_t cut;
+    flvd_site_t back_to_cut; // growing file: the way back to the tag failed
+    flvd_site_t back_without_back_pointer;
 };
 
-constexpr flvd_payload_sites_t g_flvd_videoSites = {
-    {FLVD_ERR_SHORT_DATA, 2579}, {FLVD_ERR_NONE, 2602}, {FLVD_ERR_SHORT_DATA, 2606},
-    {FLVD_ERR_SEEK, 2881},       {FLVD_ERR_SEEK, 2859},
-};
-constexpr flvd_payload_sites_t g_flvd_aacSites = {
-    {FLVD_ERR_SHORT_DATA, 2521}, {FLVD_ERR_NONE, 2536}, {FLVD_ERR_SHORT_DATA, 2540},
-    {FLVD_ERR_SEEK, 2921},       {FLVD_ERR_SEEK, 2899},
-};
-constexpr flvd_payload_sites_t g_flvd_soundSites = {
-    {FLVD_ERR_SHORT_DATA, 2521}, {FLVD_ERR_NONE, 2550}, {FLVD_ERR_SHORT_DATA, 2554},
-    {FLVD_ERR_SEEK, 2921},       {FLVD_ERR_SEEK, 2899},
-};
+constexpr flvd_payload_sites_t g_flvd_videoSites = {FLVD_SITE_VIDEO_HEADERS_CUT, FLVD_SITE_VIDEO_NO_ROOM,
+                                                    FLVD_SITE_VIDEO_CUT, FLVD_SITE_BACK_TO_CUT_VIDEO,
+                                                    FLVD_SITE_BACK_TO_VIDEO_WITHOUT_BACK_POINTER};
+constexpr flvd_payload_sites_t g_flvd_aacSites = {FLVD_SITE_AUDIO_HEADERS_CUT, FLVD_SITE_AAC_NO_ROOM, FLVD_SITE_AAC_CUT,
+                                                  FLVD_SITE_BACK_TO_CUT_AUDIO,
+                                                  FLVD_SITE_BACK_TO_AUDIO_WITHOUT_BACK_POINTER};
+constexpr flvd_payload_sites_t g_flvd_audioSites = {FLVD_SITE_AUDIO_HEADERS_CUT, FLVD_SITE_AUDIO_NO_ROOM,
+                                                    FLVD_SITE_AUDIO_CUT, FLVD_SITE_BACK_TO_CUT_AUDIO,
+                                                    FLVD_SITE_BACK_TO_AUDIO_WITHOUT_BACK_POINTER};
 
 // One request.
 struct flvd_delivery_t {
@@ -62,11 +41,6 @@ struct flvd_delivery_t {
     uint32_t passing_size; // data size of the last tag found, by which a place without tags is passed
 };
 
-const flvd_frame_sites_t& FLVD_FrameSites(const flvd_delivery_t& delivery)
-{
-    return delivery.growing ? g_flvd_growingSites : g_flvd_completeSites;
-}
-
 // What a tag led to: go on with the next, return 0, return -1 as recorded, or search on: it was no tag.
 enum class FlvdTurn { Next, Delivered, Failed, NoTag };
 
@@ -74,7 +48,7 @@ const flvd_payload_sites_t& FLVD_PayloadSites(const flvd_found_tag_t& tag)
 {
     if (tag.type == FLVD_TAG_TYPE_VIDEO)
         return g_flvd_videoSites;
-    return tag.codec_header == FLVD_AAC_HEADER_SIZE ? g_flvd_aacSites : g_flvd_soundSites;
+    return tag.codec_header == FLVD_AAC_HEADER_SIZE ? g_flvd_aacSites : g_flvd_audioSites;
 }
 
 FlvdTurn FLVD_FailRequest(const flvd_delivery_t& delivery, flvd_site_t site)
@@ -95,7 +69,7 @@ bool FLVD_GoBack(const flvd_delivery_t& delivery)
 // Growing file: the next request tries again from the saved position.
 FlvdTurn FLVD_RollBack(const flvd_delivery_t& delivery, flvd_site_t seek_failed)
 {
-    return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? FLVD_FrameSites(delivery).end : seek_failed);
+    return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? FLVD_SITE_FRAME_END : seek_failed);
 }
 
 // Leaves a tag that is cut short: a complete file goes on after it, a growing file rolls back.
@@ -110,7 +84,7 @@ FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& t
     fio_file_t* const reader = delivery.search.file;
     if (FLVD_FioSkip(left, reader) == left && FLVD_PassBackPointer(reader, tag.data_size))
         return FlvdTurn::Next;
-    return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_back_pointer);
+    return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_without_back_pointer);
 }
 
 // Makes room for n bytes in the frame buffer, whose contents are lost. The caller's buffer cannot grow.
@@ -187,8 +161,8 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
     if (got < n) {
         if (!tag.checked && !FLVD_CheckCutTag(reader, tag, got))
             return FlvdTurn::NoTag;
-        FLVD_Record(ctx, FLVD_PayloadSites(tag).short_read);
-        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_payload);
+        FLVD_Record(ctx, FLVD_PayloadSites(tag).cut);
+        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_to_cut);
     }
     const uint8_t* back_pointer = nullptr;
     const bool ended = FLVD_FioPeek(&back_pointer, FLVD_BACK_POINTER_SIZE, reader) < FLVD_BACK_POINTER_SIZE;
@@ -196,7 +170,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
         return FlvdTurn::NoTag;
     ctx->last_frame_size = n;
     if (ended && delivery.growing)
-        return FLVD_RollBack(delivery, FLVD_PayloadSites(tag).rollback_back_pointer);
+        return FLVD_RollBack(delivery, FLVD_PayloadSites(tag).back_without_back_pointer);
     FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, reader);
     FLVD_Report(delivery, tag, n, frame);
     return FlvdTurn::Delivered;
@@ -214,14 +188,14 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
         FLVD_FioPeek(&bytes, headers, reader); // so that the skip finds them: it would seek
     } else if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, reader) < FLVD_TAG_PEEK_SIZE) {
         FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
-        FLVD_Record(ctx, FLVD_PayloadSites(tag).short_peek);
-        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_payload);
+        FLVD_Record(ctx, FLVD_PayloadSites(tag).headers_cut);
+        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_to_cut);
     }
     if (tag.codec_header == 0 || tag.data_size < tag.codec_header)
         return FLVD_PassTag(delivery, tag, FLVD_TAG_HEADER_SIZE + tag.data_size);
     if (FLVD_FioSkip(headers, reader) != headers) {
-        FLVD_Record(ctx, FLVD_PayloadSites(tag).short_peek);
-        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).rollback_payload);
+        FLVD_Record(ctx, FLVD_PayloadSites(tag).headers_cut);
+        return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_to_cut);
     }
     return FLVD_DeliverPayload(delivery, tag, tag.data_size - tag.codec_header, frame);
 }
@@ -231,7 +205,7 @@ FlvdTurn FLVD_PassPlace(const flvd_delivery_t& delivery)
 {
     const bool checks_used_up = delivery.search.checks_left == 0;
     if (checks_used_up || FLVD_FioSkip(delivery.passing_size + FLVD_TAG_OVERHEAD, delivery.search.file) == 0)
-        return FLVD_FailRequest(delivery, FLVD_FrameSites(delivery).end);
+        return FLVD_FailRequest(delivery, FLVD_SITE_FRAME_END);
     return FlvdTurn::Next;
 }
 
@@ -239,7 +213,7 @@ FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
     flvd_frame_search_t* const search = &delivery->search;
     if (FLVD_FioAtEnd(search->file))
-        return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
+        return FLVD_FailRequest(*delivery, FLVD_SITE_FRAME_END);
     flvd_found_tag_t tag;
     int32_t result = FLVD_FindFrameTag(search, &tag);
     while (result == 0) {
@@ -273,7 +247,7 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
 {
     flvd_frame_search_t& search = delivery->search;
     const flvd_site_t site = FLVD_SavePosition(*delivery);
-    if (FLVD_IsFailure(site))
+    if (site != FLVD_SITE_NONE)
         return FLVD_FailRequest(*delivery, site);
     flvd_tag_info_t info;
     const int32_t result = FLVD_GetCurrTagInfo(search.ctx, search.file, &info, search.wanted, 0);
@@ -284,10 +258,10 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
         return FLVD_DeliverTag(*delivery, FLVD_CheckedTag(header), frame);
     }
     if (result == FLVD_ERR_END_OF_DATA)
-        return FLVD_RollBack(*delivery, FLVD_SITE_ROLLBACK_END);
+        return FLVD_RollBack(*delivery, FLVD_SITE_BACK_FROM_END);
     const int64_t size = int64_t{delivery->passing_size} + FLVD_TAG_OVERHEAD;
     if (__FLV_DMX__fioSeek64(search.file, size, FIO_SEEK_CUR) != 0)
-        return FLVD_RollBack(*delivery, FLVD_SITE_ROLLBACK_SKIP);
+        return FLVD_RollBack(*delivery, FLVD_SITE_BACK_FROM_SKIP);
     return FlvdTurn::Next;
 }
 
@@ -300,14 +274,14 @@ flvd_site_t FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
     switch (stream) {
     case FLVD_STREAM_VIDEO:
         delivery->search.wanted = FLVD_TAG_VIDEO;
-        return FLVD_HasVideo(ctx) ? FLVD_SITE_NONE : FLVD_FrameSites(*delivery).no_video;
+        return FLVD_HasVideo(ctx) ? FLVD_SITE_NONE : FLVD_SITE_FRAME_NO_VIDEO;
     case FLVD_STREAM_AUDIO:
         delivery->search.wanted = FLVD_TAG_AUDIO;
         delivery->search.file = ctx->audio_reader;
         delivery->saved = &ctx->saved_audio_pos;
-        return FLVD_HasAudio(ctx) ? FLVD_SITE_NONE : FLVD_FrameSites(*delivery).no_audio;
+        return FLVD_HasAudio(ctx) ? FLVD_SITE_NONE : FLVD_SITE_FRAME_NO_AUDIO;
     default:
-        return FLVD_FrameSites(*delivery).bad_stream;
+        return FLVD_SITE_FRAME_BAD_STREAM;
     }
 }
 
@@ -328,7 +302,7 @@ FlvdTurn FLVD_Deliver(flvd_delivery_t* delivery, flvd_frame_t* frame)
         if (turn != FlvdTurn::Next)
             return turn;
     }
-    return FLVD_FailRequest(*delivery, FLVD_FrameSites(*delivery).end);
+    return FLVD_FailRequest(*delivery, FLVD_SITE_FRAME_END);
 }
 
 } // namespace
@@ -338,9 +312,9 @@ int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd
     flvd_delivery_t delivery = {
         {ctx, ctx->main_reader, FLVD_TAG_MEDIA, FLVD_FAILED_CHECKS_MAX}, &ctx->saved_main_pos, FLVD_IsGrowing(ctx), 0};
     if (ctx->opened_for_info != 0)
-        return FLVD_Fail(ctx, FLVD_FrameSites(delivery).info_only);
+        return FLVD_Fail(ctx, FLVD_SITE_FRAME_INFO_ONLY);
     const flvd_site_t refused = FLVD_ChooseStream(&delivery, request->stream);
-    if (FLVD_IsFailure(refused))
+    if (refused != FLVD_SITE_NONE)
         return FLVD_Fail(ctx, refused);
     FLVD_TakeUserBuffer(ctx, request);
     *frame = {};

@@ -2,11 +2,8 @@
 #ifndef FLVDMX_FRONT_FRONT_H
 #define FLVDMX_FRONT_FRONT_H
 
+#include "flvdmx/common/sites.h"
 #include "flvdmx/flvdmx.h"
-#include "flvdmx/sites.h"
-
-// Records a failure that has no instance to be recorded in.
-void FLVD_RecordGlobal(flvd_site_t site);
 
 // Opens the file that the initialisation block names and probes it. Null on failure, which is recorded in the globals;
 // nothing stays allocated or open then.

@@ -2,8 +2,8 @@
 
 #include "flvdmx/front/front.h"
 
+#include "flvdmx/common/instance.h"
 #include "flvdmx/fio/tables.h"
-#include "flvdmx/instance.h"
 #include "flvdmx/tag/tag.h"
 
 #include <algorithm>
@@ -71,16 +71,16 @@ flvd_site_t FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name)
 {
     ctx->main_reader = FLVD_OpenReader(ctx, file_name);
     if (ctx->main_reader == nullptr)
-        return FLVD_SITE_OPEN_MAIN;
+        return FLVD_SITE_OPEN_MAIN_READER;
     ctx->audio_reader = FLVD_HasAudioReader(ctx) ? FLVD_OpenReader(ctx, file_name) : ctx->main_reader;
     if (ctx->audio_reader == nullptr)
-        return FLVD_SITE_OPEN_AUDIO;
+        return FLVD_SITE_OPEN_AUDIO_READER;
     ctx->cur_reader = ctx->main_reader;
     if (FLVD_HasUserBuffer(ctx))
         return FLVD_SITE_NONE;
     ctx->frame_buffer = static_cast<uint8_t*>(g_flvd_memFuncs.mem_alloc(FLVD_FRAME_BUFFER_SIZE));
     if (ctx->frame_buffer == nullptr)
-        return FLVD_SITE_OPEN_BUFFER;
+        return FLVD_SITE_OPEN_FRAME_BUFFER;
     ctx->frame_buffer_size = FLVD_FRAME_BUFFER_SIZE;
     return FLVD_SITE_NONE;
 }
@@ -89,9 +89,9 @@ flvd_site_t FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name)
 flvd_site_t FLVD_Fill(flvd_ctx_t* ctx, const char* file_name, flvd_open_info_t* info)
 {
     const flvd_site_t site = FLVD_Acquire(ctx, file_name);
-    if (FLVD_IsFailure(site))
+    if (site != FLVD_SITE_NONE)
         return site;
-    return FLVD_ReadFileHeader(ctx) ? FLVD_ProbeStreams(ctx, info) : FLVD_SITE_OPEN_HEADER;
+    return FLVD_ReadFileHeader(ctx) ? FLVD_ProbeStreams(ctx, info) : FLVD_SITE_OPEN_FILE_HEADER;
 }
 
 // Moves the bit reader to the first "FLV". After a MiB without one the bytes there are taken for a header all the same.
@@ -151,7 +151,7 @@ flvd_ctx_t* FLVD_OpenInstance(const flvd_init_t* init, flvd_open_info_t* info, b
     FLVD_SetMemFuncs(init);
     auto* const ctx = static_cast<flvd_ctx_t*>(g_flvd_memFuncs.mem_alloc(sizeof(flvd_ctx_t)));
     if (ctx == nullptr) {
-        FLVD_RecordGlobal(FLVD_SITE_OPEN_INSTANCE);
+        FLVD_RecordGlobal(FLVD_SITE_OPEN_INSTANCE, false);
         return nullptr;
     }
     g_flvd_memFuncs.mem_set(ctx, 0, sizeof *ctx);
@@ -160,9 +160,9 @@ flvd_ctx_t* FLVD_OpenInstance(const flvd_init_t* init, flvd_open_info_t* info, b
     FLVD_SetFileFuncs(init);
     FLVD_SetCallbackforMeta(init);
     const flvd_site_t site = FLVD_Fill(ctx, init->file_name, info);
-    if (!FLVD_IsFailure(site))
+    if (site == FLVD_SITE_NONE)
         return ctx;
-    FLVD_RecordGlobal(site);
+    FLVD_RecordGlobal(site, FLVD_IsGrowing(ctx));
     FLVD_ReleaseInstance(ctx);
     return nullptr;
 }

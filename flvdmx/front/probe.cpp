@@ -4,7 +4,7 @@
 #include "flvdmx/front/front.h"
 
 #include "flvdmx/codec/codec.h"
-#include "flvdmx/instance.h"
+#include "flvdmx/common/instance.h"
 #include "flvdmx/tag/tag.h"
 
 #include <algorithm>
@@ -84,16 +84,16 @@ flvd_site_t FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const
 {
     if (tag.type == FLVD_TAG_TYPE_SCRIPT) {
         if (FLVD_ProbeScript(ctx, probing, tag.data_size) == FLVD_ERR_END_OF_DATA)
-            return FLVD_SITE_PROBE_GROWING;
+            return FLVD_SITE_OPEN_NO_STREAM;
         FLVD_PassBackPointer(ctx->cur_reader, tag.data_size);
         return FLVD_SITE_NONE;
     }
     if (FLVD_ProbeTag(ctx, probing, tag.type) == FLVD_ERR_END_OF_DATA)
-        return FLVD_SITE_PROBE_GROWING_SHORT;
+        return FLVD_SITE_OPEN_TAG_CUT;
     probing->first_ts = std::min(probing->first_ts, tag.timestamp);
     const int64_t size = int64_t{tag.data_size} + FLVD_TAG_OVERHEAD;
     const bool moved = __FLV_DMX__fioSeek64(ctx->cur_reader, size, FIO_SEEK_CUR) == 0;
-    return moved ? FLVD_SITE_NONE : FLVD_SITE_PROBE_GROWING_SHORT;
+    return moved ? FLVD_SITE_NONE : FLVD_SITE_OPEN_TAG_CUT;
 }
 
 flvd_site_t FLVD_ProbeGrowingTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
@@ -103,7 +103,7 @@ flvd_site_t FLVD_ProbeGrowingTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
         if (FLVD_GetCurrTagInfo(ctx, ctx->cur_reader, &tag, FLVD_TAG_ANY, 0) != 0)
             break;
         const flvd_site_t site = FLVD_ProbeGrowingTag(ctx, probing, tag);
-        if (FLVD_IsFailure(site))
+        if (site != FLVD_SITE_NONE)
             return site;
     }
     return FLVD_SITE_NONE;
@@ -112,21 +112,20 @@ flvd_site_t FLVD_ProbeGrowingTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
 // Walks the first tags and stores the streams found and the first timestamp.
 flvd_site_t FLVD_ProbeTags(flvd_ctx_t* ctx)
 {
-    const flvd_site_t no_stream = FLVD_IsGrowing(ctx) ? FLVD_SITE_PROBE_GROWING : FLVD_SITE_PROBE_COMPLETE;
     if (FLVD_SeekToFirstTag(ctx, ctx->cur_reader) != 0)
-        return no_stream;
+        return FLVD_SITE_OPEN_NO_STREAM;
     const uint32_t wanted = ctx->streams == 0 ? FLVD_FOUND_ALL : ctx->streams | FLVD_FOUND_METADATA;
     flvd_probing_t probing = {wanted, 0, FLVD_NO_TIMESTAMP};
     if (FLVD_IsGrowing(ctx)) {
         const flvd_site_t site = FLVD_ProbeGrowingTags(ctx, &probing);
-        if (FLVD_IsFailure(site))
+        if (site != FLVD_SITE_NONE)
             return site;
     } else {
         FLVD_ProbeCompleteTags(ctx, &probing);
     }
     ctx->streams = probing.found & (FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
     if (ctx->streams == 0)
-        return no_stream;
+        return FLVD_SITE_OPEN_NO_STREAM;
     if (probing.first_ts != FLVD_NO_TIMESTAMP)
         ctx->first_ts = probing.first_ts;
     return FLVD_SITE_NONE;
@@ -194,10 +193,10 @@ bool FLVD_Rewind(flvd_ctx_t* ctx)
 flvd_site_t FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info)
 {
     const flvd_site_t site = FLVD_ProbeTags(ctx);
-    if (FLVD_IsFailure(site))
+    if (site != FLVD_SITE_NONE)
         return site;
     if (!FLVD_MeasureExtent(ctx))
-        return FLVD_SITE_PROBE_EXTENT;
+        return FLVD_SITE_OPEN_EXTENT;
     FLVD_DeriveDuration(ctx);
     if (!FLVD_Rewind(ctx))
         return FLVD_SITE_OPEN_REWIND;

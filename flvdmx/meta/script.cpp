@@ -4,7 +4,7 @@
 // Sizes are claims of the file: a value may not begin behind the payload, containers nest to a bound, and every loop
 // consumes at least a byte a turn.
 
-#include "flvdmx/fio/bytes.h"
+#include "flvdmx/common/bytes.h"
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/flvdmx.h"
 

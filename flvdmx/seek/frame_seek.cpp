@@ -2,9 +2,9 @@
 
 #include "flvdmx/seek/seek.h"
 
-#include "flvdmx/fio/bytes.h"
-#include "flvdmx/instance.h"
-#include "flvdmx/sites.h"
+#include "flvdmx/common/bytes.h"
+#include "flvdmx/common/instance.h"
+#include "flvdmx/common/sites.h"
 #include "flvdmx/tag/tag.h"
 
 #include <algorithm>
@@ -14,17 +14,19 @@ namespace {
 constexpr uint32_t FLVD_INDEX_TOLERANCE_MS = 1000; // encoders write times some way off the tags'
 constexpr uint32_t FLVD_INDEX_ELEMENT_SIZE = 1 + FLVD_AMF_NUMBER_SIZE;
 
+// Failures by where the index is read from.
 struct flvd_index_sites_t {
     flvd_site_t rewind;
     flvd_site_t seek;
-    flvd_site_t short_tag;
+    flvd_site_t tag_cut;
     flvd_site_t tolerance;
 };
 
-constexpr flvd_index_sites_t g_flvd_fileSites = {
-    {FLVD_ERR_SEEK, 290}, {FLVD_ERR_SEEK, 335}, {FLVD_ERR_SHORT_DATA, 342}, {FLVD_ERR_SEEK_PLACE, 355}};
-constexpr flvd_index_sites_t g_flvd_memorySites = {
-    {FLVD_ERR_SEEK, 404}, {FLVD_ERR_SEEK, 432}, {FLVD_ERR_SHORT_DATA, 439}, {FLVD_ERR_SEEK_PLACE, 452}};
+constexpr flvd_index_sites_t g_flvd_fileIndexSites = {FLVD_SITE_FILE_INDEX_REWIND, FLVD_SITE_FILE_INDEX_SEEK,
+                                                      FLVD_SITE_FILE_INDEX_TAG_CUT, FLVD_SITE_FILE_INDEX_TOLERANCE};
+constexpr flvd_index_sites_t g_flvd_memoryIndexSites = {FLVD_SITE_MEMORY_INDEX_REWIND, FLVD_SITE_MEMORY_INDEX_SEEK,
+                                                        FLVD_SITE_MEMORY_INDEX_TAG_CUT,
+                                                        FLVD_SITE_MEMORY_INDEX_TOLERANCE};
 
 enum class FlvdChoice { Entry, Rewind, Miss };
 
@@ -115,7 +117,7 @@ int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, u
         return FLVD_Fail(ctx, sites.seek);
     const uint8_t* bytes = nullptr;
     if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_HEADER_SIZE, ctx->main_reader) < FLVD_TAG_HEADER_SIZE)
-        return FLVD_Fail(ctx, sites.short_tag);
+        return FLVD_Fail(ctx, sites.tag_cut);
     const uint32_t timestamp = FLVD_TagTimestamp(bytes);
     if (FLVD_TimeDistance(timestamp, expected) > FLVD_INDEX_TOLERANCE_MS)
         return FLVD_Fail(ctx, sites.tolerance);
@@ -139,8 +141,9 @@ int32_t FLVD_RunIndexSeekInMemory(flvd_ctx_t* ctx, uint32_t target, uint32_t* re
     if (choice.what == FlvdChoice::Miss)
         return FLVD_ERR_END_OF_DATA;
     if (choice.what == FlvdChoice::Rewind)
-        return FLVD_RewindByIndex(ctx, result, g_flvd_memorySites.rewind);
-    return FLVD_LandOnEntry(ctx, ctx->keyframe_arrays.positions[choice.entry], choice.time, result, g_flvd_memorySites);
+        return FLVD_RewindByIndex(ctx, result, g_flvd_memoryIndexSites.rewind);
+    return FLVD_LandOnEntry(ctx, ctx->keyframe_arrays.positions[choice.entry], choice.time, result,
+                            g_flvd_memoryIndexSites);
 }
 
 // Reads the position of an entry from the file. False on failure, recorded.
@@ -149,12 +152,12 @@ bool FLVD_ReadEntryPosition(flvd_ctx_t* ctx, uint32_t entry, int64_t* position)
     fio_file_t* const file = ctx->main_reader;
     const int64_t element = ctx->keyframe_index.positions_offset + int64_t{FLVD_INDEX_ELEMENT_SIZE} * entry;
     if (__FLV_DMX__fioSeek64(file, element, FIO_SEEK_SET) != 0) {
-        FLVD_Record(ctx, FLVD_SITE_INDEX_POSITIONS_SEEK);
+        FLVD_Record(ctx, FLVD_SITE_FILE_INDEX_POSITIONS_SEEK);
         return false;
     }
     double number = 0.0;
     if (FLVD_ReadNumberElement(file, &number) == FlvdElement::NotANumber) {
-        FLVD_Record(ctx, FLVD_SITE_INDEX_POSITION_TYPE);
+        FLVD_Record(ctx, FLVD_SITE_FILE_INDEX_POSITION_TYPE);
         return false;
     }
     *position = FLVD_DoubleToI64(number);
@@ -166,16 +169,16 @@ int32_t FLVD_RunIndexSeekFromFile(flvd_ctx_t* ctx, uint32_t target, uint32_t* re
     fio_file_t* const file = ctx->main_reader;
     const flvd_keyframe_index_t& index = ctx->keyframe_index;
     if (index.entry_count != 0 && __FLV_DMX__fioSeek64(file, index.times_offset, FIO_SEEK_SET) != 0)
-        return FLVD_Fail(ctx, FLVD_SITE_INDEX_TIMES_SEEK);
+        return FLVD_Fail(ctx, FLVD_SITE_FILE_INDEX_TIMES_SEEK);
     const flvd_choice_t choice = FLVD_ChooseEntry({file, nullptr, index.entry_count, false}, target, backward);
     if (choice.what == FlvdChoice::Miss)
         return FLVD_ERR_END_OF_DATA;
     if (choice.what == FlvdChoice::Rewind)
-        return FLVD_RewindByIndex(ctx, result, g_flvd_fileSites.rewind);
+        return FLVD_RewindByIndex(ctx, result, g_flvd_fileIndexSites.rewind);
     int64_t position = 0;
     if (!FLVD_ReadEntryPosition(ctx, choice.entry, &position))
         return -1;
-    return FLVD_LandOnEntry(ctx, position, choice.time, result, g_flvd_fileSites);
+    return FLVD_LandOnEntry(ctx, position, choice.time, result, g_flvd_fileIndexSites);
 }
 
 } // namespace

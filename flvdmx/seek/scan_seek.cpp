@@ -5,9 +5,9 @@
 
 #include "flvdmx/seek/seek.h"
 
+#include "flvdmx/common/instance.h"
+#include "flvdmx/common/sites.h"
 #include "flvdmx/fio/fio.h"
-#include "flvdmx/instance.h"
-#include "flvdmx/sites.h"
 #include "flvdmx/tag/tag.h"
 
 namespace {

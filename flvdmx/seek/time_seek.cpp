@@ -5,53 +5,17 @@
 
 #include "flvdmx/seek/seek.h"
 
-#include "flvdmx/instance.h"
-#include "flvdmx/sites.h"
+#include "flvdmx/common/instance.h"
+#include "flvdmx/common/sites.h"
 #include "flvdmx/tag/tag.h"
 
 namespace {
-
-// Moving one stream: its position cannot be taken, its frame seek failed.
-struct flvd_stream_sites_t {
-    flvd_site_t position;
-    flvd_site_t seek;
-};
-
-// Failures that the variants record at lines of their own.
-struct flvd_seek_sites_t {
-    flvd_site_t info_only;
-    flvd_site_t not_seekable;
-    flvd_site_t rewind;
-    flvd_site_t miss;
-    flvd_stream_sites_t main;
-    flvd_stream_sites_t audio;
-};
-
-constexpr flvd_stream_sites_t g_flvd_oneReaderSites = {{FLVD_ERR_POSITION, 3111}, {FLVD_ERR_FRAME_SEEK, 3118}};
-
-constexpr flvd_seek_sites_t g_flvd_completeSites = {
-    {FLVD_ERR_INFO_ONLY, 2982},
-    {FLVD_ERR_NOT_SEEKABLE, 2987},
-    {FLVD_ERR_SEEK, 3045},
-    {FLVD_ERR_SEEK_MISS, 3161},
-    {{FLVD_ERR_POSITION, 3065}, {FLVD_ERR_FRAME_SEEK, 3072}},
-    {{FLVD_ERR_POSITION, 3088}, {FLVD_ERR_FRAME_SEEK, 3095}},
-};
-constexpr flvd_seek_sites_t g_flvd_growingSites = {
-    {FLVD_ERR_INFO_ONLY, 3190},
-    {FLVD_ERR_NOT_SEEKABLE, 3195},
-    {FLVD_ERR_SEEK, 3252},
-    {FLVD_ERR_SEEK_MISS, 3338},
-    {{FLVD_ERR_POSITION, 3269}, {FLVD_ERR_FRAME_SEEK, 3276}},
-    {{FLVD_ERR_POSITION, 3288}, {}}, // audio tags are not searched there
-};
 
 constexpr int32_t FLVD_MISS = FLVD_ERR_END_OF_DATA;
 
 // One time seek.
 struct flvd_time_seek_t {
     flvd_ctx_t* ctx;
-    const flvd_seek_sites_t* sites;
     int32_t time;
     uint32_t mode;
     bool growing;
@@ -129,9 +93,9 @@ int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
     if (FLVD_HasAudioReader(ctx))
         FLVD_SavePosition(ctx->audio_reader, &ctx->saved_audio_pos);
     if (FLVD_SeekToFirstTag(ctx, ctx->main_reader) != 0)
-        return FLVD_Fail(ctx, seek->sites->rewind);
+        return FLVD_Fail(ctx, FLVD_SITE_SEEK_REWIND);
     if (FLVD_HasAudioReader(ctx) && FLVD_SeekToFirstTag(ctx, ctx->audio_reader) != 0)
-        return FLVD_Fail(ctx, seek->sites->rewind);
+        return FLVD_Fail(ctx, FLVD_SITE_SEEK_REWIND);
     ctx->last_video_ts = 0;
     ctx->last_audio_ts = 0;
     seek->reached = ctx->first_ts;
@@ -140,18 +104,18 @@ int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
 
 // Saves a reader's position and moves it by a frame seek. The time found ends in seek->reached and becomes the
 // stream's current position.
-int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, const flvd_stream_sites_t& sites)
+int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, flvd_site_t position_site, flvd_site_t seek_site)
 {
     flvd_ctx_t* const ctx = seek->ctx;
     const bool own_reader = stream == FLVD_STREAM_AUDIO && FLVD_HasAudioReader(ctx);
     if (!FLVD_SavePosition(own_reader ? ctx->audio_reader : ctx->main_reader,
                            own_reader ? &ctx->saved_audio_pos : &ctx->saved_main_pos))
-        return FLVD_Fail(ctx, sites.position);
+        return FLVD_Fail(ctx, position_site);
     const auto frame_seek = seek->growing ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
     uint32_t found = 0;
     const int32_t result = frame_seek(ctx, static_cast<uint32_t>(seek->target), &found, stream, seek->direction);
     if (result < 0) {
-        FLVD_Record(ctx, sites.seek);
+        FLVD_Record(ctx, seek_site);
         return result;
     }
     seek->reached = found;
@@ -163,7 +127,7 @@ int32_t FLVD_MoveOneReader(flvd_time_seek_t* seek)
 {
     flvd_ctx_t* const ctx = seek->ctx;
     const uint32_t stream = FLVD_HasVideo(ctx) ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
-    const int32_t result = FLVD_MoveStream(seek, stream, g_flvd_oneReaderSites);
+    const int32_t result = FLVD_MoveStream(seek, stream, FLVD_SITE_SEEK_ONE_READER_POSITION, FLVD_SITE_SEEK_ONE_READER);
     if (result == 0 && FLVD_HasAudio(ctx))
         ctx->last_audio_ts = seek->reached - ctx->first_ts;
     return result;
@@ -174,14 +138,15 @@ int32_t FLVD_MoveTwoReaders(flvd_time_seek_t* seek)
 {
     const flvd_ctx_t* const ctx = seek->ctx;
     if (!FLVD_HasVideo(ctx))
-        return FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, seek->sites->audio);
-    const int32_t result = FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, seek->sites->main);
+        return FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, FLVD_SITE_SEEK_AUDIO_POSITION, FLVD_SITE_SEEK_AUDIO);
+    const int32_t result =
+        FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, FLVD_SITE_SEEK_VIDEO_POSITION, FLVD_SITE_SEEK_VIDEO);
     if (result < 0 || !FLVD_HasAudio(ctx))
         return result;
     const uint32_t video = seek->reached;
     seek->target = video;
     seek->direction = FLVD_DIRECTION_BACKWARD;
-    const int32_t audio = FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, seek->sites->audio);
+    const int32_t audio = FLVD_MoveStream(seek, FLVD_STREAM_AUDIO, FLVD_SITE_SEEK_AUDIO_POSITION, FLVD_SITE_SEEK_AUDIO);
     seek->reached = video;
     return audio;
 }
@@ -191,7 +156,7 @@ int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
 {
     flvd_ctx_t* const ctx = seek.ctx;
     if (!FLVD_SavePosition(ctx->audio_reader, &ctx->saved_audio_pos))
-        return FLVD_Fail(ctx, seek.sites->audio.position);
+        return FLVD_Fail(ctx, FLVD_SITE_SEEK_AUDIO_POSITION);
     const int64_t position = __FLV_DMX__fioTell64(ctx->main_reader);
     if (position < 0)
         return FLVD_Fail(ctx, FLVD_SITE_SEEK_FOLLOW_POSITION);
@@ -203,7 +168,8 @@ int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
 
 int32_t FLVD_MoveGrowing(flvd_time_seek_t* seek)
 {
-    const int32_t result = FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, seek->sites->main);
+    const int32_t result =
+        FLVD_MoveStream(seek, FLVD_STREAM_VIDEO, FLVD_SITE_SEEK_VIDEO_POSITION, FLVD_SITE_SEEK_VIDEO);
     const bool follows = FLVD_HasAudioReader(seek->ctx) && FLVD_HasAudio(seek->ctx);
     return result == 0 && follows ? FLVD_FollowVideo(*seek) : result;
 }
@@ -220,9 +186,9 @@ int32_t FLVD_MoveReaders(flvd_time_seek_t* seek)
 {
     flvd_ctx_t* const ctx = seek->ctx;
     if (ctx->opened_for_info != 0)
-        return FLVD_Fail(ctx, seek->sites->info_only);
+        return FLVD_Fail(ctx, FLVD_SITE_SEEK_INFO_ONLY);
     if (ctx->seek_method == FLVD_SEEK_NONE || (seek->growing && !FLVD_HasVideo(ctx)))
-        return FLVD_Fail(ctx, seek->sites->not_seekable);
+        return FLVD_Fail(ctx, FLVD_SITE_SEEK_NOT_SEEKABLE);
     if (FLVD_IsByZero(*seek)) {
         seek->reached = FLVD_CurrentTime(*seek) + ctx->first_ts;
         return 0;
@@ -272,7 +238,7 @@ int32_t FLVD_RunSeek(flvd_time_seek_t seek, int32_t* result)
         }
     }
     if (moved == FLVD_MISS)
-        FLVD_Record(seek.ctx, seek.sites->miss);
+        FLVD_Record(seek.ctx, FLVD_SITE_SEEK_MISS);
     return moved == 0 ? 0 : -1;
 }
 
@@ -280,10 +246,10 @@ int32_t FLVD_RunSeek(flvd_time_seek_t seek, int32_t* result)
 
 int32_t FLVD_RunTimeSeek(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode)
 {
-    return FLVD_RunSeek({ctx, &g_flvd_completeSites, time, mode, false, 0, FLVD_DIRECTION_FORWARD, 0}, result);
+    return FLVD_RunSeek({ctx, time, mode, false, 0, FLVD_DIRECTION_FORWARD, 0}, result);
 }
 
 int32_t FLVD_RunTimeSeekProgressive(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode)
 {
-    return FLVD_RunSeek({ctx, &g_flvd_growingSites, time, mode, true, 0, FLVD_DIRECTION_FORWARD, 0}, result);
+    return FLVD_RunSeek({ctx, time, mode, true, 0, FLVD_DIRECTION_FORWARD, 0}, result);
 }

@@ -5,7 +5,7 @@
 
 #include "flvdmx/tag/tag.h"
 
-#include "flvdmx/fio/bytes.h"
+#include "flvdmx/common/bytes.h"
 #include "flvdmx/fio/fio.h"
 
 namespace {

@@ -3,10 +3,10 @@
 
 #include "flvdmx/tag/tag.h"
 
-#include "flvdmx/fio/bytes.h"
+#include "flvdmx/common/bytes.h"
+#include "flvdmx/common/instance.h"
+#include "flvdmx/common/sites.h"
 #include "flvdmx/fio/fio.h"
-#include "flvdmx/instance.h"
-#include "flvdmx/sites.h"
 
 #include <algorithm>
 

@@ -4,10 +4,10 @@
 #ifndef FLVDMX_TAG_TAG_H
 #define FLVDMX_TAG_TAG_H
 
-#include "flvdmx/fio/bytes.h"
+#include "flvdmx/common/bytes.h"
+#include "flvdmx/common/format.h"
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/flvdmx.h"
-#include "flvdmx/format.h"
 
 constexpr uint32_t FLVD_TAG_PEEK_SIZE = FLVD_TAG_HEADER_SIZE + 2; // header, codec byte and packet type
 

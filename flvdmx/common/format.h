@@ -1,6 +1,6 @@
 // Numbers of the FLV format that several layers read (FLV file format, version 10.1, annex E).
-#ifndef FLVDMX_FORMAT_H
-#define FLVDMX_FORMAT_H
+#ifndef FLVDMX_COMMON_FORMAT_H
+#define FLVDMX_COMMON_FORMAT_H
 
 #include <cstdint>
 

@@ -1,6 +1,6 @@
 // Questions about an instance that several layers ask.
-#ifndef FLVDMX_INSTANCE_H
-#define FLVDMX_INSTANCE_H
+#ifndef FLVDMX_COMMON_INSTANCE_H
+#define FLVDMX_COMMON_INSTANCE_H
 
 #include "flvdmx/flvdmx.h"
 

@@ -1,7 +1,7 @@
 // Big-endian fields and AMF0 numbers as an FLV file holds them. File bytes are never cast: a load at an odd address
 // traps on some of the targets, while compilers turn these into a load and a byte swap.
-#ifndef FLVDMX_FIO_BYTES_H
-#define FLVDMX_FIO_BYTES_H
+#ifndef FLVDMX_COMMON_BYTES_H
+#define FLVDMX_COMMON_BYTES_H
 
 #include <cstdint>
 #include <cstring>
