@@ -30,9 +30,4 @@ inline bool FLVD_HasAudio(const flvd_ctx_t* ctx)
     return (ctx->streams & FLVD_STREAM_AUDIO) != 0;
 }
 
-inline bool FLVD_IsIndexInMemory(const flvd_ctx_t* ctx)
-{
-    return ctx->keyframe_arrays.times_ms != nullptr && ctx->keyframe_arrays.positions != nullptr;
-}
-
 #endif

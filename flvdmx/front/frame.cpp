@@ -252,8 +252,8 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
     flvd_tag_info_t info;
     const int32_t result = FLVD_GetCurrTagInfo(search.ctx, search.file, &info, search.wanted, 0);
     if (result == 0) {
-        flvd_tag_header_t header;
-        FLVD_PeekTagHeader(search.file, &header); // it has just been looked at
+        flvd_tag_header_t header = {};
+        FLVD_PeekTagHeader(search.file, &header); // cached: the search has just looked at it
         delivery->passing_size = info.data_size;
         return FLVD_DeliverTag(*delivery, FLVD_CheckedTag(header), frame);
     }

@@ -5,6 +5,7 @@
 
 #include "flvdmx/codec/codec.h"
 #include "flvdmx/common/instance.h"
+#include "flvdmx/meta/keyframe_index.h"
 #include "flvdmx/tag/tag.h"
 
 #include <algorithm>

@@ -7,6 +7,7 @@
 #include "flvdmx/common/instance.h"
 #include "flvdmx/common/sites.h"
 #include "flvdmx/fio/fio.h"
+#include "flvdmx/meta/keyframe_index.h"
 
 #include <algorithm>
 
@@ -88,80 +89,6 @@ int64_t FLVD_Bisect(flvd_ctx_t* ctx)
     return high;
 }
 
-// Keyframe index.
-
-bool FLVD_IsIndexUsable(const flvd_ctx_t* ctx)
-{
-    const flvd_keyframe_index_t& index = ctx->keyframe_index;
-    return index.times_offset != 0 && index.positions_offset != 0 && index.times_offset < ctx->file_size &&
-           index.positions_offset < ctx->file_size && index.entry_count > 1;
-}
-
-enum class FlvdElement { Number, NotANumber, ShortData };
-
-// Reads one element of an AMF0 strict array in the file.
-FlvdElement FLVD_ReadElement(fio_file_t* file, double* value)
-{
-    const uint8_t* bytes = nullptr;
-    if (FLVD_FioPeek(&bytes, 1 + FLVD_AMF_NUMBER_SIZE, file) < 1 + FLVD_AMF_NUMBER_SIZE)
-        return FlvdElement::ShortData;
-    const uint8_t marker = bytes[0];
-    const double number = FLVD_GetDouble(bytes + 1);
-    FLVD_FioSkip(1, file);
-    if (marker != FLVD_AMF_NUMBER)
-        return FlvdElement::NotANumber;
-    FLVD_FioSkip(FLVD_AMF_NUMBER_SIZE, file);
-    *value = number;
-    return FlvdElement::Number;
-}
-
-// The keyframe positions in order, from memory or from the file.
-struct flvd_positions_t {
-    fio_file_t* file;
-    const int64_t* memory; // null: from the file
-    uint32_t available;
-    uint32_t read; // those read, the one beyond a limit included
-};
-
-flvd_positions_t FLVD_Positions(const flvd_ctx_t* ctx)
-{
-    if (FLVD_IsIndexInMemory(ctx))
-        return {ctx->cur_reader, ctx->keyframe_arrays.positions, ctx->keyframe_arrays.positions_count, 0};
-    return {ctx->cur_reader, nullptr, ctx->keyframe_index.entry_count, 0};
-}
-
-FlvdElement FLVD_NextPosition(flvd_positions_t* positions, int64_t* value)
-{
-    if (positions->memory != nullptr) {
-        *value = positions->memory[positions->read++];
-        return FlvdElement::Number;
-    }
-    double number = 0.0;
-    const FlvdElement element = FLVD_ReadElement(positions->file, &number);
-    if (element == FlvdElement::Number) {
-        ++positions->read;
-        *value = FLVD_DoubleToI64(number);
-    }
-    return element;
-}
-
-// Reads positions up to and including the first that is not below `limit`. `last_inside` gets the last one read
-// before that. False when the array runs out of data.
-bool FLVD_ReadPositions(flvd_positions_t* positions, int64_t limit, int64_t* last_inside)
-{
-    *last_inside = 0;
-    while (positions->read < positions->available) {
-        int64_t value = 0;
-        const FlvdElement element = FLVD_NextPosition(positions, &value);
-        if (element != FlvdElement::Number)
-            return element != FlvdElement::ShortData;
-        if (value >= limit)
-            return true;
-        *last_inside = value;
-    }
-    return true;
-}
-
 // End of the tag at the position, its PreviousTagSize included; negative when the position cannot be told.
 int64_t FLVD_TagEnd(fio_file_t* file, const flvd_tag_info_t& tag)
 {
@@ -204,77 +131,18 @@ int32_t FLVD_StepBackToEnd(flvd_ctx_t* ctx, int64_t last, int64_t* end)
 int32_t FLVD_IndexedEnd(flvd_ctx_t* ctx, int64_t* end)
 {
     fio_file_t* const file = ctx->cur_reader;
-    const bool memory = FLVD_IsIndexInMemory(ctx);
-    if (!memory && __FLV_DMX__fioSeek64(file, ctx->keyframe_index.positions_offset, FIO_SEEK_SET) != 0)
-        return FLVD_Fail(ctx, FLVD_SITE_INDEX_FILE_SEEK);
-    flvd_positions_t positions = FLVD_Positions(ctx);
     int64_t last = 0;
-    if (!FLVD_ReadPositions(&positions, ctx->file_size, &last))
+    bool all_inside = false;
+    if (FLVD_FindLastInside(ctx, &last, &all_inside) != 0)
         return -1;
-    if (positions.read == positions.available)
+    if (all_inside)
         return FLVD_LastTagEnd(ctx, FLVD_SITE_INDEX_LAST_TAG, end);
     // The file is shorter than its index says.
     if (__FLV_DMX__fioSeek64(file, last, FIO_SEEK_SET) != 0)
-        return FLVD_Fail(ctx, memory ? FLVD_SITE_INDEX_MEMORY_SEEK : FLVD_SITE_INDEX_FILE_SEEK);
+        return FLVD_Fail(ctx, FLVD_IsIndexInMemory(ctx) ? FLVD_SITE_INDEX_MEMORY_SEEK : FLVD_SITE_INDEX_FILE_SEEK);
     flvd_tag_info_t tag;
     const bool found = FLVD_GetCurrTagInfo(ctx, file, &tag, FLVD_TAG_ANY, 1) == 0;
     return found ? FLVD_WalkToEnd(ctx, tag, end) : FLVD_StepBackToEnd(ctx, last, end);
-}
-
-// Cuts the entries behind the end of the valid data off. The entry that crosses it stays.
-int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end)
-{
-    flvd_keyframe_index_t& index = ctx->keyframe_index;
-    if (end == ctx->file_size)
-        return 0;
-    const bool memory = FLVD_IsIndexInMemory(ctx);
-    if (!memory && __FLV_DMX__fioSeek64(ctx->cur_reader, index.positions_offset, FIO_SEEK_SET) != 0)
-        return FLVD_Fail(ctx, FLVD_SITE_TRIM_POSITIONS_SEEK);
-    flvd_positions_t positions = FLVD_Positions(ctx);
-    int64_t last = 0;
-    if (end >= 1 && !FLVD_ReadPositions(&positions, end, &last))
-        return -1;
-    index.entry_count = std::min(index.entry_count, positions.read); // "times" may be the shorter array
-    return 0;
-}
-
-// Time of the last entry kept.
-int32_t FLVD_ReadLastKeyTime(flvd_ctx_t* ctx, uint32_t* time)
-{
-    const uint32_t count = ctx->keyframe_index.entry_count;
-    *time = 0;
-    if (FLVD_IsIndexInMemory(ctx)) {
-        const uint32_t usable = std::min(count, ctx->keyframe_arrays.times_count);
-        if (usable != 0)
-            *time = ctx->keyframe_arrays.times_ms[usable - 1];
-        return 0;
-    }
-    if (count == 0)
-        return 0;
-    if (__FLV_DMX__fioSeek64(ctx->cur_reader, ctx->keyframe_index.times_offset, FIO_SEEK_SET) != 0)
-        return FLVD_Fail(ctx, FLVD_SITE_TRIM_TIMES_SEEK);
-    double seconds = 0.0;
-    for (uint32_t i = 0; i < count; ++i) {
-        const FlvdElement element = FLVD_ReadElement(ctx->cur_reader, &seconds);
-        if (element == FlvdElement::ShortData)
-            return -1;
-        if (element == FlvdElement::NotANumber)
-            break;
-    }
-    *time = FLVD_SecondsToMs(seconds);
-    return 0;
-}
-
-int32_t FLVD_TrimIndex(flvd_ctx_t* ctx, int64_t end)
-{
-    if (FLVD_TrimEntries(ctx, end) != 0)
-        return -1;
-    uint32_t time = 0;
-    if (FLVD_ReadLastKeyTime(ctx, &time) != 0)
-        return -1;
-    ctx->last_keyframe_ms = time;
-    ctx->video_info.last_key_time_ms = time;
-    return 0;
 }
 
 // Backward walk: the largest timestamp of the last tags, until each stream was met.

@@ -1,0 +1,31 @@
+// The properties of script data that the library knows.
+#ifndef FLVDMX_META_KEYS_H
+#define FLVDMX_META_KEYS_H
+
+#include <cstdint>
+
+// The index of a key in the table is its identity.
+enum : uint32_t {
+    FLVD_META_KEY_TIMES,
+    FLVD_META_KEY_WIDTH,
+    FLVD_META_KEY_HEIGHT,
+    FLVD_META_KEY_DURATION,
+    FLVD_META_KEY_FILESIZE,
+    FLVD_META_KEY_FRAMERATE,
+    FLVD_META_KEY_KEYFRAMES,
+    FLVD_META_KEY_AUDIODELAY,
+    FLVD_META_KEY_AUDIODATARATE,
+    FLVD_META_KEY_FILEPOSITIONS,
+    FLVD_META_KEY_LASTTIMESTAMP,
+    FLVD_META_KEY_TOTALDURATION,
+    FLVD_META_KEY_AUDIOSAMPLERATE,
+    FLVD_META_KEY_AUDIOSAMPLESIZE,
+    FLVD_META_KEY_LASTKEYFRAMELOCATION,
+    FLVD_META_KEY_LASTKEYFRAMETIMESTAMP,
+    FLVD_META_KEY_NONE
+};
+
+// The key of this name in any case, or FLVD_META_KEY_NONE.
+uint32_t FLVD_FindKey(const uint8_t* name, uint32_t length);
+
+#endif
