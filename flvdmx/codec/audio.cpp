@@ -5,6 +5,7 @@
 #include "flvdmx/common/bytes.h"
 #include "flvdmx/common/format.h"
 #include "flvdmx/common/sites.h"
+#include "flvdmx/fio/fio.h"
 
 #include <algorithm>
 #include <iterator>
@@ -144,7 +145,7 @@ int32_t FLVD_ParseMpegAudioHeader(const uint8_t* data, int32_t length, flvd_audi
 int32_t FLVD_ProbeMp3(flvd_ctx_t* ctx, uint32_t format, flvd_site_t short_site, flvd_site_t header_site)
 {
     const uint8_t* tag = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&tag, FLVD_MP3_PEEK, ctx->cur_reader) < FLVD_MP3_PEEK)
+    if (FLVD_FioPeek(&tag, FLVD_MP3_PEEK, ctx->cur_reader) < FLVD_MP3_PEEK)
         return FLVD_FailShort(ctx, short_site);
     if (FLVD_ParseAudioHeader(static_cast<int32_t>(format), tag, FLVD_MP3_PEEK, &ctx->audio_info) != 0)
         return FLVD_Fail(ctx, header_site);
@@ -158,7 +159,7 @@ int32_t FLVD_ProbeAacConfig(flvd_ctx_t* ctx, uint32_t data_size)
     flvd_audio_info_t& info = ctx->audio_info;
     const uint8_t* tag = nullptr;
     const uint32_t size = data_size + FLVD_CODEC_BYTE;
-    if (__FLV_DMX__fioShowBytesByPtr(&tag, size, ctx->cur_reader) < size)
+    if (FLVD_FioPeek(&tag, size, ctx->cur_reader) < size)
         return FLVD_FailShort(ctx, FLVD_SITE_AAC_DATA);
     if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AAC_HEADER_SIZE))
         return FLVD_Fail(ctx, FLVD_SITE_AAC_MEMORY);
@@ -169,7 +170,7 @@ int32_t FLVD_ProbeAacConfig(flvd_ctx_t* ctx, uint32_t data_size)
 int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 {
     const uint8_t* tag = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&tag, FLVD_AAC_PEEK, ctx->cur_reader) < FLVD_AAC_PEEK)
+    if (FLVD_FioPeek(&tag, FLVD_AAC_PEEK, ctx->cur_reader) < FLVD_AAC_PEEK)
         return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
     const bool sequence_header = tag[FLVD_PACKET_TYPE] == FLVD_PACKET_SEQUENCE_HEADER;
     const int32_t result = sequence_header ? FLVD_ProbeAacConfig(ctx, FLVD_GetBE24(tag + FLVD_DATA_SIZE_FIELD)) : 0;
@@ -213,7 +214,7 @@ int32_t FLVD_ParseAudioHeader(int32_t format, const uint8_t* data, int32_t lengt
 int32_t FLVD_ProbeAudioTag(flvd_ctx_t* ctx)
 {
     const uint8_t* tag = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&tag, FLVD_AUDIO_PEEK, ctx->cur_reader) < FLVD_AUDIO_PEEK)
+    if (FLVD_FioPeek(&tag, FLVD_AUDIO_PEEK, ctx->cur_reader) < FLVD_AUDIO_PEEK)
         return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
     const uint8_t audio_byte = tag[FLVD_CODEC_BYTE];
     ctx->audio_format_filter = audio_byte;

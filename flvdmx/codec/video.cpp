@@ -5,6 +5,7 @@
 #include "flvdmx/common/bytes.h"
 #include "flvdmx/common/format.h"
 #include "flvdmx/common/sites.h"
+#include "flvdmx/fio/fio.h"
 
 #include <cstring>
 #include <iterator>
@@ -91,7 +92,7 @@ int32_t FLVD_ProbePicture(flvd_ctx_t* ctx, uint32_t codec, const char* fourcc, f
                           flvd_site_t header_site)
 {
     const uint8_t* tag = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&tag, FLVD_PICTURE_PEEK, ctx->cur_reader) < FLVD_PICTURE_PEEK)
+    if (FLVD_FioPeek(&tag, FLVD_PICTURE_PEEK, ctx->cur_reader) < FLVD_PICTURE_PEEK)
         return FLVD_FailShort(ctx, short_site);
     if (FLVD_ParseVideoHeader(static_cast<int32_t>(codec), tag + FLVD_VIDEO_PAYLOAD,
                               FLVD_PICTURE_PEEK - FLVD_VIDEO_PAYLOAD, &ctx->video_info) != 0)
@@ -106,7 +107,7 @@ int32_t FLVD_ProbeAvc(flvd_ctx_t* ctx, uint32_t data_size)
     flvd_video_info_t& info = ctx->video_info;
     const uint8_t* tag = nullptr;
     const uint32_t size = data_size + FLVD_CODEC_BYTE;
-    if (__FLV_DMX__fioShowBytesByPtr(&tag, size, ctx->cur_reader) < size)
+    if (FLVD_FioPeek(&tag, size, ctx->cur_reader) < size)
         return FLVD_FailShort(ctx, FLVD_SITE_AVC_DATA);
     if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AVC_HEADER_SIZE))
         return FLVD_Fail(ctx, FLVD_SITE_AVC_MEMORY);
@@ -170,7 +171,7 @@ int32_t FLVD_ParseVideoHeader(int32_t codec, const uint8_t* data, int32_t length
 int32_t FLVD_ProbeVideoTag(flvd_ctx_t* ctx)
 {
     const uint8_t* tag = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&tag, FLVD_VIDEO_PEEK, ctx->cur_reader) < FLVD_VIDEO_PEEK)
+    if (FLVD_FioPeek(&tag, FLVD_VIDEO_PEEK, ctx->cur_reader) < FLVD_VIDEO_PEEK)
         return FLVD_FailShort(ctx, FLVD_SITE_VIDEO_TAG);
     const uint8_t video_byte = tag[FLVD_CODEC_BYTE];
     ctx->video_codec_filter = video_byte;

@@ -51,7 +51,7 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
 
 // __FLV_DMX__fioShowBytesByPtr, without a call when the bytes are cached: most of the work on a frame is peeks and
 // skips. When it returns 0 because the file is being written, the pointer is not to be used.
-[[gnu::always_inline]] inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
+inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
         n = FLVD_FioRefill(file, n);
@@ -60,7 +60,7 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
 }
 
 // __FLV_DMX__fioSkipBytes in the same way. The bit reader's own skips do not come through here.
-[[gnu::always_inline]] inline uint32_t FLVD_FioSkip(uint32_t n, fio_file_t* file)
+inline uint32_t FLVD_FioSkip(uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
         return __FLV_DMX__fioSkipBytes(n, file);

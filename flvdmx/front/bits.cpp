@@ -37,7 +37,7 @@ void FLVD_BitRefill(fio_file_t* file)
     const auto left = static_cast<uint32_t>(file->bits_left);
     const uint32_t held = left / 8; // whole bytes behind the position that are in `bits` already
     const uint8_t* bytes = nullptr;
-    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, held + FLVD_BIT_REFILL / 8, file);
+    const uint32_t available = FLVD_FioPeek(&bytes, held + FLVD_BIT_REFILL / 8, file);
     const uint64_t word = FLVD_BitWord(bytes, held, available);
     file->bits |= word << (FLVD_BIT_REFILL - left);
     file->bits_left += static_cast<int32_t>(FLVD_BIT_REFILL);
@@ -63,7 +63,7 @@ void FLVD_BitConsume(fio_file_t* file, uint32_t n)
 int32_t __FLV_DMX__bitInit(fio_file_t* file)
 {
     const uint8_t* bytes = nullptr;
-    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_BIT_CACHE / 8, file);
+    const uint32_t available = FLVD_FioPeek(&bytes, FLVD_BIT_CACHE / 8, file);
     file->bits = uint64_t{FLVD_BitWord(bytes, 0, available)} << 32 | FLVD_BitWord(bytes, 4, available);
     file->bits_left = static_cast<int32_t>(FLVD_BIT_CACHE);
     return 1;

@@ -235,7 +235,7 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
 {
     fio_file_t* const reader = delivery.search.file;
     const bool at_end = FLVD_FioAtEnd(reader);
-    const int64_t position = __FLV_DMX__fioTell64(reader);
+    const int64_t position = FLVD_FioTell(reader);
     if (position < 0)
         return FLVD_SITE_FRAME_POSITION;
     *delivery.saved = position;

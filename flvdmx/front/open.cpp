@@ -3,6 +3,7 @@
 #include "flvdmx/front/front.h"
 
 #include "flvdmx/common/instance.h"
+#include "flvdmx/fio/fio.h"
 #include "flvdmx/fio/tables.h"
 #include "flvdmx/tag/tag.h"
 
@@ -102,7 +103,7 @@ bool FLVD_FindSignature(fio_file_t* file)
     uint32_t signature = __FLV_DMX__bitShowUBits(file, FLVD_SIGNATURE_BITS);
     for (uint32_t step = 0;; ++step) {
         const uint8_t* bytes = nullptr;
-        if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_HEADER_SIZE, file) < FLVD_HEADER_SIZE)
+        if (FLVD_FioPeek(&bytes, FLVD_HEADER_SIZE, file) < FLVD_HEADER_SIZE)
             return false;
         if (signature == FLVD_SIGNATURE || step == FLVD_SIGNATURE_STEPS)
             return true;
@@ -115,7 +116,7 @@ bool FLVD_MeasureFile(flvd_ctx_t* ctx)
 {
     if (__FLV_DMX__fioSeek64(ctx->main_reader, 0, FIO_SEEK_END) != 0)
         return false;
-    const int64_t size = __FLV_DMX__fioTell64(ctx->main_reader);
+    const int64_t size = FLVD_FioTell(ctx->main_reader);
     if (size < 0 || ctx->data_offset >= size)
         return false;
     ctx->file_size = size;

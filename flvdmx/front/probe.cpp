@@ -5,6 +5,7 @@
 
 #include "flvdmx/codec/codec.h"
 #include "flvdmx/common/instance.h"
+#include "flvdmx/fio/fio.h"
 #include "flvdmx/meta/keyframe_index.h"
 #include "flvdmx/tag/tag.h"
 
@@ -43,7 +44,7 @@ int32_t FLVD_ProbeTag(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t tag_typ
 // Reads a script tag whose header the reader stands on.
 int32_t FLVD_ProbeScript(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t data_size)
 {
-    __FLV_DMX__fioSkipBytes(FLVD_TAG_HEADER_SIZE, ctx->cur_reader);
+    FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, ctx->cur_reader);
     const int32_t result = FLVD_ReadMetadata(ctx, data_size);
     if (result == 0)
         probing->found |= FLVD_FOUND_METADATA;

@@ -36,7 +36,7 @@ void FLVD_NoteArray(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t seen, 
 {
     if ((state->flags & FLVD_META_IN_KEYFRAMES) == 0)
         return;
-    const int64_t position = __FLV_DMX__fioTell64(ctx->cur_reader);
+    const int64_t position = FLVD_FioTell(ctx->cur_reader);
     if (position < 0)
         return;
     state->flags |= seen;

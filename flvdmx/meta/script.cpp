@@ -287,7 +287,7 @@ uint64_t FLVD_ParseScriptValues(flvd_ctx_t* ctx, flvd_script_state_t* state, boo
 {
     uint64_t total = 0;
     *stopped = false;
-    while (!*stopped && total < state->length && __FLV_DMX__fioIsEof(ctx->cur_reader) == 0) {
+    while (!*stopped && total < state->length && !FLVD_FioAtEnd(ctx->cur_reader)) {
         const int32_t size = FLVD_ParseScriptValue(ctx, state);
         if (size > 0)
             total += static_cast<uint32_t>(size);
@@ -301,7 +301,7 @@ uint64_t FLVD_ParseScriptValues(flvd_ctx_t* ctx, flvd_script_state_t* state, boo
 
 int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length)
 {
-    const int64_t start = __FLV_DMX__fioTell64(ctx->cur_reader);
+    const int64_t start = FLVD_FioTell(ctx->cur_reader);
     if (start < 0 || length == 0)
         return -1;
     flvd_script_state_t state = {};

@@ -4,6 +4,7 @@
 
 #include "flvdmx/common/instance.h"
 #include "flvdmx/common/sites.h"
+#include "flvdmx/fio/fio.h"
 #include "flvdmx/meta/keyframe_index.h"
 #include "flvdmx/tag/tag.h"
 
@@ -39,7 +40,7 @@ int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, u
     if (__FLV_DMX__fioSeek64(ctx->main_reader, position, FIO_SEEK_SET) != 0)
         return FLVD_Fail(ctx, sites.seek);
     const uint8_t* bytes = nullptr;
-    if (__FLV_DMX__fioShowBytesByPtr(&bytes, FLVD_TAG_HEADER_SIZE, ctx->main_reader) < FLVD_TAG_HEADER_SIZE)
+    if (FLVD_FioPeek(&bytes, FLVD_TAG_HEADER_SIZE, ctx->main_reader) < FLVD_TAG_HEADER_SIZE)
         return FLVD_Fail(ctx, sites.tag_cut);
     const uint32_t timestamp = FLVD_TagTimestamp(bytes);
     if (FLVD_TimeDistance(timestamp, expected) > FLVD_INDEX_TOLERANCE_MS)

@@ -73,7 +73,7 @@ int32_t FLVD_Step(flvd_scan_t* scan, bool forward)
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
     for (scan->steps = 0;;) {
-        if (__FLV_DMX__fioIsEof(scan->file) != 0)
+        if (FLVD_FioAtEnd(scan->file))
             return scan->steps != 0 && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
         ++scan->steps;
         const int32_t code = FLVD_Step(scan, forward);
@@ -213,7 +213,7 @@ int32_t FLVD_SeekFromFirstTag(flvd_scan_t* scan)
 // Audio with a reader of its own starts where the video seek has put the main reader.
 int32_t FLVD_SeekAfterVideo(flvd_scan_t* scan)
 {
-    const int64_t position = __FLV_DMX__fioTell64(scan->ctx->main_reader);
+    const int64_t position = FLVD_FioTell(scan->ctx->main_reader);
     if (position < 0)
         return FLVD_Fail(scan->ctx, FLVD_SITE_AUDIO_FOLLOW_POSITION);
     if (__FLV_DMX__fioSeek64(scan->file, position, FIO_SEEK_SET) != 0)

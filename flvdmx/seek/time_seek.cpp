@@ -7,6 +7,7 @@
 
 #include "flvdmx/common/instance.h"
 #include "flvdmx/common/sites.h"
+#include "flvdmx/fio/fio.h"
 #include "flvdmx/tag/tag.h"
 
 namespace {
@@ -59,7 +60,7 @@ bool FLVD_SavePosition(fio_file_t* reader, int64_t* saved)
 {
     if (*saved != 0)
         return true;
-    const int64_t position = __FLV_DMX__fioTell64(reader);
+    const int64_t position = FLVD_FioTell(reader);
     if (position < 0)
         return false;
     *saved = position;
@@ -157,7 +158,7 @@ int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
     flvd_ctx_t* const ctx = seek.ctx;
     if (!FLVD_SavePosition(ctx->audio_reader, &ctx->saved_audio_pos))
         return FLVD_Fail(ctx, FLVD_SITE_SEEK_AUDIO_POSITION);
-    const int64_t position = __FLV_DMX__fioTell64(ctx->main_reader);
+    const int64_t position = FLVD_FioTell(ctx->main_reader);
     if (position < 0)
         return FLVD_Fail(ctx, FLVD_SITE_SEEK_FOLLOW_POSITION);
     if (__FLV_DMX__fioSeek64(ctx->audio_reader, position, FIO_SEEK_SET) != 0)

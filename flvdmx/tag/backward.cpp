@@ -73,7 +73,7 @@ int32_t FLVD_SearchBack(fio_file_t* file, const flvd_ctx_t* ctx, int64_t cursor,
             return FLVD_ERR_END_OF_DATA;
         case FlvdStepBack::Unwanted: {
             __FLV_DMX__fioSeek64(file, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_CUR);
-            const int64_t before = __FLV_DMX__fioTell64(file);
+            const int64_t before = FLVD_FioTell(file);
             if (before < 0 || before >= cursor) // a host whose seeks fail would go round for ever
                 return FLVD_ERR_NOT_FOUND;
             cursor = before;
@@ -97,7 +97,7 @@ int32_t FLVD_MoveToPrevTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* i
 {
     if (kind != nullptr)
         *kind = 0;
-    const int64_t position = __FLV_DMX__fioTell64(file);
+    const int64_t position = FLVD_FioTell(file);
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
     if (position <= ctx->data_offset)

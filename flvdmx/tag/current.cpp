@@ -28,7 +28,7 @@ bool FLVD_IsCachedAndValid(const fio_file_t* file, uint32_t data_size)
 
 bool FLVD_CheckPastData(fio_file_t* file, uint32_t data_size)
 {
-    __FLV_DMX__fioSkipBytes(data_size + FLVD_TAG_HEADER_SIZE, file);
+    FLVD_FioSkip(data_size + FLVD_TAG_HEADER_SIZE, file);
     const uint32_t quantum = file->read_size;
     const FLVD_ReadSizeGuard narrow(file, quantum > FLVD_NARROW_READ ? FLVD_BACK_POINTER_SIZE : quantum, quantum);
     const uint8_t* bytes = nullptr;

@@ -65,7 +65,7 @@ int64_t FLVD_ProbeFrom(const flvd_ctx_t* ctx, int64_t offset, int32_t whence, ui
 {
     if (__FLV_DMX__fioSeek64(ctx->cur_reader, offset, whence) != 0)
         return FLVD_NO_SEEK;
-    const int64_t cursor = __FLV_DMX__fioTell64(ctx->cur_reader);
+    const int64_t cursor = FLVD_FioTell(ctx->cur_reader);
     return cursor < 0 ? FLVD_NO_POSITION : FLVD_ProbeCursors(ctx, cursor, cursors);
 }
 
@@ -92,7 +92,7 @@ int64_t FLVD_Bisect(flvd_ctx_t* ctx)
 // End of the tag at the position, its PreviousTagSize included; negative when the position cannot be told.
 int64_t FLVD_TagEnd(fio_file_t* file, const flvd_tag_info_t& tag)
 {
-    const int64_t start = __FLV_DMX__fioTell64(file);
+    const int64_t start = FLVD_FioTell(file);
     return start < 0 ? start : start + tag.data_size + FLVD_TAG_OVERHEAD;
 }
 

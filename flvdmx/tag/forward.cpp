@@ -58,7 +58,7 @@ uint32_t FLVD_FindCandidate(const uint8_t* window, uint32_t starts, const flvd_t
 // FLVD_FindNextTag, telling a spent limit (FLVD_ERR_NOT_FOUND) from the end of the data (FLVD_ERR_END_OF_DATA).
 int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
 {
-    const FLVD_ReadSizeGuard whole(file, FLVD_WHOLE_CACHE, __FLV_DMX__fioGetCacheReadSize(file));
+    const FLVD_ReadSizeGuard whole(file, FLVD_WHOLE_CACHE, file->read_size);
     if (limit == 0)
         return FLVD_ERR_NOT_FOUND;
     if (ctx->cache_size < FLVD_TAG_PEEK_SIZE)
@@ -71,7 +71,7 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
     // call for each of many. With nothing cached the first look is a short one: the next false header is often near.
     const bool cached = file->count >= FLVD_TAG_PEEK_SIZE;
     uint32_t size = std::min(cached ? file->count : FLVD_FIRST_LOOK, ctx->cache_size);
-    __FLV_DMX__fioSetCacheReadSize(file, std::min(size, file->capacity));
+    FLVD_FioSetReadSize(file, std::min(size, file->capacity));
     int64_t scanned = 0;
     while (scanned < stop) {
         const uint8_t* window = nullptr;
@@ -86,7 +86,7 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
         if (found < starts)
             return scanned;
         size = ctx->cache_size;
-        __FLV_DMX__fioSetCacheReadSize(file, FLVD_WHOLE_CACHE);
+        FLVD_FioSetReadSize(file, FLVD_WHOLE_CACHE);
     }
     return FLVD_ERR_NOT_FOUND;
 }
@@ -110,7 +110,7 @@ void FLVD_Resynchronise(flvd_search_t* search)
 // and a host that lies could send it round for ever.
 bool FLVD_TakePosition(flvd_search_t* search)
 {
-    const int64_t position = __FLV_DMX__fioTell64(search->file);
+    const int64_t position = FLVD_FioTell(search->file);
     const bool taken = position >= search->position;
     search->position = position;
     return taken;
@@ -341,7 +341,7 @@ int32_t FLVD_MoveToNextTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* i
 {
     if (kind != nullptr)
         *kind = 0;
-    const int64_t position = __FLV_DMX__fioTell64(file);
+    const int64_t position = FLVD_FioTell(file);
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
     uint32_t checks_left = FLVD_FAILED_CHECKS_MAX;
