@@ -2,9 +2,8 @@
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
-#include "flvdmx/common/bytes.h"
-#include "flvdmx/common/format.h"
 #include "flvdmx/common/sites.h"
+#include "flvdmx/common/tag_header.h"
 #include "flvdmx/fio/fio.h"
 
 #include <algorithm>
@@ -13,9 +12,8 @@
 namespace {
 
 // How much of the tag is looked at.
-constexpr uint32_t FLVD_AUDIO_PEEK = 12; // tag header and audio byte
-constexpr uint32_t FLVD_AAC_PEEK = 13;   // and packet type
-constexpr uint32_t FLVD_MP3_PEEK = 16;   // tag header, audio byte and one MPEG frame header
+constexpr uint32_t FLVD_AUDIO_PEEK = FLVD_CODEC_BYTE_OFFSET + 1; // tag header and codec byte
+constexpr uint32_t FLVD_MP3_PEEK = 16;                           // tag header, audio byte and one MPEG frame header
 
 constexpr uint32_t FLVD_SAMPLE_BITS = 16; // whatever SoundSize says: it is the size after decoding
 
@@ -158,10 +156,11 @@ int32_t FLVD_ProbeAacConfig(flvd_ctx_t* ctx, uint32_t data_size)
 {
     flvd_audio_info_t& info = ctx->audio_info;
     const uint8_t* tag = nullptr;
-    const uint32_t size = data_size + FLVD_CODEC_BYTE;
+    const uint32_t size = data_size + FLVD_CODEC_BYTE_OFFSET;
     if (FLVD_FioPeek(&tag, size, ctx->cur_reader) < size)
         return FLVD_FailShort(ctx, FLVD_SITE_AAC_DATA);
-    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AAC_HEADER_SIZE))
+    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE_OFFSET, data_size,
+                            FLVD_AAC_HEADER_SIZE))
         return FLVD_Fail(ctx, FLVD_SITE_AAC_MEMORY);
     FLVD_ParseAudioSpecificConfig(info.config, info.config_size, &info);
     return 0;
@@ -170,10 +169,10 @@ int32_t FLVD_ProbeAacConfig(flvd_ctx_t* ctx, uint32_t data_size)
 int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 {
     const uint8_t* tag = nullptr;
-    if (FLVD_FioPeek(&tag, FLVD_AAC_PEEK, ctx->cur_reader) < FLVD_AAC_PEEK)
+    if (FLVD_FioPeek(&tag, FLVD_TAG_PEEK_SIZE, ctx->cur_reader) < FLVD_TAG_PEEK_SIZE)
         return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
-    const bool sequence_header = tag[FLVD_PACKET_TYPE] == FLVD_PACKET_SEQUENCE_HEADER;
-    const int32_t result = sequence_header ? FLVD_ProbeAacConfig(ctx, FLVD_GetBE24(tag + FLVD_DATA_SIZE_FIELD)) : 0;
+    const bool sequence_header = tag[FLVD_PACKET_TYPE_OFFSET] == FLVD_PACKET_SEQUENCE_HEADER;
+    const int32_t result = sequence_header ? FLVD_ProbeAacConfig(ctx, FLVD_GetBE24(tag + FLVD_DATA_SIZE_OFFSET)) : 0;
     if (result == 0)
         ctx->audio_info.format_tag = FLVD_AUDIO_TAG_AAC;
     return result;
@@ -216,7 +215,7 @@ int32_t FLVD_ProbeAudioTag(flvd_ctx_t* ctx)
     const uint8_t* tag = nullptr;
     if (FLVD_FioPeek(&tag, FLVD_AUDIO_PEEK, ctx->cur_reader) < FLVD_AUDIO_PEEK)
         return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
-    const uint8_t audio_byte = tag[FLVD_CODEC_BYTE];
+    const uint8_t audio_byte = tag[FLVD_CODEC_BYTE_OFFSET];
     ctx->audio_format_filter = audio_byte;
     flvd_audio_info_t& info = ctx->audio_info;
     info.sample_rate = g_flvd_soundRate[audio_byte >> 2u & 3u];

@@ -2,9 +2,8 @@
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
-#include "flvdmx/common/bytes.h"
-#include "flvdmx/common/format.h"
 #include "flvdmx/common/sites.h"
+#include "flvdmx/common/tag_header.h"
 #include "flvdmx/fio/fio.h"
 
 #include <cstring>
@@ -12,8 +11,7 @@
 
 namespace {
 
-constexpr uint32_t FLVD_VIDEO_PAYLOAD = FLVD_CODEC_BYTE + 1; // codecs without a packet type
-constexpr uint32_t FLVD_VIDEO_PEEK = 13;
+constexpr uint32_t FLVD_VIDEO_PAYLOAD = FLVD_CODEC_BYTE_OFFSET + 1; // codecs without a packet type
 constexpr uint32_t FLVD_PICTURE_PEEK = 128; // as much of the tag as a picture header is looked for in
 
 constexpr int32_t FLVD_VIDEO_HEADER_MIN = 8; // less is no header of any codec
@@ -106,10 +104,11 @@ int32_t FLVD_ProbeAvc(flvd_ctx_t* ctx, uint32_t data_size)
 {
     flvd_video_info_t& info = ctx->video_info;
     const uint8_t* tag = nullptr;
-    const uint32_t size = data_size + FLVD_CODEC_BYTE;
+    const uint32_t size = data_size + FLVD_CODEC_BYTE_OFFSET;
     if (FLVD_FioPeek(&tag, size, ctx->cur_reader) < size)
         return FLVD_FailShort(ctx, FLVD_SITE_AVC_DATA);
-    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE, data_size, FLVD_AVC_HEADER_SIZE))
+    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE_OFFSET, data_size,
+                            FLVD_AVC_HEADER_SIZE))
         return FLVD_Fail(ctx, FLVD_SITE_AVC_MEMORY);
     uint8_t parameters[FLVD_AVC_OUT_CAPACITY];
     const auto record_size = static_cast<int32_t>(info.config_size); // below DataSize, which has 24 bits
@@ -171,10 +170,10 @@ int32_t FLVD_ParseVideoHeader(int32_t codec, const uint8_t* data, int32_t length
 int32_t FLVD_ProbeVideoTag(flvd_ctx_t* ctx)
 {
     const uint8_t* tag = nullptr;
-    if (FLVD_FioPeek(&tag, FLVD_VIDEO_PEEK, ctx->cur_reader) < FLVD_VIDEO_PEEK)
+    if (FLVD_FioPeek(&tag, FLVD_TAG_PEEK_SIZE, ctx->cur_reader) < FLVD_TAG_PEEK_SIZE)
         return FLVD_FailShort(ctx, FLVD_SITE_VIDEO_TAG);
-    const uint8_t video_byte = tag[FLVD_CODEC_BYTE];
+    const uint8_t video_byte = tag[FLVD_CODEC_BYTE_OFFSET];
     ctx->video_codec_filter = video_byte;
-    return FLVD_ProbeCodec(ctx, video_byte & FLVD_CODEC_ID_MASK, tag[FLVD_PACKET_TYPE],
-                           FLVD_GetBE24(tag + FLVD_DATA_SIZE_FIELD));
+    return FLVD_ProbeCodec(ctx, video_byte & FLVD_CODEC_ID_MASK, tag[FLVD_PACKET_TYPE_OFFSET],
+                           FLVD_GetBE24(tag + FLVD_DATA_SIZE_OFFSET));
 }

@@ -4,19 +4,15 @@
 
 #include <cstdint>
 
-// A tag: header, DataSize bytes, and PreviousTagSize, the back-pointer, which is DataSize + 11 in a sound file.
+// A tag: header, DataSize bytes, and PreviousTagSize, the back-pointer, which is DataSize + 11 in a valid file.
 constexpr uint32_t FLVD_TAG_HEADER_SIZE = 11;
 constexpr uint32_t FLVD_BACK_POINTER_SIZE = 4;
 constexpr uint32_t FLVD_TAG_OVERHEAD = FLVD_TAG_HEADER_SIZE + FLVD_BACK_POINTER_SIZE; // beside its data
 
-// Offsets in a tag.
-constexpr uint32_t FLVD_DATA_SIZE_FIELD = 1; // 24 bits
-constexpr uint32_t FLVD_TIMESTAMP_FIELD = 4; // 24 bits, then TimestampExtended
-constexpr uint32_t FLVD_STREAM_ID_FIELD = 8; // 24 bits
-constexpr uint32_t FLVD_CODEC_BYTE = 11;     // first data byte: what the data is
-constexpr uint32_t FLVD_PACKET_TYPE = 12;    // AAC and AVC only
-
 // Codec byte of video: FrameType above CodecID.
+constexpr uint32_t FLVD_FRAME_TYPE_SHIFT = 4;
+enum : uint32_t { FLVD_FRAME_TYPE_KEY = 1, FLVD_FRAME_TYPE_GENERATED_KEY = 4 };
+constexpr uint32_t FLVD_CODEC_BYTE_MAX = 0x5F; // FrameType 5, any CodecID
 constexpr uint32_t FLVD_CODEC_ID_MASK = 0x0F;
 enum : uint32_t {
     FLVD_CODEC_JPEG = 1,

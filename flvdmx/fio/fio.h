@@ -38,6 +38,12 @@ inline void FLVD_FioDropBits(fio_file_t* file)
     file->bits = 0;
 }
 
+// The cached bytes at the position, file->count of them while reading.
+[[gnu::always_inline]] inline const uint8_t* FLVD_FioCached(const fio_file_t* file)
+{
+    return file->cache + file->head;
+}
+
 // Consumes n cached bytes, n being at most file->count.
 [[gnu::always_inline]] inline void FLVD_FioConsume(fio_file_t* file, uint32_t n)
 {
@@ -51,11 +57,11 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
 
 // __FLV_DMX__fioShowBytesByPtr, without a call when the bytes are cached: most of the work on a frame is peeks and
 // skips. When it returns 0 because the file is being written, the pointer is not to be used.
-inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
+[[gnu::always_inline]] inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
         n = FLVD_FioRefill(file, n);
-    *bytes = file->cache + file->head;
+    *bytes = FLVD_FioCached(file);
     return n;
 }
 

@@ -82,7 +82,7 @@ FlvdTurn FLVD_LeaveCutTag(const flvd_delivery_t& delivery, flvd_site_t seek_fail
 FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t left)
 {
     fio_file_t* const reader = delivery.search.file;
-    if (FLVD_FioSkip(left, reader) == left && FLVD_PassBackPointer(reader, tag.data_size))
+    if (FLVD_FioSkip(left, reader) == left && FLVD_SkipBackPointer(reader, tag.data_size))
         return FlvdTurn::Next;
     return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_without_back_pointer);
 }
@@ -127,7 +127,7 @@ bool FLVD_DeliverCached(const flvd_delivery_t& delivery, const flvd_found_tag_t&
     const uint32_t n = tag.data_size - tag.codec_header;
     if (tag.codec_header == 0 || tag.data_size <= tag.codec_header || n > ctx->frame_buffer_size)
         return false;
-    const uint8_t* const payload = reader->cache + reader->head + FLVD_TAG_HEADER_SIZE + tag.codec_header;
+    const uint8_t* const payload = FLVD_FioCached(reader) + FLVD_TAG_HEADER_SIZE + tag.codec_header;
     ctx->last_frame_size = n;
     FLVD_FioDropBits(reader);
     FLVD_FioConsume(reader, size); // first: nothing need be kept for after the copy; the bytes stay in the cache

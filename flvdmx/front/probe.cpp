@@ -87,7 +87,7 @@ flvd_site_t FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const
     if (tag.type == FLVD_TAG_TYPE_SCRIPT) {
         if (FLVD_ProbeScript(ctx, probing, tag.data_size) == FLVD_ERR_END_OF_DATA)
             return FLVD_SITE_OPEN_NO_STREAM;
-        FLVD_PassBackPointer(ctx->cur_reader, tag.data_size);
+        FLVD_SkipBackPointer(ctx->cur_reader, tag.data_size);
         return FLVD_SITE_NONE;
     }
     if (FLVD_ProbeTag(ctx, probing, tag.type) == FLVD_ERR_END_OF_DATA)

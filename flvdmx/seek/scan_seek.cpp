@@ -57,12 +57,6 @@ int32_t FLVD_Rewind(const flvd_scan_t* scan)
     return 0;
 }
 
-// True on an AVC tag that carries no picture.
-bool FLVD_IsPictureless(const flvd_tag_header_t& header)
-{
-    return header.IsVideo() && header.IsAvc() && FLVD_IsPicturelessPacket(header.second);
-}
-
 int32_t FLVD_Step(flvd_scan_t* scan, bool forward)
 {
     const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
@@ -85,7 +79,7 @@ int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
         flvd_tag_header_t header;
         if (!FLVD_PeekTagHeader(scan->file, &header))
             return FLVD_ERR_NOT_FOUND;
-        if (!FLVD_IsPictureless(header))
+        if (!header.IsPictureless())
             return 0;
     }
 }
@@ -187,7 +181,7 @@ bool FLVD_IsKeyframeSought(const flvd_scan_t* scan)
 {
     flvd_tag_header_t header;
     return scan->tag.timestamp == scan->target && FLVD_PeekTagHeader(scan->file, &header) && header.IsKeyframe() &&
-           !FLVD_IsPictureless(header);
+           !header.IsPictureless();
 }
 
 int64_t FLVD_EstimatePosition(const flvd_ctx_t* ctx, uint32_t target)

@@ -1,8 +1,6 @@
-// Forward navigation: the search for a tag, resynchronising after damage, stepping to the next tag.
+// Forward navigation: resynchronising after damage, the search for a tag, stepping to the next tag.
 
-#include "flvdmx/tag/tag.h"
-
-#include "flvdmx/fio/fio.h"
+#include "flvdmx/tag/search.h"
 
 #include <algorithm>
 
@@ -11,8 +9,8 @@ namespace {
 // Bytes read at first by a resynchronisation that finds nothing cached, whatever the cache holds.
 constexpr uint32_t FLVD_FIRST_LOOK = 4096;
 
-// Trusting mode takes a position only once in so many tags passed: it has no budget for them, and a host whose seek
-// does not move could send it round for ever.
+// The trusting search takes a position only once in so many tags passed: it has no budget for them, and a host whose
+// seek does not move could keep it busy for ever.
 constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x1000;
 
 // Results inside a search, beside those of the navigation functions.
@@ -26,21 +24,20 @@ struct flvd_search_t {
     fio_file_t* file;
     flvd_tag_rules_t rules;
     uint32_t wanted;
-    bool verify;                      // careful: back-pointers count, and the position of every tag is taken
     int32_t budget;                   // bytes that resynchronisation may still cross
     int64_t position;                 // the last position taken
     bool data_ended;                  // the last resynchronisation ran out of data, not out of budget
-    uint32_t passed;                  // trusting mode: unwanted tags
     uint32_t* checks_left;            // back-pointer checks that may still fail
-    const flvd_frame_search_t* frame; // for a frame request: some tags are delivered before they are checked
+    const flvd_frame_search_t* frame; // the request it is for: some of its tags are delivered before they are checked
 };
 
-flvd_search_t FLVD_MakeSearch(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted, bool verify, int64_t position,
+flvd_search_t FLVD_MakeSearch(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted, int64_t position,
                               uint32_t* checks_left)
 {
-    return {ctx,   file, FLVD_TagRules(ctx), wanted, verify, FLVD_RESYNC_WINDOW, position,
-            false, 0,    checks_left,        nullptr};
+    return {ctx, file, FLVD_TagRules(ctx), wanted, FLVD_RESYNC_WINDOW, position, false, checks_left, nullptr};
 }
+
+// Resynchronising.
 
 // Index of the first candidate among the starts of a window, or `starts` when there is none.
 uint32_t FLVD_FindCandidate(const uint8_t* window, uint32_t starts, const flvd_tag_rules_t& rules)
@@ -58,35 +55,33 @@ uint32_t FLVD_FindCandidate(const uint8_t* window, uint32_t starts, const flvd_t
 // FLVD_FindNextTag, telling a spent limit (FLVD_ERR_NOT_FOUND) from the end of the data (FLVD_ERR_END_OF_DATA).
 int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
 {
-    const FLVD_ReadSizeGuard whole(file, FLVD_WHOLE_CACHE, file->read_size);
     if (limit == 0)
         return FLVD_ERR_NOT_FOUND;
     if (ctx->cache_size < FLVD_TAG_PEEK_SIZE)
         return FLVD_ERR_END_OF_DATA;
+    constexpr uint32_t overlap = FLVD_TAG_PEEK_SIZE - 1; // the last bytes of a window begin the next one
     flvd_tag_rules_t rules = FLVD_TagRules(ctx);
     --rules.max_timestamp; // here alone the ceiling itself is out of reach; it is never 0
-    const uint32_t step = ctx->cache_size - (FLVD_TAG_PEEK_SIZE - 1); // the last 12 bytes begin the next window
-    const int64_t stop = int64_t{(limit - 1) / step} * step + step;   // the limit, in whole windows
-    // What is cached comes first: behind a false header that is nearly a window, and filling it up would cost a host
+    const uint32_t step = ctx->cache_size - overlap;
+    const int64_t stop = int64_t{(limit - 1) / step} * step + step; // the limit, in whole windows
+    // What is cached comes first: after a false header that is nearly a window, and filling it up would cost a host
     // call for each of many. With nothing cached the first look is a short one: the next false header is often near.
-    const bool cached = file->count >= FLVD_TAG_PEEK_SIZE;
-    uint32_t size = std::min(cached ? file->count : FLVD_FIRST_LOOK, ctx->cache_size);
-    FLVD_FioSetReadSize(file, std::min(size, file->capacity));
+    const uint32_t first = file->count >= FLVD_TAG_PEEK_SIZE ? file->count : FLVD_FIRST_LOOK;
+    uint32_t size = std::min(first, ctx->cache_size);
     int64_t scanned = 0;
     while (scanned < stop) {
+        const FLVD_ReadSizeGuard window_size(file, std::min(size, file->capacity), file->read_size);
         const uint8_t* window = nullptr;
         const uint32_t available = FLVD_FioPeek(&window, size, file);
         if (available < FLVD_TAG_PEEK_SIZE)
             return FLVD_ERR_END_OF_DATA;
-        const auto starts =
-            static_cast<uint32_t>(std::min<int64_t>(available - (FLVD_TAG_PEEK_SIZE - 1), stop - scanned));
+        const auto starts = static_cast<uint32_t>(std::min<int64_t>(available - overlap, stop - scanned));
         const uint32_t found = FLVD_FindCandidate(window, starts, rules);
         FLVD_FioSkip(found, file);
         scanned += found;
         if (found < starts)
             return scanned;
         size = ctx->cache_size;
-        FLVD_FioSetReadSize(file, FLVD_WHOLE_CACHE);
     }
     return FLVD_ERR_NOT_FOUND;
 }
@@ -98,7 +93,7 @@ void FLVD_ChargeScan(flvd_search_t* search, int64_t distance, int32_t failed_cos
     search->budget -= distance < 0 ? failed_cost : static_cast<int32_t>(std::min<int64_t>(distance, INT32_MAX));
 }
 
-// Resynchronisation step: from the byte behind the position to the next candidate. A failed one ends the search.
+// Resynchronisation step: from the byte after the position to the next candidate. A failed one ends the search.
 void FLVD_Resynchronise(flvd_search_t* search)
 {
     FLVD_FioSkip(1, search->file);
@@ -106,8 +101,10 @@ void FLVD_Resynchronise(flvd_search_t* search)
     FLVD_ChargeScan(search, distance, search->budget);
 }
 
+// Both searches.
+
 // Takes the position. False when the host cannot tell it, or tells one before the last: a search only moves forward,
-// and a host that lies could send it round for ever.
+// and a host that lies could keep it busy for ever.
 bool FLVD_TakePosition(flvd_search_t* search)
 {
     const int64_t position = FLVD_FioTell(search->file);
@@ -116,14 +113,61 @@ bool FLVD_TakePosition(flvd_search_t* search)
     return taken;
 }
 
-// The same behind a tag: it must have moved.
+// The same after a tag: it must have moved.
 bool FLVD_TakeLaterPosition(flvd_search_t* search)
 {
     const int64_t before = search->position;
     return FLVD_TakePosition(search) && search->position > before;
 }
 
-// Outcome of a back-pointer check. In place, the reader still stands on the tag; else it stands behind the tag's data.
+// Peeks the next header. 0, or why the search ends.
+int32_t FLVD_PeekNext(const flvd_search_t* search, flvd_tag_header_t* header)
+{
+    if (FLVD_FioAtEnd(search->file))
+        return FLVD_ERR_END_OF_DATA;
+    if (search->budget <= 0 || *search->checks_left == 0)
+        return FLVD_BUDGET_SPENT;
+    return FLVD_PeekTagHeader(search->file, header) ? 0 : FLVD_ERR_END_OF_DATA;
+}
+
+// What FLVD_GetCurrTagInfo returns for the result of a search.
+int32_t FLVD_TranslateSpent(const flvd_search_t* search, int32_t result)
+{
+    if (result != FLVD_BUDGET_SPENT)
+        return result;
+    return search->data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
+}
+
+// The trusting search: the header alone decides.
+
+// Moves past an unwanted tag by its size. `passed` counts them.
+bool FLVD_PassBySize(flvd_search_t* search, const flvd_tag_header_t& header, uint32_t* passed)
+{
+    const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
+    const bool moved = header.IsAudio() ? FLVD_FioSkip(size, search->file) == size
+                                        : __FLV_DMX__fioSeek64(search->file, size, FIO_SEEK_CUR) == 0;
+    return moved && (++*passed % FLVD_TAGS_PER_POSITION != 0 || FLVD_TakeLaterPosition(search));
+}
+
+// 0 with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
+int32_t FLVD_SearchTrusting(flvd_search_t* search, flvd_tag_header_t* header)
+{
+    for (uint32_t passed = 0;;) {
+        const int32_t result = FLVD_PeekNext(search, header);
+        if (result != 0)
+            return result;
+        if (!FLVD_IsPlausibleTag(search->rules, *header))
+            FLVD_Resynchronise(search);
+        else if (FLVD_IsWantedTag(*header, search->wanted))
+            return 0;
+        else if (!FLVD_PassBySize(search, *header, &passed))
+            return FLVD_ERR_END_OF_DATA;
+    }
+}
+
+// The careful search: back-pointers count, and the position of every tag is taken.
+
+// Outcome of a back-pointer check. In place, the reader still stands on the tag; else it stands after the tag's data.
 struct flvd_check_t {
     bool passed;
     bool in_place;
@@ -133,7 +177,7 @@ struct flvd_check_t {
 flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_info_t& tag)
 {
     fio_file_t* const file = search->file;
-    // Many muxers write a wrong size behind the first script tag, which they fill in at the end.
+    // Many muxers write a wrong size after the first script tag, which they fill in at the end.
     const bool exempt = tag.type == FLVD_TAG_TYPE_SCRIPT && search->position <= search->rules.first_tag;
     const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size <= file->capacity && file->read_size == file->capacity) {
@@ -141,7 +185,7 @@ flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_i
         const uint32_t first = FLVD_FioPeek(&bytes, size, file);
         if (first == size)
             return {FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, tag.data_size) || exempt, true};
-        // Where the data ends no more comes. Looking behind would cost a whole cache for each false header there.
+        // Where the data ends no more comes. Going past it would cost a whole cache for each false header there.
         if (FLVD_FioPeek(&bytes, size, file) == first)
             return {exempt, true};
     }
@@ -163,7 +207,7 @@ bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
     return true;
 }
 
-// Behind a sound tag: the next one, with the whole budget.
+// After a valid tag: the next one, with the whole budget.
 bool FLVD_PassGoodTag(flvd_search_t* search, bool in_place, const flvd_tag_info_t& tag)
 {
     FLVD_FioSkip(in_place ? tag.data_size + FLVD_TAG_OVERHEAD : FLVD_BACK_POINTER_SIZE, search->file);
@@ -177,72 +221,46 @@ bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_inf
     return check.passed ? FLVD_PassGoodTag(search, check.in_place, tag) : FLVD_PassBadTag(search, check.in_place);
 }
 
-// Careful mode: a plausible header at the position is taken when its back-pointer agrees and its kind is wanted.
-int32_t FLVD_TakeVerified(flvd_search_t* search, const flvd_tag_header_t& header)
+// A plausible header at the position is taken when its kind is wanted and its back-pointer agrees, or need not be asked
+// yet. 0, FLVD_UNCHECKED, FLVD_SEARCH_ON or FLVD_ERR_NOT_FOUND.
+int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& header)
 {
     if (!FLVD_TakePosition(search))
         return FLVD_ERR_NOT_FOUND;
-    if (search->frame != nullptr && FLVD_IsWantedTag(header, search->wanted) &&
-        FLVD_IsReadBeforeCheck(*search->frame, FLVD_CheckedTag(header)))
+    const bool wanted = FLVD_IsWantedTag(header, search->wanted);
+    if (wanted && search->frame != nullptr && FLVD_IsReadBeforeCheck(*search->frame, FLVD_CheckedTag(header)))
         return FLVD_UNCHECKED;
     const flvd_check_t check = FLVD_CheckBackPointer(search, header.info);
-    if (!check.passed || !FLVD_IsWantedTag(header, search->wanted))
+    if (!wanted || !check.passed)
         return FLVD_StepOver(search, check, header.info) ? FLVD_SEARCH_ON : FLVD_ERR_NOT_FOUND;
     const bool on_tag = check.in_place || __FLV_DMX__fioSeek64(search->file, search->position, FIO_SEEK_SET) == 0;
     return on_tag ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
-// Trusting mode: the header alone decides; an unwanted tag is passed by its size.
-int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& header)
-{
-    if (FLVD_IsWantedTag(header, search->wanted))
-        return 0;
-    const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
-    const bool moved = header.IsAudio() ? FLVD_FioSkip(size, search->file) == size
-                                        : __FLV_DMX__fioSeek64(search->file, size, FIO_SEEK_CUR) == 0;
-    if (!moved)
-        return FLVD_ERR_END_OF_DATA;
-    const bool goes_on = ++search->passed % FLVD_TAGS_PER_POSITION != 0 || FLVD_TakeLaterPosition(search);
-    return goes_on ? FLVD_SEARCH_ON : FLVD_ERR_END_OF_DATA;
-}
-
-// The search from the position on: 0 with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
-int32_t FLVD_SearchTag(flvd_search_t* search, flvd_tag_header_t* header)
+// 0 or FLVD_UNCHECKED with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
+int32_t FLVD_SearchCareful(flvd_search_t* search, flvd_tag_header_t* header)
 {
     for (;;) {
-        if (FLVD_FioAtEnd(search->file))
-            return FLVD_ERR_END_OF_DATA;
-        if (search->budget <= 0 || *search->checks_left == 0)
-            return FLVD_BUDGET_SPENT;
-        if (!FLVD_PeekTagHeader(search->file, header))
-            return FLVD_ERR_END_OF_DATA;
-        if (!FLVD_IsPlausibleTag(search->rules, *header)) {
-            FLVD_Resynchronise(search);
-            if (search->verify && !FLVD_TakePosition(search))
-                return FLVD_ERR_NOT_FOUND;
-            continue;
-        }
-        const int32_t result =
-            search->verify ? FLVD_TakeVerified(search, *header) : FLVD_TakePlausible(search, *header);
-        if (result != FLVD_SEARCH_ON)
+        int32_t result = FLVD_PeekNext(search, header);
+        if (result != 0)
             return result;
+        if (FLVD_IsPlausibleTag(search->rules, *header)) {
+            result = FLVD_TakePlausible(search, *header);
+            if (result != FLVD_SEARCH_ON)
+                return result;
+        } else {
+            FLVD_Resynchronise(search);
+            if (!FLVD_TakePosition(search))
+                return FLVD_ERR_NOT_FOUND;
+        }
     }
 }
 
-// The same with the results of FLVD_GetCurrTagInfo for a spent budget.
-int32_t FLVD_SearchHere(flvd_search_t* search, flvd_tag_header_t* header)
-{
-    const int32_t result = FLVD_SearchTag(search, header);
-    if (result != FLVD_BUDGET_SPENT)
-        return result;
-    return search->data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
-}
-
-// The same for a frame request.
-int32_t FLVD_SearchFrameTag(flvd_search_t* search, flvd_found_tag_t* tag)
+// The same with the results of FLVD_FindFrameTag.
+int32_t FLVD_TakeFrameTag(flvd_search_t* search, flvd_found_tag_t* tag)
 {
     flvd_tag_header_t header;
-    const int32_t result = FLVD_SearchHere(search, &header);
+    const int32_t result = FLVD_TranslateSpent(search, FLVD_SearchCareful(search, &header));
     if (result != 0 && result != FLVD_UNCHECKED)
         return result;
     *tag = FLVD_CheckedTag(header);
@@ -252,38 +270,33 @@ int32_t FLVD_SearchFrameTag(flvd_search_t* search, flvd_found_tag_t* tag)
     return 0;
 }
 
+// Stepping.
+
 uint32_t FLVD_VideoKind(const flvd_tag_header_t& header, uint32_t wanted)
 {
     if ((wanted & FLVD_TAG_KEYFRAME) != 0)
         return FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME;
     if ((wanted & FLVD_TAG_CONFIG) != 0 && header.IsAvc())
         return FLVD_TAG_VIDEO | FLVD_TAG_CONFIG;
-    uint32_t kind = FLVD_TAG_VIDEO;
-    if (header.IsKeyframe())
-        kind |= FLVD_TAG_KEYFRAME;
-    if (!header.IsAvc() || header.second == FLVD_PACKET_SEQUENCE_HEADER)
-        kind |= FLVD_TAG_CONFIG;
-    return kind;
-}
-
-uint32_t FLVD_AudioKind(const flvd_tag_header_t& header)
-{
-    const bool media = header.IsAac() && header.second != FLVD_PACKET_SEQUENCE_HEADER;
-    return media ? FLVD_TAG_AUDIO : FLVD_TAG_AUDIO | FLVD_TAG_CONFIG;
+    const uint32_t keyframe = header.IsKeyframe() ? FLVD_TAG_KEYFRAME : 0;
+    const uint32_t config = header.IsAvcConfigOrOther() ? FLVD_TAG_CONFIG : 0;
+    return FLVD_TAG_VIDEO | keyframe | config;
 }
 
 uint32_t FLVD_ForwardKind(const flvd_tag_header_t& header, uint32_t wanted)
 {
     if (header.IsVideo())
         return FLVD_VideoKind(header, wanted);
-    return header.IsAudio() ? FLVD_AudioKind(header) : uint32_t{FLVD_TAG_SCRIPT};
+    if (header.IsAudio())
+        return header.IsAacConfigOrOther() ? FLVD_TAG_AUDIO | FLVD_TAG_CONFIG : FLVD_TAG_AUDIO;
+    return FLVD_TAG_SCRIPT;
 }
 
 // Moves from the tag at the position to where the next search begins. 0, or the result to return.
 int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 {
-    if (search->position == search->ctx->data_offset) { // PreviousTagSize0: the first tag itself comes next
-        FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, search->file);
+    if (search->position == search->ctx->data_offset) { // the first tag itself comes next
+        FLVD_SkipFirstBackPointer(search->ctx, search->file, search->position);
         return FLVD_TakePosition(search) ? 0 : FLVD_ERR_NOT_FOUND;
     }
     flvd_tag_header_t header;
@@ -302,30 +315,31 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 } // namespace
 
 // Neither is inlined: most frames are found without them, and with few registers to save.
-[[gnu::noinline]] int32_t FLVD_SearchForFrame(flvd_frame_search_t* frame, int64_t position, flvd_found_tag_t* tag)
+[[gnu::noinline]] int32_t FLVD_SearchFrameTag(flvd_frame_search_t* frame, int64_t position, flvd_found_tag_t* tag)
 {
-    flvd_search_t search = FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, true, position, &frame->checks_left);
+    flvd_search_t search = FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, position, &frame->checks_left);
     search.frame = frame;
-    return FLVD_SearchFrameTag(&search, tag);
+    return FLVD_TakeFrameTag(&search, tag);
 }
 
 [[gnu::noinline]] int32_t FLVD_FindFrameTagAfterBad(flvd_frame_search_t* frame, flvd_found_tag_t* tag)
 {
-    flvd_search_t search =
-        FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, true, tag->start, &frame->checks_left);
+    flvd_search_t search = FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, tag->start, &frame->checks_left);
     search.budget = tag->budget;
-    return FLVD_PassBadTag(&search, false) ? FLVD_SearchFrameTag(&search, tag) : FLVD_ERR_NOT_FOUND;
+    return FLVD_PassBadTag(&search, false) ? FLVD_TakeFrameTag(&search, tag) : FLVD_ERR_NOT_FOUND;
 }
 
 int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
 {
-    const int64_t position = FLVD_StartOnTag(ctx, file);
+    const int64_t position = FLVD_FioTell(file);
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
+    FLVD_SkipFirstBackPointer(ctx, file, position);
     uint32_t checks_left = FLVD_FAILED_CHECKS_MAX;
-    flvd_search_t search = FLVD_MakeSearch(ctx, file, wanted, verify != 0, position, &checks_left);
+    flvd_search_t search = FLVD_MakeSearch(ctx, file, wanted, position, &checks_left);
     flvd_tag_header_t header;
-    const int32_t result = FLVD_SearchHere(&search, &header);
+    const int32_t found = verify != 0 ? FLVD_SearchCareful(&search, &header) : FLVD_SearchTrusting(&search, &header);
+    const int32_t result = FLVD_TranslateSpent(&search, found);
     if (result == 0)
         *info = header.info;
     return result;
@@ -345,11 +359,11 @@ int32_t FLVD_MoveToNextTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* i
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
     uint32_t checks_left = FLVD_FAILED_CHECKS_MAX;
-    flvd_search_t search = FLVD_MakeSearch(ctx, file, wanted, true, position, &checks_left);
+    flvd_search_t search = FLVD_MakeSearch(ctx, file, wanted, position, &checks_left);
     flvd_tag_header_t header;
     int32_t result = FLVD_LeaveCurrentTag(&search);
     if (result == 0)
-        result = FLVD_SearchTag(&search, &header);
+        result = FLVD_SearchCareful(&search, &header);
     if (result == FLVD_BUDGET_SPENT) {
         const bool ended = ctx->data_end - search.position < int64_t{FLVD_TAG_PEEK_SIZE};
         return ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;

@@ -1,6 +1,6 @@
 // Finding the tag of the next frame: what playing does for every frame.
 
-#include "flvdmx/tag/tag.h"
+#include "flvdmx/tag/search.h"
 
 namespace {
 
@@ -11,7 +11,7 @@ bool FLVD_IsNextWanted(const flvd_frame_search_t& search, flvd_tag_header_t* hea
     const fio_file_t* const file = search.file;
     if (file->count < FLVD_TAG_PEEK_SIZE || file->state != FIO_STATE_READ || file->read_size != file->capacity)
         return false;
-    *header = FLVD_ReadTagHeader(file->cache + file->head);
+    *header = FLVD_ReadTagHeader(FLVD_FioCached(file));
     return header->info.type != FLVD_TAG_TYPE_SCRIPT && FLVD_IsPlausibleTag(FLVD_TagRules(search.ctx), *header) &&
            FLVD_IsWantedTag(*header, search.wanted);
 }
@@ -20,8 +20,7 @@ bool FLVD_IsNextWanted(const flvd_frame_search_t& search, flvd_tag_header_t* hea
 bool FLVD_IsCachedAndValid(const fio_file_t* file, uint32_t data_size)
 {
     const uint32_t size = data_size + FLVD_TAG_OVERHEAD;
-    return size <= file->count &&
-           FLVD_IsBackPointer(file->cache + file->head + size - FLVD_BACK_POINTER_SIZE, data_size);
+    return size <= file->count && FLVD_IsBackPointer(FLVD_FioCached(file) + size - FLVD_BACK_POINTER_SIZE, data_size);
 }
 
 } // namespace
@@ -29,8 +28,8 @@ bool FLVD_IsCachedAndValid(const fio_file_t* file, uint32_t data_size)
 bool FLVD_CheckPastData(fio_file_t* file, uint32_t data_size)
 {
     FLVD_FioSkip(data_size + FLVD_TAG_HEADER_SIZE, file);
-    const uint32_t quantum = file->read_size;
-    const FLVD_ReadSizeGuard narrow(file, quantum > FLVD_NARROW_READ ? FLVD_BACK_POINTER_SIZE : quantum, quantum);
+    const uint32_t before = file->read_size;
+    const FLVD_ReadSizeGuard narrow(file, before > FLVD_NARROW_READ ? FLVD_BACK_POINTER_SIZE : before, before);
     const uint8_t* bytes = nullptr;
     return FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) == FLVD_BACK_POINTER_SIZE &&
            FLVD_IsBackPointer(bytes, data_size);
@@ -38,19 +37,18 @@ bool FLVD_CheckPastData(fio_file_t* file, uint32_t data_size)
 
 int32_t FLVD_FindFrameTag(flvd_frame_search_t* search, flvd_found_tag_t* tag)
 {
-    const int64_t position = FLVD_StartOnTag(search->ctx, search->file);
+    const int64_t position = FLVD_FioTell(search->file);
     if (position < 0)
         return FLVD_ERR_NOT_FOUND;
+    FLVD_SkipFirstBackPointer(search->ctx, search->file, position);
     flvd_tag_header_t header;
     if (!FLVD_IsNextWanted(*search, &header))
-        return FLVD_SearchForFrame(search, position, tag);
+        return FLVD_SearchFrameTag(search, position, tag);
     *tag = FLVD_CheckedTag(header);
     tag->checked = FLVD_IsCachedAndValid(search->file, tag->data_size);
     if (!tag->checked && !FLVD_IsReadBeforeCheck(*search, *tag))
-        return FLVD_SearchForFrame(search, position, tag);
+        return FLVD_SearchFrameTag(search, position, tag);
     tag->start = FLVD_FioTell(search->file);
     tag->budget = FLVD_RESYNC_WINDOW;
-    if (tag->start < position)
-        return FLVD_ERR_NOT_FOUND;
-    return 0;
+    return tag->start >= position ? 0 : FLVD_ERR_NOT_FOUND;
 }
