@@ -151,31 +151,25 @@ int32_t FLVD_ProbeMp3(flvd_ctx_t* ctx, uint32_t format, flvd_site_t short_site, 
     return 0;
 }
 
-// Copies and reads the AudioSpecificConfig of a sequence header.
-int32_t FLVD_ProbeAacConfig(flvd_ctx_t* ctx, uint32_t data_size)
+// Copies and reads the AudioSpecificConfig when the tag is a sequence header.
+int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 {
     flvd_audio_info_t& info = ctx->audio_info;
     const uint8_t* tag = nullptr;
-    const uint32_t size = data_size + FLVD_CODEC_BYTE_OFFSET;
-    if (FLVD_FioPeek(&tag, size, ctx->cur_reader) < size)
-        return FLVD_FailShort(ctx, FLVD_SITE_AAC_DATA);
-    if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE_OFFSET, data_size,
-                            FLVD_AAC_HEADER_SIZE))
-        return FLVD_Fail(ctx, FLVD_SITE_AAC_MEMORY);
-    FLVD_ParseAudioSpecificConfig(info.config, info.config_size, &info);
-    return 0;
-}
-
-int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
-{
-    const uint8_t* tag = nullptr;
     if (FLVD_FioPeek(&tag, FLVD_TAG_PEEK_SIZE, ctx->cur_reader) < FLVD_TAG_PEEK_SIZE)
         return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
-    const bool sequence_header = tag[FLVD_PACKET_TYPE_OFFSET] == FLVD_PACKET_SEQUENCE_HEADER;
-    const int32_t result = sequence_header ? FLVD_ProbeAacConfig(ctx, FLVD_GetBE24(tag + FLVD_DATA_SIZE_OFFSET)) : 0;
-    if (result == 0)
-        ctx->audio_info.format_tag = FLVD_AUDIO_TAG_AAC;
-    return result;
+    if (tag[FLVD_PACKET_TYPE_OFFSET] == FLVD_PACKET_SEQUENCE_HEADER) {
+        const uint32_t data_size = FLVD_GetBE24(tag + FLVD_DATA_SIZE_OFFSET);
+        const uint32_t size = FLVD_TAG_HEADER_SIZE + data_size;
+        if (FLVD_FioPeek(&tag, size, ctx->cur_reader) < size)
+            return FLVD_FailShort(ctx, FLVD_SITE_AAC_DATA);
+        if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_TAG_HEADER_SIZE, data_size,
+                                FLVD_AAC_HEADER_SIZE))
+            return FLVD_Fail(ctx, FLVD_SITE_AAC_MEMORY);
+        FLVD_ParseAudioSpecificConfig(info.config, info.config_size, &info);
+    }
+    info.format_tag = FLVD_AUDIO_TAG_AAC;
+    return 0;
 }
 
 int32_t FLVD_ProbeSoundFormat(flvd_ctx_t* ctx, uint8_t audio_byte)

@@ -138,11 +138,6 @@ void FLVD_SpsSkipScalingMatrix()
             FLVD_SpsSkipScalingList(i < FLVD_SCALING_LISTS_4X4 ? 16 : 64);
 }
 
-bool FLVD_IsHighProfile(uint32_t profile_idc)
-{
-    return profile_idc == 100 || profile_idc == 110 || profile_idc == 122 || profile_idc == 144;
-}
-
 // The fields of the high profiles. Returns chroma_format_idc.
 uint32_t FLVD_SpsReadHighProfile()
 {
@@ -237,7 +232,8 @@ int32_t FLVD_ParseH264SPS(flvd_video_info_t* info, const uint8_t* data, int32_t 
     const uint32_t profile_idc = FLVD_SpsGetBits(8);
     FLVD_SpsGetBits(8 + 8); // constraint flags, level_idc
     FLVD_SpsGetUE();        // seq_parameter_set_id
-    const uint32_t chroma_format_idc = FLVD_IsHighProfile(profile_idc) ? FLVD_SpsReadHighProfile() : FLVD_CHROMA_420;
+    const bool high = profile_idc == 100 || profile_idc == 110 || profile_idc == 122 || profile_idc == 144;
+    const uint32_t chroma_format_idc = high ? FLVD_SpsReadHighProfile() : FLVD_CHROMA_420;
     FLVD_SpsGetUE(); // log2_max_frame_num_minus4
     if (!FLVD_SpsSkipPictureOrder())
         return -1;

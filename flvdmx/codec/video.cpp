@@ -104,7 +104,7 @@ int32_t FLVD_ProbeAvc(flvd_ctx_t* ctx, uint32_t data_size)
 {
     flvd_video_info_t& info = ctx->video_info;
     const uint8_t* tag = nullptr;
-    const uint32_t size = data_size + FLVD_CODEC_BYTE_OFFSET;
+    const uint32_t size = FLVD_TAG_HEADER_SIZE + data_size;
     if (FLVD_FioPeek(&tag, size, ctx->cur_reader) < size)
         return FLVD_FailShort(ctx, FLVD_SITE_AVC_DATA);
     if (!FLVD_ReplaceConfig(&info.config, &info.config_size, tag + FLVD_CODEC_BYTE_OFFSET, data_size,

@@ -43,16 +43,6 @@ uint32_t FLVD_FioReadOver(fio_file_t* file, uint8_t* destination, uint32_t n)
     return FLVD_FioReadThroughCache(file, destination, n);
 }
 
-// Reads n bytes, nothing being cached. Returns what was missing.
-uint32_t FLVD_FioReadUncached(fio_file_t* file, uint8_t* destination, uint32_t n)
-{
-    if (n < file->read_size)
-        return FLVD_FioReadThroughCache(file, destination, n);
-    if (file->overread != 0)
-        return FLVD_FioReadOver(file, destination, n);
-    return n - FLVD_FioHostRead(file, destination, n);
-}
-
 void FLVD_FioPutPending(fio_file_t* file, const void* source, uint32_t n)
 {
     FLVD_FioCompact(file);
@@ -74,11 +64,19 @@ uint32_t FLVD_FioReadBytes(fio_file_t* file, uint8_t* destination, uint32_t n)
         __FLV_DMX__fioFlush(file);
     file->state = FIO_STATE_READ;
     FLVD_FioDropBits(file);
-    const uint32_t cached = std::min(n, file->count);
-    FLVD_FioTake(file, destination, cached);
-    if (n == cached && file->count != 0)
+    if (n < file->count) {
+        FLVD_FioTake(file, destination, n);
         return n;
-    return n - FLVD_FioReadUncached(file, destination + cached, n - cached);
+    }
+    const uint32_t cached = file->count;
+    FLVD_FioTake(file, destination, cached);
+    const uint32_t rest = n - cached;
+    destination += cached;
+    if (rest < file->read_size)
+        return n - FLVD_FioReadThroughCache(file, destination, rest);
+    if (file->overread != 0)
+        return n - FLVD_FioReadOver(file, destination, rest);
+    return cached + FLVD_FioHostRead(file, destination, rest);
 }
 
 uint32_t __FLV_DMX__fioShowBytesByCopy(void* destination, uint32_t n, fio_file_t* file)

@@ -48,19 +48,13 @@ bool FLVD_FioModeText(uint32_t mode, char (&text)[FIO_MODE_TEXT_MAX])
     return true;
 }
 
-// A cache of this size, or null, also when the sum does not fit 32 bits.
-uint8_t* FLVD_FioAllocateCache(uint32_t cache_size, uint32_t extra)
-{
-    if (extra > UINT32_MAX - cache_size)
-        return nullptr;
-    return static_cast<uint8_t*>(g_flvd_fioFuncs.mem_alloc(cache_size + extra));
-}
-
 // The object and its cache around an open handle. Without memory the handle is closed and null returned.
 fio_file_t* FLVD_FioAllocate(uint32_t cache_size, uint32_t extra, void* handle)
 {
     auto* const file = static_cast<fio_file_t*>(g_flvd_fioFuncs.mem_alloc(sizeof(fio_file_t)));
-    uint8_t* const cache = file != nullptr ? FLVD_FioAllocateCache(cache_size, extra) : nullptr;
+    const bool fits = extra <= UINT32_MAX - cache_size;
+    auto* const cache =
+        file != nullptr && fits ? static_cast<uint8_t*>(g_flvd_fioFuncs.mem_alloc(cache_size + extra)) : nullptr;
     if (cache != nullptr) {
         *file = fio_file_t{};
         file->handle = handle;

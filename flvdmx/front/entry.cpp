@@ -22,7 +22,7 @@ int32_t FLVD_TranslateError(int32_t result, int32_t error)
     return error == FLVD_ERR_NO_INSTANCE ? FLVD_RET_NO_INSTANCE : result;
 }
 
-int32_t FLVD_Open(flvd_ctx_t** handle, const void* init, void* info, bool for_info)
+int32_t FLVD_CallOpen(flvd_ctx_t** handle, const void* init, void* info, bool for_info)
 {
     if (handle == nullptr)
         return FLVD_RET_FAILED;
@@ -47,7 +47,7 @@ int32_t FLVD_OperateOnNothing(uint32_t operation)
     }
 }
 
-int32_t FLVD_Deliver(flvd_ctx_t* ctx, const void* request, void* frame)
+int32_t FLVD_CallGetFrame(flvd_ctx_t* ctx, const void* request, void* frame)
 {
     if (request == nullptr || frame == nullptr)
         return FLVD_RET_FAILED;
@@ -56,7 +56,7 @@ int32_t FLVD_Deliver(flvd_ctx_t* ctx, const void* request, void* frame)
     return result >= 0 ? result : FLVD_TranslateError(result, ctx->error);
 }
 
-int32_t FLVD_Seek(flvd_ctx_t* ctx, const void* arguments, void* reached)
+int32_t FLVD_CallSeek(flvd_ctx_t* ctx, const void* arguments, void* reached)
 {
     if (arguments == nullptr || reached == nullptr)
         return FLVD_RET_FAILED;
@@ -73,9 +73,9 @@ int32_t FLVD_Operate(uint32_t operation, flvd_ctx_t* ctx, const void* arg1, void
         return FLVD_OperateOnNothing(operation);
     switch (operation) {
     case FLVD_OP_GET_FRAME:
-        return FLVD_Deliver(ctx, arg1, arg2);
+        return FLVD_CallGetFrame(ctx, arg1, arg2);
     case FLVD_OP_SEEK:
-        return FLVD_Seek(ctx, arg1, arg2);
+        return FLVD_CallSeek(ctx, arg1, arg2);
     case FLVD_OP_CLOSE:
         FLVD_ReleaseInstance(ctx);
         return 0;
@@ -94,6 +94,6 @@ int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, v
     if (operation >= FLVD_OP_CLOSE && operation <= FLVD_OP_GET_LAST_ERROR)
         return FLVD_Operate(operation, handle != nullptr ? *handle : nullptr, arg1, arg2);
     if (operation == FLVD_OP_OPEN || operation == FLVD_OP_OPEN_INFO)
-        return FLVD_Open(handle, arg1, arg2, operation == FLVD_OP_OPEN_INFO);
+        return FLVD_CallOpen(handle, arg1, arg2, operation == FLVD_OP_OPEN_INFO);
     return FLVD_RET_FAILED;
 }

@@ -231,7 +231,7 @@ FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 
 // Saves the position before the next tag. At the end of what was there the seek clears the host's end flag: the file
 // may have grown since.
-flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
+flvd_site_t FLVD_BeginTurn(const flvd_delivery_t& delivery)
 {
     fio_file_t* const reader = delivery.search.file;
     const bool at_end = FLVD_FioAtEnd(reader);
@@ -246,7 +246,7 @@ flvd_site_t FLVD_SavePosition(const flvd_delivery_t& delivery)
 [[gnu::noinline]] FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
     flvd_frame_search_t& search = delivery->search;
-    const flvd_site_t site = FLVD_SavePosition(*delivery);
+    const flvd_site_t site = FLVD_BeginTurn(*delivery);
     if (site != FLVD_SITE_NONE)
         return FLVD_FailRequest(*delivery, site);
     flvd_tag_info_t info;
@@ -285,26 +285,6 @@ flvd_site_t FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
     }
 }
 
-void FLVD_TakeUserBuffer(flvd_ctx_t* ctx, const flvd_frame_request_t* request)
-{
-    if (!FLVD_HasUserBuffer(ctx))
-        return;
-    ctx->frame_buffer = request->buffer;
-    ctx->frame_buffer_size = request->buffer != nullptr ? request->buffer_size : 0;
-}
-
-// The tag loop.
-FlvdTurn FLVD_Deliver(flvd_delivery_t* delivery, flvd_frame_t* frame)
-{
-    for (uint32_t turns = 0; turns < FLVD_TAG_BUDGET; ++turns) {
-        const FlvdTurn turn =
-            delivery->growing ? FLVD_TurnGrowing(delivery, frame) : FLVD_TurnComplete(delivery, frame);
-        if (turn != FlvdTurn::Next)
-            return turn;
-    }
-    return FLVD_FailRequest(*delivery, FLVD_SITE_FRAME_END);
-}
-
 } // namespace
 
 int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd_frame_t* frame)
@@ -316,9 +296,18 @@ int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd
     const flvd_site_t refused = FLVD_ChooseStream(&delivery, request->stream);
     if (refused != FLVD_SITE_NONE)
         return FLVD_Fail(ctx, refused);
-    FLVD_TakeUserBuffer(ctx, request);
+    if (FLVD_HasUserBuffer(ctx)) {
+        ctx->frame_buffer = request->buffer;
+        ctx->frame_buffer_size = request->buffer != nullptr ? request->buffer_size : 0;
+    }
     *frame = {};
     if (delivery.growing && *delivery.saved != 0 && !FLVD_GoBack(delivery))
         return FLVD_Fail(ctx, FLVD_SITE_FRAME_RESUME);
-    return FLVD_Deliver(&delivery, frame) == FlvdTurn::Delivered ? 0 : -1;
+    for (uint32_t turns = 0; turns < FLVD_TAG_BUDGET; ++turns) {
+        const FlvdTurn turn =
+            delivery.growing ? FLVD_TurnGrowing(&delivery, frame) : FLVD_TurnComplete(&delivery, frame);
+        if (turn != FlvdTurn::Next)
+            return turn == FlvdTurn::Delivered ? 0 : -1;
+    }
+    return FLVD_Fail(ctx, FLVD_SITE_FRAME_END);
 }

@@ -41,24 +41,16 @@ void FLVD_SetFileFuncs(const flvd_init_t* init)
     __FLV_DMX__fioSetFunc(&funcs);
 }
 
-uint32_t FLVD_CacheSize(uint32_t word)
-{
-    return word == 0 ? FLVD_CACHE_DEFAULT : std::max(word, FLVD_CACHE_MIN);
-}
-
-uint32_t FLVD_ScanReadSize(uint32_t word, uint32_t cache_size)
-{
-    return std::min(word == 0 ? FLVD_SCAN_READ_DEFAULT : word, cache_size);
-}
-
 void FLVD_Configure(flvd_ctx_t* ctx, const flvd_init_t* init, bool for_info)
 {
     ctx->video_codec_filter = FLVD_ANY_CODEC;
     ctx->audio_format_filter = FLVD_ANY_CODEC;
     ctx->options = static_cast<uint32_t>(init->options); // the words are 32 bits wide in meaning
     ctx->opened_for_info = for_info ? 1 : 0;
-    ctx->cache_size = FLVD_CacheSize(static_cast<uint32_t>(init->cache_size));
-    ctx->scan_read_size = FLVD_ScanReadSize(static_cast<uint32_t>(init->scan_read_size), ctx->cache_size);
+    const auto cache_size = static_cast<uint32_t>(init->cache_size);
+    ctx->cache_size = cache_size == 0 ? FLVD_CACHE_DEFAULT : std::max(cache_size, FLVD_CACHE_MIN);
+    const auto scan_read_size = static_cast<uint32_t>(init->scan_read_size);
+    ctx->scan_read_size = std::min(scan_read_size == 0 ? FLVD_SCAN_READ_DEFAULT : scan_read_size, ctx->cache_size);
     ctx->file_info.file_name = init->file_name;
 }
 
@@ -84,15 +76,6 @@ flvd_site_t FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name)
         return FLVD_SITE_OPEN_FRAME_BUFFER;
     ctx->frame_buffer_size = FLVD_FRAME_BUFFER_SIZE;
     return FLVD_SITE_NONE;
-}
-
-// Everything of opening behind the allocation of the instance.
-flvd_site_t FLVD_Fill(flvd_ctx_t* ctx, const char* file_name, flvd_open_info_t* info)
-{
-    const flvd_site_t site = FLVD_Acquire(ctx, file_name);
-    if (site != FLVD_SITE_NONE)
-        return site;
-    return FLVD_ReadFileHeader(ctx) ? FLVD_ProbeStreams(ctx, info) : FLVD_SITE_OPEN_FILE_HEADER;
 }
 
 // Moves the bit reader to the first "FLV". After a MiB without one the bytes there are taken for a header all the same.
@@ -160,7 +143,9 @@ flvd_ctx_t* FLVD_OpenInstance(const flvd_init_t* init, flvd_open_info_t* info, b
     FLVD_Configure(ctx, init, for_info);
     FLVD_SetFileFuncs(init);
     FLVD_SetCallbackforMeta(init);
-    const flvd_site_t site = FLVD_Fill(ctx, init->file_name, info);
+    flvd_site_t site = FLVD_Acquire(ctx, init->file_name);
+    if (site == FLVD_SITE_NONE)
+        site = FLVD_ReadFileHeader(ctx) ? FLVD_ProbeStreams(ctx, info) : FLVD_SITE_OPEN_FILE_HEADER;
     if (site == FLVD_SITE_NONE)
         return ctx;
     FLVD_RecordGlobal(site, FLVD_IsGrowing(ctx));

@@ -143,14 +143,6 @@ bool FLVD_MeasureExtent(flvd_ctx_t* ctx)
     return true;
 }
 
-uint32_t FLVD_ByteRate(const flvd_ctx_t* ctx)
-{
-    if (ctx->duration_ms == 0 || ctx->data_end == INT64_MAX)
-        return 0;
-    const auto scaled = static_cast<int64_t>(static_cast<uint64_t>(ctx->data_end) << FLVD_BYTE_RATE_SHIFT);
-    return static_cast<uint32_t>(static_cast<uint64_t>(scaled / int64_t{ctx->duration_ms}));
-}
-
 void FLVD_DeriveDuration(flvd_ctx_t* ctx)
 {
     if (ctx->last_ts < ctx->first_ts) {
@@ -162,7 +154,9 @@ void FLVD_DeriveDuration(flvd_ctx_t* ctx)
         return;
     }
     ctx->duration_ms = ctx->last_ts - ctx->first_ts;
-    ctx->byte_rate = FLVD_ByteRate(ctx);
+    const bool known = ctx->duration_ms != 0 && ctx->data_end != INT64_MAX;
+    const auto scaled = static_cast<int64_t>(static_cast<uint64_t>(ctx->data_end) << FLVD_BYTE_RATE_SHIFT);
+    ctx->byte_rate = known ? static_cast<uint32_t>(static_cast<uint64_t>(scaled / int64_t{ctx->duration_ms})) : 0;
 }
 
 void FLVD_FillRecords(flvd_ctx_t* ctx, flvd_open_info_t* info)
@@ -183,13 +177,6 @@ void FLVD_FillRecords(flvd_ctx_t* ctx, flvd_open_info_t* info)
     }
 }
 
-bool FLVD_Rewind(flvd_ctx_t* ctx)
-{
-    if (FLVD_SeekToFirstTag(ctx, ctx->main_reader) != 0)
-        return false;
-    return !FLVD_HasAudioReader(ctx) || FLVD_SeekToFirstTag(ctx, ctx->audio_reader) == 0;
-}
-
 } // namespace
 
 flvd_site_t FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info)
@@ -200,7 +187,9 @@ flvd_site_t FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info)
     if (!FLVD_MeasureExtent(ctx))
         return FLVD_SITE_OPEN_EXTENT;
     FLVD_DeriveDuration(ctx);
-    if (!FLVD_Rewind(ctx))
+    if (FLVD_SeekToFirstTag(ctx, ctx->main_reader) != 0)
+        return FLVD_SITE_OPEN_REWIND;
+    if (FLVD_HasAudioReader(ctx) && FLVD_SeekToFirstTag(ctx, ctx->audio_reader) != 0)
         return FLVD_SITE_OPEN_REWIND;
     FLVD_FillRecords(ctx, info); // last: the records of an open that fails stay empty
     return FLVD_SITE_NONE;

@@ -50,27 +50,22 @@ int32_t FLVD_Answer(const flvd_scan_t* scan)
     return 0;
 }
 
-int32_t FLVD_Rewind(const flvd_scan_t* scan)
+int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
 {
     FLVD_SeekToFirstTag(scan->ctx, scan->file);
     *scan->result = scan->ctx->first_ts;
     return 0;
 }
 
-int32_t FLVD_Step(flvd_scan_t* scan, bool forward)
-{
-    const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
-    return step(scan->ctx, scan->file, &scan->tag, scan->kind, nullptr);
-}
-
 // Walks until the target is reached or passed. 0, or the code of the step that failed.
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
+    const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
     for (scan->steps = 0;;) {
         if (FLVD_FioAtEnd(scan->file))
             return scan->steps != 0 && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
         ++scan->steps;
-        const int32_t code = FLVD_Step(scan, forward);
+        const int32_t code = step(scan->ctx, scan->file, &scan->tag, scan->kind, nullptr);
         if (code != 0)
             return code;
         const bool reached = forward ? scan->tag.timestamp >= scan->target : scan->tag.timestamp <= scan->target;
@@ -103,7 +98,7 @@ int32_t FLVD_SeekForward(flvd_scan_t* scan)
     if (code == 0 && scan->backward && scan->tag.timestamp != scan->target) {
         code = FLVD_Walk(scan, false);
         if (code == FLVD_ERR_AT_FIRST_TAG)
-            return FLVD_Rewind(scan);
+            return FLVD_AnswerFirstTag(scan);
     }
     return code == 0 ? FLVD_Answer(scan) : FLVD_FailWalk(scan, code);
 }
@@ -118,7 +113,7 @@ int32_t FLVD_SeekFromStart(flvd_scan_t* scan)
 int32_t FLVD_EndBackwardWalk(flvd_scan_t* scan, int32_t code)
 {
     if (code == FLVD_ERR_AT_FIRST_TAG)
-        return scan->backward ? FLVD_Rewind(scan) : FLVD_SeekFromStart(scan);
+        return scan->backward ? FLVD_AnswerFirstTag(scan) : FLVD_SeekFromStart(scan);
     if (code == 0 && !scan->backward && scan->tag.timestamp != scan->target) {
         code = FLVD_Walk(scan, true);
         if (code == FLVD_ERR_END_OF_DATA)
@@ -176,14 +171,6 @@ int32_t FLVD_FirstTag(flvd_scan_t* scan, uint32_t kind, flvd_site_t site)
     return code == 0 || code == FLVD_ERR_AT_FIRST_TAG ? code : FLVD_ERR_NOT_FOUND;
 }
 
-// True when the tag at the position is itself the keyframe sought.
-bool FLVD_IsKeyframeSought(const flvd_scan_t* scan)
-{
-    flvd_tag_header_t header;
-    return scan->tag.timestamp == scan->target && FLVD_PeekTagHeader(scan->file, &header) && header.IsKeyframe() &&
-           !header.IsPictureless();
-}
-
 int64_t FLVD_EstimatePosition(const flvd_ctx_t* ctx, uint32_t target)
 {
     const uint64_t time = target > ctx->first_ts ? target - ctx->first_ts : 0;
@@ -192,7 +179,9 @@ int64_t FLVD_EstimatePosition(const flvd_ctx_t* ctx, uint32_t target)
 
 int32_t FLVD_SeekFromFirstTag(flvd_scan_t* scan)
 {
-    if (FLVD_IsKeyframeSought(scan))
+    flvd_tag_header_t header;
+    if (scan->tag.timestamp == scan->target && FLVD_PeekTagHeader(scan->file, &header) && header.IsKeyframe() &&
+        !header.IsPictureless())
         return FLVD_Answer(scan);
     switch (FLVD_Nearest(scan, scan->tag.timestamp)) {
     case FlvdNearest::Start:
@@ -214,7 +203,7 @@ int32_t FLVD_SeekAfterVideo(flvd_scan_t* scan)
         return FLVD_Fail(scan->ctx, FLVD_SITE_AUDIO_FOLLOW_SEEK);
     const int32_t code = FLVD_FirstTag(scan, FLVD_TAG_AUDIO, FLVD_SITE_AUDIO_FIRST_STEP);
     if (code == FLVD_ERR_AT_FIRST_TAG)
-        return FLVD_Rewind(scan);
+        return FLVD_AnswerFirstTag(scan);
     if (code != 0)
         return code;
     return scan->tag.timestamp == scan->target ? FLVD_Answer(scan) : FLVD_SeekFromTag(scan);
@@ -251,7 +240,7 @@ int32_t FLVD_RunVideoScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result
         return FLVD_Fail(ctx, FLVD_SITE_VIDEO_ESTIMATE);
     const int32_t code = FLVD_FirstTag(&scan, FLVD_TAG_VIDEO, FLVD_SITE_VIDEO_FIRST_STEP);
     if (code == FLVD_ERR_AT_FIRST_TAG)
-        return FLVD_Rewind(&scan);
+        return FLVD_AnswerFirstTag(&scan);
     return code == 0 ? FLVD_SeekFromFirstTag(&scan) : code;
 }
 

@@ -67,12 +67,6 @@ bool FLVD_SavePosition(fio_file_t* reader, int64_t* saved)
     return true;
 }
 
-void FLVD_ForgetPositions(flvd_ctx_t* ctx)
-{
-    ctx->saved_main_pos = 0;
-    ctx->saved_audio_pos = 0;
-}
-
 void FLVD_RestorePosition(fio_file_t* reader, int64_t* saved)
 {
     if (*saved != 0 && __FLV_DMX__fioSeek64(reader, *saved, FIO_SEEK_SET) == 0)
@@ -213,8 +207,10 @@ int32_t FLVD_Attempt(flvd_time_seek_t* seek, int32_t* result)
         return moved;
     }
     *result = static_cast<int32_t>(seek->reached - seek->ctx->first_ts);
-    if (!seek->growing || !FLVD_IsByZero(*seek)) // a growing file's tag that waits to be retried goes on waiting
-        FLVD_ForgetPositions(seek->ctx);
+    if (!seek->growing || !FLVD_IsByZero(*seek)) { // a growing file's tag that waits to be retried goes on waiting
+        seek->ctx->saved_main_pos = 0;
+        seek->ctx->saved_audio_pos = 0;
+    }
     return 0;
 }
 
