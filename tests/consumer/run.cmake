@@ -41,7 +41,7 @@ endforeach()
 
 run(pkg-config --cflags flvdmx)
 separate_arguments(flags UNIX_COMMAND "${output}")
-file(GLOB copied ${doc}/host/*.cpp)
+file(GLOB copied ${doc}/host/src/*.cpp)
 run(${CC} -std=c++17 -fsyntax-only -I${doc} ${flags} ${copied})
 
 unset(ENV{LD_LIBRARY_PATH})

@@ -2,7 +2,7 @@
 
 #include "flvdmx/memory_host.h"
 
-#include "host/adapter.h"
+#include "host/src/adapter.h"
 
 #include <algorithm>
 #include <cstdio>

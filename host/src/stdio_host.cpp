@@ -5,7 +5,7 @@
 
 #include "flvdmx/stdio_host.h"
 
-#include "host/adapter.h"
+#include "host/src/adapter.h"
 
 #include <cerrno>
 #include <cstdio>

@@ -2,7 +2,7 @@
 #ifndef FLVDMX_HOST_DESCRIPTOR_H
 #define FLVDMX_HOST_DESCRIPTOR_H
 
-#include "host/adapter.h"
+#include "host/src/adapter.h"
 
 #include <cerrno>
 #include <cstddef>

@@ -7,8 +7,8 @@
 
 #include "flvdmx/window_host.h"
 
-#include "host/adapter.h"
-#include "host/descriptor.h"
+#include "host/src/adapter.h"
+#include "host/src/descriptor.h"
 
 #include <algorithm>
 #include <cerrno>

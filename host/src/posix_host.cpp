@@ -5,8 +5,8 @@
 
 #include "flvdmx/posix_host.h"
 
-#include "host/adapter.h"
-#include "host/descriptor.h"
+#include "host/src/adapter.h"
+#include "host/src/descriptor.h"
 
 #include <cerrno>
 

@@ -3,9 +3,9 @@
 #define _FILE_OFFSET_BITS 64 // a 32-bit open() refuses files of 2 GiB and more
 #endif
 
-#include "host/descriptor.h"
+#include "host/src/descriptor.h"
 
-#include "host/adapter.h"
+#include "host/src/adapter.h"
 
 #include <cerrno>
 
