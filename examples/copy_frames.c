@@ -4,7 +4,7 @@
  * What comes out are bare frames: an MP3 stream plays as it is, AAC and AVC need their configuration beside it.
  */
 #include "flvdmx/flvdmx.h"
-#include "flvdmx/window_host.h"
+#include "flvdmx/posix_host.h"
 
 #include <inttypes.h>
 #include <stdio.h>
@@ -66,7 +66,7 @@ int main(int argc, char** argv)
         return 2;
     }
     stream = strcmp(argv[2], "video") == 0 ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
-    flvd_window_host_fill(&init); /* the fastest for playing a whole file */
+    flvd_posix_host_fill(&init); /* the fastest for playing a whole file */
     init.file_name = argv[1];
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &instance, &init, &info) != 0) {
         fprintf(stderr, "copy_frames: %s: error %" PRId32 ", line %" PRId32 "\n", argv[1], g_flvd_lLastError,

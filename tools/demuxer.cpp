@@ -9,7 +9,7 @@
 #include <fmt/core.h>
 #include <sys/stat.h>
 
-#include "flvdmx/window_host.h"
+#include "flvdmx/posix_host.h"
 #include "tools/crc32.h"
 #include "tools/time_text.h"
 
@@ -84,7 +84,7 @@ void RefusePipe(const std::string& path)
 std::string OpenFailureText(const std::string& path, int32_t code)
 {
     if (code == FLVD_ERR_OPEN_MAIN || code == FLVD_ERR_OPEN_AUDIO) {
-        const int error = flvd_window_host_open_error();
+        const int error = flvd_posix_host_open_error();
         return fmt::format("cannot be opened: {}", error != 0 ? std::strerror(error) : "no memory");
     }
     if (code == FLVD_ERR_FILE_HEADER)
@@ -113,7 +113,7 @@ Demuxer::Demuxer(const std::string& path, uint32_t options) : m_path(path)
 {
     RefusePipe(path);
     flvd_init_t init;
-    flvd_window_host_fill(&init);
+    flvd_posix_host_fill(&init);
     init.file_name = m_path.c_str();
     init.options = options;
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &m_instance, &init, &m_info) != 0)

@@ -41,8 +41,8 @@ endforeach()
 
 run(pkg-config --cflags flvdmx)
 separate_arguments(flags UNIX_COMMAND "${output}")
-file(GLOB copied ${doc}/host/src/*.cpp)
-run(${CC} -std=c++17 -fsyntax-only -I${doc} ${flags} ${copied})
+file(GLOB copied ${doc}/host/src/*.c)
+run(${CC} -std=c11 -fsyntax-only ${flags} ${copied})
 
 unset(ENV{LD_LIBRARY_PATH})
 run(${prefix}/bin/flvdmx info ${SAMPLE})
