@@ -40,7 +40,7 @@ set(doc_dir ${CMAKE_INSTALL_DATADIR}/doc/flvdmx)
 install(FILES ${PROJECT_SOURCE_DIR}/docs/host-guide.md ${PROJECT_SOURCE_DIR}/docs/damage.md
     DESTINATION ${doc_dir}/docs COMPONENT development)
 install(DIRECTORY ${PROJECT_SOURCE_DIR}/examples ${PROJECT_SOURCE_DIR}/host DESTINATION ${doc_dir} COMPONENT development
-    FILES_MATCHING PATTERN "*.c" PATTERN "*.cpp" PATTERN "host/include" EXCLUDE)
+    FILES_MATCHING PATTERN "*.c" PATTERN "*.cpp" PATTERN "*.h" PATTERN "host/include" EXCLUDE)
 
 file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/man)
 # flvdmx_install_man(PAGE COMPONENT): compressed without the time, so that the same sources give the same bytes.

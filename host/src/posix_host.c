@@ -9,11 +9,10 @@
 
 #include "flvdmx/posix_host.h"
 
-#include "flvdmx/stdio_host.h"
+#include "counted_file.h"
 
 #include <assert.h>
 #include <errno.h>
-#include <stdbool.h>
 #include <stdlib.h>
 #include <string.h>
 
@@ -31,10 +30,9 @@ enum {
 };
 
 typedef struct posix_file_t {
+    counted_file_t counted;
     int descriptor;
-    bool end;              /* a read met the end of the file and no seek followed */
     bool large;            /* the last read did not go through the window */
-    int64_t position;      /* what the library sees */
     int64_t descriptor_at; /* where the descriptor stands */
     int64_t file_end;      /* where it was when the library last asked for it */
     int64_t start;         /* of the window in the file */
@@ -65,9 +63,18 @@ static int open_descriptor(const char* path)
     return descriptor;
 }
 
+static int64_t size_of(void* handle)
+{
+    posix_file_t* const file = handle;
+    const int64_t size = lseek(file->descriptor, 0, SEEK_END);
+    if (size >= 0)
+        file->descriptor_at = file->file_end = size;
+    return size;
+}
+
 static void* open_file(const char* path, const char* mode)
 {
-    if (mode[0] != 'r' || strchr(mode, '+') != NULL) {
+    if (!flvd_counted_only_reads(mode)) {
         open_error = EACCES;
         return NULL;
     }
@@ -82,6 +89,7 @@ static void* open_file(const char* path, const char* mode)
         close(descriptor);
         return NULL;
     }
+    file->counted.size = size_of;
     file->descriptor = descriptor;
     return file;
 }
@@ -107,7 +115,7 @@ static uint32_t read_at(posix_file_t* file, int64_t from, char* to, uint32_t lea
         if (got < 0 && errno == EINTR)
             continue;
         if (got == 0)
-            file->end = true;
+            file->counted.end = true;
         if (got <= 0)
             break;
         done += (uint32_t)got; /* at most `most` */
@@ -120,21 +128,21 @@ static uint32_t read_at(posix_file_t* file, int64_t from, char* to, uint32_t lea
 /* Copies what the window holds at the position, and moves past it. */
 static uint32_t take_from_window(posix_file_t* file, char* to, uint32_t wanted)
 {
-    const int64_t offset = file->position - file->start;
+    const int64_t offset = file->counted.position - file->start;
     if (offset < 0 || offset >= file->count)
         return 0;
     const uint32_t at = (uint32_t)offset; /* below WINDOW */
     const uint32_t n = least_of(wanted, file->count - at);
     memcpy(to, file->window + at, n);
-    file->position += n;
+    file->counted.position += n;
     return n;
 }
 
 /* True where the library steps backward: before the window, and from the end of the file. */
 static bool is_way_back(const posix_file_t* file)
 {
-    const int64_t left = file->file_end - file->position;
-    return file->position < file->start || (left > 0 && left < WINDOW / 2);
+    const int64_t left = file->file_end - file->counted.position;
+    return file->counted.position < file->start || (left > 0 && left < WINDOW / 2);
 }
 
 /*
@@ -143,11 +151,11 @@ static bool is_way_back(const posix_file_t* file)
  */
 static void move_window(posix_file_t* file, uint32_t wanted)
 {
-    const uint32_t room = file->position < WINDOW / 2 ? (uint32_t)file->position : WINDOW / 2;
+    const uint32_t room = file->counted.position < WINDOW / 2 ? (uint32_t)file->counted.position : WINDOW / 2;
     const uint32_t before = is_way_back(file) ? room : 0;
     const uint32_t least = before + wanted;
     const uint32_t between = least > BETWEEN_LARGE ? least : BETWEEN_LARGE;
-    const int64_t start = file->position - before;
+    const int64_t start = file->counted.position - before;
     const uint32_t got = read_at(file, start, file->window, least, file->large ? between : WINDOW);
     file->large = false;
     if (got == 0)
@@ -169,84 +177,23 @@ static uint32_t read_file(void* buffer, uint32_t size, uint32_t count, void* han
     const uint32_t rest = wanted - done;
     if (rest == 0)
         return done;
-    const bool is_beyond = wanted <= BACK_POINTER && file->position > file->start + file->count;
+    const bool is_beyond = wanted <= BACK_POINTER && file->counted.position > file->start + file->count;
     if (rest < WINDOW / 2 && !is_beyond) {
         move_window(file, rest);
         return done + take_from_window(file, to + done, rest);
     }
-    const uint32_t got = read_at(file, file->position, to + done, rest, rest);
-    file->position += got;
+    const uint32_t got = read_at(file, file->counted.position, to + done, rest, rest);
+    file->counted.position += got;
     file->large = !is_beyond;
     return done + got;
 }
 
-static uint32_t write_file(const void* buffer, uint32_t size, uint32_t count, void* handle)
-{
-    (void)buffer, (void)size, (void)count, (void)handle;
-    return 0;
-}
-
-static int32_t seek64(void* handle, int64_t offset, int32_t whence)
-{
-    posix_file_t* const file = handle;
-    int64_t base = 0;
-    if (whence == FIO_SEEK_CUR)
-        base = file->position;
-    else if (whence == FIO_SEEK_END)
-        base = lseek(file->descriptor, 0, SEEK_END);
-    else if (whence != FIO_SEEK_SET)
-        return -1;
-    if (base < 0)
-        return -1;
-    if (whence == FIO_SEEK_END)
-        file->descriptor_at = file->file_end = base;
-    if (offset > INT64_MAX - base || base + offset < 0)
-        return -1;
-    file->position = base + offset;
-    file->end = false;
-    return 0;
-}
-
-static int64_t tell64(void* handle)
-{
-    return ((posix_file_t*)handle)->position;
-}
-
-static int32_t seek(void* handle, int32_t offset, int32_t whence)
-{
-    return seek64(handle, offset, whence);
-}
-
-static int32_t tell(void* handle)
-{
-    const int64_t position = tell64(handle);
-    return position > INT32_MAX ? -1 : (int32_t)position;
-}
-
-static int32_t is_at_end(void* handle)
-{
-    return ((posix_file_t*)handle)->end;
-}
-
-static int32_t flush(void* handle)
-{
-    (void)handle;
-    return 0;
-}
-
 void flvd_posix_host_fill(flvd_init_t* init)
 {
-    flvd_stdio_host_fill(init); /* for the memory functions; all file functions are replaced */
+    flvd_counted_fill(init);
     init->file_open = open_file;
     init->file_read = read_file;
-    init->file_seek = seek;
-    init->file_tell = tell;
     init->file_close = close_file;
-    init->file_eof = is_at_end;
-    init->file_flush = flush;
-    init->file_write = write_file;
-    init->file_seek64 = seek64;
-    init->file_tell64 = tell64;
 }
 
 int flvd_posix_host_open_error(void)
