@@ -4,16 +4,14 @@
 
 #include "flvdmx/posix_host.h"
 #include "flvdmx/stdio_host.h"
-#include "flvdmx/window_host.h"
 
 #include <algorithm>
 
 namespace flvd_bench {
 
-const std::array<HostKind, 3> g_hosts = {{
+const std::array<HostKind, 2> g_hosts = {{
     {"stdio", flvd_stdio_host_fill},
     {"posix", flvd_posix_host_fill},
-    {"window", flvd_window_host_fill},
 }};
 
 flvd_init_t MakeHost(const HostKind& kind, uint32_t options)

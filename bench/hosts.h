@@ -15,8 +15,8 @@ struct HostKind {
     void (*fill)(flvd_init_t*);
 };
 
-/** C streams, descriptors, descriptors with a window. */
-extern const std::array<HostKind, 3> g_hosts;
+/** C streams, POSIX descriptors with a window. */
+extern const std::array<HostKind, 2> g_hosts;
 
 flvd_init_t MakeHost(const HostKind& kind, uint32_t options = 0);
 

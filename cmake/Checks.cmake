@@ -16,7 +16,7 @@ add_test(NAME format COMMAND ${CLANG_FORMAT} --dry-run -Werror ${sources} WORKIN
 # Sources of the folders that this build compiles; headers are checked with the sources that include them. The tests
 # and the bench go without the path-sensitive analyzer: it takes minutes for the macros of one test file and finds fault
 # with Google Benchmark's, and the tests run with the sanitizers anyway.
-list(FILTER sources INCLUDE REGEX "\\.cpp$")
+list(FILTER sources INCLUDE REGEX "\\.c(pp)?$")
 foreach(source IN LISTS sources)
     string(REGEX REPLACE "/.*" "" folder ${source})
     if(NOT EXISTS ${PROJECT_SOURCE_DIR}/${folder}/CMakeLists.txt)

@@ -15,10 +15,10 @@ install(TARGETS flvdmx EXPORT flvdmx
 install(TARGETS flvdmx-host EXPORT flvdmx
     ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT development
     INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
-install(FILES ${PROJECT_SOURCE_DIR}/flvdmx/flvdmx.h ${PROJECT_SOURCE_DIR}/flvdmx/flvdmx.hpp
+install(FILES ${PROJECT_SOURCE_DIR}/flvdmx/flvdmx.h
     DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/flvdmx COMPONENT development)
-install(DIRECTORY ${PROJECT_SOURCE_DIR}/host/flvdmx DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT development
-    FILES_MATCHING PATTERN "*_host.h")
+install(DIRECTORY ${PROJECT_SOURCE_DIR}/host/include/flvdmx
+    DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT development)
 
 install(EXPORT flvdmx NAMESPACE flvdmx:: FILE flvdmxTargets.cmake DESTINATION ${package_dir} COMPONENT development)
 configure_package_config_file(${PROJECT_SOURCE_DIR}/cmake/flvdmxConfig.cmake.in ${PROJECT_BINARY_DIR}/flvdmxConfig.cmake
@@ -40,7 +40,7 @@ set(doc_dir ${CMAKE_INSTALL_DATADIR}/doc/flvdmx)
 install(FILES ${PROJECT_SOURCE_DIR}/docs/host-guide.md ${PROJECT_SOURCE_DIR}/docs/damage.md
     DESTINATION ${doc_dir}/docs COMPONENT development)
 install(DIRECTORY ${PROJECT_SOURCE_DIR}/examples ${PROJECT_SOURCE_DIR}/host DESTINATION ${doc_dir} COMPONENT development
-    FILES_MATCHING PATTERN "*.c" PATTERN "*.cpp" PATTERN "*.h" PATTERN "host/flvdmx" EXCLUDE)
+    FILES_MATCHING PATTERN "*.c" PATTERN "*.cpp" PATTERN "*.h" PATTERN "host/include" EXCLUDE)
 
 file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/man)
 # flvdmx_install_man(PAGE COMPONENT): compressed without the time, so that the same sources give the same bytes.

@@ -3,9 +3,10 @@
 
 find_package(Python3 REQUIRED COMPONENTS Interpreter)
 
-set(header_flags ${FLVDMX_WARNINGS} -pedantic -fsyntax-only -I${PROJECT_SOURCE_DIR} -I${PROJECT_SOURCE_DIR}/host)
-foreach(header IN ITEMS flvdmx/flvdmx.h flvdmx/flvdmx.hpp flvdmx/stdio_host.h flvdmx/memory_host.h flvdmx/posix_host.h
-        flvdmx/window_host.h)
+set(header_flags ${FLVDMX_WARNINGS} -pedantic -fsyntax-only -I${PROJECT_SOURCE_DIR} -I${PROJECT_SOURCE_DIR}/host/include)
+file(GLOB headers CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR}/host/include
+    ${PROJECT_SOURCE_DIR}/host/include/flvdmx/*)
+foreach(header IN LISTS headers ITEMS flvdmx/flvdmx.h)
     if(header MATCHES "\\.h$")
         add_test(NAME ${FLVDMX_TEST_PREFIX}c11/${header}
             COMMAND ${CMAKE_C_COMPILER} -std=c11 ${header_flags} -Wstrict-prototypes -include ${header} -x c /dev/null)

@@ -28,12 +28,13 @@ add_test(NAME manuals COMMAND ${MANDOC} -T lint -W warning ${manuals}/flvdmx.1 $
 
 # The binary interface against the one that was released. New functions are no break; `abi-dump` takes changes in.
 target_compile_options(flvdmx PRIVATE -g) # changes no code; packages are stripped
-add_library(flvdmx-behind SHARED packaging/abi/behind_pointers.cpp)
-flvdmx_target(flvdmx-behind)
-target_compile_options(flvdmx-behind PRIVATE -g)
-target_include_directories(flvdmx-behind PRIVATE ${PROJECT_SOURCE_DIR})
+add_library(flvdmx-argument-types SHARED packaging/abi/argument_types.cpp)
+flvdmx_target(flvdmx-argument-types)
+target_compile_options(flvdmx-argument-types PRIVATE -g)
+target_include_directories(flvdmx-argument-types PRIVATE ${PROJECT_SOURCE_DIR})
+set_target_properties(flvdmx-argument-types PROPERTIES LIBRARY_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/abi)
 add_custom_target(abi-dump)
-foreach(target IN ITEMS flvdmx flvdmx-behind)
+foreach(target IN ITEMS flvdmx flvdmx-argument-types)
     set(dump ${PROJECT_SOURCE_DIR}/packaging/abi/lib${target}.${CMAKE_LIBRARY_ARCHITECTURE}.abi)
     add_custom_command(TARGET abi-dump VERBATIM COMMAND ${ABIDW} --exported-interfaces-only
         --drop-undefined-syms --no-elf-needed --no-show-locs --no-comp-dir-path --no-corpus-path

@@ -12,7 +12,7 @@ file(CONFIGURE OUTPUT ${PROJECT_BINARY_DIR}/readme_example.c CONTENT "${example}
 
 add_executable(readme-example ${PROJECT_BINARY_DIR}/readme_example.c)
 flvdmx_target(readme-example)
-target_link_libraries(readme-example PRIVATE flvdmx)
+target_link_libraries(readme-example PRIVATE flvdmx-host)
 add_test(NAME ${FLVDMX_TEST_PREFIX}readme_example
     COMMAND readme-example ${PROJECT_BINARY_DIR}/dead_tags.flv)
 set_tests_properties(${FLVDMX_TEST_PREFIX}readme_example PROPERTIES PASS_REGULAR_EXPRESSION "\n172 frames, at the end")

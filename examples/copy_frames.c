@@ -1,41 +1,27 @@
 /*
- * Copies the frames of one stream to a file, one behind the other: copy_frames FILE video|audio OUTPUT
+ * Copies the frames of one stream to a file, one after the other: copy_frames FILE video|audio OUTPUT
  *
- * What comes out are bare frames: an MP3 stream plays as it is, AAC and AVC need their configuration beside it.
+ * What comes out are bare frames: an MP3 stream plays as it is, AAC and AVC need their configuration as well.
  */
+#include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
-#include "flvdmx/window_host.h"
+#include "flvdmx/next_frame.h"
+#include "flvdmx/posix_host.h"
 
 #include <inttypes.h>
 #include <stdio.h>
 #include <string.h>
 
-/*
- * Takes the next frame, of both streams, as the file has one reader. A request ends after 102 tags without a frame,
- * inside the file: it is asked again while that leads on.
- */
-static int32_t next_frame(flvd_ctx_t* instance, flvd_frame_t* frame)
-{
-    const flvd_frame_request_t request = {NULL, 0, 0};
-    int64_t reached = -1;
-    for (;;) {
-        const int32_t result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &instance, &request, frame);
-        const int64_t position = __FLV_DMX__fioTell64(instance->main_reader);
-        if (result != FLVD_RET_END || position <= reached || position >= instance->data_end)
-            return result;
-        reached = position;
-    }
-}
-
 /* Until the data ends. 0, or a complaint printed. */
 static int copy_stream(flvd_ctx_t* instance, uint32_t stream, FILE* output)
 {
+    const flvd_frame_request_t request = {NULL, 0, 0}; /* whatever comes next: the file has one reader */
     flvd_frame_t frame;
     unsigned long frames = 0;
     unsigned long bytes = 0;
     int32_t result;
 
-    while ((result = next_frame(instance, &frame)) == 0) {
+    while ((result = flvd_next_frame(instance, &request, &frame)) == 0) {
         if (frame.stream != stream)
             continue;
         if (fwrite(frame.data, 1, frame.size, output) != frame.size) {
@@ -48,7 +34,7 @@ static int copy_stream(flvd_ctx_t* instance, uint32_t stream, FILE* output)
     printf("%lu frames, %lu bytes\n", frames, bytes);
     if (result == FLVD_RET_END)
         return 0;
-    fprintf(stderr, "copy_frames: error %" PRId32 ", line %" PRId32 "\n", instance->error, instance->error_line);
+    fprintf(stderr, "copy_frames: %s (line %" PRId32 ")\n", flvd_error_text(instance->error), instance->error_line);
     return -1;
 }
 
@@ -66,10 +52,10 @@ int main(int argc, char** argv)
         return 2;
     }
     stream = strcmp(argv[2], "video") == 0 ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
-    flvd_window_host_fill(&init); /* the fastest for playing a whole file */
+    flvd_posix_host_fill(&init); /* the fastest for playing a whole file */
     init.file_name = argv[1];
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &instance, &init, &info) != 0) {
-        fprintf(stderr, "copy_frames: %s: error %" PRId32 ", line %" PRId32 "\n", argv[1], g_flvd_lLastError,
+        fprintf(stderr, "copy_frames: %s: %s (line %" PRId32 ")\n", argv[1], flvd_error_text(g_flvd_lLastError),
                 g_flvd_lErrorLine);
         return 1;
     }

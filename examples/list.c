@@ -1,4 +1,5 @@
 /* Opens a file and lists what is in it: list FILE */
+#include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
 #include "flvdmx/stdio_host.h"
 
@@ -38,7 +39,7 @@ int main(int argc, char** argv)
     flvd_stdio_host_fill(&init);
     init.file_name = argv[1]; /* must live until the close, as argv does */
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &instance, &init, &info) != 0) {
-        fprintf(stderr, "list: %s: error %" PRId32 ", line %" PRId32 "\n", argv[1], g_flvd_lLastError,
+        fprintf(stderr, "list: %s: %s (line %" PRId32 ")\n", argv[1], flvd_error_text(g_flvd_lLastError),
                 g_flvd_lErrorLine);
         return 1;
     }

@@ -1,9 +1,9 @@
 // The hosts of the kit keep the contract of the public header, all on the same bytes.
 
+#include "flvdmx/error_text.h"
 #include "flvdmx/memory_host.h"
 #include "flvdmx/posix_host.h"
 #include "flvdmx/stdio_host.h"
-#include "flvdmx/window_host.h"
 #include "support/flv_writer.h"
 
 #include <gtest/gtest.h>
@@ -12,6 +12,8 @@
 #include <filesystem>
 #include <fstream>
 #include <map>
+#include <regex>
+#include <set>
 #include <sys/stat.h>
 #include <thread>
 
@@ -19,10 +21,8 @@ using namespace flvd_test;
 
 namespace {
 
-const std::map<std::string, void (*)(flvd_init_t*)> g_fill = {{"stdio", flvd_stdio_host_fill},
-                                                              {"posix", flvd_posix_host_fill},
-                                                              {"window", flvd_window_host_fill},
-                                                              {"memory", flvd_memory_host_fill}};
+const std::map<std::string, void (*)(flvd_init_t*)> g_fill = {
+    {"stdio", flvd_stdio_host_fill}, {"posix", flvd_posix_host_fill}, {"memory", flvd_memory_host_fill}};
 constexpr int64_t SIZE = 200000, FAR = (int64_t{1} << 32) + 12345; // SIZE: three windows and a bit
 
 class Host : public testing::TestWithParam<std::string> {
@@ -98,6 +98,15 @@ TEST_P(Host, SeesAFileGrow)
     EXPECT_EQ(read(150), bytes.substr(SIZE - 150, 150));
 }
 
+// A file that was given its size first: the stdio host keeps no bytes that it read before.
+TEST_P(FileHost, SeesBytesChangedInPlace)
+{
+    EXPECT_EQ(read(10), bytes.substr(0, 10));
+    std::fstream(file, std::ios::in | std::ios::out) << "changed";
+    ASSERT_EQ(t.file_seek64(handle, 0, 0), 0);
+    EXPECT_EQ(read(7), GetParam() == "stdio" ? "changed" : bytes.substr(0, 7));
+}
+
 TEST_P(FileHost, ReachesBeyondFourGibibytes)
 {
     std::filesystem::resize_file(file, FAR);
@@ -131,15 +140,35 @@ TEST_P(FileHost, FillsARequestFromAPipe)
 TEST_P(FileHost, TellsWhereAnAppendEnded)
 {
     t.file_close(handle);
-    handle = t.file_open(file.c_str(), GetParam() == "window" ? "rb" : "a+b"); // a window only reads
+    handle = t.file_open(file.c_str(), GetParam() == "posix" ? "rb" : "a+b"); // the POSIX host only reads
     ASSERT_EQ(t.file_seek64(handle, 100, 0), 0);
     EXPECT_EQ(read(5), bytes.substr(100, 5));
     const uint32_t put = t.file_write("more", 1, 4, handle);
-    EXPECT_EQ(put, GetParam() == "window" ? 0 : 4);
+    EXPECT_EQ(put, GetParam() == "posix" ? 0 : 4);
     EXPECT_EQ(t.file_tell64(handle), put == 0 ? 105 : SIZE + 4);
 }
 
-INSTANTIATE_TEST_SUITE_P(Kit, FileHost, testing::Values("stdio", "posix", "window"));
-INSTANTIATE_TEST_SUITE_P(Kit, Host, testing::Values("stdio", "posix", "window", "memory"));
+INSTANTIATE_TEST_SUITE_P(Kit, FileHost, testing::Values("stdio", "posix"));
+INSTANTIATE_TEST_SUITE_P(Kit, Host, testing::Values("stdio", "posix", "memory"));
+
+// The table of texts against the list of codes in the public header.
+TEST(ErrorText, HasEveryCodeOfTheHeader)
+{
+    std::ifstream in(FLVDMX_TEST_DATA "/../../flvdmx/flvdmx.h");
+    const std::string header = {std::istreambuf_iterator<char>(in), {}};
+    const size_t begin = header.find("/** Error codes");
+    ASSERT_NE(begin, std::string::npos);
+    const std::string list = header.substr(begin, header.find("};", begin) - begin);
+    const std::regex row(R"((FLVD_ERR_\w+) = (-?\d+))");
+    std::set<std::string> texts = {flvd_error_text(1)};
+    for (std::sregex_iterator code(list.begin(), list.end(), row), end; code != end; ++code) {
+        const std::string name = (*code)[1];
+        const int32_t number = std::stoi((*code)[2]);
+        EXPECT_EQ(flvd_error_name(number), name);
+        EXPECT_TRUE(texts.insert(flvd_error_text(number)).second) << name << " has no text of its own";
+    }
+    EXPECT_GT(texts.size(), 20U) << "the list of codes was not read";
+    EXPECT_STREQ(flvd_error_name(1), "unknown");
+}
 
 } // namespace

@@ -120,20 +120,24 @@ TEST(Interface, FollowsAGrowingFile)
     EXPECT_EQ(file->last_error().kind(), Kind::not_yet);
 }
 
-// More tags without a frame than one request passes.
+// More tags without a frame than one request passes. With two readers video is at its end before audio begins.
 TEST(Interface, CrossesTagsWithoutAFrame)
 {
-    std::vector<Tag> tags = {g_avc, Nalu(0), Nalu(40)};
-    tags.insert(tags.begin() + 2, 150, g_avc);
-    const Bytes bytes = File(tags, 1).bytes;
+    std::vector<Tag> tags = {g_avc, g_aac, Nalu(0), Raw(10)};
+    for (int i = 0; i < 300; ++i)
+        tags.push_back(i % 2 == 0 ? g_avc : g_aac);
+    tags.insert(tags.end(), {Nalu(40), Raw(50)});
+    const Bytes bytes = File(tags).bytes;
     const Memory memory("memory", bytes);
-    for (const bool growing : {false, true}) {
-        const flvdmx::Options options = {0, 0, false, growing};
+    for (const auto& [apart, growing] : {std::pair(false, false), {false, true}, {true, false}, {true, true}}) {
+        SCOPED_TRACE(testing::Message() << (apart ? "two readers" : "one reader") << (growing ? ", growing" : ""));
+        const flvdmx::Options options = {0, 0, apart, growing};
         auto file = flvdmx::File::open("memory", flvdmx::make_host(flvd_memory_host_fill), options);
         std::vector<int64_t> times;
-        for (const flvdmx::Frame& frame : file->frames())
-            times.push_back(frame.time.count());
-        EXPECT_EQ(times, (std::vector<int64_t>{0, 40}));
+        for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
+            for (const flvdmx::Frame& frame : file->frames(stream))
+                times.push_back(frame.time.count());
+        EXPECT_EQ(times, (apart ? std::vector<int64_t>{0, 40, 10, 50} : std::vector<int64_t>{0, 10, 40, 50}));
         EXPECT_EQ(file->last_error().kind(), growing ? Kind::not_yet : Kind::end);
     }
 }

@@ -336,7 +336,7 @@ class Follow(Case):
                  ("aac_only", None, "4", None, ""), ("truncated", None, "4", None, broken),
                  ("avc_aac", None, "20 --count 9", 9, ""), ("avc_aac", None, "20 --to 0.3", early, ""),
                  ("avc_aac", 8, "4", 0, ".*damaged or cut short.*\n"),
-                 ("avc_aac", 30, "4", 0, ".*(stream was found|ends too early).*\n")]
+                 ("avc_aac", 30, "4", 0, ".*(stream was found|data ended).*\n")]
         start = time.monotonic()
         with concurrent.futures.ThreadPoolExecutor(len(cases)) as pool:
             results = list(pool.map(lambda case: self.follow(sample_bytes(case[0])[:case[1]], case[2].split()), cases))

@@ -153,34 +153,15 @@ void Chain::TakeUnlinked(const Tag& tag, int64_t next)
 
 int64_t Chain::Resume(int64_t position, const std::optional<Tag>& tag)
 {
-    const int64_t found = FindTagBehind(position);
-    if (found == 0) {
+    const auto found = FindTag(m_instance, m_reader, position + 1, m_probe.FileSize(), m_progress);
+    if (!found) {
         AddRest(position, tag);
         return m_probe.FileSize();
     }
-    const int64_t bytes = found - position;
+    const int64_t bytes = *found - position;
     m_findings.Add("gap", position, fmt::format("{} bytes belong to no tag", bytes), {{"bytes", bytes}});
     m_findings.Lose(bytes);
-    return found;
-}
-
-// One search covers a bounded stretch; the next one begins where it ended. 0 is no place for a tag.
-int64_t Chain::FindTagBehind(int64_t position) const
-{
-    int64_t reached = position;
-    if (__FLV_DMX__fioSeek64(m_reader, position + 1, FIO_SEEK_SET) != 0)
-        return 0;
-    for (;;) {
-        flvd_tag_info_t info{};
-        const int32_t result = FLVD_GetCurrTagInfo(m_instance, m_reader, &info,
-                                                   FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT, 1 /* verify */);
-        const int64_t found = __FLV_DMX__fioTell64(m_reader);
-        if (result == 0)
-            return found;
-        if (found <= reached || found >= m_probe.FileSize())
-            return 0;
-        m_progress(reached = found);
-    }
+    return *found;
 }
 
 // The end of the file holds no tag any more: its last one was cut off, or something else follows.

@@ -56,7 +56,6 @@ private:
     bool CouldFollow(int64_t position) const;
     void TakeUnlinked(const Tag& tag, int64_t next);
     int64_t Resume(int64_t position, const std::optional<Tag>& tag);
-    int64_t FindTagBehind(int64_t position) const;
     void AddRest(int64_t position, const std::optional<Tag>& tag);
     void Take(const Tag& tag);
 

@@ -9,45 +9,15 @@
 #include <fmt/core.h>
 #include <sys/stat.h>
 
-#include "flvdmx/window_host.h"
+#include "flvdmx/error_text.h"
+#include "flvdmx/next_frame.h"
+#include "flvdmx/posix_host.h"
 #include "tools/crc32.h"
 #include "tools/time_text.h"
 
 namespace tool {
 
 namespace {
-
-struct CodeText {
-    int32_t code;
-    const char* text;
-};
-
-constexpr CodeText CODE_TEXTS[] = {
-    {FLVD_ERR_POSITION, "the position in the file cannot be told"},
-    {FLVD_ERR_SEEK, "seeking in the file failed"},
-    {FLVD_ERR_NO_MEMORY, "no memory for the codec configuration"},
-    {FLVD_ERR_INSTANCE_MEMORY, "no memory"},
-    {FLVD_ERR_FRAME_BUFFER, "no memory for the frame buffer"},
-    {FLVD_ERR_NO_STREAM, "neither a video nor an audio stream was found"},
-    {FLVD_ERR_EXTENT, "the end of the valid data was not found"},
-    {FLVD_ERR_FRAME_SEEK, "no tag was found to land on"},
-    {FLVD_ERR_SEEK_PLACE, "the tag at the place sought is not the one expected"},
-    {FLVD_ERR_INDEX_ELEMENT, "the keyframe index holds something that is not a number"},
-    {FLVD_ERR_NO_VIDEO, "the file has no video stream"},
-    {FLVD_ERR_NO_AUDIO, "the file has no audio stream"},
-    {FLVD_ERR_NO_TAG, "no valid tag was found"},
-    {FLVD_ERR_SHORT_DATA, "the file ends too early"},
-    {FLVD_ERR_NOT_SEEKABLE, "the file cannot be seeked in: it has no usable keyframe index and cannot be scanned"},
-};
-
-std::string TextOf(int32_t code)
-{
-    for (const CodeText& entry : CODE_TEXTS) {
-        if (entry.code == code)
-            return entry.text;
-    }
-    return "demuxing failed";
-}
 
 bool BeginsWithSignature(const std::string& path)
 {
@@ -84,12 +54,12 @@ void RefusePipe(const std::string& path)
 std::string OpenFailureText(const std::string& path, int32_t code)
 {
     if (code == FLVD_ERR_OPEN_MAIN || code == FLVD_ERR_OPEN_AUDIO) {
-        const int error = flvd_window_host_open_error();
+        const int error = flvd_posix_host_open_error();
         return fmt::format("cannot be opened: {}", error != 0 ? std::strerror(error) : "no memory");
     }
     if (code == FLVD_ERR_FILE_HEADER)
         return HeaderFailureText(path);
-    return TextOf(code);
+    return flvd_error_text(code);
 }
 
 bool SeeksForward(int64_t target, int64_t current, uint32_t mode)
@@ -113,7 +83,7 @@ Demuxer::Demuxer(const std::string& path, uint32_t options) : m_path(path)
 {
     RefusePipe(path);
     flvd_init_t init;
-    flvd_window_host_fill(&init);
+    flvd_posix_host_fill(&init);
     init.file_name = m_path.c_str();
     init.options = options;
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &m_instance, &init, &m_info) != 0)
@@ -142,28 +112,19 @@ int64_t Demuxer::Position(uint32_t stream) const
 
 void Demuxer::ThrowLastError() const
 {
-    throw DemuxError(TextOf(m_instance->error), m_instance->error, m_instance->error_line);
+    throw DemuxError(flvd_error_text(m_instance->error), m_instance->error, m_instance->error_line);
 }
 
-// A request gives up after a bounded number of unusable tags. While the reader comes further and has not passed the
-// valid data, there may be frames behind a long damaged stretch, so the next request is worth making.
 std::optional<Frame> Demuxer::NextFrame(uint32_t stream)
 {
-    int64_t reached = -1;
-    for (;;) {
-        flvd_frame_request_t request{};
-        request.stream = stream;
-        flvd_frame_t frame{};
-        const int32_t result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &request, &frame);
-        if (result == 0)
-            return Describe(frame);
-        if (result != FLVD_RET_END)
-            ThrowLastError();
-        const int64_t position = Position(stream);
-        if (position <= reached || position >= m_instance->data_end)
-            return std::nullopt;
-        reached = position;
-    }
+    const flvd_frame_request_t request = {nullptr, 0, stream};
+    flvd_frame_t frame{};
+    const int32_t result = flvd_next_frame(m_instance, &request, &frame);
+    if (result == 0)
+        return Describe(frame);
+    if (result != FLVD_RET_END)
+        ThrowLastError();
+    return std::nullopt;
 }
 
 Frame Demuxer::Describe(const flvd_frame_t& frame) const

@@ -1,4 +1,4 @@
-// One open file: the library's entry point with the window host, results as exceptions with words for the user.
+// One open file: the library's entry point with the POSIX host, results as exceptions with words for the user.
 #ifndef FLVDMX_TOOLS_DEMUXER_H
 #define FLVDMX_TOOLS_DEMUXER_H
 

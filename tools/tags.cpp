@@ -33,34 +33,39 @@ bool Tag::IsFrame() const
     return !IsConfig() && !(IsAvc() && packetType == 2);
 }
 
+std::optional<int64_t> FindTag(flvd_ctx_t* instance, fio_file_t* reader, int64_t from, int64_t end,
+                               const std::function<void(int64_t)>& progress)
+{
+    constexpr uint32_t ALL_KINDS = FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT;
+    int64_t reached = from - 1;
+    if (__FLV_DMX__fioSeek64(reader, from, FIO_SEEK_SET) != 0)
+        return std::nullopt;
+    for (;;) {
+        flvd_tag_info_t info{};
+        const int32_t result = FLVD_GetCurrTagInfo(instance, reader, &info, ALL_KINDS, 1 /* verify */);
+        const int64_t position = __FLV_DMX__fioTell64(reader);
+        if (result == 0)
+            return position;
+        if (position <= reached || position >= end)
+            return std::nullopt;
+        progress(reached = position);
+    }
+}
+
 TagReader::TagReader(const Demuxer& demuxer)
     : m_instance(demuxer.Instance()), m_reader(demuxer.Reader(FLVD_STREAM_VIDEO)), m_streams(demuxer.Streams()),
       m_next(m_instance->data_offset), m_end(m_next + BACK_POINTER_SIZE)
 {
 }
 
-// One search covers a bounded stretch of damage. While the reader comes further the next search is worth making.
 std::optional<Tag> TagReader::Find()
 {
-    int64_t reached = -1;
-    if (__FLV_DMX__fioSeek64(m_reader, m_next, FIO_SEEK_SET) != 0)
+    const auto position = FindTag(m_instance, m_reader, m_next, m_instance->data_end, [](int64_t) {});
+    const uint8_t* bytes = nullptr;
+    const uint32_t available = position ? __FLV_DMX__fioShowBytesByPtr(&bytes, TAG_HEADER_SIZE + 2, m_reader) : 0;
+    if (available < TAG_HEADER_SIZE)
         return std::nullopt;
-    for (;;) {
-        flvd_tag_info_t info{};
-        const int32_t result = FLVD_GetCurrTagInfo(m_instance, m_reader, &info,
-                                                   FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT, 1 /* verify */);
-        const int64_t position = __FLV_DMX__fioTell64(m_reader);
-        if (result == 0) {
-            const uint8_t* bytes = nullptr;
-            const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, TAG_HEADER_SIZE + 2, m_reader);
-            if (available < TAG_HEADER_SIZE)
-                return std::nullopt;
-            return Tag::Parse(position, bytes, available);
-        }
-        if (position <= reached || position >= m_instance->data_end)
-            return std::nullopt;
-        reached = position;
-    }
+    return Tag::Parse(*position, bytes, available);
 }
 
 void TagReader::Skip(int64_t from, int64_t to)

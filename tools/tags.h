@@ -3,6 +3,7 @@
 #define FLVDMX_TOOLS_TAGS_H
 
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <vector>
 
@@ -44,6 +45,16 @@ struct Tag {
     bool IsFrame() const; /**< a tag that is played */
     bool IsKeyframe() const { return IsVideo() && IsFrame() && (codec >> 4 == 1 || codec >> 4 == 4); }
 };
+
+/**
+ * Finds the first tag at or after `from`, however much damage lies before it: one search of the library covers a
+ * bounded stretch, and the next is worth making while the reader advances and has not passed `end`.
+ *
+ * @param progress called with the place that each search without a tag has reached
+ * @return where the tag and then the reader stand; nothing when there is none
+ */
+std::optional<int64_t> FindTag(flvd_ctx_t* instance, fio_file_t* reader, int64_t from, int64_t end,
+                               const std::function<void(int64_t)>& progress);
 
 /** Walks over the tags of the streams that were found, those with codec configurations included. */
 class TagReader {

@@ -1,6 +1,7 @@
 /*
  * Host over the C library's streams: malloc and friends, fopen, fread, fseeko. Runs wherever the C library has files
- * with 64-bit positions; a host that reads from ordinary files needs nothing else:
+ * with 64-bit positions. Nothing is cached besides the library's own cache, so it also suits files that are filled in
+ * place. Its source is the one to copy for a host of your own.
  *
  *     flvd_init_t init;
  *     flvd_stdio_host_fill(&init);

@@ -1,5 +1,5 @@
 /*
- * flvdmx for C++17: one open file as an object over the C interface of flvdmx.h. Header only.
+ * flvdmx for C++17: one open file as an object over the C interface of flvdmx.h. Header only; link flvdmx-host.
  *
  *     auto file = flvdmx::File::open("clip.flv");
  *     if (!file)
@@ -24,7 +24,10 @@
 #ifndef FLVDMX_FLVDMX_HPP
 #define FLVDMX_FLVDMX_HPP
 
+#include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
+#include "flvdmx/next_frame.h"
+#include "flvdmx/stdio_host.h"
 
 #include <chrono>
 #include <cstddef>
@@ -36,9 +39,6 @@
 #include <optional>
 #include <string_view>
 #include <utility>
-
-/** The stdio host of the kit. Only those who open without a Host need it: they link flvdmx-host. */
-extern "C" void flvd_stdio_host_fill(flvd_init_t* init);
 
 namespace flvdmx {
 
@@ -99,45 +99,6 @@ enum class Kind {
     failed   /**< anything else */
 };
 
-/** One line of the table of codes. */
-struct ErrorText {
-    int32_t code;     /**< FLVD_ERR_* */
-    const char* name; /**< the same as text */
-    const char* text; /**< what happened */
-};
-
-/** Every code that a failure can have. */
-inline constexpr ErrorText error_texts[] = {
-    {FLVD_ERR_NONE, "FLVD_ERR_NONE", "no error, or a frame that did not fit was passed over"},
-    {FLVD_ERR_POSITION, "FLVD_ERR_POSITION", "the position in the file cannot be told"},
-    {FLVD_ERR_SEEK, "FLVD_ERR_SEEK", "seeking in the file failed"},
-    {FLVD_ERR_NO_MEMORY, "FLVD_ERR_NO_MEMORY", "no memory for the codec configuration, or it is too short"},
-    {FLVD_ERR_INSTANCE_MEMORY, "FLVD_ERR_INSTANCE_MEMORY", "no memory"},
-    {FLVD_ERR_OPEN_MAIN, "FLVD_ERR_OPEN_MAIN", "the file cannot be opened"},
-    {FLVD_ERR_OPEN_AUDIO, "FLVD_ERR_OPEN_AUDIO", "the file cannot be opened a second time, for its audio"},
-    {FLVD_ERR_FRAME_BUFFER, "FLVD_ERR_FRAME_BUFFER", "no memory for the frame buffer"},
-    {FLVD_ERR_NO_STREAM, "FLVD_ERR_NO_STREAM", "neither a video nor an audio stream was found"},
-    {FLVD_ERR_FILE_HEADER, "FLVD_ERR_FILE_HEADER", "no FLV file header"},
-    {FLVD_ERR_EXTENT, "FLVD_ERR_EXTENT", "the end of the valid data was not found"},
-    {FLVD_ERR_FRAME_SEEK, "FLVD_ERR_FRAME_SEEK", "no tag was found to land on"},
-    {FLVD_ERR_SEEK_MISS, "FLVD_ERR_SEEK_MISS", "the target is beyond the end, or no keyframe lies in that direction"},
-    {FLVD_ERR_SEEK_PLACE, "FLVD_ERR_SEEK_PLACE", "the tag at the place sought is not the one expected"},
-    {FLVD_ERR_INDEX_ELEMENT, "FLVD_ERR_INDEX_ELEMENT", "the keyframe index holds something that is not a number"},
-    {FLVD_ERR_AVC_CONFIG, "FLVD_ERR_AVC_CONFIG", "the AVC configuration is damaged"},
-    {FLVD_ERR_VIDEO_HEADER, "FLVD_ERR_VIDEO_HEADER", "the video's own header was not understood"},
-    {FLVD_ERR_AUDIO_HEADER, "FLVD_ERR_AUDIO_HEADER", "the audio's own header was not understood"},
-    {FLVD_ERR_AVC_NO_SEQ_HEADER, "FLVD_ERR_AVC_NO_SEQ_HEADER", "the AVC stream does not begin with its configuration"},
-    {FLVD_ERR_NO_INSTANCE, "FLVD_ERR_NO_INSTANCE", "no file is open"},
-    {FLVD_ERR_NO_VIDEO, "FLVD_ERR_NO_VIDEO", "the file has no video stream"},
-    {FLVD_ERR_NO_AUDIO, "FLVD_ERR_NO_AUDIO", "the file has no audio stream"},
-    {FLVD_ERR_BAD_STREAM, "FLVD_ERR_BAD_STREAM", "with a separate audio reader a stream must be named"},
-    {FLVD_ERR_RESERVED_OP, "FLVD_ERR_RESERVED_OP", "the operation is reserved"},
-    {FLVD_ERR_INFO_ONLY, "FLVD_ERR_INFO_ONLY", "the file was opened for information only"},
-    {FLVD_ERR_NO_TAG, "FLVD_ERR_NO_TAG", "no valid tag was found"},
-    {FLVD_ERR_SHORT_DATA, "FLVD_ERR_SHORT_DATA", "the data ended"},
-    {FLVD_ERR_NOT_SEEKABLE, "FLVD_ERR_NOT_SEEKABLE", "the file cannot be seeked in"},
-};
-
 /** A failure: the library's code and line, and what they mean. */
 class error {
 public:
@@ -148,19 +109,10 @@ public:
     constexpr Kind kind() const { return m_kind; }    /**< what it means for the caller */
     constexpr int32_t code() const { return m_code; } /**< FLVD_ERR_* */
     constexpr int32_t line() const { return m_line; } /**< number of the place of failure, the same in every release */
-    constexpr const char* name() const { return find().name; } /**< such as "FLVD_ERR_SEEK" */
-    constexpr const char* text() const { return find().text; } /**< what happened, for people */
+    const char* name() const { return flvd_error_name(m_code); } /**< such as "FLVD_ERR_SEEK" */
+    const char* text() const { return flvd_error_text(m_code); } /**< what happened, for people */
 
 private:
-    constexpr ErrorText find() const
-    {
-        for (const ErrorText& entry : error_texts) {
-            if (entry.code == m_code)
-                return entry;
-        }
-        return {m_code, "unknown", "unknown error"};
-    }
-
     Kind m_kind = Kind::none;
     int32_t m_code = FLVD_ERR_NONE;
     int32_t m_line = 0;
@@ -360,7 +312,7 @@ public:
     }
 
     /**
-     * The next frame. Damaged stretches are crossed however long they are, as long as the reader comes further.
+     * The next frame, as flvd_next_frame() finds it: damaged stretches of any length are crossed.
      *
      * @param stream with a separate audio reader video or audio; without one it is not looked at
      * @return the frame; Kind::end, for a growing file Kind::not_yet; Kind::failed
@@ -368,17 +320,10 @@ public:
     result<Frame> next_frame(Stream stream = Stream::any)
     {
         m_request.stream = static_cast<uint32_t>(stream);
-        int64_t reached = -1;
-        for (;;) {
-            flvd_frame_t frame{};
-            const int32_t code = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &m_request, &frame);
-            if (code == 0)
-                return describe(frame);
-            const int64_t position = code == FLVD_RET_END ? tell(stream) : reached;
-            if (position <= reached || position >= m_instance->data_end)
-                return failure();
-            reached = position;
-        }
+        flvd_frame_t frame{};
+        if (flvd_next_frame(m_instance, &m_request, &frame) != 0)
+            return failure();
+        return describe(frame);
     }
 
     /**
@@ -446,12 +391,6 @@ private:
                        bits_if(options.growing, FLVD_OPT_PROGRESSIVE) |
                        bits_if(options.index_in_memory, FLVD_OPT_INDEX_IN_MEMORY);
         return init;
-    }
-
-    int64_t tell(Stream stream) const
-    {
-        const bool audio = stream == Stream::audio; // without a separate reader it is the main one again
-        return __FLV_DMX__fioTell64(audio ? m_instance->audio_reader : m_instance->main_reader);
     }
 
     static Kind kind_of(int32_t code, bool growing)

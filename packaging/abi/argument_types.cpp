@@ -1,5 +1,5 @@
-// What the functions' signatures do not name, since it goes through pointers to void or as plain integers: gathered
-// here for the comparison of binary interfaces, and compiled for nothing else.
+// The types of arguments and results that the signatures give as pointers to void or plain integers: gathered here for
+// the comparison of binary interfaces, and compiled for nothing else.
 #include "flvdmx/flvdmx.h"
 
 struct Interface {

@@ -1,0 +1,168 @@
+/*
+ * Host functions over the C library's streams. The file stands alone: to write a host for another system, copy it and
+ * put that system's functions in place of the C library's.
+ */
+#define _FILE_OFFSET_BITS 64    /* fseeko and ftello have 64 bits on 32-bit systems too */
+#define _POSIX_C_SOURCE 200809L /* fseeko, ftello, fileno */
+
+#include "flvdmx/stdio_host.h"
+
+#include <assert.h>
+#include <errno.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+
+#include <sys/stat.h>
+#include <sys/types.h>
+
+static_assert(sizeof(off_t) == sizeof(int64_t), "fseeko and ftello must reach beyond 2 GiB");
+
+enum { UNKNOWN = -1 };
+
+/*
+ * An open file. The position is counted, because the library asks for it twice per frame and the C library takes longer
+ * to answer than the demuxer for the whole frame. After a seek or a write it is UNKNOWN until the next tell.
+ */
+typedef struct stream_t {
+    FILE* file;
+    int64_t position;
+} stream_t;
+
+static _Thread_local int open_error;
+
+static void* allocate(uint32_t size)
+{
+    return malloc(size);
+}
+
+static void* copy(void* destination, const void* source, uint32_t count)
+{
+    return memcpy(destination, source, count);
+}
+
+static void* set(void* destination, int value, uint32_t count)
+{
+    return memset(destination, value, count);
+}
+
+/* fopen opens a directory for reading without complaint; every read then fails as if the file were empty. */
+static int is_directory(FILE* file)
+{
+    struct stat status;
+    return fstat(fileno(file), &status) == 0 && S_ISDIR(status.st_mode);
+}
+
+static void* open_stream(const char* path, const char* mode)
+{
+    FILE* const file = fopen(path, mode);
+    open_error = file == NULL ? errno : 0;
+    if (file == NULL)
+        return NULL;
+    const int directory = is_directory(file);
+    stream_t* const stream = directory ? NULL : malloc(sizeof *stream);
+    if (stream == NULL) {
+        open_error = directory ? EISDIR : ENOMEM;
+        fclose(file);
+        return NULL;
+    }
+    setvbuf(file, NULL, _IONBF, 0); /* the library has a cache of its own */
+    *stream = (stream_t){file, UNKNOWN};
+    return stream;
+}
+
+/* Elements are single bytes. A signal may cut a read short; only the end of the file or a real failure ends it. */
+static uint32_t read_stream(void* buffer, uint32_t size, uint32_t count, void* handle)
+{
+    stream_t* const stream = handle;
+    uint32_t done = 0;
+    for (;;) {
+        errno = 0;
+        done += (uint32_t)fread((char*)buffer + done, size, count - done, stream->file);
+        if (done == count || errno != EINTR)
+            break;
+        clearerr(stream->file);
+    }
+    if (stream->position != UNKNOWN)
+        stream->position += done;
+    return done;
+}
+
+/* Leaves the position unknown: a file that is appended to is written at its end. */
+static uint32_t write_stream(const void* buffer, uint32_t size, uint32_t count, void* handle)
+{
+    stream_t* const stream = handle;
+    stream->position = UNKNOWN;
+    return (uint32_t)fwrite(buffer, size, count, stream->file);
+}
+
+static int32_t seek64(void* handle, int64_t offset, int32_t whence)
+{
+    stream_t* const stream = handle;
+    if (whence != SEEK_SET && whence != SEEK_CUR && whence != SEEK_END)
+        return -1; /* systems have further origins of their own */
+    stream->position = UNKNOWN;
+    return fseeko(stream->file, offset, whence);
+}
+
+static int64_t tell64(void* handle)
+{
+    stream_t* const stream = handle;
+    if (stream->position == UNKNOWN)
+        stream->position = ftello(stream->file);
+    return stream->position;
+}
+
+/* For callers without the 64-bit functions. A position that does not fit is a failure, never a smaller position. */
+static int32_t seek(void* handle, int32_t offset, int32_t whence)
+{
+    return seek64(handle, offset, whence);
+}
+
+static int32_t tell(void* handle)
+{
+    const int64_t position = tell64(handle);
+    return position > INT32_MAX ? -1 : (int32_t)position;
+}
+
+static int32_t is_at_end(void* handle)
+{
+    return feof(((stream_t*)handle)->file);
+}
+
+static int32_t flush(void* handle)
+{
+    return fflush(((stream_t*)handle)->file);
+}
+
+static int32_t close_stream(void* handle)
+{
+    FILE* const file = ((stream_t*)handle)->file;
+    free(handle);
+    return fclose(file);
+}
+
+void flvd_stdio_host_fill(flvd_init_t* init)
+{
+    *init = (flvd_init_t){
+        .mem_alloc = allocate,
+        .mem_free = free,
+        .mem_copy = copy,
+        .mem_set = set,
+        .file_open = open_stream,
+        .file_read = read_stream,
+        .file_seek = seek,
+        .file_tell = tell,
+        .file_close = close_stream,
+        .file_eof = is_at_end,
+        .file_flush = flush,
+        .file_write = write_stream,
+        .file_seek64 = seek64,
+        .file_tell64 = tell64,
+    };
+}
+
+int flvd_stdio_host_open_error(void)
+{
+    return open_error;
+}
