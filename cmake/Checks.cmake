@@ -1,27 +1,17 @@
-# Checks of the sources, one test a file so that they run side by side, and of the samples under valgrind.
+# Checks of the sources, one test per file so that they run side by side, and of the samples under valgrind.
 
-find_program(CLANG_FORMAT clang-format REQUIRED)
 find_program(CLANG_TIDY clang-tidy REQUIRED)
 find_program(CPPCHECK cppcheck REQUIRED)
 find_program(VALGRIND valgrind REQUIRED)
 
-foreach(folder IN ITEMS flvdmx host tools examples packaging tests bench fuzz)
-    file(GLOB_RECURSE found CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${folder}/*.cpp ${folder}/*.h
-        ${folder}/*.hpp ${folder}/*.c)
-    list(APPEND sources ${found})
-endforeach()
-
-add_test(NAME format COMMAND ${CLANG_FORMAT} --dry-run -Werror ${sources} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
-
 # Sources of the folders that this build compiles; headers are checked with the sources that include them. The tests
 # and the bench go without the path-sensitive analyzer: it takes minutes for the macros of one test file and finds fault
 # with Google Benchmark's, and the tests run with the sanitizers anyway.
-list(FILTER sources INCLUDE REGEX "\\.c(pp)?$")
+foreach(folder IN ITEMS flvdmx host tools examples tests bench fuzz)
+    file(GLOB_RECURSE found CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${folder}/*.c ${folder}/*.cpp)
+    list(APPEND sources ${found})
+endforeach()
 foreach(source IN LISTS sources)
-    string(REGEX REPLACE "/.*" "" folder ${source})
-    if(NOT EXISTS ${PROJECT_SOURCE_DIR}/${folder}/CMakeLists.txt)
-        continue()
-    endif()
     set(less "")
     if(source MATCHES "^(tests|bench)/")
         set(less --checks=-clang-analyzer-*)

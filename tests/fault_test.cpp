@@ -4,6 +4,7 @@
 
 #include "support/report.h"
 #include "support/session.h"
+#include "support/sweep.h"
 
 #include <algorithm>
 #include <set>
@@ -273,7 +274,7 @@ std::vector<Scenario> Scenarios()
 }
 
 // Every call of a scenario fails, once and from there on, and every read is cut short.
-void Sweep(const Scenario& scenario, const OpenOptions& open, Seen* seen)
+void SweepFaults(const Scenario& scenario, const OpenOptions& open, Sweep* sweep, Seen* seen)
 {
     const auto run = [&](const Fault& fault) {
         const uint64_t where[] = {open.options, fault.nth, fault.later ? 1u : 0u, fault.bytes};
@@ -283,19 +284,24 @@ void Sweep(const Scenario& scenario, const OpenOptions& open, Seen* seen)
     const auto [calls, reads] = run({});
     for (const bool later : {false, true}) {
         for (uint64_t n = 1; n <= calls; ++n)
-            run({n, later});
+            if (sweep->takes_next())
+                run({n, later});
         for (uint64_t n = 1; n <= reads; ++n)
             for (const uint32_t bytes : later ? std::array{11u, 12u, 15u} : std::array{1u, 16u, 255u})
-                run({n, later, bytes});
+                if (sweep->takes_next())
+                    run({n, later, bytes});
     }
 }
 
 TEST(Faults, AreSurvivedAtEveryCall)
 {
+    Sweep sweep;
     Seen seen;
     for (const Scenario& scenario : Scenarios())
         for (const OpenOptions& open : scenario.opens)
-            Sweep(scenario, open, &seen);
+            SweepFaults(scenario, open, &sweep, &seen);
+    if (!Sweep::is_complete())
+        return; // a sample does not lead to every place
     for (const Place& place : Places())
         for (const char by : place.by)
             EXPECT_EQ(seen[std::pair(place.code, place.line)].count(by), 1u) << place.line << by;

@@ -1,0 +1,11 @@
+# The test "format": every source as clang-format would write it. `./dev format` writes it so.
+
+find_program(CLANG_FORMAT clang-format REQUIRED)
+
+foreach(folder IN ITEMS flvdmx host tools examples packaging tests bench fuzz)
+    file(GLOB_RECURSE found CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${folder}/*.cpp ${folder}/*.h
+        ${folder}/*.hpp ${folder}/*.c)
+    list(APPEND sources ${found})
+endforeach()
+
+add_test(NAME format COMMAND ${CLANG_FORMAT} --dry-run -Werror ${sources} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
