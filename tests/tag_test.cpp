@@ -114,7 +114,7 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
 
 // A sound tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
 const Tag BAD{8, 0, Bytes{0xAF, 1, 0xEE, 0xEE, 0xEE}, 0xEEEEEEEE};
-constexpr int64_t BAD_SIZE = 20, BAD_COST = BAD_SIZE - 1 + 64; // the distance to the next, and the penalty
+constexpr int64_t BAD_SIZE = 20, CHECKS = 16384; // of which one search makes so many
 const auto Bad = [](int64_t count) { return File(std::vector(static_cast<size_t>(count), BAD)).body(); };
 
 TEST(Resynchronisation, CoversOneMiBInAll)
@@ -134,13 +134,25 @@ TEST(Resynchronisation, CoversOneMiBInAll)
     all(Zeros(MIB / 2), ENDED);
     const int64_t far = MIB / 2 + 1000, second = 100 + far + 115 + far; // a sound tag restores the careful budget alone
     expect(Concat({Zeros(far) + Sound(), Zeros(far) + Picture()}), {second, NOT_FOUND, second});
-    const int64_t spent = (MIB + BAD_COST - 1) / BAD_COST, after = 100 + spent * BAD_SIZE;
-    expect(Bad(spent) + Picture(), {NOT_FOUND, after, NOT_FOUND});
-    all(Bad(spent - 1) + Picture(), after - BAD_SIZE);
-    const int64_t most = MIB - 64; // left after a bad tag behind which nothing was found
-    const Bytes gap = Concat({Bad(1), Zeros(1 + SCANNED - BAD_SIZE + most)});
-    expect(gap + Picture(), {101 + SCANNED + most, NOT_FOUND, 101 + SCANNED + most});
+    // A failed check costs no distance: with one every 64 bytes all of the MiB is crossed.
+    const Bytes sparse = Concat(std::vector<Bytes>(MIB / 64 - 1, Concat({Bad(1), Zeros(64 - BAD_SIZE)})));
+    all(sparse + Picture(), 100 + MIB - 64);
+    all(Bad(CHECKS - 1) + Picture(), 100 + (CHECKS - 1) * BAD_SIZE);
+    expect(Bad(CHECKS) + Picture(), {NOT_FOUND, 100 + CHECKS * BAD_SIZE, NOT_FOUND});
+    // Nor does one after which the scan finds nothing: the whole MiB is left.
+    const Bytes gap = Concat({Bad(1), Zeros(1 + SCANNED - BAD_SIZE + MIB)});
+    expect(gap + Picture(), {101 + SCANNED + MIB, NOT_FOUND, 101 + SCANNED + MIB});
     all(Concat({gap, {0}}) + Picture(), NOT_FOUND);
+}
+
+TEST(Resynchronisation, CountsFailedChecksAnewInEachSearch)
+{
+    Reader r(Concat({Zeros(100), Bad(2 * CHECKS - 1)}) + Picture());
+    for (const Step step : {&Reader::verify, &Reader::next}) {
+        EXPECT_EQ((r.at(100).*step)(VIDEO), Found(NOT_FOUND, 0, 0));
+        const auto [rc, pos, kind] = (r.*step)(VIDEO); // on from there
+        EXPECT_EQ(rc + pos, 100 + (2 * CHECKS - 1) * BAD_SIZE);
+    }
 }
 
 TEST(PrevTag, SlidesBackOneMiBInAll)
@@ -176,6 +188,23 @@ TEST(HostCalls, OfTheBackPointerCheck)
     check(100, 0, "tell64()=13 eof()=0 read(4096)=50 tell64()=63 read(4046)=50 read(3996)=50 seek64(13,0)=0", 50);
     check(100, 16, "tell64()=13 eof()=0 read(16)=16 tell64()=29 seek64(95,1)=0 read(16)=16 seek64(13,0)=0");
     check(100, 5, "tell64()=13 eof()=0 read(13)=13 tell64()=26 seek64(98,1)=0 read(5)=5 seek64(13,0)=0");
+}
+
+TEST(HostCalls, ASeekBackToATagIsTriedOnce)
+{
+    const struct {
+        const char* what;
+        Step step;
+        int64_t from;
+        uint64_t seek; // the one that goes back to the tag
+    } rows[] = {{.what = "describing", .step = &Reader::verify, .from = FIRST_TAG, .seek = 2},
+                {.what = "stepping", .step = &Reader::next, .from = DATA_OFFSET, .seek = 3}};
+    for (const auto& row : rows) {
+        Reader r(Zeros(FIRST_TAG) + Sound(5000) + Picture());
+        r.at(row.from).host.fail_nth(HostFn::Seek, row.seek);
+        EXPECT_EQ((r.*row.step)(AUDIO), Found(NOT_FOUND, 0, 0)) << row.what;
+        EXPECT_EQ(r.host.calls(HostFn::Seek), row.seek) << row.what;
+    }
 }
 
 // What opening finds out: end of the valid data, last timestamp, seek method, index entries, time of the last keyframe.
