@@ -77,13 +77,17 @@ TEST(VideoConfig, IsWhatTheTableSays)
     for (const std::vector<std::string>& row : ReadTable("picture_headers.txt")) {
         ASSERT_EQ(row.size(), 3u) << row[0];
         const int32_t codec = std::stoi(row[0]);
-        const Bytes header = Bits(row[1]);
-        flvd_video_info_t info{};
-        info.width = info.height = OLD;
-        const int32_t rc = FLVD_ParseVideoHeader(codec, header.data(), static_cast<int32_t>(header.size()), &info);
-        const std::string size = std::to_string(info.width) + 'x' + std::to_string(info.height);
-        EXPECT_EQ(std::to_string(rc) + ' ' + size, row[2]) << row[1];
-        EXPECT_EQ(std::string(info.fourcc, 4), rc == 0 && codec == 7 ? "H264" : std::string(4, '\0'));
+        for (const size_t more : {0u, 8u}) { // ones after the header change nothing
+            Bytes header = Bits(row[1]);
+            const auto length = static_cast<int32_t>(header.size());
+            header.insert(header.end(), more, 0xFF);
+            flvd_video_info_t info{};
+            info.width = info.height = OLD;
+            const int32_t rc = FLVD_ParseVideoHeader(codec, header.data(), length, &info);
+            const std::string size = std::to_string(info.width) + 'x' + std::to_string(info.height);
+            EXPECT_EQ(std::to_string(rc) + ' ' + size, row[2]) << row[1] << more;
+            EXPECT_EQ(std::string(info.fourcc, 4), rc == 0 && codec == 7 ? "H264" : std::string(4, '\0'));
+        }
     }
 }
 

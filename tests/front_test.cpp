@@ -288,6 +288,40 @@ TEST(Delivery, GivesThePayloadsBehindTheCodecBytes)
     }
 }
 
+TEST(Delivery, KeepsTheSizeOfTheLastFrameAndTheTimeOfEachStream)
+{
+    const struct {
+        Tag tag;
+        uint32_t size, video, audio; // afterwards; the times count from 1000
+    } rows[] = {
+        {.tag = Nalu(1000, 60), .size = 60, .video = 0, .audio = 0},
+        {.tag = Raw(1010, 50), .size = 50, .video = 0, .audio = 10},
+        {.tag = Nalu(1040, LARGE), .size = LARGE, .video = 40, .audio = 10},
+        {.tag = Raw(1050, LARGE + 9), .size = LARGE + 9, .video = 40, .audio = 50},
+        {.tag = Raw(1070, 20), .size = 20, .video = 40, .audio = 70},
+        {.tag = Nalu(1080, 70), .size = 70, .video = 80, .audio = 70},
+    };
+    std::vector<Tag> tags = {g_meta, g_avc, g_aac};
+    for (const auto& row : rows)
+        tags.push_back(row.tag);
+    for (const OpenOptions& mode : {OpenOptions{}, Cache(SMALL), Buffer(5000), Cache(SMALL, GROWING)}) {
+        FakeHost host(File(tags).bytes);
+        Session session(host, mode);
+        const flvd_ctx_t& ctx = *session.ctx();
+        EXPECT_EQ(std::tuple(ctx.last_frame_size, ctx.last_video_ts, ctx.last_audio_ts), std::tuple(0u, 0u, 0u));
+        const uint32_t first = mode.options == GROWING ? 1000 : 0; // a growing file's times are those of its tags
+        for (const auto& row : rows) {
+            ASSERT_EQ(session.frame().rc, 0);
+            EXPECT_EQ(ctx.last_frame_size, row.size);
+            EXPECT_EQ(ctx.last_video_ts, first + row.video);
+            EXPECT_EQ(ctx.last_audio_ts, first != 0 && row.audio == 0 ? 0 : first + row.audio);
+        }
+        EXPECT_EQ(session.frame().rc, -2); // changes nothing
+        EXPECT_EQ(std::tuple(ctx.last_frame_size, ctx.last_video_ts - first, ctx.last_audio_ts - first),
+                  std::tuple(70u, 80u, 70u));
+    }
+}
+
 TEST(Delivery, GoesOnInAFileThatGrowsTagByTag)
 {
     FakeHost host(g_chain.bytes);

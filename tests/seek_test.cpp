@@ -293,6 +293,47 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
     }
 }
 
+// A keyframe every 200 ms, sound every 23; all times count from 1000, but for the growing file.
+TEST(Seek, SetsTheTimeOfEachStream)
+{
+    constexpr uint32_t KEPT = UINT32_MAX;
+    const Flv scan = Chain(1000, false), index = Chain(1000, true), sound = Chain(1000, false, false);
+    const Flv growing = Chain(0, true);
+    const struct {
+        const Flv& flv;
+        uint32_t options;
+        int32_t time;
+        uint32_t mode, video, audio;
+        int32_t rc = 0;
+    } rows[] = {
+        {.flv = scan, .options = ONE, .time = 500, .mode = BACK, .video = 400, .audio = 400},
+        {.flv = scan, .options = TWO, .time = 500, .mode = BACK, .video = 400, .audio = 391},
+        {.flv = index, .options = INDEX, .time = 500, .mode = FORTH, .video = 600, .audio = 600},
+        {.flv = sound, .options = ONE, .time = 500, .mode = BACK, .video = KEPT, .audio = 483},
+        {.flv = sound, .options = TWO, .time = 500, .mode = FORTH, .video = KEPT, .audio = 506},
+        {.flv = growing, .options = GROWING, .time = 500, .mode = BACK, .video = 400, .audio = KEPT},
+        {.flv = growing, .options = GROWING | TWO, .time = 500, .mode = BACK, .video = 400, .audio = 400},
+        {.flv = scan, .options = TWO, .time = -5000, .mode = AUTO, .video = 0, .audio = 0},
+        {.flv = growing, .options = GROWING, .time = -1, .mode = AUTO, .video = 0, .audio = 0},
+        {.flv = scan, .options = ONE, .time = 0, .mode = REL, .video = KEPT, .audio = KEPT},
+        {.flv = scan, .options = TWO, .time = 9000, .mode = FORTH, .video = KEPT, .audio = KEPT, .rc = -2},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(&row - rows);
+        FakeHost host(row.flv.bytes);
+        Session session(host, {row.options});
+        const flvd_ctx_t& ctx = *session.ctx();
+        for (const uint32_t stream : Streams(row.options))
+            for (int i = 0; i < 8; ++i)
+                session.frame(stream);
+        const auto [size, video, audio] = std::tuple(ctx.last_frame_size, ctx.last_video_ts, ctx.last_audio_ts);
+        EXPECT_EQ(session.seek(row.time, row.mode), row.rc);
+        EXPECT_EQ(ctx.last_video_ts, row.video == KEPT ? video : row.video);
+        EXPECT_EQ(ctx.last_audio_ts, row.audio == KEPT ? audio : row.audio);
+        EXPECT_EQ(ctx.last_frame_size, size);
+    }
+}
+
 TEST(Seek, InAFileThatStillGrows)
 {
     const Media media(Chain(0, true));

@@ -22,9 +22,24 @@ constexpr int64_t SCANNED = (MIB / WINDOW + 1) * WINDOW; // what a failed scan h
 
 using Found = std::tuple<int32_t, int64_t, uint32_t>; // result, place and kind, the latter two on success alone
 
+// A host that may tell one position wrong.
+class Liar : public FakeHost {
+public:
+    using FakeHost::FakeHost;
+    uint64_t nth = 0;
+    int64_t error = 0;
+
+protected:
+    int64_t tell(void* handle, bool wide) override
+    {
+        const int64_t position = FakeHost::tell(handle, wide);
+        return calls(HostFn::Tell) == nth ? position + error : position;
+    }
+};
+
 // A reader on some bytes, with an instance that knows nothing of its streams.
 struct Reader {
-    FakeHost host;
+    Liar host;
     flvd_ctx_t ctx{};
     fio_file_t* file;
     int64_t end;
@@ -66,6 +81,86 @@ const auto Zeros = [](int64_t count) { return Bytes(static_cast<size_t>(count));
 Bytes operator+(const Bytes& front, const Tag& tag)
 {
     return Concat({front, File({tag}).body()});
+}
+
+// A header at its bounds: taken by a search that stands on it, by one that scans for it, and on the way back.
+TEST(TagHeaders, ArePlausibleUpToTheirBounds)
+{
+    constexpr uint32_t ANY_CODEC = 0xFFFF;
+    struct Row {
+        const char* what;
+        bool described, scanned, stepped_back;
+        Bytes data = {0x17, 1, 0, 0, 0};
+        uint32_t timestamp = 5000;
+        uint32_t last_ts = 0; // 0: not known
+        int64_t data_end = 1000;
+        uint32_t video = ANY_CODEC, audio = ANY_CODEC; // filters
+        uint8_t type = 9;
+    };
+    const Bytes avc5 = {0x57, 1, 0, 0, 0}, avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
+    const Row rows[] = {
+        {.what = "at the last time", .described = true, .scanned = false, .stepped_back = true, .last_ts = 5000},
+        {.what = "before it", .described = true, .scanned = true, .stepped_back = true, .last_ts = 5001},
+        {.what = "after it", .described = false, .scanned = false, .stepped_back = false, .last_ts = 4999},
+        {.what = "no time known",
+         .described = true,
+         .scanned = true,
+         .stepped_back = true,
+         .timestamp = UINT32_MAX - 1},
+        {.what = "the last of all", .described = true, .scanned = false, .stepped_back = true, .timestamp = UINT32_MAX},
+        {.what = "size of all data", .described = false, .scanned = false, .stepped_back = true, .data_end = 5},
+        {.what = "a byte less", .described = true, .scanned = true, .stepped_back = true, .data_end = 6},
+        {.what = "type 5", .described = true, .scanned = true, .stepped_back = true, .data = avc5, .video = 7},
+        {.what = "type 6", .described = false, .scanned = false, .stepped_back = false, .data = avc6, .video = 7},
+        {.what = "type 6, any", .described = true, .scanned = true, .stepped_back = true, .data = avc6},
+        {.what = "codec 15", .described = true, .scanned = true, .stepped_back = true, .data = last5, .video = 15},
+        {.what = "type 6 of 0",
+         .described = false,
+         .scanned = false,
+         .stepped_back = false,
+         .data = first6,
+         .video = 0},
+        {.what = "low bits", .described = true, .scanned = true, .stepped_back = true, .video = 0x37},
+        {.what = "codec", .described = false, .scanned = false, .stepped_back = false, .video = 6},
+        {.what = "sound", .described = true, .scanned = true, .stepped_back = true, .audio = 0x17, .type = 8},
+        {.what = "its rate", .described = false, .scanned = false, .stepped_back = false, .audio = 0x13, .type = 8},
+        {.what = "type 10", .described = false, .scanned = false, .stepped_back = false, .type = 10},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.what);
+        Reader r(Zeros(FIRST_TAG) + Tag{row.type, row.timestamp, row.data});
+        std::tie(r.ctx.last_ts, r.ctx.data_end) = std::tie(row.last_ts, row.data_end);
+        std::tie(r.ctx.video_codec_filter, r.ctx.audio_format_filter) = std::tie(row.video, row.audio);
+        EXPECT_EQ(std::get<0>(r.at(FIRST_TAG).trust(ANY)), row.described ? 0 : ENDED);
+        EXPECT_EQ(r.at(FIRST_TAG).find(), row.scanned ? 0 : NOT_FOUND);
+        EXPECT_EQ(std::get<0>(r.at(r.end).prev(ANY)), row.stepped_back ? 0 : FLVD_ERR_AT_FIRST_TAG);
+    }
+}
+
+// Many muxers write a wrong size after the first script tag. It may stand up to four bytes after DataOffset.
+TEST(TagHeaders, OfTheFirstScriptTagNeedNoBackPointer)
+{
+    const struct {
+        const char* what;
+        Tag tag;
+        int64_t at;
+        bool taken;
+    } rows[] = {
+        {.what = "first tag", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG, .taken = true},
+        {.what = "before it", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG - 1, .taken = true},
+        {.what = "a byte after it", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG + 1, .taken = false},
+        {.what = "large", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG, .taken = true},
+        {.what = "large, a byte after", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG + 1, .taken = false},
+        {.what = "beyond the end", .tag = {18, 0, Noise(100), 7, 9000}, .at = FIRST_TAG, .taken = true},
+        {.what = "picture", .tag = {9, 0, AvcNalu(true, Noise(100)), 7}, .at = FIRST_TAG, .taken = false},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        Reader r(Concat({Zeros(row.at) + row.tag, Zeros(6000)}));
+        r.ctx.data_end = 10000;
+        const Found tag(row.taken ? 0 : ENDED, row.taken ? row.at : 0, 0);
+        EXPECT_EQ(r.at(row.at).verify(ANY), tag);
+    }
 }
 
 TEST(TagKinds, AreReportedInBothDirections)
@@ -152,6 +247,55 @@ TEST(Resynchronisation, CountsFailedChecksAnewInEachSearch)
         EXPECT_EQ((r.at(100).*step)(VIDEO), Found(NOT_FOUND, 0, 0));
         const auto [rc, pos, kind] = (r.*step)(VIDEO); // on from there
         EXPECT_EQ(rc + pos, 100 + (2 * CHECKS - 1) * BAD_SIZE);
+    }
+}
+
+// A budget that is used up tells the end of the data by the place where that happened.
+TEST(Resynchronisation, EndsWithTheDataWhenNoHeaderFitsBeforeTheirEnd)
+{
+    Reader r(Zeros(2 * MIB));
+    for (const int64_t left : {12, 13}) {
+        r.ctx.data_end = 101 + SCANNED + left; // a byte is skipped, then windows are scanned
+        EXPECT_EQ(r.at(100).next(ANY), Found(left < 13 ? ENDED : NOT_FOUND, 0, 0));
+        EXPECT_EQ(__FLV_DMX__fioTell64(r.file), 101 + SCANNED);
+    }
+}
+
+// The scan after a bad tag gets no bytes; the host then recovers, and the budget is used up far from the end.
+TEST(Resynchronisation, ForgetsAnEndOfDataThatWasNone)
+{
+    Reader r(Concat({Zeros(100), Bad(1), Zeros(3 * MIB)}));
+    r.at(100).host.fail_nth(HostFn::Read, 2);
+    EXPECT_EQ(r.verify(ANY), Found(NOT_FOUND, 0, 0));
+}
+
+TEST(Position, ThatDoesNotAdvanceEndsASearch)
+{
+    // A picture of 65 bytes and 15 more, sound of 115 bytes in all, a picture; the first lies at FIRST_TAG.
+    const Bytes bytes = Zeros(FIRST_TAG) + Picture(65) + Sound() + Picture();
+    const int64_t sound = FIRST_TAG + 80, last = sound + 115;
+    const struct {
+        const char* what;
+        Step step;
+        int64_t from;
+        uint64_t nth; // position query
+        int64_t error;
+        Found found;
+    } rows[] = {
+        {"forward: after the sound, where it began", &Reader::verify, sound, 3, -115, {NOT_FOUND, 0, 0}},
+        {"forward: a byte on", &Reader::verify, sound, 3, -114, {0, last, 0}},
+        {"forward: a tag before the start", &Reader::verify, sound, 2, -1, {NOT_FOUND, 0, 0}},
+        {"forward: stepping", &Reader::next, sound, 3, -115, {NOT_FOUND, 0, 0}},
+        {"forward: stepping a byte on", &Reader::next, sound, 3, -114, {0, last, KEY}},
+        {"backward: after the sound, where it ended", &Reader::prev, last, 2, 115, {NOT_FOUND, 0, 0}},
+        {"backward: a byte on", &Reader::prev, last, 2, 114, {0, FIRST_TAG, VIDEO}},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        Reader r(bytes);
+        r.at(row.from);
+        std::tie(r.host.nth, r.host.error) = std::tie(row.nth, row.error);
+        EXPECT_EQ((r.*row.step)(VIDEO), row.found);
     }
 }
 
