@@ -241,7 +241,8 @@ TEST(Work, CrossesOneMiBOfRandomBytes)
                              {{0, Concat({head, {last.begin(), last.begin() + 12}})},
                               {size + 11 + SCRIPT, {last.begin() + 12, last.end()}}});
         Session session(host);
-        ASSERT_EQ(session.ctx()->streams, row.streams);
+        ASSERT_TRUE(session.opened());
+        EXPECT_EQ(session.ctx()->streams, row.streams);
         EXPECT_EQ(session.ctx()->last_ts, LATE);
         EXPECT_LT(host.io_calls(), MOST_CALLS);
         Frames frames;
