@@ -111,7 +111,7 @@ std::string Probe(uint8_t type, const std::vector<Bytes>& tags)
     return out.str();
 }
 
-TEST(StreamProbe, TakesWhatTwelveBytesOfASoundTagTell)
+TEST(StreamProbe, TakesWhatTwelveBytesOfAnAudioTagTell)
 {
     const struct {
         const char* what;

@@ -385,7 +385,7 @@ TEST(Delivery, KeepsItsPlaceBehindManyTagsOfTheOtherStream)
 }
 
 // Tags whose back-pointer disagrees, with a configuration packet, which is a turn of its own, between two runs of them.
-TEST(Delivery, ChecksSoManyBackPointersInVainInAllTurnsOfARequest)
+TEST(Delivery, LimitsFailedChecksOverAllTurnsOfARequest)
 {
     constexpr size_t CHECKS = 16384;
     const Tag bad = {8, 0, AacRaw({1, 2, 3}), 0xEEEEEEEE};
@@ -405,7 +405,7 @@ TEST(Delivery, ChecksSoManyBackPointersInVainInAllTurnsOfARequest)
         tags.insert(tags.end(), row.before, bad);
         tags.push_back(g_aac);
         tags.insert(tags.end(), row.after, bad);
-        tags.insert(tags.end(), {Raw(40), Raw(80)}); // a search does not stop at the last time of the file
+        tags.insert(tags.end(), {Raw(40), Raw(80)}); // a scan takes no tag at the last time of the file
         FakeHost host(File(tags, 4).bytes);
         Session session(host);
         ASSERT_EQ(session.frame().rc, 0);
@@ -519,7 +519,7 @@ TEST(LargeFrames, WithAWrongBackPointerAreLostAlone)
         EXPECT_EQ(got.frame.timestamp, request.timestamp);
         EXPECT_EQ(session.ctx()->last_frame_size, request.last_size);
         EXPECT_EQ(host.calls(HostFn::Seek) != 0, request.seeks);
-        EXPECT_EQ(session.last_error(), request.rc == 0 ? 0 : -10002); // what was copied in vain is not recorded
+        EXPECT_EQ(session.last_error(), request.rc == 0 ? 0 : -10002); // a copy that came to nothing is not recorded
     }
 }
 
@@ -549,8 +549,8 @@ TEST(LargeFrames, CutShortByTheHostAreRecorded)
         }
 }
 
-// Headers in damaged data that claim more than there is, or half a MiB.
-TEST(LargeFrames, ThatDamagedDataClaimsCostOnePayloadInVain)
+// False headers in damaged data that claim half a MiB, or more than there is.
+TEST(LargeFrames, CostAtMostOnePayloadWhenTheyAreFalse)
 {
     constexpr uint64_t CACHE = 4096, HEADERS = 50, FRAME = 10000;
     const auto claim = [](uint32_t size) { return Tag{9, 40, AvcNalu(true, Noise(100)), 0xEEEEEEEE, size}; };

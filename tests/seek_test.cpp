@@ -241,7 +241,7 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
         return hidden.build();
     };
     const Flv unseen = hide(FlvBuilder().add(Screen(90000)), Pcm);
-    const Flv ended = Configured(); // sound up to 1978 ms, pictures up to 2360
+    const Flv ended = Configured(); // audio up to 1978 ms, video up to 2360
     const int64_t end = ended.size();
     const Flv unheard = hide(FlvBuilder().add(g_avc).add(Pcm(90000)), Nalu);
     Flv text = index;
@@ -256,7 +256,7 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
         uint32_t reached = 0;
         int64_t at = HERE; // where the reader stands afterwards; HERE: not looked at
     };
-    // unseen, unheard: no tag of the kind to begin with. ended: after, on and before the last sound, from the end.
+    // unseen, unheard: no tag of the kind to begin with. ended: after, on and before the last audio tag.
     const Case cases[] = {{index, GROWING | INFO, TIME, 100, AUTO, 3190}, {scan, INFO, TIME, 100, AUTO, 2982},
                           {scan, GROWING, TIME, 100, AUTO, 3195},         {one, ONE, TIME, 100, AUTO, 2987},
                           {audio, GROWING, TIME, 100, AUTO, 3195},        {scan, ONE, TIME, 9000, AUTO, 3161},
@@ -293,7 +293,7 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
     }
 }
 
-// A keyframe every 200 ms, sound every 23; all times count from 1000, but for the growing file.
+// A keyframe every 200 ms, audio every 23; the times count from 1000, those of the growing file from 0.
 TEST(Seek, SetsTheTimeOfEachStream)
 {
     constexpr uint32_t KEPT = UINT32_MAX;
@@ -382,7 +382,7 @@ TEST(Seek, GoesBackToAPlaceThatItCouldNotGoBackToBefore)
         player.seek(1950, FORTH); // there is no keyframe
         player.next[0] = succeeds ? last : first;
         player.deliver(9);
-        player.seek(1950, FORTH); // that place is used up
+        player.seek(1950, FORTH); // that place was used
         player.deliver(9);
     }
 }

@@ -271,27 +271,28 @@ TEST(Resynchronisation, ForgetsAnEndOfDataThatWasNone)
 
 TEST(Position, ThatDoesNotAdvanceEndsASearch)
 {
-    // A picture of 65 bytes and 15 more, sound of 115 bytes in all, a picture; the first lies at FIRST_TAG.
+    // A picture of 65 bytes and 15 more, audio of 115 bytes in all, a picture; the first starts at FIRST_TAG.
     const Bytes bytes = Zeros(FIRST_TAG) + Picture(65) + Sound() + Picture();
-    const int64_t sound = FIRST_TAG + 80, last = sound + 115;
+    const int64_t audio = FIRST_TAG + 80, last = audio + 115;
+    const Step describe = &Reader::verify, next = &Reader::next, prev = &Reader::prev;
+    const Found none(NOT_FOUND, 0, 0);
     const struct {
-        const char* what;
         Step step;
         int64_t from;
         uint64_t nth; // position query
         int64_t error;
         Found found;
     } rows[] = {
-        {"forward: after the sound, where it began", &Reader::verify, sound, 3, -115, {NOT_FOUND, 0, 0}},
-        {"forward: a byte on", &Reader::verify, sound, 3, -114, {0, last, 0}},
-        {"forward: a tag before the start", &Reader::verify, sound, 2, -1, {NOT_FOUND, 0, 0}},
-        {"forward: stepping", &Reader::next, sound, 3, -115, {NOT_FOUND, 0, 0}},
-        {"forward: stepping a byte on", &Reader::next, sound, 3, -114, {0, last, KEY}},
-        {"backward: after the sound, where it ended", &Reader::prev, last, 2, 115, {NOT_FOUND, 0, 0}},
-        {"backward: a byte on", &Reader::prev, last, 2, 114, {0, FIRST_TAG, VIDEO}},
+        {.step = describe, .from = audio, .nth = 2, .error = -1, .found = none},   // the tag starts before the search
+        {.step = describe, .from = audio, .nth = 3, .error = -115, .found = none}, // after the tag: where it starts
+        {.step = describe, .from = audio, .nth = 3, .error = -114, .found = {0, last, 0}}, // a byte on
+        {.step = next, .from = audio, .nth = 3, .error = -115, .found = none},
+        {.step = next, .from = audio, .nth = 3, .error = -114, .found = {0, last, KEY}},
+        {.step = prev, .from = last, .nth = 2, .error = 115, .found = none}, // before the tag: where it ends
+        {.step = prev, .from = last, .nth = 2, .error = 114, .found = {0, FIRST_TAG, VIDEO}}, // a byte back
     };
     for (const auto& row : rows) {
-        SCOPED_TRACE(row.what);
+        SCOPED_TRACE(&row - rows);
         Reader r(bytes);
         r.at(row.from);
         std::tie(r.host.nth, r.host.error) = std::tie(row.nth, row.error);
