@@ -84,10 +84,13 @@ private:
     bool growing() const { return (m_open.options & GROWING) != 0; }
     uint64_t calls() const { return m_fault.bytes != 0 ? m_host.calls(HostFn::Read) : m_host.failable_calls(); }
     bool fired() const { return m_fault.nth != 0 && calls() >= m_fault.nth; }
+    // A growing file without its position is read on inside a tag, where a false header may pass for one.
+    bool strays() const { return growing() && m_by == 't'; }
     void arm(HostFn fn)
     {
         if (calls() + 1 == m_fault.nth)
             m_by = m_fault.bytes != 0 ? 'r' : INITIALS[static_cast<size_t>(fn)];
+        m_exact = m_exact && !strays();
         if (m_fault.later && fired())
             m_host.fail_from(fn, 1);
     }
@@ -142,7 +145,7 @@ private:
             return rc;
         const Frame tag{got.stream, got.timestamp + m_session->ctx()->first_ts, got.data};
         const auto index = static_cast<size_t>(std::find(frames.begin(), frames.end(), tag) - frames.begin());
-        EXPECT_LT(index, frames.size()) << "at " << got.timestamp;
+        EXPECT_TRUE(strays() || index < frames.size()) << "at " << got.timestamp;
         EXPECT_TRUE(!m_exact || m_fault.later || next == UNKNOWN || next == index) << index << " for " << next;
         next = index + 1;
         return 0;
@@ -194,7 +197,7 @@ private:
             EXPECT_EQ(failures, 3u);
             const int64_t stopped = __FLV_DMX__fioTell64(stream == AUDIO ? ctx.audio_reader : ctx.main_reader);
             const bool reads = ctx.opened_for_info == 0 && (stream & ctx.streams) != 0;
-            const bool ends = reads && !m_fault.later;
+            const bool ends = reads && !m_fault.later && !strays();
             const auto& [frames, next] = due;
             EXPECT_TRUE(!ends || !m_exact || next == UNKNOWN || next == frames.size()) << next;
             EXPECT_TRUE(!ends || stopped >= m_scenario.flv.tags.back().offset) << stopped;

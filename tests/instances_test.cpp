@@ -77,10 +77,13 @@ TEST(Instances, RefusesWhatItCannotServe)
     }
     for (const uint32_t operation : {FLVD_OP_OPEN, FLVD_OP_OPEN_INFO})
         expect(operation, no_handle, &init, &info, -1);
-    for (const uint32_t operation : {FLVD_OP_OPEN, FLVD_OP_OPEN_INFO, FLVD_OP_GET_FRAME, FLVD_OP_SEEK}) {
-        expect(operation, &live, nullptr, &info, -1);
-        expect(operation, &live, &init, nullptr, -1);
-    }
+    for (const uint32_t operation : {FLVD_OP_OPEN, FLVD_OP_OPEN_INFO, FLVD_OP_GET_FRAME, FLVD_OP_SEEK})
+        for (const bool first : {true, false}) {
+            flvd_ctx_t* word = live;
+            expect(operation, &word, first ? nullptr : &init, first ? &info : nullptr, -1);
+            const bool opens = operation == FLVD_OP_OPEN || operation == FLVD_OP_OPEN_INFO;
+            EXPECT_EQ(word, opens ? nullptr : live) << operation; // a refused open is a failed open
+        }
     for (const uint32_t operation : {6u, 7u, 8u, 9u, 11u, 0xFFFFFFFFu})
         expect(operation, &live, &init, &info, -1);
     EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_RESERVED, &live, nullptr, nullptr), -1);

@@ -241,6 +241,8 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
         return hidden.build();
     };
     const Flv unseen = hide(FlvBuilder().add(Screen(90000)), Pcm);
+    const Flv ended = Configured(); // audio up to 1978 ms, video up to 2360
+    const int64_t end = ended.size();
     const Flv unheard = hide(FlvBuilder().add(g_avc).add(Pcm(90000)), Nalu);
     Flv text = index;
     for (const auto& [key, element] : {std::pair("filepositions", 36), {"times", 72}})
@@ -252,7 +254,9 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
         uint32_t options, stream, time, mode;
         int32_t line_or_rc;
         uint32_t reached = 0;
+        int64_t at = HERE; // where the reader stands afterwards; HERE: not looked at
     };
+    // unseen, unheard: no tag of the kind to begin with. ended: after, on and before the last audio tag.
     const Case cases[] = {{index, GROWING | INFO, TIME, 100, AUTO, 3190}, {scan, INFO, TIME, 100, AUTO, 2982},
                           {scan, GROWING, TIME, 100, AUTO, 3195},         {one, ONE, TIME, 100, AUTO, 2987},
                           {audio, GROWING, TIME, 100, AUTO, 3195},        {scan, ONE, TIME, 9000, AUTO, 3161},
@@ -263,10 +267,14 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
                           {lying, ONE, VIDEO, 1400, BACK, 0, 400},        {text, ONE, VIDEO, 800, AUTO, 325},
                           {index, ONE, VIDEO, 1801, AUTO, -101},          {one, ONE, VIDEO, 900, BACK, 844},
                           {scan, ONE, VIDEO, 1950, AUTO, -101, 1978},     {index, ONE, AUDIO, 1979, BACK, 0, 1978},
-                          {unseen, ONE, VIDEO, 1700, AUTO, -101, 1978},   {index, ONE, AUDIO, 1979, AUTO, 0, 1978},
-                          {unheard, TWO, AUDIO, 1700, AUTO, 0, 1978},     {index, GROWING, AUDIO, 900, BACK, -1},
+                          {index, ONE, AUDIO, 1979, AUTO, 0, 1978},       {index, GROWING, AUDIO, 900, BACK, -1},
                           {text, ONE, VIDEO, 1900, BACK, 0, 1400},        {lying, ONE, TIME, 700, BACK, 0, 200},
-                          {in_header, ONE, VIDEO, 200, AUTO, 355},        {in_header, INDEX, VIDEO, 200, AUTO, 452}};
+                          {in_header, ONE, VIDEO, 200, AUTO, 0, 0, 5},    {in_header, INDEX, VIDEO, 200, AUTO, 0, 0, 5},
+                          {unseen, ONE, VIDEO, 1700, AUTO, 0, 1538, 9},   {unseen, ONE, VIDEO, 1700, BACK, 0, 1538, 9},
+                          {unheard, TWO, AUDIO, 1700, AUTO, 0, 1538, 9},  {unheard, TWO, AUDIO, 1700, BACK, 0, 1538, 9},
+                          {ended, ONE, AUDIO, 2100, AUTO, 0, 2360, end},  {ended, ONE, AUDIO, 2100, BACK, 0, 2360, end},
+                          {ended, ONE, AUDIO, 1979, BACK, 0, 2360, end},  {ended, ONE, AUDIO, 1978, BACK, 0, 1978},
+                          {ended, ONE, AUDIO, 1977, BACK, 0, 1955}};
     for (const Case& c : cases) {
         SCOPED_TRACE(&c - cases);
         FakeHost host(c.flv.bytes);
@@ -280,6 +288,49 @@ TEST(Seek, TellsWhatItReachedOrWhereItFailed)
         EXPECT_TRUE(c.line_or_rc <= 0 ? rc == c.line_or_rc
                                       : session.failed_as_listed(c.stream == TIME ? Op::Seek : Op::FrameSeek, rc));
         EXPECT_EQ(reached + static_cast<uint32_t>(time), c.reached);
+        fio_file_t* const reader = c.stream == AUDIO ? session.ctx()->audio_reader : session.ctx()->main_reader;
+        EXPECT_TRUE(c.at == HERE || __FLV_DMX__fioTell64(reader) == c.at);
+    }
+}
+
+// A keyframe every 200 ms, audio every 23; the times count from 1000, those of the growing file from 0.
+TEST(Seek, SetsTheTimeOfEachStream)
+{
+    constexpr uint32_t KEPT = UINT32_MAX;
+    const Flv scan = Chain(1000, false), index = Chain(1000, true), sound = Chain(1000, false, false);
+    const Flv growing = Chain(0, true);
+    const struct {
+        const Flv& flv;
+        uint32_t options;
+        int32_t time;
+        uint32_t mode, video, audio;
+        int32_t rc = 0;
+    } rows[] = {
+        {.flv = scan, .options = ONE, .time = 500, .mode = BACK, .video = 400, .audio = 400},
+        {.flv = scan, .options = TWO, .time = 500, .mode = BACK, .video = 400, .audio = 391},
+        {.flv = index, .options = INDEX, .time = 500, .mode = FORTH, .video = 600, .audio = 600},
+        {.flv = sound, .options = ONE, .time = 500, .mode = BACK, .video = KEPT, .audio = 483},
+        {.flv = sound, .options = TWO, .time = 500, .mode = FORTH, .video = KEPT, .audio = 506},
+        {.flv = growing, .options = GROWING, .time = 500, .mode = BACK, .video = 400, .audio = KEPT},
+        {.flv = growing, .options = GROWING | TWO, .time = 500, .mode = BACK, .video = 400, .audio = 400},
+        {.flv = scan, .options = TWO, .time = -5000, .mode = AUTO, .video = 0, .audio = 0},
+        {.flv = growing, .options = GROWING, .time = -1, .mode = AUTO, .video = 0, .audio = 0},
+        {.flv = scan, .options = ONE, .time = 0, .mode = REL, .video = KEPT, .audio = KEPT},
+        {.flv = scan, .options = TWO, .time = 9000, .mode = FORTH, .video = KEPT, .audio = KEPT, .rc = -2},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(&row - rows);
+        FakeHost host(row.flv.bytes);
+        Session session(host, {row.options});
+        const flvd_ctx_t& ctx = *session.ctx();
+        for (const uint32_t stream : Streams(row.options))
+            for (int i = 0; i < 8; ++i)
+                session.frame(stream);
+        const auto [size, video, audio] = std::tuple(ctx.last_frame_size, ctx.last_video_ts, ctx.last_audio_ts);
+        EXPECT_EQ(session.seek(row.time, row.mode), row.rc);
+        EXPECT_EQ(ctx.last_video_ts, row.video == KEPT ? video : row.video);
+        EXPECT_EQ(ctx.last_audio_ts, row.audio == KEPT ? audio : row.audio);
+        EXPECT_EQ(ctx.last_frame_size, size);
     }
 }
 
@@ -308,19 +359,83 @@ TEST(Seek, InAFileThatStillGrows)
     }
 }
 
-TEST(Seek, ForgetsAPlaceThatItCouldNotGoBackTo)
+// A seek that failed could not go back either. The next one that fails goes back to where the first began, however
+// much was played between them; one that succeeds ends that.
+TEST(Seek, GoesBackToAPlaceThatItCouldNotGoBackToBefore)
 {
     const Media media(Chain(0, false));
-    FakeHost host(media.bytes);
-    Player player(host, media, {ONE});
-    player.deliver(3);
-    host.fail_from(HostFn::Seek, host.calls(HostFn::Seek) + 1);
-    EXPECT_EQ(player.session.seek(1000, BACK), -1);
-    host.fail_nothing();
-    player.place(__FLV_DMX__fioTell64(player.reader()));
-    player.deliver(9);
-    player.seek(1950, FORTH);
-    player.deliver(9);
+    for (const bool succeeds : {false, true}) {
+        FakeHost host(media.bytes);
+        Player player(host, media, {ONE});
+        player.deliver(3);
+        const size_t first = player.next[0];
+        host.fail_from(HostFn::Seek, host.calls(HostFn::Seek) + 1);
+        EXPECT_EQ(player.session.seek(1000, BACK), -1);
+        host.fail_nothing();
+        player.place(__FLV_DMX__fioTell64(player.reader()));
+        player.deliver(9);
+        if (succeeds) {
+            player.seek(800, BACK);
+            player.deliver(9);
+        }
+        const size_t last = player.next[0];
+        player.seek(1950, FORTH); // there is no keyframe
+        player.next[0] = succeeds ? last : first;
+        player.deliver(9);
+        player.seek(1950, FORTH); // that place was used
+        player.deliver(9);
+    }
+}
+
+// The file loses its end after opening, and with it elements of the times, which are its last bytes; or no byte can be
+// read any more. Elements without a byte count as 0.0; with two of them in a row the index ends with its last entry, at
+// 0 s, which is near enough to its tag at 800 ms.
+TEST(Seek, ReadsZerosWhereTheIndexInTheFileIsCut)
+{
+    std::vector<Tag> tags = {g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(800)};
+    std::string positions = "filepositions: [5";
+    for (size_t i = 0; const Tag& tag : File(tags, 1).tags)
+        positions += i++ != 0 ? " " + std::to_string(tag.offset) : "";
+    tags.push_back({18, 0, OnMetaData("keyframes: { " + positions + " times: [5 0 0.2 0.4 0.6 0.8 }")});
+    const Bytes bytes = File(tags, 1).bytes;
+    const auto times = static_cast<int64_t>(Elements(bytes, "times"));
+    const int64_t no_read = -1;
+    const struct {
+        const char* what;
+        int64_t visible;
+        uint32_t target;
+        bool backward;
+        int32_t rc;
+        uint32_t reached;
+        int32_t line = 0;
+    } rows[] = {
+        {.what = "whole", .visible = times + 45, .target = 300, .backward = true, .rc = 0, .reached = 200},
+        {.what = "the last cut", .visible = times + 44, .target = 700, .backward = true, .rc = 0, .reached = 800},
+        {.what = "the last gone", .visible = times + 36, .target = 700, .backward = true, .rc = 0, .reached = 800},
+        {.what = "two gone", .visible = times + 27, .target = 500, .backward = true, .rc = 0, .reached = 800},
+        {.what = "forward", .visible = times + 27, .target = 500, .backward = false, .rc = -101, .reached = 0},
+        {.what = "one cut, two gone", .visible = times + 19, .target = 300, .backward = true, .rc = 0, .reached = 800},
+        {.what = "not needed", .visible = times + 27, .target = 300, .backward = true, .rc = 0, .reached = 200},
+        {.what = "all gone", .visible = times, .target = 300, .backward = true, .rc = 0, .reached = 800},
+        {.what = "all gone, to the start", .visible = times, .target = 0, .backward = true, .rc = 0, .reached = 0},
+        {.what = "no read", .visible = no_read, .target = 300, .backward = true, .rc = -1, .reached = 0, .line = 342},
+        {.what = "no read, forward", .visible = no_read, .target = 300, .backward = false, .rc = -101, .reached = 0},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        FakeHost host(bytes);
+        Session session(host);
+        ASSERT_EQ(session.ctx()->keyframe_index.entry_count, 5u);
+        if (row.visible == no_read)
+            host.fail_from(HostFn::Read, host.calls(HostFn::Read) + 1);
+        else
+            host.set_visible(row.visible);
+        uint32_t reached = 0;
+        EXPECT_EQ(FLVD_RunFrameSeek(session.ctx(), row.target, &reached, VIDEO, row.backward ? 1 : 0), row.rc);
+        EXPECT_EQ(reached, row.reached);
+        EXPECT_EQ(session.last_error(), row.line != 0 ? FLVD_ERR_SHORT_DATA : 0);
+        EXPECT_EQ(session.error_line(), row.line);
+    }
 }
 
 TEST(Seek, BeyondFourGiB)

@@ -22,9 +22,24 @@ constexpr int64_t SCANNED = (MIB / WINDOW + 1) * WINDOW; // what a failed scan h
 
 using Found = std::tuple<int32_t, int64_t, uint32_t>; // result, place and kind, the latter two on success alone
 
+// A host that may tell one position wrong.
+class Liar : public FakeHost {
+public:
+    using FakeHost::FakeHost;
+    uint64_t nth = 0;
+    int64_t error = 0;
+
+protected:
+    int64_t tell(void* handle, bool wide) override
+    {
+        const int64_t position = FakeHost::tell(handle, wide);
+        return calls(HostFn::Tell) == nth ? position + error : position;
+    }
+};
+
 // A reader on some bytes, with an instance that knows nothing of its streams.
 struct Reader {
-    FakeHost host;
+    Liar host;
     flvd_ctx_t ctx{};
     fio_file_t* file;
     int64_t end;
@@ -66,6 +81,86 @@ const auto Zeros = [](int64_t count) { return Bytes(static_cast<size_t>(count));
 Bytes operator+(const Bytes& front, const Tag& tag)
 {
     return Concat({front, File({tag}).body()});
+}
+
+// A header at its bounds: taken by a search that stands on it, by one that scans for it, and on the way back.
+TEST(TagHeaders, ArePlausibleUpToTheirBounds)
+{
+    constexpr uint32_t ANY_CODEC = 0xFFFF;
+    struct Row {
+        const char* what;
+        bool described, scanned, stepped_back;
+        Bytes data = {0x17, 1, 0, 0, 0};
+        uint32_t timestamp = 5000;
+        uint32_t last_ts = 0; // 0: not known
+        int64_t data_end = 1000;
+        uint32_t video = ANY_CODEC, audio = ANY_CODEC; // filters
+        uint8_t type = 9;
+    };
+    const Bytes avc5 = {0x57, 1, 0, 0, 0}, avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
+    const Row rows[] = {
+        {.what = "at the last time", .described = true, .scanned = false, .stepped_back = true, .last_ts = 5000},
+        {.what = "before it", .described = true, .scanned = true, .stepped_back = true, .last_ts = 5001},
+        {.what = "after it", .described = false, .scanned = false, .stepped_back = false, .last_ts = 4999},
+        {.what = "no time known",
+         .described = true,
+         .scanned = true,
+         .stepped_back = true,
+         .timestamp = UINT32_MAX - 1},
+        {.what = "the last of all", .described = true, .scanned = false, .stepped_back = true, .timestamp = UINT32_MAX},
+        {.what = "size of all data", .described = false, .scanned = false, .stepped_back = true, .data_end = 5},
+        {.what = "a byte less", .described = true, .scanned = true, .stepped_back = true, .data_end = 6},
+        {.what = "type 5", .described = true, .scanned = true, .stepped_back = true, .data = avc5, .video = 7},
+        {.what = "type 6", .described = false, .scanned = false, .stepped_back = false, .data = avc6, .video = 7},
+        {.what = "type 6, any", .described = true, .scanned = true, .stepped_back = true, .data = avc6},
+        {.what = "codec 15", .described = true, .scanned = true, .stepped_back = true, .data = last5, .video = 15},
+        {.what = "type 6 of 0",
+         .described = false,
+         .scanned = false,
+         .stepped_back = false,
+         .data = first6,
+         .video = 0},
+        {.what = "low bits", .described = true, .scanned = true, .stepped_back = true, .video = 0x37},
+        {.what = "codec", .described = false, .scanned = false, .stepped_back = false, .video = 6},
+        {.what = "sound", .described = true, .scanned = true, .stepped_back = true, .audio = 0x17, .type = 8},
+        {.what = "its rate", .described = false, .scanned = false, .stepped_back = false, .audio = 0x13, .type = 8},
+        {.what = "type 10", .described = false, .scanned = false, .stepped_back = false, .type = 10},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.what);
+        Reader r(Zeros(FIRST_TAG) + Tag{row.type, row.timestamp, row.data});
+        std::tie(r.ctx.last_ts, r.ctx.data_end) = std::tie(row.last_ts, row.data_end);
+        std::tie(r.ctx.video_codec_filter, r.ctx.audio_format_filter) = std::tie(row.video, row.audio);
+        EXPECT_EQ(std::get<0>(r.at(FIRST_TAG).trust(ANY)), row.described ? 0 : ENDED);
+        EXPECT_EQ(r.at(FIRST_TAG).find(), row.scanned ? 0 : NOT_FOUND);
+        EXPECT_EQ(std::get<0>(r.at(r.end).prev(ANY)), row.stepped_back ? 0 : FLVD_ERR_AT_FIRST_TAG);
+    }
+}
+
+// Many muxers write a wrong size after the first script tag. It may stand up to four bytes after DataOffset.
+TEST(TagHeaders, OfTheFirstScriptTagNeedNoBackPointer)
+{
+    const struct {
+        const char* what;
+        Tag tag;
+        int64_t at;
+        bool taken;
+    } rows[] = {
+        {.what = "first tag", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG, .taken = true},
+        {.what = "before it", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG - 1, .taken = true},
+        {.what = "a byte after it", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG + 1, .taken = false},
+        {.what = "large", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG, .taken = true},
+        {.what = "large, a byte after", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG + 1, .taken = false},
+        {.what = "beyond the end", .tag = {18, 0, Noise(100), 7, 9000}, .at = FIRST_TAG, .taken = true},
+        {.what = "picture", .tag = {9, 0, AvcNalu(true, Noise(100)), 7}, .at = FIRST_TAG, .taken = false},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        Reader r(Concat({Zeros(row.at) + row.tag, Zeros(6000)}));
+        r.ctx.data_end = 10000;
+        const Found tag(row.taken ? 0 : ENDED, row.taken ? row.at : 0, 0);
+        EXPECT_EQ(r.at(row.at).verify(ANY), tag);
+    }
 }
 
 TEST(TagKinds, AreReportedInBothDirections)
@@ -114,7 +209,7 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
 
 // A sound tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
 const Tag BAD{8, 0, Bytes{0xAF, 1, 0xEE, 0xEE, 0xEE}, 0xEEEEEEEE};
-constexpr int64_t BAD_SIZE = 20, BAD_COST = BAD_SIZE - 1 + 64; // the distance to the next, and the penalty
+constexpr int64_t BAD_SIZE = 20, CHECKS = 16384; // of which one search makes so many
 const auto Bad = [](int64_t count) { return File(std::vector(static_cast<size_t>(count), BAD)).body(); };
 
 TEST(Resynchronisation, CoversOneMiBInAll)
@@ -134,13 +229,75 @@ TEST(Resynchronisation, CoversOneMiBInAll)
     all(Zeros(MIB / 2), ENDED);
     const int64_t far = MIB / 2 + 1000, second = 100 + far + 115 + far; // a sound tag restores the careful budget alone
     expect(Concat({Zeros(far) + Sound(), Zeros(far) + Picture()}), {second, NOT_FOUND, second});
-    const int64_t spent = (MIB + BAD_COST - 1) / BAD_COST, after = 100 + spent * BAD_SIZE;
-    expect(Bad(spent) + Picture(), {NOT_FOUND, after, NOT_FOUND});
-    all(Bad(spent - 1) + Picture(), after - BAD_SIZE);
-    const int64_t most = MIB - 64; // left after a bad tag behind which nothing was found
-    const Bytes gap = Concat({Bad(1), Zeros(1 + SCANNED - BAD_SIZE + most)});
-    expect(gap + Picture(), {101 + SCANNED + most, NOT_FOUND, 101 + SCANNED + most});
+    // A failed check costs no distance: with one every 64 bytes all of the MiB is crossed.
+    const Bytes sparse = Concat(std::vector<Bytes>(MIB / 64 - 1, Concat({Bad(1), Zeros(64 - BAD_SIZE)})));
+    all(sparse + Picture(), 100 + MIB - 64);
+    all(Bad(CHECKS - 1) + Picture(), 100 + (CHECKS - 1) * BAD_SIZE);
+    expect(Bad(CHECKS) + Picture(), {NOT_FOUND, 100 + CHECKS * BAD_SIZE, NOT_FOUND});
+    // Nor does one after which the scan finds nothing: the whole MiB is left.
+    const Bytes gap = Concat({Bad(1), Zeros(1 + SCANNED - BAD_SIZE + MIB)});
+    expect(gap + Picture(), {101 + SCANNED + MIB, NOT_FOUND, 101 + SCANNED + MIB});
     all(Concat({gap, {0}}) + Picture(), NOT_FOUND);
+}
+
+TEST(Resynchronisation, CountsFailedChecksAnewInEachSearch)
+{
+    Reader r(Concat({Zeros(100), Bad(2 * CHECKS - 1)}) + Picture());
+    for (const Step step : {&Reader::verify, &Reader::next}) {
+        EXPECT_EQ((r.at(100).*step)(VIDEO), Found(NOT_FOUND, 0, 0));
+        const auto [rc, pos, kind] = (r.*step)(VIDEO); // on from there
+        EXPECT_EQ(rc + pos, 100 + (2 * CHECKS - 1) * BAD_SIZE);
+    }
+}
+
+// A budget that is used up tells the end of the data by the place where that happened.
+TEST(Resynchronisation, EndsWithTheDataWhenNoHeaderFitsBeforeTheirEnd)
+{
+    Reader r(Zeros(2 * MIB));
+    for (const int64_t left : {12, 13}) {
+        r.ctx.data_end = 101 + SCANNED + left; // a byte is skipped, then windows are scanned
+        EXPECT_EQ(r.at(100).next(ANY), Found(left < 13 ? ENDED : NOT_FOUND, 0, 0));
+        EXPECT_EQ(__FLV_DMX__fioTell64(r.file), 101 + SCANNED);
+    }
+}
+
+// The scan after a bad tag gets no bytes; the host then recovers, and the budget is used up far from the end.
+TEST(Resynchronisation, ForgetsAnEndOfDataThatWasNone)
+{
+    Reader r(Concat({Zeros(100), Bad(1), Zeros(3 * MIB)}));
+    r.at(100).host.fail_nth(HostFn::Read, 2);
+    EXPECT_EQ(r.verify(ANY), Found(NOT_FOUND, 0, 0));
+}
+
+TEST(Position, ThatDoesNotAdvanceEndsASearch)
+{
+    // A picture of 65 bytes and 15 more, audio of 115 bytes in all, a picture; the first starts at FIRST_TAG.
+    const Bytes bytes = Zeros(FIRST_TAG) + Picture(65) + Sound() + Picture();
+    const int64_t audio = FIRST_TAG + 80, last = audio + 115;
+    const Step describe = &Reader::verify, next = &Reader::next, prev = &Reader::prev;
+    const Found none(NOT_FOUND, 0, 0);
+    const struct {
+        Step step;
+        int64_t from;
+        uint64_t nth; // position query
+        int64_t error;
+        Found found;
+    } rows[] = {
+        {.step = describe, .from = audio, .nth = 2, .error = -1, .found = none},   // the tag starts before the search
+        {.step = describe, .from = audio, .nth = 3, .error = -115, .found = none}, // after the tag: where it starts
+        {.step = describe, .from = audio, .nth = 3, .error = -114, .found = {0, last, 0}}, // a byte on
+        {.step = next, .from = audio, .nth = 3, .error = -115, .found = none},
+        {.step = next, .from = audio, .nth = 3, .error = -114, .found = {0, last, KEY}},
+        {.step = prev, .from = last, .nth = 2, .error = 115, .found = none}, // before the tag: where it ends
+        {.step = prev, .from = last, .nth = 2, .error = 114, .found = {0, FIRST_TAG, VIDEO}}, // a byte back
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(&row - rows);
+        Reader r(bytes);
+        r.at(row.from);
+        std::tie(r.host.nth, r.host.error) = std::tie(row.nth, row.error);
+        EXPECT_EQ((r.*row.step)(VIDEO), row.found);
+    }
 }
 
 TEST(PrevTag, SlidesBackOneMiBInAll)
@@ -176,6 +333,23 @@ TEST(HostCalls, OfTheBackPointerCheck)
     check(100, 0, "tell64()=13 eof()=0 read(4096)=50 tell64()=63 read(4046)=50 read(3996)=50 seek64(13,0)=0", 50);
     check(100, 16, "tell64()=13 eof()=0 read(16)=16 tell64()=29 seek64(95,1)=0 read(16)=16 seek64(13,0)=0");
     check(100, 5, "tell64()=13 eof()=0 read(13)=13 tell64()=26 seek64(98,1)=0 read(5)=5 seek64(13,0)=0");
+}
+
+TEST(HostCalls, ASeekBackToATagIsTriedOnce)
+{
+    const struct {
+        const char* what;
+        Step step;
+        int64_t from;
+        uint64_t seek; // the one that goes back to the tag
+    } rows[] = {{.what = "describing", .step = &Reader::verify, .from = FIRST_TAG, .seek = 2},
+                {.what = "stepping", .step = &Reader::next, .from = DATA_OFFSET, .seek = 3}};
+    for (const auto& row : rows) {
+        Reader r(Zeros(FIRST_TAG) + Sound(5000) + Picture());
+        r.at(row.from).host.fail_nth(HostFn::Seek, row.seek);
+        EXPECT_EQ((r.*row.step)(AUDIO), Found(NOT_FOUND, 0, 0)) << row.what;
+        EXPECT_EQ(r.host.calls(HostFn::Seek), row.seek) << row.what;
+    }
 }
 
 // What opening finds out: end of the valid data, last timestamp, seek method, index entries, time of the last keyframe.
