@@ -81,8 +81,8 @@ FlvdTurn FLVD_LeaveCutTag(const flvd_delivery_t& delivery, flvd_site_t seek_fail
 // Passes the bytes that are left of a tag that is not delivered.
 FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t left)
 {
-    fio_file_t* const reader = delivery.search.file;
-    if (FLVD_FioSkip(left, reader) == left && FLVD_SkipBackPointer(reader, tag.data_size))
+    FLVD_FioSkip(left, delivery.search.file);
+    if (FLVD_SkipBackPointer(delivery.search.file, tag.data_size))
         return FlvdTurn::Next;
     return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_without_back_pointer);
 }

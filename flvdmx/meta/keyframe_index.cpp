@@ -98,9 +98,12 @@ int32_t FLVD_GoToPositions(flvd_ctx_t* ctx, flvd_site_t site)
     return FLVD_Fail(ctx, site);
 }
 
-// The entry that crosses the end of the valid data stays.
-int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end)
+// Counts the entries before the end of the valid data and the one that crosses it, and cuts off the others, unless
+// there is nothing in memory to count.
+int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end, uint32_t* count)
 {
+    uint32_t& entry_count = ctx->keyframe_index.entry_count;
+    *count = entry_count;
     if (end == ctx->file_size)
         return 0;
     if (FLVD_GoToPositions(ctx, FLVD_SITE_TRIM_POSITIONS_SEEK) != 0)
@@ -108,27 +111,28 @@ int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end)
     flvd_positions_t positions = {};
     if (end >= 1 && !FLVD_ReadPositionsBelow(ctx, end, &positions))
         return -1;
-    uint32_t& count = ctx->keyframe_index.entry_count;
-    count = std::min(count, positions.read); // the times may be the shorter array
+    *count = std::min(entry_count, positions.read); // the times may be the shorter array
+    if (!FLVD_IsIndexInMemory(ctx) || positions.available != 0)
+        entry_count = *count;
     return 0;
 }
 
-// Time of the last entry in memory that has one.
-uint32_t FLVD_LastTimeInMemory(const flvd_ctx_t* ctx)
+// Time of the last of so many entries in memory that has one.
+uint32_t FLVD_LastTimeInMemory(const flvd_ctx_t* ctx, uint32_t count)
 {
-    const uint32_t count = std::min(ctx->keyframe_index.entry_count, ctx->keyframe_arrays.times_count);
+    count = std::min(count, ctx->keyframe_arrays.times_count);
     return count != 0 ? ctx->keyframe_arrays.times_ms[count - 1] : 0;
 }
 
-int32_t FLVD_ReadLastTime(flvd_ctx_t* ctx, uint32_t* time)
+int32_t FLVD_ReadLastTime(flvd_ctx_t* ctx, uint32_t count, uint32_t* time)
 {
     *time = 0;
-    if (ctx->keyframe_index.entry_count == 0)
+    if (count == 0)
         return 0;
     if (__FLV_DMX__fioSeek64(ctx->cur_reader, ctx->keyframe_index.times_offset, FIO_SEEK_SET) != 0)
         return FLVD_Fail(ctx, FLVD_SITE_TRIM_TIMES_SEEK);
     double seconds = 0.0;
-    for (uint32_t i = 0; i < ctx->keyframe_index.entry_count; ++i) {
+    for (uint32_t i = 0; i < count; ++i) {
         const FlvdElement element = FLVD_ReadWholeElement(ctx->cur_reader, &seconds);
         if (element == FlvdElement::Missing)
             return -1;
@@ -224,12 +228,13 @@ int32_t FLVD_FindLastInside(flvd_ctx_t* ctx, int64_t* last, bool* all_inside)
 
 int32_t FLVD_TrimIndex(flvd_ctx_t* ctx, int64_t end)
 {
-    if (FLVD_TrimEntries(ctx, end) != 0)
+    uint32_t count = 0;
+    if (FLVD_TrimEntries(ctx, end, &count) != 0)
         return -1;
     uint32_t time = 0;
     if (FLVD_IsIndexInMemory(ctx))
-        time = FLVD_LastTimeInMemory(ctx);
-    else if (FLVD_ReadLastTime(ctx, &time) != 0)
+        time = FLVD_LastTimeInMemory(ctx, count);
+    else if (FLVD_ReadLastTime(ctx, count, &time) != 0)
         return -1;
     ctx->last_keyframe_ms = time;
     ctx->video_info.last_key_time_ms = time;
@@ -254,6 +259,10 @@ flvd_choice_t FLVD_ChooseEntry(const flvd_ctx_t* ctx, FlvdIndex index, uint32_t 
             break;
         before = time;
     }
+    // Above all times: the reader ends one element further on.
+    double unused = 0.0;
+    if (index == FlvdIndex::InFile && i != 0 && i == times.count && !times.missing)
+        FLVD_ReadElementOrZero(times.file, &unused);
     if (!backward)
         return {FlvdChoice::Miss, 0, 0};
     return i != 0 ? flvd_choice_t{FlvdChoice::Entry, i - 1, before} : flvd_choice_t{FlvdChoice::Rewind, 0, 0};

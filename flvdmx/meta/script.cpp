@@ -137,11 +137,9 @@ FlvdArray FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, u
     const bool kept = (ctx->options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
     if (!kept || (!times && state->pending_key != FLVD_META_KEY_FILEPOSITIONS))
         return FlvdArray::None;
-    bool refused = count > FLVD_ScriptLeft(state);
-    if (!refused) {
+    const bool refused = count > FLVD_ScriptLeft(state) || state->kept_elements + count > uint64_t{2} * state->length;
+    if (!refused)
         state->kept_elements += count;
-        refused = state->kept_elements > uint64_t{2} * state->length;
-    }
     return FLVD_ReplaceArray(ctx, times ? FlvdArray::Times : FlvdArray::Positions, count, refused);
 }
 

@@ -19,7 +19,7 @@ struct flvd_script_state_t {
     uint32_t length;               // of the payload
     uint64_t consumed;             // bytes of it, and of what lies after it when a value runs over
     uint32_t containers;           // open at present
-    uint64_t kept_elements;        // of all keyframe arrays asked for so far
+    uint64_t kept_elements;        // of all keyframe arrays that were not refused
     uint8_t scratch[FLVD_META_TEXT_MAX];
 };
 

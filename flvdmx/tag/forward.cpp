@@ -73,8 +73,8 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
         const FLVD_ReadSizeGuard window_size(file, std::min(size, file->capacity), file->read_size);
         const uint8_t* window = nullptr;
         const uint32_t available = FLVD_FioPeek(&window, size, file);
-        if (available < FLVD_TAG_PEEK_SIZE)
-            return FLVD_ERR_END_OF_DATA;
+        if (available < FLVD_TAG_PEEK_SIZE) // the last window was not a whole one
+            return scanned < limit ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
         const auto starts = static_cast<uint32_t>(std::min<int64_t>(available - overlap, stop - scanned));
         const uint32_t found = FLVD_FindCandidate(window, starts, rules);
         FLVD_FioSkip(found, file);
@@ -86,19 +86,25 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
     return FLVD_ERR_NOT_FOUND;
 }
 
-// Charges a search its distance, or what a failed one costs.
-void FLVD_ChargeScan(flvd_search_t* search, int64_t distance, int32_t failed_cost)
+// Scans for the next candidate and charges the search its distance, which is below 2 windows. Returns the result.
+int64_t FLVD_Scan(flvd_search_t* search)
 {
-    search->data_ended = distance == FLVD_ERR_END_OF_DATA;
-    search->budget -= distance < 0 ? failed_cost : static_cast<int32_t>(std::min<int64_t>(distance, INT32_MAX));
+    const int64_t distance = FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW);
+    search->data_ended = false;
+    if (distance > 0)
+        search->budget -= static_cast<int32_t>(std::min<int64_t>(distance, FLVD_RESYNC_WINDOW));
+    return distance;
 }
 
 // Resynchronisation step: from the byte after the position to the next candidate. A failed one ends the search.
 void FLVD_Resynchronise(flvd_search_t* search)
 {
     FLVD_FioSkip(1, search->file);
-    const int64_t distance = FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW);
-    FLVD_ChargeScan(search, distance, search->budget);
+    const int64_t distance = FLVD_Scan(search);
+    if (distance >= 0)
+        return;
+    search->data_ended = distance == FLVD_ERR_END_OF_DATA;
+    search->budget = 0;
 }
 
 // Both searches.
@@ -140,28 +146,33 @@ int32_t FLVD_TranslateSpent(const flvd_search_t* search, int32_t result)
 
 // The trusting search: the header alone decides.
 
-// Moves past an unwanted tag by its size. `passed` counts them.
-bool FLVD_PassBySize(flvd_search_t* search, const flvd_tag_header_t& header, uint32_t* passed)
+// Moves past an unwanted tag by its size. `passed` counts them. 0, or why the search ends.
+int32_t FLVD_PassBySize(flvd_search_t* search, const flvd_tag_header_t& header, uint32_t* passed)
 {
     const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
     const bool moved = header.IsAudio() ? FLVD_FioSkip(size, search->file) == size
                                         : __FLV_DMX__fioSeek64(search->file, size, FIO_SEEK_CUR) == 0;
-    return moved && (++*passed % FLVD_TAGS_PER_POSITION != 0 || FLVD_TakeLaterPosition(search));
+    if (!moved)
+        return FLVD_ERR_END_OF_DATA;
+    const bool goes_on = ++*passed % FLVD_TAGS_PER_POSITION != 0 || FLVD_TakeLaterPosition(search);
+    return goes_on ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
 // 0 with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
 int32_t FLVD_SearchTrusting(flvd_search_t* search, flvd_tag_header_t* header)
 {
     for (uint32_t passed = 0;;) {
-        const int32_t result = FLVD_PeekNext(search, header);
+        int32_t result = FLVD_PeekNext(search, header);
         if (result != 0)
             return result;
         if (!FLVD_IsPlausibleTag(search->rules, *header))
             FLVD_Resynchronise(search);
         else if (FLVD_IsWantedTag(*header, search->wanted))
             return 0;
-        else if (!FLVD_PassBySize(search, *header, &passed))
-            return FLVD_ERR_END_OF_DATA;
+        else
+            result = FLVD_PassBySize(search, *header, &passed);
+        if (result != 0)
+            return result;
     }
 }
 
@@ -201,7 +212,7 @@ bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
         FLVD_FioSkip(1, search->file);
     else if (__FLV_DMX__fioSeek64(search->file, next, FIO_SEEK_SET) != 0)
         return false;
-    FLVD_ChargeScan(search, FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW), 0);
+    FLVD_Scan(search);
     --*search->checks_left;
     search->position = next;
     return true;
