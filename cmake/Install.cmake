@@ -15,7 +15,7 @@ install(TARGETS flvdmx EXPORT flvdmx
 install(TARGETS flvdmx-host EXPORT flvdmx
     ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR} COMPONENT development
     INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
-install(FILES ${PROJECT_SOURCE_DIR}/flvdmx/flvdmx.h
+install(FILES ${PROJECT_SOURCE_DIR}/flvdmx/flvdmx.h ${PROJECT_SOURCE_DIR}/flvdmx/layers.h
     DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/flvdmx COMPONENT development)
 install(DIRECTORY ${PROJECT_SOURCE_DIR}/host/include/flvdmx
     DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} COMPONENT development)

@@ -1,9 +1,9 @@
 #!/usr/bin/env python3
 """Compares what the library exports and imports with what it is allowed to.
 
-usage: check_symbols.py NM READELF HEADER MAP ABSENT LIBRARY
+usage: check_symbols.py NM READELF HEADERS MAP ABSENT LIBRARY
 
-Exports: the names in the version script, which must be the FLVD_API declarations of the public header.
+Exports: the names in the version script, which must be the FLVD_API declarations of the public headers, those in HEADERS.
 Imports: the memory functions that a compiler may call on its own, and the toolchain's start-up symbols.
 Also: the soname, no library needed but the C library, and no path of the build machine inside.
 """
@@ -14,7 +14,7 @@ import sys
 
 from differences import differences
 
-nm, readelf, header, version_script, absent, library = sys.argv[1:]
+nm, readelf, headers, version_script, absent, library = sys.argv[1:]
 SONAME, LIBC = ("SONAME", "libflvdmx.so.1"), ("NEEDED", "libc.so.6")
 ALLOWED_IMPORTS = {"memcpy", "memmove", "memset", "memcmp", "__cxa_finalize", "__gmon_start__",
                    "_ITM_deregisterTMCloneTable", "_ITM_registerTMCloneTable"}
@@ -33,7 +33,8 @@ def symbols(which):
 
 
 # The identifier before the parameter list, or the last one of a variable.
-declarations = re.findall(r"^FLVD_API\b([^;]*);", read(header), re.M)
+interface = "".join(read(header) for header in sorted(pathlib.Path(headers).glob("*.h")))
+declarations = re.findall(r"^FLVD_API\b([^;]*);", interface, re.M)
 declared = [re.findall(r"\w+", text.split("(")[0])[-1] for text in declarations]
 script = re.findall(r"(\w+)\s*;", re.search(r"global:(.*)local:\s*\*\s*;", read(version_script), re.DOTALL)[1])
 exports, imports = symbols("--defined-only"), symbols("--undefined-only")
