@@ -501,7 +501,7 @@ TEST(LargeFrames, AreCheckedFirstWhenTheBufferHasToGrow)
 TEST(LargeFrames, WithAWrongBackPointerAreLostAlone)
 {
     FakeHost host(
-        File({g_avc, Nalu(0, 5000), Damaged(Nalu(40, 6000)), Nalu(80, 7000), Nalu(120, 8000), Damaged(Nalu(160, 9000))},
+        File({g_avc, Nalu(0, 5000), Damaged(Nalu(40, 6000)), Nalu(80, 7000), Nalu(120, 8000), Damaged(Nalu(100, 9000))},
              1)
             .bytes);
     Session session(host);
@@ -527,32 +527,42 @@ TEST(LargeFrames, WithAWrongBackPointerAreLostAlone)
     }
 }
 
-// False headers in damaged data that claim half a MiB, or more than there is.
+// False headers in damaged data that claim half a MiB, or more than there is; all in one turn of a request, or each in
+// one of its own, after a configuration packet.
 TEST(LargeFrames, CostAtMostOnePayloadWhenTheyAreFalse)
 {
     constexpr uint64_t CACHE = 4096, HEADERS = 50, FRAME = 10000;
-    const auto claim = [](uint32_t size) { return Tag{9, 40, AvcNalu(true, Noise(100)), 0xEEEEEEEE, size}; };
-    const uint64_t crossed = HEADERS * (120 + CACHE + 16) + FRAME + 4 * CACHE; // each header, and the frame after them
+    const uint64_t crossed =
+        HEADERS * (200 + 2 * CACHE + 16) + FRAME + 4 * CACHE; // each header, and the frame after them
+    const std::vector<Tag> bad = {Damaged(Nalu(20))};         // fails a check before them
     const struct {
         const char* what;
-        std::vector<Tag> before; // the headers
-        uint32_t claimed;
+        uint32_t claim;
         uint64_t most; // bytes read
+        bool turns = false;
+        std::vector<Tag> before = {};
     } rows[] = {
-        {.what = "half a MiB", .before = {}, .claimed = 500000, .most = crossed + 500000},
-        {.what = "after a failed check", .before = {Damaged(Nalu(20))}, .claimed = 500000, .most = crossed},
-        {.what = "more than the buffer holds", .before = {}, .claimed = 600000, .most = crossed},
-        {.what = "more than is left", .before = {}, .claimed = 750000, .most = crossed + 710000},
+        {.what = "half a MiB", .claim = 500000, .most = crossed + 500000},
+        {.what = "in turns", .claim = 500000, .most = crossed + 500000, .turns = true},
+        {.what = "after a failed check", .claim = 500000, .most = crossed, .before = bad},
+        {.what = "in turns after it", .claim = 500000, .most = crossed, .turns = true, .before = bad},
+        {.what = "more than the buffer holds", .claim = 600000, .most = crossed},
+        {.what = "in turns more than it holds", .claim = 600000, .most = crossed, .turns = true},
+        {.what = "more than is left", .claim = 750000, .most = crossed + 711000},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
         std::vector<Tag> tags = {g_avc, Nalu(0, 100000)};
         tags.insert(tags.end(), row.before.begin(), row.before.end());
-        tags.insert(tags.end(), HEADERS, claim(row.claimed));
+        for (uint64_t i = 0; i < HEADERS; ++i) {
+            if (row.turns)
+                tags.push_back(g_avc);
+            tags.push_back({9, 40, AvcNalu(true, Noise(100)), 0xEEEEEEEE, row.claim});
+        }
         for (uint32_t i = 0; i < 70; ++i)
             tags.push_back(Nalu(80 + i, FRAME));
         FakeHost host(File(tags, 1).bytes);
-        Session session(host, row.claimed > 700000 ? Buffer(800000) : OpenOptions{});
+        Session session(host, row.claim > 700000 ? Buffer(800000) : OpenOptions{});
         ASSERT_EQ(session.frame().rc, 0);
         host.reset_calls();
         EXPECT_EQ(session.frame().frame.timestamp, 80u);
