@@ -6,6 +6,7 @@
 
 #include <map>
 #include <numeric>
+#include <regex>
 #include <set>
 #include <sstream>
 
@@ -266,6 +267,7 @@ TEST(KeyframeIndex, DecidesHowToSeekAndTheLastTime)
     const std::string two =
         "keyframes: { times: [1 1 filepositions: [3 13 2 2 } keyframes: { filepositions: [3 13 2 2 }";
     expect(two, FLVD_SEEK_BY_INDEX, 1000, INDEX);
+    expect(std::regex_replace(two, std::regex("\\[1 1"), "[0"), FLVD_SEEK_BY_INDEX, 0, INDEX);
     const std::string at_end = "keyframes: { times: [9 1 1 1 1 1 1 1 1 1 filepositions: [9 13 2 2 }";
     FakeHost host(FlvBuilder(4).add(Pcm(5)).metadata(at_end).build().bytes);
     EXPECT_EQ(Session(host).open_rc(), -1); // it ends with the file
