@@ -48,8 +48,7 @@ TEST_P(Sample, IsDescribedAndPlayed)
         EXPECT_EQ(info.size, expected.size());
         for (const ExpectedStream& stream : expected.streams) {
             const bool video = stream.stream == FLVD_STREAM_VIDEO;
-            const flvdmx::Bytes config = video ? info.video->config : info.audio->config;
-            EXPECT_EQ(Bytes(config.begin(), config.end()), stream.extradata);
+            EXPECT_EQ(video ? info.video->config : info.audio->config, stream.extradata);
             EXPECT_EQ(video ? info.video->width : info.audio->sample_rate, video ? stream.width : stream.sample_rate);
         }
         flvd_test::Frames frames;
