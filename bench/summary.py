@@ -70,6 +70,9 @@ def time_rows(times):
     yield ratio_row(times, "… to the trusting loop", "play/small/flvdmx-stdio", "play/small/trusting", 1.15)
     yield ratio_row(times, "play `small`, POSIX, to libavformat", "play/small/flvdmx-posix", "play/small/libavformat", 0.08)
     yield ratio_row(times, "… to the trusting loop", "play/small/flvdmx-posix", "play/small/trusting", 0.60)
+    for host, host_name in HOSTS.items():
+        what = f"play `small`, {host_name}, through flvdmx.hpp to the C entry point"
+        yield ratio_row(times, what, f"play/small/header-{host}", f"play/small/flvdmx-{host}", 1.5)
     for medium in ("hd", "long"):
         name = f"play/{medium}/flvdmx-posix"
         yield ratio_row(times, f"play `{medium}`, POSIX, to libavformat", name, f"play/{medium}/libavformat", 1.0)

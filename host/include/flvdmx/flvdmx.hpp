@@ -434,17 +434,10 @@ public:
      */
     result<Frame> next_frame(Stream stream = Stream::any)
     {
-        if (!can_read())
-            return unreadable();
-        fio_file_t* const reader = reader_of(stream);
-        const Tag ahead = peek_ahead(reader, stream);
-        if (m_return.reader != nullptr)
-            return unreadable();
-        m_request.stream = static_cast<uint32_t>(stream);
-        flvd_frame_t frame{};
-        if (flvd_next_frame(m_instance, &m_request, &frame) != 0)
-            return failure();
-        return describe(frame, reader, ahead);
+        result<Frame> frame{Frame()};
+        if (!take(stream, *frame))
+            return m_return.reader != nullptr ? unreadable() : failure();
+        return frame;
     }
 
     /**
@@ -485,6 +478,7 @@ public:
     {
         if (!can_read())
             return unreadable();
+        m_next = {-1, -1};
         const flvd_seek_request_t request = {clamp<int32_t>(time.count()), static_cast<uint32_t>(mode)};
         int32_t reached = 0;
         if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) != 0)
@@ -496,6 +490,8 @@ public:
     error last_error() const { return failure(); }
 
 private:
+    friend FrameRange; // takes frames without a copy
+
     // Of a tag (FLV file format, version 10.1, annex E.4).
     static constexpr uint32_t tag_header_size = 11;
     static constexpr uint32_t back_pointer_size = 4;
@@ -512,8 +508,9 @@ private:
         // The tag at the reader's position, which is given. None when fewer bytes than a tag has are left.
         Tag(fio_file_t* reader, int64_t at)
         {
-            const uint8_t* bytes = nullptr;
-            if (at < 0 || __FLV_DMX__fioShowBytesByPtr(&bytes, sizeof m_bytes, reader) < sizeof m_bytes)
+            const uint8_t* bytes = reader->cache + reader->head; // seen without a call when it is cached
+            const bool cached = reader->count >= sizeof m_bytes;
+            if (!cached && __FLV_DMX__fioShowBytesByPtr(&bytes, sizeof m_bytes, reader) < sizeof m_bytes)
                 return;
             std::memcpy(m_bytes, bytes, sizeof m_bytes);
             position = at;
@@ -522,8 +519,8 @@ private:
         bool is_video() const { return m_bytes[0] == FLVD_TAG_TYPE_VIDEO; }
         bool is_audio() const { return m_bytes[0] == FLVD_TAG_TYPE_AUDIO; }
         Stream stream() const { return is_video() ? Stream::video : is_audio() ? Stream::audio : Stream::any; }
-        uint32_t data_size() const { return unsigned24(1); }
-        uint32_t timestamp() const { return unsigned24(4) | uint32_t{m_bytes[7]} << 24; }
+        uint32_t data_size() const { return word(0) & 0xFFFFFF; }
+        uint32_t timestamp() const { return word(4) >> 8 | uint32_t{m_bytes[7]} << 24; }
         int64_t end() const { return position + tag_header_size + data_size() + back_pointer_size; }
         bool is_keyframe() const { return is_audio() || m_bytes[11] >> 4 == 1 || m_bytes[11] >> 4 == 4; }
 
@@ -534,22 +531,23 @@ private:
         int32_t composition_offset() const
         {
             constexpr int32_t sign = 1 << 23;
-            return is_avc() ? (static_cast<int32_t>(unsigned24(13)) ^ sign) - sign : 0;
+            return is_avc() ? (static_cast<int32_t>(word(12) & 0xFFFFFF) ^ sign) - sign : 0;
         }
 
         // True when the frame, after which its reader stands at `frame_end`, is that of this tag.
         bool carries(const flvd_frame_t& frame, int64_t frame_end) const
         {
-            return position >= 0 && end() == frame_end && static_cast<uint32_t>(stream()) == frame.stream &&
-                   data_size() == frame.size + codec_header_size() && has_frame();
+            const uint32_t type = frame.stream == FLVD_STREAM_VIDEO ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
+            return word(0) == (type << 24 | (frame.size + codec_header_size())) && end() == frame_end;
         }
 
     private:
         bool is_avc() const { return is_video() && (m_bytes[11] & 15) == static_cast<uint8_t>(VideoCodec::avc); }
         bool is_aac() const { return is_audio() && m_bytes[11] >> 4 == static_cast<uint8_t>(AudioCodec::aac); }
-        uint32_t unsigned24(size_t at) const
+        uint32_t word(size_t at) const
         {
-            return uint32_t{m_bytes[at]} << 16 | uint32_t{m_bytes[at + 1]} << 8 | m_bytes[at + 2];
+            return uint32_t{m_bytes[at]} << 24 | uint32_t{m_bytes[at + 1]} << 16 | uint32_t{m_bytes[at + 2]} << 8 |
+                   m_bytes[at + 3];
         }
 
         uint8_t m_bytes[tag_header_size + 5]{};
@@ -576,6 +574,7 @@ private:
         std::swap(m_return, other.m_return);
         std::swap(m_changes, other.m_changes);
         std::swap(m_given, other.m_given);
+        std::swap(m_next, other.m_next);
     }
 
     /* Opening. */
@@ -709,37 +708,56 @@ private:
 
     /* Frames. */
 
-    // What is probably the tag of the next frame. With two readers the tags of the other stream come first: the library
-    // would cross them as well, and goes on from the tag behind them.
-    Tag peek_ahead(fio_file_t* reader, Stream stream)
+    // The next frame, all its fields. False when there is none.
+    bool take(Stream stream, Frame& frame)
     {
-        const int64_t position = __FLV_DMX__fioTell64(reader);
-        const Tag tag(reader, position);
-        const bool apart = m_instance->main_reader != m_instance->audio_reader;
-        const bool found = (m_instance->streams & static_cast<uint32_t>(stream)) != 0;
-        if (!apart || !found || tag.position < 0 || tag.stream() == stream)
-            return tag;
-        const Tag next = find_tag(reader, stream == Stream::video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO);
-        if (next.position < 0)
-            go_back(reader, position);
-        return next;
+        if (!can_read())
+            return false;
+        const bool audio = stream == Stream::audio;
+        fio_file_t* const reader = audio ? m_instance->audio_reader : m_instance->main_reader;
+        int64_t begin = std::exchange(m_next[audio ? 1 : 0], -1);
+        if (begin < 0)
+            begin = __FLV_DMX__fioTell64(reader);
+        Tag ahead(reader, begin);
+        if (m_instance->main_reader != m_instance->audio_reader && !go_to_stream(reader, stream, ahead))
+            return false;
+        m_request.stream = static_cast<uint32_t>(stream);
+        flvd_frame_t taken;
+        if (request(taken) != 0)
+            return false;
+        const int64_t end = __FLV_DMX__fioTell64(reader);
+        frame.stream = static_cast<Stream>(taken.stream);
+        frame.time = time_of(taken.timestamp_ms + m_instance->first_ts);
+        frame.data = {taken.data, taken.size};
+        if (!ahead.carries(taken, end))
+            ahead = look_again(taken, reader, ahead.position, end);
+        frame.composition_offset = Milliseconds(ahead.composition_offset());
+        frame.keyframe = ahead.is_keyframe();
+        frame.position = ahead.position;
+        frame.new_config = m_changes.empty() ? Bytes() : changed_config(frame.stream, ahead.position);
+        m_next[audio ? 1 : 0] = end;
+        return true;
     }
 
-    Frame describe(const flvd_frame_t& frame, fio_file_t* reader, Tag tag)
+    // Most requests bring a frame: flvd_next_frame only goes on where one does not.
+    int32_t request(flvd_frame_t& frame)
     {
-        const int64_t end = __FLV_DMX__fioTell64(reader);
-        if (!tag.carries(frame, end))
-            tag = look_again(frame, reader, tag.position, end);
-        Frame described;
-        described.stream = static_cast<Stream>(frame.stream);
-        described.time = time_of(frame.timestamp_ms + m_instance->first_ts);
-        described.data = {frame.data, frame.size};
-        described.composition_offset = Milliseconds(tag.composition_offset());
-        described.keyframe = tag.is_keyframe();
-        described.position = tag.position;
-        if (!m_changes.empty())
-            described.new_config = changed_config(described.stream, tag.position);
-        return described;
+        const int32_t result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &m_request, &frame);
+        return result == FLVD_RET_END ? flvd_next_frame(m_instance, &m_request, &frame) : result;
+    }
+
+    // With two readers the tags of the other stream come first: the library would cross them as well, and goes on from
+    // the tag after them. False when the reader is no longer where playing is.
+    [[gnu::noinline]] bool go_to_stream(fio_file_t* reader, Stream stream, Tag& ahead)
+    {
+        const bool found = (m_instance->streams & static_cast<uint32_t>(stream)) != 0;
+        if (!found || ahead.position < 0 || ahead.stream() == stream)
+            return true;
+        const int64_t begin = ahead.position;
+        ahead = find_tag(reader, stream == Stream::video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO);
+        if (ahead.position < 0)
+            go_back(reader, begin);
+        return m_return.reader == nullptr;
     }
 
     // Of a file timestamp. One before the first is negative.
@@ -750,7 +768,7 @@ private:
 
     // After a frame before which tags were passed over: its tag, and what configurations are between. `from` is where
     // the reader stood before, `end` where it stands now.
-    Tag look_again(const flvd_frame_t& frame, fio_file_t* reader, int64_t from, int64_t end)
+    [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, fio_file_t* reader, int64_t from, int64_t end)
     {
         const Tag tag = tag_before(frame, reader, end);
         if (from >= 0 && from < tag.position && move_to(reader, from))
@@ -774,7 +792,7 @@ private:
     void learn_configs(fio_file_t* reader, int64_t end)
     {
         for (int64_t reached = -1;;) {
-            const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_CONFIG);
+            const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO);
             if (tag.position <= reached || tag.position >= end)
                 return;
             if (tag.is_config())
@@ -823,7 +841,7 @@ private:
     }
 
     // The configuration of a frame, when it is not the one that was given last.
-    Bytes changed_config(Stream stream, int64_t position)
+    [[gnu::noinline]] Bytes changed_config(Stream stream, int64_t position)
     {
         const Change* const change = change_at(stream, position);
         int64_t& given = m_given[stream == Stream::video ? 0 : 1];
@@ -959,6 +977,7 @@ private:
     Return m_return;
     std::vector<Change> m_changes;          // in file order
     std::array<int64_t, 2> m_given{-1, -1}; // positions of the changes that video and audio had last; -1: none
+    std::array<int64_t, 2> m_next{-1, -1};  // where the main and the audio reader stand, when that is known; else -1
 };
 
 /** The frames of a file from where it stands, for one range-for. */
@@ -970,17 +989,17 @@ public:
     /** The place in the range; all of them of one range are the same place. */
     class Iterator {
     public:
-        explicit Iterator(FrameRange* range) : m_range(range) {}       /**< of a range whose frame was taken */
-        const Frame& operator*() const { return *m_range->m_frame; }   /**< the frame */
-        const Frame* operator->() const { return &*m_range->m_frame; } /**< of the frame */
+        explicit Iterator(FrameRange* range) : m_range(range) {}      /**< of a range whose frame was taken */
+        const Frame& operator*() const { return m_range->m_frame; }   /**< the frame; an empty one after the last */
+        const Frame* operator->() const { return &m_range->m_frame; } /**< of the frame */
         /** Takes the next frame. */
         Iterator& operator++()
         {
             m_range->advance();
             return *this;
         }
-        bool operator!=(Sentinel) const { return static_cast<bool>(m_range->m_frame); } /**< true at a frame */
-        bool operator==(Sentinel) const { return !m_range->m_frame; }                   /**< true after the last */
+        bool operator!=(Sentinel) const { return m_range->m_has_frame; }  /**< true at a frame */
+        bool operator==(Sentinel) const { return !m_range->m_has_frame; } /**< true after the last */
 
     private:
         FrameRange* m_range;
@@ -996,11 +1015,17 @@ public:
     static Sentinel end() { return {}; } /**< where every range ends */
 
 private:
-    void advance() { m_frame = m_file.next_frame(m_stream); }
+    void advance()
+    {
+        m_has_frame = m_file.take(m_stream, m_frame);
+        if (!m_has_frame)
+            m_frame = Frame();
+    }
 
     File& m_file;
     Stream m_stream;
-    result<Frame> m_frame{flvdmx::error()};
+    Frame m_frame;
+    bool m_has_frame = false;
 };
 
 inline FrameRange File::frames(Stream stream) &
