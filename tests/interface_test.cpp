@@ -213,7 +213,7 @@ TEST(Interface, ReportsChangedConfigurations)
         SCOPED_TRACE(testing::Message() << (apart ? "two readers" : "one reader") << (growing ? ", growing" : ""));
         auto file = flvdmx::File::open("memory", g_memory, {0, 0, apart, growing});
         std::vector<std::pair<int64_t, Bytes>> changes;
-        const auto play = [&] {
+        const auto play = [&, apart = apart] {
             changes.clear();
             for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
                 for (const flvdmx::Frame& frame : file->frames(stream))

@@ -72,6 +72,7 @@ int main(int argc, char** argv)
         std::atomic<size_t> opened = 0;
         std::array<size_t, THREADS> frames{};
         std::vector<std::thread> threads;
+        threads.reserve(THREADS);
         for (size_t& count : frames)
             threads.emplace_back(PlayOwnFile, std::ref(bytes), std::ref(opened), std::ref(count));
         for (std::thread& thread : threads)

@@ -35,6 +35,10 @@
 #ifndef FLVDMX_FLVDMX_HPP
 #define FLVDMX_FLVDMX_HPP
 
+#if __cplusplus < 201703L
+#error "flvdmx.hpp needs C++17"
+#endif
+
 #include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
 #include "flvdmx/metadata.hpp"
@@ -957,15 +961,13 @@ private:
         return numbers;
     }
 
-    // What does not fit becomes the greatest or least number that does, no number 0.
+    // What does not fit becomes the greatest or least number that does, what is no number the least.
     template <typename To, typename From> static To clamp(From value)
     {
         using Limits = std::numeric_limits<To>;
         if (value >= static_cast<From>(Limits::max()))
             return Limits::max();
-        if (value <= static_cast<From>(Limits::min()))
-            return Limits::min();
-        return value == value ? static_cast<To>(value) : To{0};
+        return value > static_cast<From>(Limits::min()) ? static_cast<To>(value) : Limits::min();
     }
 
     inline static Host m_host = make_host(nullptr); // of the files that are open, both under open_mutex

@@ -93,23 +93,10 @@ private:
         }
 
     private:
-        enum Marker : uint8_t {
-            number = 0,
-            boolean = 1,
-            string = 2,
-            object = 3,
-            null = 5,
-            undefined = 6,
-            reference = 7,
-            ecma_array = 8,
-            object_end = 9,
-            strict_array = 10,
-            date = 11,
-            long_string = 12,
-            unsupported = 13,
-            xml_document = 15,
-            typed_object = 16
-        };
+        // Type markers.
+        static constexpr uint8_t number = 0, boolean = 1, string = 2, object = 3, null = 5, undefined = 6,
+                                 reference = 7, ecma_array = 8, object_end = 9, strict_array = 10, date = 11,
+                                 long_string = 12, unsupported = 13, xml_document = 15, typed_object = 16;
 
         // The next bytes; none when there are not so many, and the payload has ended.
         Bytes take(size_t size)
