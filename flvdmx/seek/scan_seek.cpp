@@ -1,7 +1,7 @@
 // Frame seek by scanning: from the nearest of a few starting places, walks from tag to tag until the target is reached.
 //
 // A walk never ends on an AVC configuration or end-of-sequence tag: they are keyframes by their FrameType, but no
-// picture. Forward means at or after the target, so only a backward seek may end in front of the first tag.
+// picture. Forward means at or after the target, so only a backward seek may end before the first tag.
 
 #include "flvdmx/seek/seek.h"
 
@@ -31,7 +31,7 @@ struct flvd_scan_t {
 
 int32_t FLVD_SeekBackward(flvd_scan_t* scan);
 
-// The results of seeks made to start a walk are not looked at: the walk then starts where the reader is, and answers on
+// The results of seeks made to start a walk are ignored: the walk then starts where the reader is, and answers on
 // the right side of the target all the same.
 void FLVD_StartAt(const flvd_scan_t* scan, int64_t position)
 {
@@ -155,7 +155,7 @@ FlvdNearest FLVD_Nearest(const flvd_scan_t* scan, uint32_t known)
     return int64_t{distance} >= int64_t{scan->ctx->last_ts} - scan->target ? FlvdNearest::End : FlvdNearest::Known;
 }
 
-// The first tag of a kind at or behind an estimated place, else the last one of the file. 0 with the tag,
+// The first tag of a kind at or after an estimated place, else the last one of the file. 0 with the tag,
 // FLVD_ERR_AT_FIRST_TAG when there is none, or -1.
 int32_t FLVD_FirstTag(flvd_scan_t* scan, uint32_t kind, flvd_site_t site)
 {

@@ -232,8 +232,8 @@ bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_inf
     return check.passed ? FLVD_PassGoodTag(search, check.in_place, tag) : FLVD_PassBadTag(search, check.in_place);
 }
 
-// A plausible header at the position is taken when its kind is wanted and its back-pointer agrees, or need not be asked
-// yet. 0, FLVD_UNCHECKED, FLVD_SEARCH_ON or FLVD_ERR_NOT_FOUND.
+// A plausible header at the position is taken when its kind is wanted and its back-pointer agrees, or is compared
+// later. 0, FLVD_UNCHECKED, FLVD_SEARCH_ON or FLVD_ERR_NOT_FOUND.
 int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& header)
 {
     if (!FLVD_TakePosition(search))
