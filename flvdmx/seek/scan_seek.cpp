@@ -26,7 +26,7 @@ struct flvd_scan_t {
     bool backward;
     bool audio;
     flvd_tag_info_t tag; // the tag reached last
-    uint32_t steps;      // of the last walk
+    int64_t steps;       // of the last walk
 };
 
 int32_t FLVD_SeekBackward(flvd_scan_t* scan);
@@ -61,10 +61,13 @@ int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
     const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
+    // More than the file has room for: a host that lies about positions could keep a walk busy for ever.
+    const int64_t most_steps = scan->ctx->data_end / FLVD_TAG_OVERHEAD;
     for (scan->steps = 0;;) {
         if (FLVD_FioAtEnd(scan->file))
             return scan->steps != 0 && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
-        ++scan->steps;
+        if (scan->steps++ > most_steps)
+            return FLVD_ERR_NOT_FOUND;
         const int32_t code = step(scan->ctx, scan->file, &scan->tag, scan->kind, nullptr);
         if (code != 0)
             return code;
