@@ -1,4 +1,8 @@
-// Inside of the cached file layer, shared by its files, and the guard that its users narrow the refill quantum with.
+// The cached file from inside the library: what its own files share, and the short ways that the layers above use where
+// the exported functions would cost a call. The guard narrows the read size for a while.
+//
+// Files: file.cpp (opening, positions, refill, peek, skip), block.cpp (reading and writing blocks), tables.cpp (the
+// process-wide host functions).
 #ifndef FLVDMX_FIO_FIO_H
 #define FLVDMX_FIO_FIO_H
 
