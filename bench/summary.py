@@ -192,7 +192,7 @@ def main():
     opens = {"open `small`": f"{media}/small.flv", MANY_PROPERTIES: ROOT / "tests/data/avc_aac.flv"}
     own = instructions.measure(programs / "flvdmx-own", opens, programs.parent / "instructions")
     goals = ["| What | Goal | Measured | Met |", "|---|---|---|---|", *time_rows(times), *cost_rows(cost)]
-    goals += figure_rows(own, {"small frame": 260, "large frame": 450}, "instructions")
+    goals += figure_rows(own, {"small frame": 260, "large frame": 450, "small frame, added by flvdmx.hpp": 160}, "instructions")
     goals += [measured(name, f"{own[name]:.0f} instructions") for name in opens]
     if targets.exists():
         bounds = {"code and constants": 24576, "static data": 512, "instance": 1024, "deepest stack": 8192}

@@ -41,6 +41,7 @@
 
 #include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
+#include "flvdmx/layers.h"
 #include "flvdmx/metadata.hpp"
 #include "flvdmx/next_frame.h"
 #include "flvdmx/result.hpp"
