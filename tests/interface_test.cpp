@@ -449,6 +449,8 @@ void UseAll(flvdmx::result<flvdmx::File> file, const Lines& whole)
     play(3);
     (void)file->seek(300ms, SeekMode::backward);
     play(1000);
+    file->close();
+    EXPECT_FALSE(file->next_frame());
 }
 
 // Each function of the host fails once, at each of its calls.
