@@ -20,16 +20,31 @@ inline std::vector<uint32_t> Streams(uint32_t options)
     return (options & SEPARATE) != 0 ? std::vector{VIDEO, AUDIO} : std::vector{BOTH};
 }
 
-/** What may fail: opening, a frame, a time seek, a frame seek; and what opening or a frame records besides. */
-enum class Op { Open, Frame, Seek, FrameSeek, Inside };
+/**
+ * What fails at a place: a call without an instance, an open, a frame request, a time seek, a frame seek. Besides these
+ * an open records why a tag does not describe its stream and why it finds no end, a request why it delivers no tag.
+ */
+enum class Op { Call, Open, Codec, Extent, Tag, Frame, Seek, FrameSeek };
 
-/** A place of failure. */
-struct Place {
-    Op op;
-    int32_t rc, code, line; /**< result, error code and line; rc is 0 for what is recorded besides */
-    std::string by;         /**< of alloc, open, read, seek, tell the initials of those whose failure leads there */
+/** The places of failure, named as in the library's table of them. */
+enum class Site : uint8_t {
+#define FLVD_SITE(operation, name, code, line, growing_line) name,
+#include "flvdmx/common/sites.def"
+#undef FLVD_SITE
 };
-/** All of them. */
+struct Place {
+    Site site;
+    Op op;
+    int32_t code, line, growing_line; /**< error code; lines, growing_line 0 when it is the same in a growing file */
+
+    bool records(int32_t error, int32_t error_line) const
+    {
+        return code == error && error_line != 0 && (line == error_line || growing_line == error_line);
+    }
+    /** What an operation returns that fails here. */
+    int32_t result() const;
+};
+/** All places, in the order of their sites. */
 const std::vector<Place>& Places();
 bool IsListed(Op op, int32_t rc, int32_t code, int32_t line);
 
