@@ -352,7 +352,7 @@ TEST(Faults, AreSurvivedAtEveryCall)
         return; // a sample does not lead to every place
     for (const auto& [fn, sites] : g_ledTo)
         for (const Site site : sites) {
-            const Place& place = Places().at(static_cast<size_t>(site));
+            const Place& place = At(site);
             EXPECT_EQ(seen[place.line].count(fn), 1u) << place.line;
             EXPECT_TRUE(place.growing_line == 0 || seen[place.growing_line].count(fn) == 1) << place.growing_line;
         }

@@ -41,11 +41,19 @@ struct Place {
     {
         return code == error && error_line != 0 && (line == error_line || growing_line == error_line);
     }
+    int32_t line_of(uint32_t options) const
+    {
+        return (options & GROWING) != 0 && growing_line != 0 ? growing_line : line;
+    }
     /** What an operation returns that fails here. */
     int32_t result() const;
 };
 /** All places, in the order of their sites. */
 const std::vector<Place>& Places();
+inline const Place& At(Site site)
+{
+    return Places().at(static_cast<size_t>(site));
+}
 bool IsListed(Op op, int32_t rc, int32_t code, int32_t line);
 
 struct OpenOptions {
