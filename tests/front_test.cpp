@@ -11,6 +11,8 @@ using namespace flvd_test;
 
 namespace {
 
+using enum Site;
+
 constexpr size_t BUDGET = 102; // tags that a request or a probing handles
 constexpr uint32_t MIB = 0x100000;
 constexpr uint8_t SOUND_MP3_8K = 0xEF, SOUND_AAC = 0xAF;
@@ -18,10 +20,10 @@ constexpr uint8_t SOUND_MP3_8K = 0xEF, SOUND_AAC = 0xAF;
 const auto Video = [](uint32_t ts, const Bytes& data) { return Tag{9, ts, data}; };
 const auto Audio = [](uint32_t ts, const Bytes& data) { return Tag{8, ts, data}; };
 
-Flv Repeat(size_t n, const Tag& tag, std::vector<Tag> behind, uint8_t flags = 5)
+Flv Repeat(size_t n, const Tag& tag, std::vector<Tag> then, uint8_t flags = 5)
 {
-    behind.insert(behind.begin(), n, tag);
-    return File(behind, flags);
+    then.insert(then.begin(), n, tag);
+    return File(then, flags);
 }
 
 const auto Cut = [](const Bytes& bytes, size_t size) { return Bytes(bytes.data(), bytes.data() + size); };
@@ -32,133 +34,162 @@ const Flv g_indexed = Indexed(5);
 const auto Cache = [](uint32_t size, uint32_t options = 0) { return OpenOptions{options, false, size}; };
 const auto Buffer = [](uint32_t size) { return OpenOptions{USER, false, 0, 0, FakeHost::DEFAULT_FILE, size}; };
 
-// What a host sees of a call: its result, the code and the line recorded; then, of a failed open, the code and the
-// line in the instance that it released.
-struct Failure {
+// What a host sees of a call. The file alone leads to these; those that take a failing host are in the fault sweep.
+struct Row {
     const char* what;
-    Bytes file;
-    OpenOptions open;
-    std::vector<int32_t> expected;
-    int request = 0; // the call that fails: 0 the open, else the request of this number
-    uint32_t stream = 0;
+    Bytes file = {};
+    OpenOptions open = {};
+    std::optional<Site> site = {};        // recorded: the call fails, or the open and the request go on
+    std::optional<Site> in_instance = {}; // recorded in the instance that a failed open released; empty: anything
+    int before = 0;                       // requests before the one that fails
+    uint32_t stream = 0;                  // requested
 };
 
-// The file alone leads to these; those that take a failing host are in the fault sweep.
-void ExpectFailures(const std::vector<Failure>& failures)
+// request: number of the request that is looked at, 0 for the open.
+void Expect(const Row& row, int request = 0)
 {
-    for (const Failure& failure : failures) {
-        FakeHost host(failure.file);
-        std::vector<int32_t> seen(3);
-        host.on_release = [&seen](const void* block, uint32_t size) {
-            if (const auto* const ctx = static_cast<const flvd_ctx_t*>(block); size == sizeof(*ctx))
-                seen.insert(seen.end(), {ctx->error, ctx->error_line});
-        };
-        Session session(host, failure.open);
-        seen[0] = session.open_rc();
-        for (int request = 0; request < failure.request; ++request)
-            seen[0] = session.frame(failure.stream).rc;
-        seen[1] = session.last_error();
-        seen[2] = session.error_line();
-        seen.resize(failure.expected.size());
-        EXPECT_EQ(seen, failure.expected) << failure.what;
-    }
+    SCOPED_TRACE(std::string(row.what) + ((row.open.options & GROWING) != 0 ? ", growing" : ""));
+    FakeHost host(row.file);
+    host.on_release = [&row](const void* block, uint32_t size) {
+        const auto* const ctx = static_cast<const flvd_ctx_t*>(block);
+        EXPECT_TRUE(size != sizeof(*ctx) || !row.in_instance ||
+                    At(*row.in_instance).records(ctx->error, ctx->error_line));
+    };
+    Session session(host, row.open);
+    host.on_release = nullptr;
+    int32_t rc = session.open_rc();
+    for (int i = 0; i < request; ++i)
+        rc = session.frame(row.stream).rc;
+    const bool fails = row.site && (At(*row.site).op == Op::Open || At(*row.site).op == Op::Frame);
+    EXPECT_EQ(rc, fails ? At(*row.site).result() : 0);
+    EXPECT_TRUE(session.recorded(row.site)) << session.last_error() << " / " << session.error_line();
 }
 
 TEST(Failures, OfOpening)
 {
     const auto header = [](uint32_t size) { return File({Pcm(0)}, 5, {}, size).bytes; };
+    const Bytes far = File({Pcm(0)}, 5, Noise(MIB + 1)).bytes, script = File({g_meta}).bytes;
     const Bytes unseen = Repeat(BUDGET, g_meta, {Pcm(0)}).bytes;
-    ExpectFailures({{"no such file", {}, {0, false, 0, 0, "b.flv"}, {-4, -5, 2386}},
-                    {"no signature", Noise(5000), {}, {-1, -1004, 2423}},
-                    {"signature too far", File({Pcm(0)}, 5, Noise(MIB + 1)).bytes, {}, {-1, -1004, 2423}},
-                    {"8 bytes", Cut(g_chain.bytes, 8), {GROWING}, {-1, -1004, 2423}},
-                    {"data offset 8", header(8), {GROWING}, {-1, -1004, 2423}},
-                    {"negative data offset", header(0x80000010), {GROWING}, {-1, -1004, 2423}},
-                    {"data offset at the end", Cut(header(9), 9), {}, {-1, -1004, 2423}},
-                    {"data offset in front of the end", Cut(header(9), 10), {}, {-1, -1002, 2458}},
-                    {"data offset behind the end, growing", header(0x7FFFFFFF), {GROWING}, {-1, -1002, 2434}},
-                    {"growing: no stream", File({g_meta}).bytes, {GROWING}, {-1, -1002, 2434}},
-                    {"no stream in the first tags", unseen, {}, {-1, -1002, 2458}},
-                    {"growing: no stream in the first tags", unseen, {GROWING}, {-1, -1002, 2434}}});
+    const Row rows[] = {
+        {.what = "no such file", .open = {0, false, 0, 0, "b.flv"}, .site = OPEN_MAIN_READER},
+        {.what = "no signature", .file = Noise(5000), .site = OPEN_FILE_HEADER},
+        {.what = "signature too far", .file = far, .site = OPEN_FILE_HEADER},
+        {.what = "8 bytes", .file = Cut(g_chain.bytes, 8), .open = {GROWING}, .site = OPEN_FILE_HEADER},
+        {.what = "data offset 8", .file = header(8), .open = {GROWING}, .site = OPEN_FILE_HEADER},
+        {.what = "data offset -", .file = header(1u << 31), .open = {GROWING}, .site = OPEN_FILE_HEADER},
+        {.what = "data offset at the end", .file = Cut(header(9), 9), .site = OPEN_FILE_HEADER},
+        {.what = "data offset before the end", .file = Cut(header(9), 10), .site = OPEN_NO_STREAM},
+        {.what = "data offset past the end", .file = header(INT32_MAX), .open = {GROWING}, .site = OPEN_NO_STREAM},
+        {.what = "no stream", .file = script, .open = {GROWING}, .site = OPEN_NO_STREAM},
+        {.what = "no stream in the first tags", .file = unseen, .site = OPEN_NO_STREAM},
+        {.what = "no stream in the first tags", .file = unseen, .open = {GROWING}, .site = OPEN_NO_STREAM},
+    };
+    for (const Row& row : rows)
+        Expect(row);
 }
 
+// The other stream is valid, so that a complete file opens with the failure still recorded.
 TEST(Failures, OfCodecProbes)
 {
-    // Another stream is sound, so that a complete file opens with the failure still recorded.
-    const auto video = [](const Bytes& data) { return File({Pcm(0), Pcm(9), {9, 0, data}}).bytes; };
-    const auto audio = [](const Bytes& data) { return File({Screen(0), Screen(9), {8, 0, data}}).bytes; };
-    const auto growing = [](const Tag& tag, size_t size) { return Cut(File({tag}, 0).bytes, 13 + size); };
-    const auto cut_short = [](int32_t line) { return std::vector<int32_t>{-2, -10002, 2440, -10002, line}; };
-    const auto coded = [](uint8_t codec, const Bytes& payload) { return VideoData(1, codec, payload); };
+    const auto audio = [](uint8_t header, const Bytes& payload) {
+        return File({Screen(0), Screen(9), Audio(0, AudioData(header, payload))}).bytes;
+    };
+    const auto video = [](uint8_t codec, const Bytes& payload) {
+        return File({Pcm(0), Pcm(9), Video(0, VideoData(1, codec, payload))}).bytes;
+    };
+    const auto avc = [&video](const Bytes& record) { return video(7, Concat({{0, 0, 0, 0}, record})); };
+    // A growing file that has so many bytes after its header.
+    const auto cut = [](const Tag& tag, size_t size) { return Cut(File({tag}, 0).bytes, 13 + size); };
     const Bytes blank(200, 0xFF), no_frame_header(200, 0x80), no_set = AvcRecord({}, {{0x68, 0xCE, 0x3C, 0x80}});
-    const Tag mp3 = Audio(0, AudioData(SOUND_MP3, Mp3Frame())), mp3_8k = Audio(0, AudioData(SOUND_MP3_8K, Mp3Frame()));
-    ExpectFailures(
-        {{"growing: MP3 data", growing(mp3, 15), {GROWING}, cut_short(694)},
-         {"MP3 header", audio(AudioData(SOUND_MP3, no_frame_header)), {}, {0, -3003, 700}},
-         {"AAC above the cache", audio(AacConfig(Noise(SMALL))), Cache(SMALL), {0, -10002, 741}},
-         {"AAC without room", audio({SOUND_AAC}), {}, {0, -3, 752}},
-         {"growing: MP3 8 kHz data", growing(mp3_8k, 13), {GROWING}, cut_short(781)},
-         {"MP3 8 kHz header", audio(AudioData(SOUND_MP3_8K, no_frame_header)), {}, {0, -3003, 787}},
-         {"H.263 data", video(coded(CODEC_H263, H263Picture(2, 50))), {}, {0, -10002, 841}},
-         {"growing: H.263 data", growing(Video(0, coded(CODEC_H263, H263Picture(2))), 127), {GROWING}, cut_short(841)},
-         {"H.263 header", video(coded(CODEC_H263, blank)), {}, {0, -3002, 847}},
-         {"VP6 data", video(coded(CODEC_VP6, Vp6Picture(false, 4, 3, 0, 50))), {}, {0, -10002, 863}},
-         {"VP6 header", video(coded(CODEC_VP6, blank)), {}, {0, -3002, 869}},
-         {"VP6A data", video(coded(CODEC_VP6A, Vp6Picture(true, 4, 3, 0, 50))), {}, {0, -10002, 881}},
-         {"VP6A header", video(coded(CODEC_VP6A, blank)), {}, {0, -3002, 887}},
-         {"AVC above the cache", video(AvcConfig(Noise(SMALL))), Cache(SMALL), {0, -10002, 913}},
-         {"AVC without room", video({0x17, 0, 0, 0}), {}, {0, -3, 924}},
-         {"AVC record of 0 bytes", video({0x17, 0, 0, 0, 0}), {}, {0, -3001, 932}},
-         {"AVC record", video(AvcConfig(blank)), {}, {0, -3001, 932}},
-         {"AVC parameter set", video(AvcConfig(no_set)), {}, {0, -3002, 938}},
-         {"growing: no AVC header", File({Nalu(0), Pcm(9), Screen(9)}).bytes, {GROWING}, {0, -3004, 946}}});
+    const Bytes mp3 = cut(Audio(0, AudioData(SOUND_MP3, Mp3Frame())), 15);
+    const Bytes mp3_8k = cut(Audio(0, AudioData(SOUND_MP3_8K, Mp3Frame())), 13);
+    const Bytes h263 = cut(Video(0, VideoData(1, CODEC_H263, H263Picture(2))), 127);
+    const Bytes no_config = File({Nalu(0), Pcm(9), Screen(9)}).bytes;
+    const Row rows[] = {
+        {.what = "MP3 cut", .file = mp3, .open = {GROWING}, .site = OPEN_TAG_CUT, .in_instance = MP3_DATA},
+        {.what = "MP3 8 kHz cut",
+         .file = mp3_8k,
+         .open = {GROWING},
+         .site = OPEN_TAG_CUT,
+         .in_instance = MP3_8KHZ_DATA},
+        {.what = "H.263 cut", .file = h263, .open = {GROWING}, .site = OPEN_TAG_CUT, .in_instance = H263_DATA},
+        {.what = "MP3 header", .file = audio(SOUND_MP3, no_frame_header), .site = MP3_HEADER},
+        {.what = "MP3 8 kHz header", .file = audio(SOUND_MP3_8K, no_frame_header), .site = MP3_8KHZ_HEADER},
+        {.what = "AAC above the cache",
+         .file = audio(SOUND_AAC, Concat({{0}, Noise(SMALL)})),
+         .open = Cache(SMALL),
+         .site = AAC_DATA},
+        {.what = "AAC of one byte", .file = audio(SOUND_AAC, {}), .site = AAC_MEMORY},
+        {.what = "H.263 data", .file = video(CODEC_H263, H263Picture(2, 50)), .site = H263_DATA},
+        {.what = "H.263 header", .file = video(CODEC_H263, blank), .site = H263_HEADER},
+        {.what = "VP6 data", .file = video(CODEC_VP6, Vp6Picture(false, 4, 3, 0, 50)), .site = VP6_DATA},
+        {.what = "VP6 header", .file = video(CODEC_VP6, blank), .site = VP6_HEADER},
+        {.what = "VP6A data", .file = video(CODEC_VP6A, Vp6Picture(true, 4, 3, 0, 50)), .site = VP6A_DATA},
+        {.what = "VP6A header", .file = video(CODEC_VP6A, blank), .site = VP6A_HEADER},
+        {.what = "AVC above the cache", .file = avc(Noise(SMALL)), .open = Cache(SMALL), .site = AVC_DATA},
+        {.what = "AVC without CompositionTime", .file = video(7, {0, 0, 0}), .site = AVC_MEMORY},
+        {.what = "AVC record of 0 bytes", .file = avc({}), .site = AVC_CONFIG},
+        {.what = "AVC record", .file = avc(blank), .site = AVC_CONFIG},
+        {.what = "AVC parameter set", .file = avc(no_set), .site = AVC_PARAMETERS},
+        {.what = "AVC without configuration", .file = no_config, .open = {GROWING}, .site = AVC_NO_SEQUENCE_HEADER},
+    };
+    for (const Row& row : rows)
+        Expect(row);
 }
 
 TEST(Failures, OfDelivery)
 {
-    const Bytes sound = File({Pcm(0), Pcm(9)}, 4).bytes, pictures = File({Screen(0), Screen(9)}, 1).bytes;
+    const Bytes audio = File({Pcm(0), Pcm(9)}, 4).bytes, video = File({Screen(0), Screen(9)}, 1).bytes;
     const auto large = [](const Tag& config, const auto& frame) {
         return File({g_meta, config, frame(0, 5000), frame(40), frame(80)}).bytes;
     };
-    const int end = static_cast<int>(g_chain.frames().size()) + 1;
-    const Bytes within = Repeat(BUDGET - 1, g_avc, {Nalu(0)}, 1).bytes,
-                beyond = Repeat(BUDGET, g_avc, {Nalu(0)}, 1).bytes;
+    const int frames = static_cast<int>(g_chain.frames().size());
+    const Bytes within = Repeat(BUDGET - 1, g_avc, {Nalu(0)}, 1).bytes;
     Tag bad = Nalu(0, 5000);
     bad.back_pointer = 0;
     const Bytes wrong = Repeat(BUDGET - 1, g_avc, {bad, Nalu(0), Nalu(40)}, 1).bytes;
-    ExpectFailures({{"end", g_chain.bytes, {}, {-2, -10002, 2737}, end},
-                    {"growing: end", g_chain.bytes, {GROWING}, {-2, -10002, 2957}, end},
-                    {"within the budget", within, {}, {0, 0, 0}, 1},
-                    {"growing: within the budget", within, {GROWING}, {0, 0, 0}, 1},
-                    {"beyond the budget", beyond, {}, {-2, -10002, 2737}, 1},
-                    {"growing: beyond the budget", beyond, {GROWING}, {-2, -10002, 2957}, 1},
-                    {"goes on behind it", beyond, {}, {0}, 2},
-                    {"growing: goes on behind it", beyond, {GROWING}, {0}, 2},
-                    {"a wrong back-pointer in the last turn", wrong, {}, {0, 0, 0}, 1},
-                    {"no room for AVC", large(g_avc, Nalu), Buffer(1000), {0, 0, 2602}, 1},
-                    {"no room for AAC", large(g_aac, Raw), Buffer(1000), {0, 0, 2536}, 1},
-                    {"no room for PCM", large(Pcm(0), Pcm), Buffer(1000), {0, 0, 2550}, 2},
-                    {"info", sound, {SEPARATE, true}, {-1, -4007, 2638}, 1, AUDIO},
-                    {"no video", sound, {SEPARATE}, {-1, -4002, 2651}, 1, VIDEO},
-                    {"no audio", pictures, {SEPARATE}, {-1, -4003, 2661}, 1, AUDIO},
-                    {"stream 0", sound, {SEPARATE}, {-1, -4004, 2667}, 1, 0},
-                    {"stream 3", sound, {SEPARATE}, {-1, -4004, 2667}, 1, 3},
-                    {"growing: info", sound, {GROWING | SEPARATE, true}, {-1, -4007, 2767}, 1, AUDIO},
-                    {"growing: no video", sound, {GROWING | SEPARATE}, {-1, -4002, 2783}, 1, VIDEO},
-                    {"growing: no audio", pictures, {GROWING | SEPARATE}, {-1, -4003, 2796}, 1, AUDIO},
-                    {"growing: stream 0", sound, {GROWING | SEPARATE}, {-1, -4004, 2802}, 1, 0},
-                    {"growing: stream 3", sound, {GROWING | SEPARATE}, {-1, -4004, 2802}, 1, 3}});
+    const Row rows[] = {
+        // each also in a growing file
+        {.what = "end", .file = g_chain.bytes, .site = FRAME_END, .before = frames},
+        {.what = "within the budget", .file = within},
+        {.what = "no room for AVC", .file = large(g_avc, Nalu), .open = Buffer(1000), .site = VIDEO_NO_ROOM},
+        {.what = "no room for AAC", .file = large(g_aac, Raw), .open = Buffer(1000), .site = AAC_NO_ROOM},
+        {.what = "no room for PCM",
+         .file = large(Pcm(0), Pcm),
+         .open = Buffer(1000),
+         .site = AUDIO_NO_ROOM,
+         .before = 1},
+        {.what = "information", .file = audio, .open = {SEPARATE, true}, .site = FRAME_INFO_ONLY, .stream = AUDIO},
+        {.what = "no video", .file = audio, .open = {SEPARATE}, .site = FRAME_NO_VIDEO, .stream = VIDEO},
+        {.what = "no audio", .file = video, .open = {SEPARATE}, .site = FRAME_NO_AUDIO, .stream = AUDIO},
+        {.what = "stream 0", .file = audio, .open = {SEPARATE}, .site = FRAME_BAD_STREAM, .stream = 0},
+        {.what = "stream 3", .file = audio, .open = {SEPARATE}, .site = FRAME_BAD_STREAM, .stream = 3},
+    };
+    for (Row row : rows)
+        for (const uint32_t options : {row.open.options, row.open.options | GROWING}) {
+            row.open.options = options;
+            Expect(row, row.before + 1);
+        }
+    Expect({.what = "wrong back-pointer in the last turn", .file = wrong}, 1);
 }
 
 TEST(Open, BoundsTheSizesOfTheInitialisationBlock)
 {
+    const struct {
+        uint32_t cache, scan_read; // given
+        uint32_t cache_size, scan_read_size;
+    } rows[] = {
+        {.cache = 0, .scan_read = 0, .cache_size = 4096, .scan_read_size = 16},
+        {.cache = 1, .scan_read = 5, .cache_size = 1024, .scan_read_size = 5},
+        {.cache = 1023, .scan_read = 100000, .cache_size = 1024, .scan_read_size = 1024},
+        {.cache = 1025, .scan_read = 1025, .cache_size = 1025, .scan_read_size = 1025},
+    };
     FakeHost host(g_chain.bytes);
-    for (const auto& [cache, scan, cache_taken, scan_taken] :
-         {std::tuple(0u, 0u, 4096u, 16u), {1, 5, 1024, 5}, {1023, 100000, 1024, 1024}, {1025, 1025, 1025, 1025}}) {
-        const Session session(host, {0, false, cache, scan});
-        EXPECT_EQ(std::pair(session.ctx()->cache_size, session.ctx()->scan_read_size),
-                  std::pair(cache_taken, scan_taken));
-        EXPECT_EQ(session.ctx()->main_reader->capacity, cache_taken);
+    for (const auto& row : rows) {
+        const Session session(host, {0, false, row.cache, row.scan_read});
+        EXPECT_EQ(session.ctx()->cache_size, row.cache_size);
+        EXPECT_EQ(session.ctx()->scan_read_size, row.scan_read_size);
+        EXPECT_EQ(session.ctx()->main_reader->capacity, row.cache_size);
     }
 }
 
@@ -317,6 +348,17 @@ TEST(Delivery, KeepsTheSizeOfTheLastFrameAndTheTimeOfEachStream)
         EXPECT_EQ(session.frame().rc, -2); // changes nothing
         EXPECT_EQ(std::tuple(ctx.last_frame_size, ctx.last_video_ts - first, ctx.last_audio_ts - first),
                   std::tuple(70u, 80u, 70u));
+    }
+}
+
+TEST(Delivery, GoesOnAfterTheTagsOfARequest)
+{
+    for (const uint32_t options : {0u, GROWING}) {
+        FakeHost host(Repeat(BUDGET, g_avc, {Nalu(0)}, 1).bytes);
+        Session session(host, {options});
+        EXPECT_EQ(session.frame().rc, -2);
+        EXPECT_TRUE(session.recorded(FRAME_END));
+        EXPECT_EQ(session.frame().rc, 0);
     }
 }
 

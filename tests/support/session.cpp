@@ -41,7 +41,7 @@ bool IsListed(Op op, int32_t rc, int32_t code, int32_t line)
     });
 }
 
-Session::Session(FakeHost& host, const OpenOptions& options)
+Session::Session(FakeHost& host, const OpenOptions& options) : m_options(options.options)
 {
     const flvd_init_t init = host.init(options.options, options.cache_size, options.scan_read_size, options.path);
     if ((options.options & FLVD_OPT_USER_BUFFER) != 0)

@@ -3,6 +3,8 @@
 
 #include "fake_host.h"
 
+#include <optional>
+
 namespace flvd_test {
 
 constexpr uint32_t SEPARATE = FLVD_OPT_SEPARATE_AUDIO_READER, USER = FLVD_OPT_USER_BUFFER;
@@ -90,6 +92,11 @@ public:
     int32_t last_error() { return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr); }
     /** Line of the last failure: the instance's, or the global one after a failed open. */
     int32_t error_line() const { return m_ctx != nullptr ? m_ctx->error_line : g_flvd_lErrorLine; }
+    /** The last failure is that of a place, or there is none. */
+    bool recorded(std::optional<Site> site)
+    {
+        return last_error() == (site ? At(*site).code : 0) && error_line() == (site ? At(*site).line_of(m_options) : 0);
+    }
     /** The last failure is one that such an operation may have. */
     bool failed_as_listed(Op op, int32_t rc) { return IsListed(op, rc, last_error(), error_line()); }
     /** Also done at the end. */
@@ -99,6 +106,7 @@ private:
     flvd_ctx_t* m_ctx = nullptr;
     flvd_open_info_t m_info{};
     Bytes m_user_buffer;
+    const uint32_t m_options;
     int32_t m_open_rc = 0;
 };
 
