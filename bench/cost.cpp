@@ -77,14 +77,21 @@ private:
     FlvdmxPlayer m_player;
 };
 
-/** Every frame of a file by itself. */
+/** Every request of a play by itself, also after one that ends inside the file. */
 Price MeasureRequests(Meter& meter)
 {
     Price request;
     flvd_frame_t frame{};
-    bool more = true;
-    for (uint32_t i = 0; more && i < MOST_FRAMES; ++i)
-        meter.measure(request, [&] { more = meter.player().frame(frame); });
+    const flvd_ctx_t& instance = meter.player().instance();
+    int64_t reached = -1;
+    for (uint32_t i = 0; i < MOST_FRAMES; ++i) {
+        bool delivered = false;
+        meter.measure(request, [&] { delivered = meter.player().frame(frame); });
+        const int64_t position = __FLV_DMX__fioTell64(instance.main_reader);
+        if (!delivered && (position <= reached || position >= instance.data_end))
+            break;
+        reached = position;
+    }
     return request;
 }
 

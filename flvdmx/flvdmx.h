@@ -4,7 +4,7 @@
  * The host loads the library, fills an flvd_init_t with its memory and file functions and the name of a
  * file, and drives the library through one entry point, QVX_FLV_DMX: open, get frames, seek, close. The
  * library finds the streams and their codec configuration, reads the metadata and delivers one audio or
- * video frame a call. It decodes nothing.
+ * video frame per call. It decodes nothing.
  *
  * Usable alone from C11 and from C++17. All sizes are bytes and all times milliseconds unless said
  * otherwise. Multi-byte fields of an FLV file are big-endian (FLV file format, version 10.1, annex E).
@@ -28,7 +28,7 @@
  *   read means the end of the data: a host function must fill the request or have reached the end. A host
  *   that reads from a pipe or socket has to loop. There is no retry and no separate error.
  * - Seeking and telling. `whence` is 0 from the start, 1 from the current position, 2 from the end; 0 is
- *   success. A tell returns a negative value when it fails. Seeking behind the end of the file is allowed,
+ *   success. A tell returns a negative value when it fails. Seeking past the end of the file is allowed,
  *   as fseek allows it, and a successful seek must clear the state that `file_eof` reports.
  * - Context. The memory functions and `file_open` carry none, so there is one set of them for the process:
  *   every open overwrites the process-wide tables, and all instances, older ones included, go on with the
@@ -115,7 +115,7 @@ enum {
 
 /** Error codes, as recorded in flvd_ctx_t::error or in g_flvd_lLastError. */
 enum {
-    FLVD_ERR_NONE = 0,                  /**< none; also recorded when a frame did not fit and was passed over */
+    FLVD_ERR_NONE = 0,                  /**< none; also recorded when a frame did not fit and was skipped */
     FLVD_ERR_POSITION = -1,             /**< the host could not tell a position */
     FLVD_ERR_SEEK = -2,                 /**< a host seek failed */
     FLVD_ERR_NO_MEMORY = -3,            /**< no memory for a codec configuration, or one too short to be one */
@@ -167,7 +167,7 @@ typedef int64_t (*flvd_file_tell64_fn)(void* handle); /**< position, negative on
 
 /**
  * Initialisation block of operations 0 and 10: 36 words, each as wide as a pointer (word n lies at n × pointer
- * size). Read only during the call, except the string behind `file_name`, which must live until close.
+ * size). Read only during the call, except the string that `file_name` points to, which must live until close.
  */
 typedef struct flvd_init_t {
     flvd_mem_alloc_fn mem_alloc;     /**< word 0 */
@@ -193,7 +193,7 @@ typedef struct flvd_init_t {
     const char* file_name;           /**< word 32: path, passed unchanged to file_open; must live until close */
     uintptr_t options;               /**< word 33: FLVD_OPT_* bits */
     uintptr_t cache_size;            /**< word 34: cache of each reader; 0: 4096, 1 to 1023: 1024 */
-    uintptr_t scan_read_size;        /**< word 35: bytes a read while scanning; 0: 16, at most the cache size */
+    uintptr_t scan_read_size;        /**< word 35: bytes per read while scanning; 0: 16, at most the cache size */
 } flvd_init_t;
 
 /* -------------------------------------------------------------------------------------- records */
@@ -213,7 +213,7 @@ typedef struct flvd_video_info_t {
     uint32_t reserved;         /**< 0 */
     uint32_t width;            /**< pixels */
     uint32_t height;           /**< pixels */
-    uint32_t frame_rate;       /**< thousandths of a frame a second, from metadata */
+    uint32_t frame_rate;       /**< thousandths of a frame per second, from metadata */
     char fourcc[4];            /**< "JPEG" "FLV1" "SCR1" "VP60" "VP6A" "SCR2" "H264"; zeros: unknown CodecID */
     uint8_t* config;           /**< AVC: AVCDecoderConfigurationRecord (ISO/IEC 14496-15), else null; the instance's */
     uint32_t config_size;      /**< its bytes */
@@ -246,9 +246,9 @@ typedef struct flvd_open_info_t {
 
 /** First argument of operation 2. A null buffer counts as one of 0 bytes. */
 typedef struct flvd_frame_request_t {
-    uint8_t* buffer;      /**< with FLVD_OPT_USER_BUFFER: where the frame goes; else not looked at */
+    uint8_t* buffer;      /**< with FLVD_OPT_USER_BUFFER: where the frame goes; else ignored */
     uint32_t buffer_size; /**< its bytes */
-    uint32_t stream;      /**< with FLVD_OPT_SEPARATE_AUDIO_READER: FLVD_STREAM_VIDEO or _AUDIO; else not looked at */
+    uint32_t stream;      /**< with FLVD_OPT_SEPARATE_AUDIO_READER: FLVD_STREAM_VIDEO or _AUDIO; else ignored */
 } flvd_frame_request_t;
 
 /**
@@ -267,15 +267,15 @@ typedef struct flvd_frame_t {
  * First argument of operation 3; the second is an int32_t that receives the time reached, in ms from the first
  * timestamp, on success only. The current position is the time of the last video frame, without video of the last audio
  * frame. A target at or before 0 goes to the first tag, a relative time of 0 only reports. A miss (FLVD_RET_END) is a
- * target beyond the end, or without a keyframe in its direction; after it and after any failure delivery goes on where
- * it was.
+ * target beyond the end, or without a keyframe in its direction; after it and after any failure delivery continues from
+ * where it was.
  */
 typedef struct flvd_seek_request_t {
     int32_t time;  /**< ms, from the first timestamp; with FLVD_SEEK_RELATIVE from the current position */
     uint32_t mode; /**< FLVD_SEEK_RELATIVE, _BACKWARD, _FORWARD, _TO_END_ON_MISS, _RETRY_BACKWARD */
 } flvd_seek_request_t;
 
-/** Keyframe index as it lies in the file: AMF0 strict arrays of the metadata's "keyframes" object. */
+/** Keyframe index as it stands in the file: AMF0 strict arrays of the metadata's "keyframes" object. */
 typedef struct flvd_keyframe_index_t {
     int64_t times_offset;     /**< file offset of the first element of "times", 0 when there is none */
     int64_t positions_offset; /**< file offset of the first element of "filepositions", 0 when there is none */
@@ -349,13 +349,15 @@ FLVD_API extern int32_t g_flvd_lErrorLine;
  *         FLVD_OP_GET_LAST_ERROR: the instance's last error code, which later successes leave in place; without an
  *         instance g_flvd_lLastError.
  *         A handle without instance: FLVD_RET_NO_INSTANCE for operations 1 to 3, FLVD_RET_FAILED for operation 4.
- *         A null argument that the operation needs: FLVD_RET_FAILED, nothing recorded, nothing touched.
- *         FLVD_OP_GET_FRAME returns FLVD_RET_END at the end of the data, and after 102 tags without a frame, however
- *         much follows them: a host that wants to be sure asks again while the reader stands inside the file. With
- *         FLVD_OPT_PROGRESSIVE it also means that the next tag is not whole yet, or was not when its beginning was
- *         read: ask again after a while, once more after the file has stopped growing. Streams that the open did not
- *         find are not found later: open again until those that are awaited are there. Of a complete file tags with a
- *         time later than its last ones are passed over, as most of a second file that was appended to it may be.
+ *         A null handle or argument that the operation needs: FLVD_RET_FAILED, nothing recorded; an open stores null
+ *         in the handle's word all the same.
+ * @note   FLVD_OP_GET_FRAME returns FLVD_RET_END at the end of the data, but also after 102 tags without a frame and
+ *         after 16,384 places that only look like tags, whatever follows them. A host that wants every frame retries
+ *         while the reader's position advances, as flvd_next_frame of the host kit does. With FLVD_OPT_PROGRESSIVE the
+ *         result also means that the next tag is not whole yet, or was not when its beginning was read: retry after a
+ *         while, and once more after the file has stopped growing. Streams that the open did not find are not found
+ *         later: open again until those that you wait for are there. In a complete file, tags with a later timestamp
+ *         than its last ones are skipped; that may be most of a second recording that was appended to it.
  */
 FLVD_API int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2);
 

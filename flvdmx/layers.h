@@ -134,8 +134,8 @@ FLVD_API void __FLV_DMX__fioSetFunc(const fio_funcs_t* funcs);
  * @param path           passed unchanged to the host's file_open
  * @param mode           FIO_MODE_* bits; combinations that no mode string has are refused before the host is asked
  * @param cache_size     bytes of the cache, at least 1
- * @param overread       non-zero: a refill asks for the whole request behind the cached bytes
- * @param overread_extra extra cache bytes for that, not looked at when overread is 0
+ * @param overread       non-zero: a refill asks for the whole request after the cached bytes
+ * @param overread_extra extra cache bytes for that, ignored when overread is 0
  * @return object owned by the caller, or null: bad mode, file_open failed, no memory (nothing is left open)
  */
 FLVD_API fio_file_t* __FLV_DMX__fioOpen(const char* path, uint32_t mode, uint32_t cache_size, int32_t overread,
@@ -177,7 +177,7 @@ FLVD_API uint32_t __FLV_DMX__fioShowBytesByPtr(const uint8_t** bytes, uint32_t n
 FLVD_API uint32_t __FLV_DMX__fioShowBytesByCopy(void* destination, uint32_t n, fio_file_t* file);
 
 /**
- * Consumes n bytes. Going behind the end of the file succeeds when the host's seek does.
+ * Consumes n bytes. Going past the end of the file succeeds when the host's seek does.
  * @return n; only those that were cached when the host's seek failed, or cannot go so far without file_seek64;
  *         0xFFFFFFFF while writing
  */
@@ -221,7 +221,7 @@ FLVD_API void __FLV_DMX__fiodbgReset(void);
 
 /* Reads a cached file bit by bit, most significant bit first. The byte position stays in step: a byte of which
  * one bit was consumed counts as consumed. After any byte-level access but a peek it must be started again;
- * until then bits read as 0. Bits behind the end of the file read as 0. The cache must hold 8 bytes. */
+ * until then bits read as 0. Bits past the end of the file read as 0. The cache must hold 8 bytes. */
 
 /** Starts at the current byte position, consuming nothing. @return 1 */
 FLVD_API int32_t __FLV_DMX__bitInit(fio_file_t* file);
@@ -251,7 +251,7 @@ FLVD_API uint32_t __FLV_DMX__bitGetSBits(fio_file_t* file, uint32_t n);
  * @param file   reader; on success it stands on the first byte of the tag header
  * @param info   caller's record, written on success only
  * @param wanted FLVD_TAG_* bits
- * @param verify 0: header test only; else the PreviousTagSize behind the data must agree as well, except behind a
+ * @param verify 0: header test only; else the PreviousTagSize after the data must agree as well, except after a
  *               script tag that is the first tag of the file
  * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_END_OF_DATA; on failure the reader may stand anywhere
  */
@@ -289,7 +289,7 @@ FLVD_API int32_t FLVD_MoveToNextTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_
  * FLVD_MoveToNextTag; the kind reported is coarser (video or audio alone, unless keyframes or configurations were
  * wanted).
  * @return 0; FLVD_ERR_NOT_FOUND; FLVD_ERR_AT_FIRST_TAG; FLVD_ERR_END_OF_DATA; on failure the reader may stand anywhere,
- *         in front of the first tag included
+ *         before the first tag included
  */
 FLVD_API int32_t FLVD_MoveToPrevTag(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted,
                                     uint32_t* kind);
@@ -341,10 +341,10 @@ FLVD_API void FLVD_SetCallbackforMeta(const flvd_init_t* init);
  * Reads a script-data payload (AMF0) into the instance: picture size, rates, keyframe index. A keyframe array that the
  * instance holds is released when the payload brings another. FLVD_SetCallbackforMeta comes first.
  *
- * @param ctx    instance; its current reader stands on the first byte of the payload and ends behind it
+ * @param ctx    instance; its current reader stands on the first byte of the payload and ends after it
  * @param length bytes of the payload
  * @return 0 when at least one value was parsed; -1 when none was, and when the position cannot be taken;
- *         FLVD_ERR_END_OF_DATA when the reader could not be put behind the payload
+ *         FLVD_ERR_END_OF_DATA when the reader could not be put after the payload
  */
 FLVD_API int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length);
 
@@ -357,7 +357,7 @@ FLVD_API int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length);
  *
  * @param ctx       open instance of a complete file
  * @param target    file timestamp in ms (the host's time plus first_ts)
- * @param result    receives the timestamp of the tag reached; first_ts when the reader was put in front of the first
+ * @param result    receives the timestamp of the tag reached; first_ts when the reader was put before the first
  *                  tag, last_ts when audio ends before the target and the reader was put at the end of the data. May be
  *                  written on failure as well.
  * @param stream    FLVD_STREAM_VIDEO; any other value is audio

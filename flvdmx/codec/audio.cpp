@@ -11,7 +11,7 @@
 
 namespace {
 
-// How much of the tag is looked at.
+// How much of the tag is read.
 constexpr uint32_t FLVD_AUDIO_PEEK = FLVD_CODEC_BYTE_OFFSET + 1; // tag header and codec byte
 constexpr uint32_t FLVD_MP3_PEEK = 16;                           // tag header, audio byte and one MPEG frame header
 

@@ -67,10 +67,10 @@ constexpr flvd_crop_unit_t g_flvd_cropUnit[] = {{1, 1}, {2, 2}, {2, 1}, {1, 1}};
 // One reader for the process: opens do not run at the same time, and every parse sets it up anew.
 struct flvd_sps_bits_t {
     int32_t bit_pos;      // next bit, counted from start
-    const uint8_t* start; // payload behind the NAL header byte
+    const uint8_t* start; // payload after the NAL header byte
 };
 flvd_sps_bits_t g_flvd_spsBits;
-int32_t g_flvd_spsSize; // bytes from start on, set with it; bits behind them read as 0
+int32_t g_flvd_spsSize; // bytes from start on, set with it; bits past them read as 0
 
 uint32_t FLVD_SpsByte(int32_t index)
 {
@@ -78,7 +78,7 @@ uint32_t FLVD_SpsByte(int32_t index)
 }
 
 // The next bits, from four bytes: 25 of them are exact at any position, low bits may be 0. In the second case at least
-// the fourth byte is behind the end, and reads as 0.
+// the fourth byte is past the end, and reads as 0.
 inline uint32_t FLVD_SpsWindow()
 {
     const int32_t byte = g_flvd_spsBits.bit_pos >> 3;

@@ -85,7 +85,7 @@ void FLVD_SetFourcc(flvd_ctx_t* ctx, const char* fourcc)
     std::memcpy(ctx->video_info.fourcc, fourcc, sizeof ctx->video_info.fourcc);
 }
 
-// A codec whose picture header lies at the start of its data.
+// A codec whose picture header stands at the start of its data.
 int32_t FLVD_ProbePicture(flvd_ctx_t* ctx, uint32_t codec, const char* fourcc, flvd_site_t short_site,
                           flvd_site_t header_site)
 {

@@ -11,8 +11,8 @@
 constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62; // a host that tells more has not told a position
 constexpr uint32_t FLVD_WHOLE_CACHE = 0;               // as a refill quantum: the capacity of the file's cache
 
-// Reads up to n bytes from the host. One that claims more than it was asked for has failed: nothing it says is
-// believed.
+// Reads up to n bytes from the host. One that claims more than it was asked for has failed: none of
+// its bytes count.
 inline uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
     const uint32_t got = g_flvd_fioFuncs.file_read(destination, 1, n, file->handle);

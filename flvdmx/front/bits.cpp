@@ -1,7 +1,7 @@
 // The file-backed bit reader. `bits` holds the next bits left-aligned and ends on a byte boundary; the file's byte
-// position is the first boundary at or behind the bit position, so bits_left / 8 whole bytes of `bits` lie behind it.
+// position is the first boundary at or after the bit position, so bits_left / 8 whole bytes of `bits` follow it.
 //
-// A reader that another access has emptied (bits_left 0) goes on consuming the file's bytes and stays empty.
+// A reader that another access has emptied (bits_left 0) continues to consume the file's bytes and stays empty.
 
 #include "flvdmx/common/bytes.h"
 #include "flvdmx/fio/fio.h"
@@ -35,7 +35,7 @@ uint32_t FLVD_BitWord(const uint8_t* bytes, uint32_t from, uint32_t available)
 void FLVD_BitRefill(fio_file_t* file)
 {
     const auto left = static_cast<uint32_t>(file->bits_left);
-    const uint32_t held = left / 8; // whole bytes behind the position that are in `bits` already
+    const uint32_t held = left / 8; // whole bytes after the position that are in `bits` already
     const uint8_t* bytes = nullptr;
     const uint32_t available = FLVD_FioPeek(&bytes, held + FLVD_BIT_REFILL / 8, file);
     const uint64_t word = FLVD_BitWord(bytes, held, available);

@@ -81,7 +81,7 @@ void FLVD_ProbeCompleteTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
     }
 }
 
-// A tag of a growing file; the reader is behind it afterwards, a script tag's back-pointer included when it is there.
+// A tag of a growing file; the reader is past it afterwards, a script tag's back-pointer included when it is there.
 flvd_site_t FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag)
 {
     if (tag.type == FLVD_TAG_TYPE_SCRIPT) {

@@ -1,8 +1,8 @@
 // Script data: parses AMF0 values ("Action Message Format, AMF 0") and takes sixteen known properties, at any
 // depth and whatever the script object is called, into the instance and its stream descriptions.
 //
-// Sizes are claims of the file: a value may not begin behind the payload, containers nest to a bound, and every loop
-// consumes at least a byte a turn.
+// Sizes are claims of the file: a value may not start past the payload, containers nest to a bound, and every loop
+// consumes at least a byte per turn.
 
 #include "flvdmx/meta/script.h"
 #include "flvdmx/fio/fio.h"
@@ -64,7 +64,7 @@ bool FLVD_ScriptPassText(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t l
     return length <= FLVD_META_TEXT_MAX ? FLVD_ScriptRead(ctx, state, length) : FLVD_ScriptSkip(ctx, state, length);
 }
 
-// Payload bytes behind the position; a value may run over the end.
+// Payload bytes after the position; a value may run over the end.
 uint64_t FLVD_ScriptLeft(const flvd_script_state_t* state)
 {
     return state->length > state->consumed ? state->length - state->consumed : 0;
@@ -214,7 +214,7 @@ FlvdLoop FLVD_ParseProperties(flvd_ctx_t* ctx, flvd_script_state_t* state, uint3
     }
 }
 
-// An object or ECMA array behind its header of so many bytes; `failed` is what a failure of it returns.
+// An object or ECMA array after its header of so many bytes; `failed` is what a failure of it returns.
 int32_t FLVD_ParsePropertyList(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t header, int32_t failed)
 {
     uint32_t sum = 0;
@@ -240,7 +240,7 @@ int32_t FLVD_ParseContainer(flvd_ctx_t* ctx, flvd_script_state_t* state)
     ++state->containers;
     int32_t size = 0;
     if (state->value_type == FLVD_AMF_OBJECT)
-        size = FLVD_ParsePropertyList(ctx, state, 1, 0); // its bytes are lost, what encloses it goes on
+        size = FLVD_ParsePropertyList(ctx, state, 1, 0); // its bytes are lost, what encloses it continues
     else if (state->value_type == FLVD_AMF_ECMA_ARRAY)
         size = FLVD_ParseEcmaArray(ctx, state);
     else

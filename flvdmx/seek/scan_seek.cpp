@@ -1,7 +1,7 @@
 // Frame seek by scanning: from the nearest of a few starting places, walks from tag to tag until the target is reached.
 //
 // A walk never ends on an AVC configuration or end-of-sequence tag: they are keyframes by their FrameType, but no
-// picture. Forward means at or after the target, so only a backward seek may end in front of the first tag.
+// picture. Forward means at or after the target, so only a backward seek may end before the first tag.
 
 #include "flvdmx/seek/seek.h"
 
@@ -26,12 +26,12 @@ struct flvd_scan_t {
     bool backward;
     bool audio;
     flvd_tag_info_t tag; // the tag reached last
-    uint32_t steps;      // of the last walk
+    int64_t steps;       // of the last walk
 };
 
 int32_t FLVD_SeekBackward(flvd_scan_t* scan);
 
-// The results of seeks made to start a walk are not looked at: the walk then starts where the reader is, and answers on
+// The results of seeks made to start a walk are ignored: the walk then starts where the reader is, and answers on
 // the right side of the target all the same.
 void FLVD_StartAt(const flvd_scan_t* scan, int64_t position)
 {
@@ -61,10 +61,13 @@ int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
     const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
+    // More than the file has room for: a host that lies about positions could keep a walk busy for ever.
+    const int64_t most_steps = scan->ctx->data_end / FLVD_TAG_OVERHEAD;
     for (scan->steps = 0;;) {
         if (FLVD_FioAtEnd(scan->file))
             return scan->steps != 0 && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
-        ++scan->steps;
+        if (scan->steps++ > most_steps)
+            return FLVD_ERR_NOT_FOUND;
         const int32_t code = step(scan->ctx, scan->file, &scan->tag, scan->kind, nullptr);
         if (code != 0)
             return code;
@@ -155,7 +158,7 @@ FlvdNearest FLVD_Nearest(const flvd_scan_t* scan, uint32_t known)
     return int64_t{distance} >= int64_t{scan->ctx->last_ts} - scan->target ? FlvdNearest::End : FlvdNearest::Known;
 }
 
-// The first tag of a kind at or behind an estimated place, else the last one of the file. 0 with the tag,
+// The first tag of a kind at or after an estimated place, else the last one of the file. 0 with the tag,
 // FLVD_ERR_AT_FIRST_TAG when there is none, or -1.
 int32_t FLVD_FirstTag(flvd_scan_t* scan, uint32_t kind, flvd_site_t site)
 {

@@ -1,4 +1,4 @@
-// Seeking: the time seek behind operation 3, and the frame seeks that it puts the readers on a tag with.
+// Seeking: the time seek of operation 3, and the frame seeks by which it puts the readers on a tag.
 #ifndef FLVDMX_SEEK_SEEK_H
 #define FLVDMX_SEEK_SEEK_H
 

@@ -1,5 +1,5 @@
 // Time seek: turns the host's time into a target timestamp and a direction, moves the readers by frame seeks, and puts
-// them back when anything fails, so that delivery goes on where it was.
+// them back when anything fails, so that delivery continues where it was.
 //
 // last_video_ts and last_audio_ts count from first_ts; frame seeks work on the file's own timestamps.
 
@@ -207,7 +207,7 @@ int32_t FLVD_Attempt(flvd_time_seek_t* seek, int32_t* result)
         return moved;
     }
     *result = static_cast<int32_t>(seek->reached - seek->ctx->first_ts);
-    if (!seek->growing || !FLVD_IsByZero(*seek)) { // a growing file's tag that waits to be retried goes on waiting
+    if (!seek->growing || !FLVD_IsByZero(*seek)) { // a growing file's tag still waits to be retried
         seek->ctx->saved_main_pos = 0;
         seek->ctx->saved_audio_pos = 0;
     }

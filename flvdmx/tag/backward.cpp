@@ -1,4 +1,4 @@
-// Backward navigation: the four bytes in front of a tag give the size of the tag before it. Where they do not lead to
+// Backward navigation: the four bytes before a tag give the size of the tag before it. Where they do not lead to
 // a consistent tag the cursor slides back byte by byte until some four bytes do.
 //
 // The seeks are not checked on the way: a failed one shows as a failed peek or test at the next step.
@@ -20,7 +20,7 @@ int32_t FLVD_PeekBackPointer(fio_file_t* file, int64_t cursor)
     return value > 0 && value < cursor ? value : 0;
 }
 
-// A candidate's size is bounded by the back-pointer that led to it, so the end of the valid data is not asked.
+// A candidate's size is bounded by the back-pointer that led to it, so the end of the valid data is not consulted.
 bool FLVD_IsPreviousTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header, int32_t back_pointer)
 {
     return header.info.data_size + FLVD_TAG_HEADER_SIZE == static_cast<uint32_t>(back_pointer) &&

@@ -232,8 +232,8 @@ bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_inf
     return check.passed ? FLVD_PassGoodTag(search, check.in_place, tag) : FLVD_PassBadTag(search, check.in_place);
 }
 
-// A plausible header at the position is taken when its kind is wanted and its back-pointer agrees, or need not be asked
-// yet. 0, FLVD_UNCHECKED, FLVD_SEARCH_ON or FLVD_ERR_NOT_FOUND.
+// A plausible header at the position is taken when its kind is wanted and its back-pointer agrees, or is compared
+// later. 0, FLVD_UNCHECKED, FLVD_SEARCH_ON or FLVD_ERR_NOT_FOUND.
 int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& header)
 {
     if (!FLVD_TakePosition(search))
@@ -326,18 +326,19 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 } // namespace
 
 // Neither is inlined: most frames are found without them, and with few registers to save.
-[[gnu::noinline]] int32_t FLVD_SearchFrameTag(flvd_frame_search_t* frame, int64_t position, flvd_found_tag_t* tag)
+[[gnu::noinline]] int32_t FLVD_SearchFrameTag(flvd_frame_search_t* search, int64_t position, flvd_found_tag_t* tag)
 {
-    flvd_search_t search = FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, position, &frame->checks_left);
-    search.frame = frame;
-    return FLVD_TakeFrameTag(&search, tag);
+    flvd_search_t careful = FLVD_MakeSearch(search->ctx, search->file, search->wanted, position, &search->checks_left);
+    careful.frame = search;
+    return FLVD_TakeFrameTag(&careful, tag);
 }
 
-[[gnu::noinline]] int32_t FLVD_FindFrameTagAfterBad(flvd_frame_search_t* frame, flvd_found_tag_t* tag)
+[[gnu::noinline]] int32_t FLVD_FindFrameTagAfterBad(flvd_frame_search_t* search, flvd_found_tag_t* tag)
 {
-    flvd_search_t search = FLVD_MakeSearch(frame->ctx, frame->file, frame->wanted, tag->start, &frame->checks_left);
-    search.budget = tag->budget;
-    return FLVD_PassBadTag(&search, false) ? FLVD_TakeFrameTag(&search, tag) : FLVD_ERR_NOT_FOUND;
+    flvd_search_t careful =
+        FLVD_MakeSearch(search->ctx, search->file, search->wanted, tag->start, &search->checks_left);
+    careful.budget = tag->budget;
+    return FLVD_PassBadTag(&careful, false) ? FLVD_TakeFrameTag(&careful, tag) : FLVD_ERR_NOT_FOUND;
 }
 
 int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag_info_t* info, uint32_t wanted, int32_t verify)
