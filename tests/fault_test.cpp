@@ -263,7 +263,8 @@ std::vector<Scenario> Scenarios()
     const auto mp3 = [](uint32_t ts) { return Tag{8, ts, AudioData(SOUND_MP3, Mp3Frame(LARGE))}; };
     const std::vector<Seek> seeks = {{500, BACK}, {500, FORTH}, {-200, REL},   {790, FORTH | RETRY},
                                      {9000},      {-1},         {9000, AT_END}};
-    const std::vector<Seek> to_start = {{0, BACK, VIDEO}}, back = {{500, BACK, VIDEO}};
+    const std::vector<Seek> near = {{500, BACK}, {300, FORTH}, {-1}}, to_start = {{0, BACK, VIDEO}},
+                            back = {{500, BACK, VIDEO}};
     const Flv chain = MakeChain(), indexed = MakeChain({true, true, true, true}), audio = MakeChain({false});
     const Flv avc = large(g_avc, Nalu, LARGE), aac = large(g_aac, Raw, 60);
     const auto is_second = [](const Tag& tag) { return tag.is_keyframe() && tag.timestamp == 200; };
@@ -276,27 +277,19 @@ std::vector<Scenario> Scenarios()
     const Flv first_large = File({mp3(0), Screen(0, LARGE), mp3(9), Screen(9), Screen(40), Screen(80)});
     const auto plain = [&large](size_t size) { return large(Pcm(0), Pcm, size); };
     const int64_t video = avc.tags[2].end(), aac_frame = aac.tags[2].end();
+    using Opens = std::vector<OpenOptions>;
+    const Opens scanning = {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)};
+    const Opens indexing = {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}};
+    const Opens growing = {open(GROWING), open(GROWING | SEPARATE)};
+    const Opens information = {open(0, 0, true), open(SEPARATE, 0, true)};
     return {
-        {.what = "scan",
-         .flv = chain,
-         .opens = {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)},
-         .seeks = seeks},
+        {.what = "scan", .flv = chain, .opens = scanning, .seeks = seeks},
         {.what = "audio", .flv = audio, .opens = {open(0)}, .seeks = seeks},
-        {.what = "index",
-         .flv = indexed,
-         .opens = {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}},
-         .seeks = seeks},
-        {.what = "growing",
-         .flv = indexed,
-         .opens = {open(GROWING), open(GROWING | SEPARATE)},
-         .seeks = {{500, BACK}, {300, FORTH}, {-1}},
-         .shown = 6000},
+        {.what = "index", .flv = indexed, .opens = indexing, .seeks = seeks},
+        {.what = "growing", .flv = indexed, .opens = growing, .seeks = near, .shown = 6000},
         {.what = "growing without index", .flv = chain, .opens = {open(GROWING)}, .shown = 2000},
         {.what = "growing, odd metadata", .flv = odd_metadata, .opens = {open(GROWING)}},
-        {.what = "information",
-         .flv = indexed,
-         .opens = {open(0, 0, true), open(SEPARATE, 0, true)},
-         .seeks = {{500, BACK}}},
+        {.what = "information", .flv = indexed, .opens = information, .seeks = {{500, BACK}}},
         {.what = "metadata at the end", .flv = File(last.tags), .opens = {open(0), open(INDEX)}, .seeks = seeks},
         {.what = "damaged", .flv = damaged, .opens = {open(0), open(SEPARATE)}, .seeks = seeks},
         {.what = "bytes after the last tag", .flv = Cut(indexed, indexed.size() + 50), .opens = {open(0)}},

@@ -20,10 +20,9 @@ constexpr uint8_t SOUND_MP3_8K = 0xEF, SOUND_AAC = 0xAF;
 const auto Video = [](uint32_t ts, const Bytes& data) { return Tag{9, ts, data}; };
 const auto Audio = [](uint32_t ts, const Bytes& data) { return Tag{8, ts, data}; };
 
-Flv Repeat(size_t n, const Tag& tag, std::vector<Tag> then, uint8_t flags = 5)
+Flv Repeat(size_t n, const Tag& tag, const Tags& then, uint8_t flags = 5)
 {
-    then.insert(then.begin(), n, tag);
-    return File(then, flags);
+    return File(Tags(n, tag) + then, flags);
 }
 
 const auto Cut = [](const Bytes& bytes, size_t size) { return Bytes(bytes.data(), bytes.data() + size); };
@@ -104,21 +103,15 @@ TEST(Failures, OfCodecProbes)
     const Bytes mp3 = cut(Audio(0, AudioData(SOUND_MP3, Mp3Frame())), 15);
     const Bytes mp3_8k = cut(Audio(0, AudioData(SOUND_MP3_8K, Mp3Frame())), 13);
     const Bytes h263 = cut(Video(0, VideoData(1, CODEC_H263, H263Picture(2))), 127);
+    const Bytes large_aac = audio(SOUND_AAC, Concat({{0}, Noise(SMALL)}));
     const Bytes no_config = File({Nalu(0), Pcm(9), Screen(9)}).bytes;
     const Row rows[] = {
         {.what = "MP3 cut", .file = mp3, .open = {GROWING}, .site = OPEN_TAG_CUT, .in_instance = MP3_DATA},
-        {.what = "MP3 8 kHz cut",
-         .file = mp3_8k,
-         .open = {GROWING},
-         .site = OPEN_TAG_CUT,
-         .in_instance = MP3_8KHZ_DATA},
+        {.what = "8 kHz cut", .file = mp3_8k, .open = {GROWING}, .site = OPEN_TAG_CUT, .in_instance = MP3_8KHZ_DATA},
         {.what = "H.263 cut", .file = h263, .open = {GROWING}, .site = OPEN_TAG_CUT, .in_instance = H263_DATA},
         {.what = "MP3 header", .file = audio(SOUND_MP3, no_frame_header), .site = MP3_HEADER},
         {.what = "MP3 8 kHz header", .file = audio(SOUND_MP3_8K, no_frame_header), .site = MP3_8KHZ_HEADER},
-        {.what = "AAC above the cache",
-         .file = audio(SOUND_AAC, Concat({{0}, Noise(SMALL)})),
-         .open = Cache(SMALL),
-         .site = AAC_DATA},
+        {.what = "AAC above the cache", .file = large_aac, .open = Cache(SMALL), .site = AAC_DATA},
         {.what = "AAC of one byte", .file = audio(SOUND_AAC, {}), .site = AAC_MEMORY},
         {.what = "H.263 data", .file = video(CODEC_H263, H263Picture(2, 50)), .site = H263_DATA},
         {.what = "H.263 header", .file = video(CODEC_H263, blank), .site = H263_HEADER},
@@ -153,12 +146,8 @@ TEST(Failures, OfDelivery)
         {.what = "end", .file = g_chain.bytes, .site = FRAME_END, .before = frames},
         {.what = "within the budget", .file = within},
         {.what = "no room for AVC", .file = large(g_avc, Nalu), .open = Buffer(1000), .site = VIDEO_NO_ROOM},
-        {.what = "no room for AAC", .file = large(g_aac, Raw), .open = Buffer(1000), .site = AAC_NO_ROOM},
-        {.what = "no room for PCM",
-         .file = large(Pcm(0), Pcm),
-         .open = Buffer(1000),
-         .site = AUDIO_NO_ROOM,
-         .before = 1},
+        {.what = "none for AAC", .file = large(g_aac, Raw), .open = Buffer(1000), .site = AAC_NO_ROOM},
+        {.what = "none for PCM", .file = large(Pcm(0), Pcm), .open = Buffer(1000), .site = AUDIO_NO_ROOM, .before = 1},
         {.what = "information", .file = audio, .open = {SEPARATE, true}, .site = FRAME_INFO_ONLY, .stream = AUDIO},
         {.what = "no video", .file = audio, .open = {SEPARATE}, .site = FRAME_NO_VIDEO, .stream = VIDEO},
         {.what = "no audio", .file = video, .open = {SEPARATE}, .site = FRAME_NO_AUDIO, .stream = AUDIO},
@@ -175,22 +164,17 @@ TEST(Failures, OfDelivery)
 
 TEST(Open, BoundsTheSizesOfTheInitialisationBlock)
 {
-    const struct {
-        uint32_t cache, scan_read; // given
-        uint32_t cache_size, scan_read_size;
-    } rows[] = {
-        {.cache = 0, .scan_read = 0, .cache_size = 4096, .scan_read_size = 16},
-        {.cache = 1, .scan_read = 5, .cache_size = 1024, .scan_read_size = 5},
-        {.cache = 1023, .scan_read = 100000, .cache_size = 1024, .scan_read_size = 1024},
-        {.cache = 1025, .scan_read = 1025, .cache_size = 1025, .scan_read_size = 1025},
-    };
     FakeHost host(g_chain.bytes);
-    for (const auto& row : rows) {
-        const Session session(host, {0, false, row.cache, row.scan_read});
-        EXPECT_EQ(session.ctx()->cache_size, row.cache_size);
-        EXPECT_EQ(session.ctx()->scan_read_size, row.scan_read_size);
-        EXPECT_EQ(session.ctx()->main_reader->capacity, row.cache_size);
-    }
+    const auto expect = [&host](uint32_t cache, uint32_t scan, const OpenOptions& given) {
+        const Session session(host, given);
+        EXPECT_EQ(session.ctx()->cache_size, cache);
+        EXPECT_EQ(session.ctx()->main_reader->capacity, cache);
+        EXPECT_EQ(session.ctx()->scan_read_size, scan);
+    };
+    expect(4096, 16, {.cache_size = 0, .scan_read_size = 0});
+    expect(1024, 5, {.cache_size = 1, .scan_read_size = 5});
+    expect(1024, 1024, {.cache_size = 1023, .scan_read_size = 100000});
+    expect(1025, 1025, {.cache_size = 1025, .scan_read_size = 1025});
 }
 
 TEST(Open, TakesInOrderAndReleasesInOrder)
@@ -234,7 +218,8 @@ TEST(Probing, FindsStreamsAndTimes)
     };
     Flv far = after(Noise(MIB), 9);
     far.bytes[MIB] = 'X'; // there it is taken for a signature whatever it is
-    const Flv video = File({g_avc, Nalu(40), Nalu(90)}, 1), sorted = File({g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)});
+    const Flv video = File({g_avc, Nalu(40), Nalu(90)}, 1), aac = File({g_aac, Raw(23), Raw(46)}, 4);
+    const Flv sorted = File({g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)});
     const Flv all_found = File({g_meta, g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)});
     const Flv within = Repeat(BUDGET - 1, Pcm(0), {Screen(0), Pcm(5)}),
               beyond = Repeat(BUDGET, Pcm(0), {Screen(0), Pcm(5)});
@@ -244,11 +229,7 @@ TEST(Probing, FindsStreamsAndTimes)
               script_first = File({script, g_avc, Nalu(40), Nalu(90)}, 1);
     const Probe probes[] = {
         {.what = "AVC configuration", .file = video, .streams = VIDEO, .first_ts = 40, .duration = 50},
-        {.what = "AAC configuration",
-         .file = File({g_aac, Raw(23), Raw(46)}, 4),
-         .streams = AUDIO,
-         .first_ts = 23,
-         .duration = 23},
+        {.what = "AAC configuration", .file = aac, .streams = AUDIO, .first_ts = 23, .duration = 23},
         {.what = "any PCM tag", .file = File({Pcm(10), Pcm(30)}, 4), .streams = AUDIO, .first_ts = 10, .duration = 20},
         {.what = "of video AVC alone", .file = File({Screen(10), Pcm(50), Screen(60)}), .first_ts = 50, .duration = 10},
         {.what = "screen video alone", .file = File({Screen(10), Screen(60)}, 1), .streams = VIDEO, .duration = 60},
@@ -349,7 +330,7 @@ TEST(Delivery, KeepsTheSizeOfTheLastFrameAndTheTimeOfEachStream)
         {.tag = Raw(1070, 20), .size = 20, .video = 40, .audio = 70},
         {.tag = Nalu(1080, 70), .size = 70, .video = 80, .audio = 70},
     };
-    std::vector<Tag> tags = {g_meta, g_avc, g_aac};
+    Tags tags = {g_meta, g_avc, g_aac};
     for (const auto& row : rows)
         tags.push_back(row.tag);
     for (const OpenOptions& mode : {OpenOptions{}, Cache(SMALL), Buffer(5000), Cache(SMALL, GROWING)}) {
@@ -441,9 +422,7 @@ TEST(Delivery, GoesOnWhenItCannotSkipAPayload)
 
 TEST(Delivery, KeepsItsPlaceAfterManyTagsOfTheOtherStream)
 {
-    std::vector<Tag> tags(4100, Pcm(9));
-    tags.insert(tags.begin(), Screen(0));
-    tags.push_back(Screen(5000));
+    const Tags tags = Tags{Screen(0)} + Tags(4100, Pcm(9)) + Tags{Screen(5000)};
     for (uint64_t nth = 1; nth <= 3; ++nth) { // before the request, before the search, after the 4096th tag
         FakeHost host(File(tags).bytes);
         Session session(host, {GROWING | SEPARATE});
@@ -475,12 +454,9 @@ TEST(Delivery, LimitsFailedChecksOverAllTurnsOfARequest)
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        std::vector<Tag> tags = {g_meta, g_aac, Raw(0)};
-        tags.insert(tags.end(), row.before, bad);
-        tags.push_back(g_aac);
-        tags.insert(tags.end(), row.after, bad);
-        tags.insert(tags.end(), {Raw(40), Raw(80)}); // a scan takes no tag at the last time of the file
-        FakeHost host(File(tags, 4).bytes);
+        const Tags bad_tags = Tags(row.before, bad) + Tags{g_aac} + Tags(row.after, bad);
+        const Tags last = {Raw(40), Raw(80)}; // a scan takes no tag at the last time of the file
+        FakeHost host(File(Tags{g_meta, g_aac, Raw(0)} + bad_tags + last, 4).bytes);
         Session session(host);
         ASSERT_EQ(session.frame().rc, 0);
         FrameResult got = session.frame();
@@ -506,21 +482,18 @@ const auto Damaged = [](Tag tag) {
 TEST(LargeFrames, AreReadInOrder)
 {
     constexpr size_t BIG = 50000;
+    const auto two = [](const Tags& config, const auto& frame) {
+        return config + Tags{frame(0, BIG), frame(40, BIG), frame(80, 60), frame(90, 60)};
+    };
     const struct {
-        std::vector<Tag> tags;
+        Tags tags;
         const char* log; // 4096 bytes are cached: 4 of a back-pointer, 11 of a tag header, 5, 2 or 1 of a codec header
         std::optional<Site> cut = {}; // where a payload is cut short; none: no tag follows
         OpenOptions open = {};
     } rows[] = {
-        {.tags = {g_avc, Nalu(0, BIG), Nalu(40, BIG), Nalu(80), Nalu(90)},
-         .log = "copy(4076)= read(45924)=45924 read(4096)=164",
-         .cut = VIDEO_CUT},
-        {.tags = {g_aac, Raw(0, BIG), Raw(40, BIG), Raw(80), Raw(90)},
-         .log = "copy(4079)= read(45921)=45921 read(4096)=158",
-         .cut = AAC_CUT},
-        {.tags = {Pcm(0, BIG), Pcm(40, BIG), Pcm(80), Pcm(90)},
-         .log = "copy(4080)= read(45920)=45920 read(4096)=156",
-         .cut = AUDIO_CUT},
+        {.tags = two({g_avc}, Nalu), .log = "copy(4076)= read(45924)=45924 read(4096)=164", .cut = VIDEO_CUT},
+        {.tags = two({g_aac}, Raw), .log = "copy(4079)= read(45921)=45921 read(4096)=158", .cut = AAC_CUT},
+        {.tags = two({}, Pcm), .log = "copy(4080)= read(45920)=45920 read(4096)=156", .cut = AUDIO_CUT},
         {.tags = {Screen(0, BIG), Screen(40, BIG)},
          .log = "copy(4080)= read(45920)=45920 read(4096)=4",
          .open = Buffer(BIG)},
@@ -608,13 +581,13 @@ TEST(LargeFrames, CostAtMostOnePayloadWhenTheyAreFalse)
     constexpr uint64_t CACHE = 4096, HEADERS = 50, FRAME = 10000;
     const uint64_t crossed =
         HEADERS * (200 + 2 * CACHE + 16) + FRAME + 4 * CACHE; // each header, and the frame after them
-    const std::vector<Tag> bad = {Damaged(Nalu(20))};         // fails a check before them
+    const Tags bad = {Damaged(Nalu(20))};                     // fails a check before them
     const struct {
         const char* what;
         uint32_t claim;
         uint64_t most; // bytes read
         bool turns = false;
-        std::vector<Tag> before = {};
+        Tags before = {};
     } rows[] = {
         {.what = "half a MiB", .claim = 500000, .most = crossed + 500000},
         {.what = "in turns", .claim = 500000, .most = crossed + 500000, .turns = true},
@@ -626,8 +599,7 @@ TEST(LargeFrames, CostAtMostOnePayloadWhenTheyAreFalse)
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        std::vector<Tag> tags = {g_avc, Nalu(0, 100000)};
-        tags.insert(tags.end(), row.before.begin(), row.before.end());
+        Tags tags = Tags{g_avc, Nalu(0, 100000)} + row.before;
         for (uint64_t i = 0; i < HEADERS; ++i) {
             if (row.turns)
                 tags.push_back(g_avc);

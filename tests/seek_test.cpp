@@ -42,7 +42,7 @@ struct Media {
     uint32_t stream; // the one that decides
     uint32_t first_ts, last_ts = 0;
     bool by_index;
-    std::vector<Tag> tags, keys; // of the frames
+    Tags tags, keys; // of the frames
 
     // index_lag: ms by which the index's times are too early
     explicit Media(const Flv& flv, uint32_t index_lag = 0)
@@ -190,7 +190,7 @@ Flv Chain(uint32_t first_ts, bool index, bool video = true, uint32_t pictures = 
 // of them keyframes by their FrameType. Audio ends early.
 Flv Configured()
 {
-    std::vector<Tag> tags;
+    Tags tags;
     for (const Tag& tag : Chain(0, false, true, 60, 10).tags) {
         const uint32_t time = tag.timestamp;
         if (tag.type == 9 && time % 160 == 0)
@@ -422,41 +422,40 @@ TEST(Seek, GoesBackToAPlaceThatItCouldNotGoBackToBefore)
 // 0 s, which is near enough to its tag at 800 ms.
 TEST(Seek, ReadsZerosWhereTheIndexInTheFileIsCut)
 {
-    std::vector<Tag> tags = {g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(800)};
+    Tags tags = {g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(800)};
     std::string positions = "filepositions: [5";
     for (size_t i = 0; const Tag& tag : File(tags, 1).tags)
         positions += i++ != 0 ? " " + std::to_string(tag.offset) : "";
     tags.push_back({18, 0, OnMetaData("keyframes: { " + positions + " times: [5 0 0.2 0.4 0.6 0.8 }")});
     const Bytes bytes = File(tags, 1).bytes;
     const auto times = static_cast<int64_t>(Elements(bytes, "times"));
-    const int64_t no_read = -1;
+    constexpr int64_t NO_READ = -1;
     const struct {
         const char* what;
         int64_t visible;
-        uint32_t target;
-        bool backward;
-        int32_t rc;
-        uint32_t reached;
+        uint32_t target, reached;
+        bool backward = true;
+        int32_t rc = 0;
         std::optional<Site> site = {};
     } rows[] = {
-        {.what = "whole", .visible = times + 45, .target = 300, .backward = true, .rc = 0, .reached = 200},
-        {.what = "the last cut", .visible = times + 44, .target = 700, .backward = true, .rc = 0, .reached = 800},
-        {.what = "the last gone", .visible = times + 36, .target = 700, .backward = true, .rc = 0, .reached = 800},
-        {.what = "two gone", .visible = times + 27, .target = 500, .backward = true, .rc = 0, .reached = 800},
-        {.what = "forward", .visible = times + 27, .target = 500, .backward = false, .rc = -101, .reached = 0},
-        {.what = "one cut, two gone", .visible = times + 19, .target = 300, .backward = true, .rc = 0, .reached = 800},
-        {.what = "not needed", .visible = times + 27, .target = 300, .backward = true, .rc = 0, .reached = 200},
-        {.what = "all gone", .visible = times, .target = 300, .backward = true, .rc = 0, .reached = 800},
-        {.what = "all gone, to the start", .visible = times, .target = 0, .backward = true, .rc = 0, .reached = 0},
-        {.what = "no read", .visible = no_read, .target = 300, .backward = true, .rc = -1, .reached = 0, .site = FILE_INDEX_TAG_CUT},
-        {.what = "no read, forward", .visible = no_read, .target = 300, .backward = false, .rc = -101, .reached = 0},
+        {.what = "whole", .visible = times + 45, .target = 300, .reached = 200},
+        {.what = "the last is cut", .visible = times + 44, .target = 700, .reached = 800},
+        {.what = "the last is gone", .visible = times + 36, .target = 700, .reached = 800},
+        {.what = "two are gone", .visible = times + 27, .target = 500, .reached = 800},
+        {.what = "forward", .visible = times + 27, .target = 500, .reached = 0, .backward = false, .rc = -101},
+        {.what = "one is cut, two are gone", .visible = times + 19, .target = 300, .reached = 800},
+        {.what = "two are gone, not needed", .visible = times + 27, .target = 300, .reached = 200},
+        {.what = "all are gone", .visible = times, .target = 300, .reached = 800},
+        {.what = "all are gone, to the start", .visible = times, .target = 0, .reached = 0},
+        {.what = "no read", .visible = NO_READ, .target = 300, .reached = 0, .rc = -1, .site = FILE_INDEX_TAG_CUT},
+        {.what = "no read, forward", .visible = NO_READ, .target = 300, .reached = 0, .backward = false, .rc = -101},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
         FakeHost host(bytes);
         Session session(host);
         ASSERT_EQ(session.ctx()->keyframe_index.entry_count, 5u);
-        if (row.visible == no_read)
+        if (row.visible == NO_READ)
             host.fail_from(HostFn::Read, host.calls(HostFn::Read) + 1);
         else
             host.set_visible(row.visible);

@@ -179,7 +179,7 @@ TEST(TagKinds, AreReportedInBothDirections)
         {.what = "AVC end of sequence", .tag = {9, 7, g_avc_end}, .any = {k, v}, .keyframe = {k, k}},
         {.what = "script data at the end", .tag = g_meta, .any = {s, s}},
     };
-    std::vector<Tag> tags;
+    Tags tags;
     for (const Row& row : rows)
         tags.push_back(row.tag);
     const Flv flv = File(tags);
@@ -225,7 +225,8 @@ const auto Bad = [](int64_t count) { return File(std::vector(static_cast<size_t>
 // From place 100 on, damage and then the wanted tag, which begins at `found`; else each search ends with a result.
 TEST(Resynchronisation, CoversOneMiBInAll)
 {
-    constexpr int64_t far = MIB / 2 + 1000;
+    const Bytes half = Zeros(MIB / 2 + 1000), two_gaps = Concat({half + AudioTag(), half});
+    const Bytes failed = Concat({Bad(CHECKS), Zeros(30)});
     // With a failed check every 64 bytes all of the MiB is crossed: such a check costs no distance.
     const Bytes sparse = Concat(std::vector<Bytes>(MIB / 64 - 1, Concat({Bad(1), Zeros(64 - BAD_SIZE)})));
     // Nor does one after which the scan finds nothing: the whole MiB is left.
@@ -239,17 +240,11 @@ TEST(Resynchronisation, CoversOneMiBInAll)
         {.what = "one MiB", .damage = Zeros(MIB)},
         {.what = "one byte more", .damage = Zeros(MIB + 1), .careful = NOT_FOUND, .trusting = NOT_FOUND},
         {.what = "data ends", .damage = Zeros(MIB / 2), .careful = ENDED, .trusting = ENDED, .tag = false},
-        {.what = "a valid tag restores the budget of a careful search",
-         .damage = Concat({Zeros(far) + AudioTag(), Zeros(far)}),
-         .trusting = NOT_FOUND},
+        {.what = "a valid tag restores the budget of a careful search", .damage = two_gaps, .trusting = NOT_FOUND},
         {.what = "failed checks all over it", .damage = sparse},
         {.what = "all checks but one fail", .damage = Bad(CHECKS - 1)},
         {.what = "all checks fail", .damage = Bad(CHECKS), .careful = NOT_FOUND},
-        {.what = "they fail, then the data ends",
-         .damage = Concat({Bad(CHECKS), Zeros(30)}),
-         .careful = NOT_FOUND,
-         .trusting = ENDED,
-         .tag = false},
+        {.what = "then data end", .damage = failed, .careful = NOT_FOUND, .trusting = ENDED, .tag = false},
         {.what = "one MiB after a failed scan", .damage = gap, .trusting = NOT_FOUND},
         {.what = "one byte more after it", .damage = Concat({gap, {0}}), .careful = NOT_FOUND, .trusting = NOT_FOUND},
     };
@@ -356,29 +351,25 @@ TEST(PrevTag, SlidesBackOneMiBInAll)
 
 TEST(HostCalls, OfTheBackPointerCheck)
 {
-    const std::string begin = "tell64()=13 eof()=0 read(4096)=", whole = begin + "4096 tell64()=4109";
+    const std::string begin = "tell64()=13 eof()=0 read(",
+                      cache = begin + "4096)=", whole = cache + "4096 tell64()=4109";
+    const std::string back = " seek64(13,0)=0"; // to the tag
+    const std::string cut = cache + "50 tell64()=63 read(4046)=50 read(3996)=50" + back;
+    const std::string narrow = begin + "16)=16 tell64()=29 seek64(95,1)=0 read(16)=16" + back;
+    const std::string narrower = begin + "13)=13 tell64()=26 seek64(98,1)=0 read(5)=5" + back;
     const struct {
         const char* what;
         size_t size;
-        std::string log;                    // its beginning; no seek follows
+        std::string log;                    // begins so; no seek follows
         uint32_t quantum = 0, most = CACHE; // of each read
     } rows[] = {
-        {.what = "cached", .size = 100, .log = begin + "230 tell64()=243"},
+        {.what = "cached", .size = 100, .log = cache + "230 tell64()=243"},
         {.what = "as large as the cache", .size = 4081, .log = whole},
-        {.what = "one byte larger", .size = 4082, .log = whole + " read(1)=1 seek64(13,0)=0"},
-        {.what = "larger", .size = 5000, .log = whole + " seek64(915,1)=0 read(4)=4 seek64(13,0)=0"},
-        {.what = "in short reads",
-         .size = 100,
-         .log = begin + "50 tell64()=63 read(4046)=50 read(3996)=50 seek64(13,0)=0",
-         .most = 50},
-        {.what = "narrow reads",
-         .size = 100,
-         .log = "tell64()=13 eof()=0 read(16)=16 tell64()=29 seek64(95,1)=0 read(16)=16 seek64(13,0)=0",
-         .quantum = 16},
-        {.what = "narrower than a header",
-         .size = 100,
-         .log = "tell64()=13 eof()=0 read(13)=13 tell64()=26 seek64(98,1)=0 read(5)=5 seek64(13,0)=0",
-         .quantum = 5},
+        {.what = "one byte larger", .size = 4082, .log = whole + " read(1)=1" + back},
+        {.what = "larger", .size = 5000, .log = whole + " seek64(915,1)=0 read(4)=4" + back},
+        {.what = "in short reads", .size = 100, .log = cut, .most = 50},
+        {.what = "narrow reads", .size = 100, .log = narrow, .quantum = 16},
+        {.what = "narrower than a header", .size = 100, .log = narrower, .quantum = 5},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
@@ -460,7 +451,7 @@ TEST(Extent, EndsWithTheLastTag)
 
 TEST(Extent, TakesTheLargestTimeOfTheLastTags)
 {
-    const auto expect = [](const char* what, std::vector<Tag> tags, uint32_t audio, uint32_t last_ts) {
+    const auto expect = [](const char* what, Tags tags, uint32_t audio, uint32_t last_ts) {
         for (uint32_t i = 0; i < audio; ++i)
             tags.push_back(Pcm(900 - i));
         const Flv flv = File(tags);

@@ -60,12 +60,6 @@ struct WorkCase {
     uint64_t scan_read_size = 0;
 };
 
-std::vector<Tag> operator+(std::vector<Tag> front, const std::vector<Tag>& more)
-{
-    front.insert(front.end(), more.begin(), more.end());
-    return front;
-}
-
 Bytes Repeat(const Bytes& pattern, size_t size)
 {
     Bytes out(size);
@@ -226,12 +220,12 @@ TEST(Work, CrossesOneMiBOfRandomBytes)
     Bytes bytes(MIB);
     std::generate(bytes.begin(), bytes.end(), [&random] { return static_cast<uint8_t>(random()); });
     constexpr uint32_t LATE = 0xFFFFFFF0, SCRIPT = 0xFFFFF0;
-    const std::vector<Tag> video = {g_avc, Nalu(0), Nalu(40)}, audio = {g_aac, Raw(0), Raw(20)};
-    const std::vector<Tag> both = {g_avc, g_aac, Nalu(0), Raw(20)}, more_video = {Nalu(80), Nalu(LATE)};
-    const std::vector<Tag> more_audio = {Raw(60), Raw(LATE)}, more = {g_meta, Nalu(80), Raw(90), Nalu(LATE)};
+    const Tags video = {g_avc, Nalu(0), Nalu(40)}, audio = {g_aac, Raw(0), Raw(20)};
+    const Tags both = {g_avc, g_aac, Nalu(0), Raw(20)}, more_video = {Nalu(80), Nalu(LATE)};
+    const Tags more_audio = {Raw(60), Raw(LATE)}, more = {g_meta, Nalu(80), Raw(90), Nalu(LATE)};
     const struct {
         const char* what; // is known before the random bytes
-        std::vector<Tag> before, after;
+        Tags before, after;
         uint32_t streams;
     } rows[] = {
         {.what = "nothing", .before = {g_meta}, .after = both + more, .streams = BOTH},
@@ -322,14 +316,8 @@ TEST(Work, CostsLittleOnValidFiles)
     } rows[] = {
         {.what = "opening: head and tail", .size = TINY, .act = opened, .most = opening, .before = NONE},
         {.what = "opening: large frames", .size = BIG, .act = opened, .most = opening + CHECK, .before = NONE},
-        {.what = "small frames: whole caches",
-         .size = TINY,
-         .act = played,
-         .most = {tiny / CACHE + 1, 1, 2 * tags, tiny}},
-        {.what = "large frames: every byte once",
-         .size = BIG,
-         .act = played,
-         .most = {1 + 2 * FRAMES, 1, 2 * tags, big}},
+        {.what = "small: whole caches", .size = TINY, .act = played, .most = {tiny / CACHE + 1, 1, 2 * tags, tiny}},
+        {.what = "large: every byte once", .size = BIG, .act = played, .most = {1 + 2 * FRAMES, 1, 2 * tags, big}},
         {.what = "one: its rest and a cache", .size = BIG, .act = one, .most = {2, 0, 2, BIG + 20}, .before = 1},
         {.what = "scanning seek", .size = TINY, .act = sought, .most = astray, .script = long_text},
         {.what = "scanning seek in large frames", .size = BIG, .act = sought, .most = inside},
