@@ -301,7 +301,7 @@ typedef struct flvd_ctx_t {
     uint8_t* frame_buffer;                  /**< frames are copied here */
     uint32_t frame_buffer_size;             /**< its capacity */
     uint32_t cache_size;                    /**< cache of each reader */
-    uint32_t scan_read_size;                /**< refill quantum while scanning */
+    uint32_t scan_read_size;                /**< read size while scanning */
     uint32_t byte_rate;                     /**< bytes per 1024 ms, 0 when unknown */
     uint32_t streams;                       /**< FLVD_STREAM_* bits: announced by the header, then those found */
     flvd_file_info_t file_info;             /**< what the host is told of the file */

@@ -103,7 +103,7 @@ struct fio_file_t {
     uint32_t head;            /**< index of the first byte not yet consumed, or not yet written out */
     uint32_t count;           /**< bytes from head on: read-ahead, or pending */
     uint32_t state;           /**< FIO_STATE_* */
-    uint32_t read_size;       /**< refill quantum: the least number of bytes that a refill asks for */
+    uint32_t read_size;       /**< read size: the least number of bytes that a refill asks for */
     uint32_t capacity;        /**< cache size given at open */
     int32_t overread;         /**< refill beyond the request */
     uint32_t overread_extra;  /**< extra cache bytes for it */
@@ -195,7 +195,7 @@ FLVD_API int32_t __FLV_DMX__fioSeek64(fio_file_t* file, int64_t offset, int32_t 
 
 /**
  * Reads and consumes `count` elements of `size` bytes. What is cached is copied; what is missing goes straight to
- * `destination`, or through the cache when it is less than the refill quantum.
+ * `destination`, or through the cache when it is less than the read size.
  * @return whole elements delivered; 0, nothing moved, when `size` is 0 or size × count does not fit 32 bits
  */
 FLVD_API uint32_t __FLV_DMX__fioRead(void* destination, uint32_t size, uint32_t count, fio_file_t* file);
@@ -206,10 +206,10 @@ FLVD_API uint32_t __FLV_DMX__fioRead(void* destination, uint32_t size, uint32_t 
  */
 FLVD_API uint32_t __FLV_DMX__fioWrite(const void* source, uint32_t size, uint32_t count, fio_file_t* file);
 
-/** Sets the refill quantum; 0 means the whole cache. @return 1; 0 when `size` is above the capacity */
+/** Sets the read size; 0 means the whole cache. @return 1; 0 when `size` is above the capacity */
 FLVD_API int32_t __FLV_DMX__fioSetCacheReadSize(fio_file_t* file, uint32_t size);
 
-/** @return the refill quantum in bytes */
+/** @return the read size in bytes */
 FLVD_API uint32_t __FLV_DMX__fioGetCacheReadSize(fio_file_t* file);
 
 /** Debug entry without state. @return 0 */
@@ -263,7 +263,7 @@ FLVD_API int32_t FLVD_GetCurrTagInfo(flvd_ctx_t* ctx, fio_file_t* file, flvd_tag
  * equal to the file's last one is not plausible.
  *
  * @param ctx   open instance, borrowed
- * @param file  reader; its refill quantum is the whole cache for the time of the call
+ * @param file  reader; its read size is the whole cache for the time of the call
  * @param limit bytes after which the search ends (it may overrun by one cache); 0 finds nothing
  * @return bytes moved, 0 or more; -1 when there is none within the limit or the data, the reader having moved
  */

@@ -1,4 +1,7 @@
 // Codec configuration: what the first tag of each stream tells about it.
+//
+// Files: audio.cpp (tag byte, AudioSpecificConfig, MPEG frame header), video.cpp (tag byte, H.263 and VP6 pictures),
+// avc.cpp (AVC record and sequence parameter set), config.cpp (the copy of a configuration).
 #ifndef FLVDMX_CODEC_CODEC_H
 #define FLVDMX_CODEC_CODEC_H
 

@@ -1,4 +1,7 @@
 // Numbers of the FLV format that several layers read (FLV file format, version 10.1, annex E).
+//
+// This folder holds what all layers share: beside this file the header of a tag (tag_header.h), big-endian fields
+// (bytes.h), questions about an instance (instance.h) and the places of failure (sites.def).
 #ifndef FLVDMX_COMMON_FORMAT_H
 #define FLVDMX_COMMON_FORMAT_H
 

@@ -1,4 +1,4 @@
-// Blocks of a cached file: peeking by copy, reading, writing, and the refill quantum.
+// Blocks of a cached file: peeking by copy, reading, writing, and the read size.
 
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/fio/tables.h"
@@ -21,7 +21,7 @@ void FLVD_FioTake(fio_file_t* file, uint8_t* destination, uint32_t n)
     FLVD_FioConsume(file, n);
 }
 
-// Reads up to n bytes with one refill of the empty cache by its quantum. Returns what was missing.
+// Reads up to n bytes with one refill of the empty cache by its read size. Returns what was missing.
 uint32_t FLVD_FioReadThroughCache(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
     file->count = FLVD_FioHostRead(file, file->cache, file->read_size);
@@ -37,7 +37,7 @@ uint32_t FLVD_FioReadOver(fio_file_t* file, uint8_t* destination, uint32_t n)
         const uint32_t got = FLVD_FioHostRead(file, destination, file->read_size);
         destination += got;
         n -= got;
-        if (got < file->read_size || got == 0) // 0: a file without a cache has a quantum of 0
+        if (got < file->read_size || got == 0) // 0: a file without a cache has a read size of 0
             break;
     }
     return FLVD_FioReadThroughCache(file, destination, n);

@@ -1,4 +1,8 @@
-// Inside of the cached file layer, shared by its files, and the guard that its users narrow the refill quantum with.
+// The cached file from inside the library: what its own files share, and the short ways that the layers above use where
+// the exported functions would cost a call. The guard narrows the read size for a while.
+//
+// Files: file.cpp (opening, positions, refill, peek, skip), block.cpp (reading and writing blocks), tables.cpp (the
+// process-wide host functions).
 #ifndef FLVDMX_FIO_FIO_H
 #define FLVDMX_FIO_FIO_H
 
@@ -9,7 +13,7 @@
 #include <cstring>
 
 constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62; // a host that tells more has not told a position
-constexpr uint32_t FLVD_WHOLE_CACHE = 0;               // as a refill quantum: the capacity of the file's cache
+constexpr uint32_t FLVD_WHOLE_CACHE = 0;               // as a read size: the capacity of the file's cache
 
 // Reads up to n bytes from the host. One that claims more than it was asked for has failed: none of
 // its bytes count.
@@ -116,7 +120,7 @@ inline void FLVD_FioEmpty(fio_file_t* file)
     file->count = 0;
 }
 
-// Refill quantum for a while. `after` is part of each user's contract: the forward search puts back what it found,
+// Read size for a while. `after` is part of each user's contract: the forward search puts back what it found,
 // the users that step through the file leave 0, the whole cache.
 class FLVD_ReadSizeGuard {
 public:

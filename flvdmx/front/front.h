@@ -1,4 +1,7 @@
 // Front end: what the entry point is made of.
+//
+// Files: entry.cpp dispatches and translates results, open.cpp opens and releases an instance, probe.cpp finds its
+// streams, frame.cpp delivers frames, bits.cpp is the bit reader of the file header, layout.cpp asserts the records.
 #ifndef FLVDMX_FRONT_FRONT_H
 #define FLVDMX_FRONT_FRONT_H
 

@@ -3,7 +3,7 @@
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/meta/amf.h"
 #include "flvdmx/meta/keys.h"
-#include "flvdmx/meta/script.h"
+#include "flvdmx/meta/meta.h"
 
 namespace {
 

@@ -4,11 +4,11 @@
 // Sizes are claims of the file: a value may not start past the payload, containers nest to a bound, and every loop
 // consumes at least a byte per turn.
 
-#include "flvdmx/meta/script.h"
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/meta/amf.h"
 #include "flvdmx/meta/keyframe_index.h"
 #include "flvdmx/meta/keys.h"
+#include "flvdmx/meta/meta.h"
 
 namespace {
 

@@ -1,4 +1,7 @@
 // Seeking: the time seek of operation 3, and the frame seeks by which it puts the readers on a tag.
+//
+// Files: time_seek.cpp chooses the target and restores the readers after a failure, frame_seek.cpp seeks by the
+// keyframe index, scan_seek.cpp by walking from tag to tag.
 #ifndef FLVDMX_SEEK_SEEK_H
 #define FLVDMX_SEEK_SEEK_H
 

@@ -1,6 +1,9 @@
-// Parse of one script-data payload, shared by the files of this folder.
-#ifndef FLVDMX_META_SCRIPT_H
-#define FLVDMX_META_SCRIPT_H
+// Metadata: script data (AMF0) and the keyframe index in it. This header holds the state of one parse.
+//
+// Files: script.cpp parses values, keys.cpp recognises property names, properties.cpp stores what they say in the
+// instance, keyframe_index.cpp keeps, reads and trims the index. amf.h has the numbers of AMF0.
+#ifndef FLVDMX_META_META_H
+#define FLVDMX_META_META_H
 
 #include "flvdmx/flvdmx.h"
 
