@@ -1,6 +1,6 @@
-// A host that fails: in each scenario every call that can fail fails once, with and without all calls behind it, and
-// every read is cut short. Whatever comes of it is listed, all that was taken is accounted for, what is delivered
-// are frames of the file, and a host that has recovered gets the rest of them.
+// A host that fails: in each scenario every call that can fail fails once, with and without all later calls, and every
+// read is cut short. Whatever comes of it is listed, all that was taken is accounted for, what is delivered are frames
+// of the file, and a host that has recovered gets the rest of them.
 
 #include "support/report.h"
 #include "support/session.h"
@@ -15,7 +15,35 @@ namespace {
 
 constexpr int64_t STEP = 601; // of a growing file
 constexpr size_t UNKNOWN = SIZE_MAX;
-constexpr char INITIALS[] = "a   o rwst f"; // of HostFn
+
+using enum Site;
+
+// The host functions whose failure leads to each place.
+const auto Set = [](auto... sites) { return std::set<Site>{sites...}; };
+const std::map<HostFn, std::set<Site>> g_ledTo = {
+    {HostFn::Alloc, Set(OPEN_INSTANCE, OPEN_MAIN_READER, OPEN_AUDIO_READER, OPEN_FRAME_BUFFER, AAC_MEMORY, AVC_MEMORY,
+                        AAC_NO_ROOM, AUDIO_NO_ROOM, VIDEO_NO_ROOM)},
+    {HostFn::Open, Set(OPEN_MAIN_READER, OPEN_AUDIO_READER)},
+    {HostFn::Read,
+     Set(AUDIO_TAG, MP3_DATA, VIDEO_TAG, AUDIO_HEADERS_CUT, AAC_CUT, AUDIO_CUT, VIDEO_HEADERS_CUT, VIDEO_CUT)},
+    {HostFn::Seek,
+     Set(OPEN_FILE_HEADER, OPEN_NO_STREAM, OPEN_TAG_CUT, OPEN_EXTENT, OPEN_REWIND, QUICK_WALK_SEEK, INDEX_FILE_SEEK,
+         INDEX_MEMORY_SEEK, INDEX_BACK_SEEK, TRIM_POSITIONS_SEEK, TRIM_TIMES_SEEK, NO_TAG, WALK_SEEK, FRAME_RESUME,
+         BACK_TO_VIDEO_WITHOUT_BACK_POINTER, BACK_TO_CUT_VIDEO, BACK_TO_AUDIO_WITHOUT_BACK_POINTER, BACK_TO_CUT_AUDIO,
+         BACK_FROM_END, SEEK_REWIND, SEEK_VIDEO, SEEK_AUDIO, SEEK_ONE_READER, SEEK_FOLLOW, AUDIO_FOLLOW_SEEK,
+         FILE_INDEX_TIMES_SEEK, FILE_INDEX_REWIND, FILE_INDEX_POSITIONS_SEEK, FILE_INDEX_SEEK, MEMORY_INDEX_REWIND,
+         MEMORY_INDEX_SEEK, VIDEO_ESTIMATE)},
+    {HostFn::Tell, Set(OPEN_FILE_HEADER, OPEN_EXTENT, QUICK_LAST_TAG, QUICK_WALK_STEP, INDEX_FORWARD_POSITION,
+                       INDEX_BACK_POSITION, INDEX_LAST_TAG, LAST_TAG, WALK_STEP, FRAME_POSITION, BACK_FROM_SKIP,
+                       SEEK_VIDEO_POSITION, SEEK_AUDIO_POSITION, SEEK_ONE_READER_POSITION, SEEK_FOLLOW_POSITION,
+                       AUDIO_FOLLOW_POSITION, AUDIO_FIRST_STEP, AUDIO_WALK, VIDEO_FIRST_STEP, VIDEO_WALK)}};
+// To the other places the file or the caller leads alone.
+const std::set<Site> g_withoutFault =
+    Set(NO_INSTANCE, RESERVED_OPERATION, MP3_HEADER, AAC_DATA, MP3_8KHZ_DATA, MP3_8KHZ_HEADER, H263_DATA, H263_HEADER,
+        VP6_DATA, VP6_HEADER, VP6A_DATA, VP6A_HEADER, AVC_DATA, AVC_CONFIG, AVC_PARAMETERS, AVC_NO_SEQUENCE_HEADER,
+        FRAME_INFO_ONLY, FRAME_NO_VIDEO, FRAME_NO_AUDIO, FRAME_BAD_STREAM, FRAME_END, SEEK_INFO_ONLY, SEEK_NOT_SEEKABLE,
+        SEEK_MISS, FILE_INDEX_POSITION_TYPE, FILE_INDEX_TAG_CUT, FILE_INDEX_TOLERANCE, MEMORY_INDEX_TAG_CUT,
+        MEMORY_INDEX_TOLERANCE, SEEK_METHOD);
 
 struct Seek {
     int32_t time;
@@ -23,7 +51,7 @@ struct Seek {
 };
 
 struct Scenario {
-    const char* name;
+    const char* what;
     Flv flv;
     std::vector<OpenOptions> opens; // taken in turn
     std::vector<Seek> seeks = {};
@@ -37,7 +65,7 @@ struct Fault {
     uint32_t bytes = 0;
 };
 
-using Seen = std::map<std::pair<int32_t, int32_t>, std::set<char>>; // codes and lines, and what led there
+using Seen = std::map<int32_t, std::set<HostFn>>; // lines, and the functions whose failure led there
 
 // One scenario under one fault.
 class Course {
@@ -68,8 +96,8 @@ public:
         m_exact = !fired() && !m_open.for_info;
         judge(Op::Open, session.open_rc());
         bool on = session.opened();
-        const bool sound = on && fired() && !m_fault.later;
-        EXPECT_TRUE(!sound || __FLV_DMX__fioTell64(session.ctx()->main_reader) == session.ctx()->data_offset);
+        const bool rewound = on && fired() && !m_fault.later;
+        EXPECT_TRUE(!rewound || __FLV_DMX__fioTell64(session.ctx()->main_reader) == session.ctx()->data_offset);
         take(on ? 3 : 0);
         for (const Seek& seek : m_scenario.seeks)
             on = on && go(seek);
@@ -85,20 +113,20 @@ private:
     uint64_t calls() const { return m_fault.bytes != 0 ? m_host.calls(HostFn::Read) : m_host.failable_calls(); }
     bool fired() const { return m_fault.nth != 0 && calls() >= m_fault.nth; }
     // A growing file without its position is read on inside a tag, where a false header may pass for one.
-    bool strays() const { return growing() && m_by == 't'; }
+    bool strays() const { return growing() && m_by == HostFn::Tell; }
     void arm(HostFn fn)
     {
         if (calls() + 1 == m_fault.nth)
-            m_by = m_fault.bytes != 0 ? 'r' : INITIALS[static_cast<size_t>(fn)];
+            m_by = m_fault.bytes != 0 ? HostFn::Read : fn;
         m_exact = m_exact && !strays();
         if (m_fault.later && fired())
             m_host.fail_from(fn, 1);
     }
     void note(int32_t code, int32_t line)
     {
-        const auto same = [&](const Place& place) { return place.code == code && place.line == line; };
-        EXPECT_TRUE(line == 0 || std::any_of(Places().begin(), Places().end(), same)) << code << " / " << line;
-        m_seen[{code, line}].insert(m_by);
+        const auto records = [&](const Place& place) { return place.records(code, line); };
+        EXPECT_TRUE(line == 0 || std::any_of(Places().begin(), Places().end(), records)) << code << " / " << line;
+        m_seen[line].insert(m_by);
     }
     // After every operation: it failed as listed, and what the host holds is what the instance's words say.
     void judge(Op op, int32_t rc)
@@ -183,7 +211,7 @@ private:
         take((seek.mode & AT_END) != 0 ? 0 : 2);
         return true;
     }
-    // The host is sound again.
+    // The host works again.
     void play_out()
     {
         m_host.on_call = nullptr;
@@ -211,7 +239,7 @@ private:
     // Of each stream asked for the frames of the whole file, with the tags' times, and which comes next.
     std::map<uint32_t, std::pair<Frames, size_t>> m_due;
     Session* m_session = nullptr;
-    char m_by = ' ';
+    HostFn m_by = HostFn::Count; // the function that failed
     bool m_exact = true;
 };
 
@@ -235,8 +263,9 @@ std::vector<Scenario> Scenarios()
     const auto mp3 = [](uint32_t ts) { return Tag{8, ts, AudioData(SOUND_MP3, Mp3Frame(LARGE))}; };
     const std::vector<Seek> seeks = {{500, BACK}, {500, FORTH}, {-200, REL},   {790, FORTH | RETRY},
                                      {9000},      {-1},         {9000, AT_END}};
-    const std::vector<Seek> growing = {{500, BACK}, {300, FORTH}, {-1}};
-    const Flv chain = MakeChain(), indexed = MakeChain({true, true, true, true}), sound = MakeChain({false});
+    const std::vector<Seek> near = {{500, BACK}, {300, FORTH}, {-1}}, to_start = {{0, BACK, VIDEO}},
+                            back = {{500, BACK, VIDEO}};
+    const Flv chain = MakeChain(), indexed = MakeChain({true, true, true, true}), audio = MakeChain({false});
     const Flv avc = large(g_avc, Nalu, LARGE), aac = large(g_aac, Raw, 60);
     const auto is_second = [](const Tag& tag) { return tag.is_keyframe() && tag.timestamp == 200; };
     const int64_t second_key = std::find_if(indexed.tags.begin(), indexed.tags.end(), is_second)->offset;
@@ -244,35 +273,44 @@ std::vector<Scenario> Scenarios()
     std::fill_n(&damaged.bytes[static_cast<size_t>(damaged.tags[6].offset)], damaged.tags[6].size(), uint8_t{0xEE});
     damaged.tags.erase(damaged.tags.begin() + 6);
     last.tags.push_back(g_meta);
+    const Flv odd_metadata = File({{18, 0, {5, 5}}, g_avc, Nalu(0, 60), Raw(5, 60)});
+    const Flv first_large = File({mp3(0), Screen(0, LARGE), mp3(9), Screen(9), Screen(40), Screen(80)});
+    const auto plain = [&large](size_t size) { return large(Pcm(0), Pcm, size); };
+    const int64_t video = avc.tags[2].end(), aac_frame = aac.tags[2].end();
+    using Opens = std::vector<OpenOptions>;
+    const Opens scanning = {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)};
+    const Opens indexing = {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}};
+    const Opens growing = {open(GROWING), open(GROWING | SEPARATE)};
+    const Opens information = {open(0, 0, true), open(SEPARATE, 0, true)};
     return {
-        {"scan", chain, {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)}, seeks},
-        {"sound", sound, {open(0)}, seeks},
-        {"index", indexed, {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}}, seeks},
-        {"growing", indexed, {open(GROWING), open(GROWING | SEPARATE)}, growing, 6000},
-        {"growing, no index", chain, {open(GROWING)}, {}, 2000},
-        {"growing, odd metadata", File({{18, 0, {5, 5}}, g_avc, Nalu(0, 60), Raw(5, 60)}), {open(GROWING)}},
-        {"information", indexed, {open(0, 0, true), open(SEPARATE, 0, true)}, {{500, BACK}}},
-        {"metadata at the end", File(last.tags), {open(0), open(INDEX)}, seeks},
-        {"damaged", damaged, {open(0), open(SEPARATE)}, seeks},
-        {"bytes behind", Cut(indexed, indexed.size() + 50), {open(0)}},
-        {"cut in a keyframe", Cut(indexed, second_key + 20), {open(0), open(INDEX)}},
-        {"cut behind it", Cut(indexed, second_key + 900), {open(INDEX)}},
-        {"first tags", File({mp3(0), Screen(0, LARGE), mp3(9), Screen(9), Screen(40), Screen(80)}), {open(0, SMALL)}},
-        {"pictures", avc, {open(0, SMALL)}},
-        {"sounds", large(g_aac, Raw, LARGE), {open(0, SMALL)}},
-        {"plain sounds", large(Pcm(0), Pcm, LARGE), {open(0, SMALL), open(GROWING, SMALL)}},
-        {"huge pictures", large(g_avc, Nalu, GROWN), {{}}},
-        {"huge sounds", large(g_aac, Raw, GROWN), {{}}},
-        {"huge plain sounds", large(Pcm(0), Pcm, GROWN), {{}}},
-        {"growing in a picture", avc, {open(GROWING)}, {}, avc.tags[2].end() - 5},
-        {"growing in its back-pointer", avc, {open(GROWING)}, {}, avc.tags[2].end() - 4},
-        {"growing in a sound", aac, {open(GROWING)}, {}, aac.tags[2].end() - 5},
-        {"growing in its back-pointer", aac, {open(GROWING)}, {}, aac.tags[2].end() - 1},
-        {"frame seek of sound", chain, {open(SEPARATE)}, {{500, BACK, AUDIO}}},
-        {"frame seek", chain, {open(0)}, {{500, FORTH, VIDEO}}},
-        {"frame seek back", chain, {open(0)}, {{500, BACK, VIDEO}}},
-        {"frame seek by index", indexed, {open(0), open(INDEX)}, {{500, BACK, VIDEO}}},
-        {"frame seek to the start", indexed, {open(0), open(INDEX)}, {{0, BACK, VIDEO}}},
+        {.what = "scan", .flv = chain, .opens = scanning, .seeks = seeks},
+        {.what = "audio", .flv = audio, .opens = {open(0)}, .seeks = seeks},
+        {.what = "index", .flv = indexed, .opens = indexing, .seeks = seeks},
+        {.what = "growing", .flv = indexed, .opens = growing, .seeks = near, .shown = 6000},
+        {.what = "growing without index", .flv = chain, .opens = {open(GROWING)}, .shown = 2000},
+        {.what = "growing, odd metadata", .flv = odd_metadata, .opens = {open(GROWING)}},
+        {.what = "information", .flv = indexed, .opens = information, .seeks = {{500, BACK}}},
+        {.what = "metadata at the end", .flv = File(last.tags), .opens = {open(0), open(INDEX)}, .seeks = seeks},
+        {.what = "damaged", .flv = damaged, .opens = {open(0), open(SEPARATE)}, .seeks = seeks},
+        {.what = "bytes after the last tag", .flv = Cut(indexed, indexed.size() + 50), .opens = {open(0)}},
+        {.what = "cut in a keyframe", .flv = Cut(indexed, second_key + 20), .opens = {open(0), open(INDEX)}},
+        {.what = "cut after it", .flv = Cut(indexed, second_key + 900), .opens = {open(INDEX)}},
+        {.what = "first tags larger than the cache", .flv = first_large, .opens = {open(0, SMALL)}},
+        {.what = "large AVC frames", .flv = avc, .opens = {open(0, SMALL)}},
+        {.what = "large AAC frames", .flv = large(g_aac, Raw, LARGE), .opens = {open(0, SMALL)}},
+        {.what = "large PCM frames", .flv = plain(LARGE), .opens = {open(0, SMALL), open(GROWING, SMALL)}},
+        {.what = "AVC frames above the buffer", .flv = large(g_avc, Nalu, GROWN), .opens = {{}}},
+        {.what = "AAC frames above the buffer", .flv = large(g_aac, Raw, GROWN), .opens = {{}}},
+        {.what = "PCM frames above the buffer", .flv = plain(GROWN), .opens = {{}}},
+        {.what = "growing, ends in a video frame", .flv = avc, .opens = {open(GROWING)}, .shown = video - 5},
+        {.what = "growing, ends before its back-pointer", .flv = avc, .opens = {open(GROWING)}, .shown = video - 4},
+        {.what = "growing, ends in an audio frame", .flv = aac, .opens = {open(GROWING)}, .shown = aac_frame - 5},
+        {.what = "growing, ends in its back-pointer", .flv = aac, .opens = {open(GROWING)}, .shown = aac_frame - 1},
+        {.what = "frame seek of audio", .flv = chain, .opens = {open(SEPARATE)}, .seeks = {{500, BACK, AUDIO}}},
+        {.what = "frame seek forward", .flv = chain, .opens = {open(0)}, .seeks = {{500, FORTH, VIDEO}}},
+        {.what = "frame seek backward", .flv = chain, .opens = {open(0)}, .seeks = back},
+        {.what = "frame seek by index", .flv = indexed, .opens = {open(0), open(INDEX)}, .seeks = back},
+        {.what = "frame seek to the start", .flv = indexed, .opens = {open(0), open(INDEX)}, .seeks = to_start},
     };
 }
 
@@ -281,7 +319,7 @@ void SweepFaults(const Scenario& scenario, const OpenOptions& open, Sweep* sweep
 {
     const auto run = [&](const Fault& fault) {
         const uint64_t where[] = {open.options, fault.nth, fault.later ? 1u : 0u, fault.bytes};
-        SCOPED_TRACE(scenario.name + testing::PrintToString(where)); // options, call, and later, bytes
+        SCOPED_TRACE(scenario.what + testing::PrintToString(where)); // options, call, and later, bytes
         return Course(scenario, open, fault, seen).run();
     };
     const auto [calls, reads] = run({});
@@ -305,9 +343,21 @@ TEST(Faults, AreSurvivedAtEveryCall)
             SweepFaults(scenario, open, &sweep, &seen);
     if (!Sweep::is_complete())
         return; // a sample does not lead to every place
-    for (const Place& place : Places())
-        for (const char by : place.by)
-            EXPECT_EQ(seen[std::pair(place.code, place.line)].count(by), 1u) << place.line << by;
+    for (const auto& [fn, sites] : g_ledTo)
+        for (const Site site : sites) {
+            const Place& place = At(site);
+            EXPECT_EQ(seen[place.line].count(fn), 1u) << place.line;
+            EXPECT_TRUE(place.growing_line == 0 || seen[place.growing_line].count(fn) == 1) << place.growing_line;
+        }
+}
+
+TEST(Faults, LeadToEveryPlaceOrTheFileAloneDoes)
+{
+    for (const Place& place : Places()) {
+        const auto leads = [&place](const auto& led) { return led.second.count(place.site) != 0; };
+        const bool fault = std::any_of(g_ledTo.begin(), g_ledTo.end(), leads);
+        EXPECT_NE(fault, g_withoutFault.count(place.site) != 0) << place.line;
+    }
 }
 
 } // namespace

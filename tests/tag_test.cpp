@@ -4,8 +4,6 @@
 #include "support/report.h"
 #include "support/session.h"
 
-#include <array>
-
 using namespace flvd_test;
 
 namespace {
@@ -73,10 +71,9 @@ struct Reader {
     Found found(int32_t rc) { return {rc, rc == 0 ? __FLV_DMX__fioTell64(file) : 0, std::exchange(kind, 0)}; }
 };
 using Step = Found (Reader::*)(uint32_t wanted);
-constexpr Step FORWARD[] = {&Reader::verify, &Reader::trust, &Reader::next};
 
-const auto Sound = [](size_t size = 100) { return Raw(5, size - 2); };
-const auto Picture = [](size_t size = 100) { return Nalu(5, size - 5); };
+const auto AudioTag = [](size_t size = 100) { return Raw(5, size - 2); };
+const auto VideoTag = [](size_t size = 100) { return Nalu(5, size - 5); };
 const auto Zeros = [](int64_t count) { return Bytes(static_cast<size_t>(count)); };
 Bytes operator+(const Bytes& front, const Tag& tag)
 {
@@ -86,10 +83,10 @@ Bytes operator+(const Bytes& front, const Tag& tag)
 // A header at its bounds: taken by a search that stands on it, by one that scans for it, and on the way back.
 TEST(TagHeaders, ArePlausibleUpToTheirBounds)
 {
-    constexpr uint32_t ANY_CODEC = 0xFFFF;
+    constexpr uint32_t ANY_CODEC = 0xFFFF, NONE = 0, STANDING = 1, SCANNING = 2, BACKWARD = 4, ALL = 7;
     struct Row {
         const char* what;
-        bool described, scanned, stepped_back;
+        uint32_t taken; // by which searches
         Bytes data = {0x17, 1, 0, 0, 0};
         uint32_t timestamp = 5000;
         uint32_t last_ts = 0; // 0: not known
@@ -99,41 +96,32 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
     };
     const Bytes avc5 = {0x57, 1, 0, 0, 0}, avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
     const Row rows[] = {
-        {.what = "at the last time", .described = true, .scanned = false, .stepped_back = true, .last_ts = 5000},
-        {.what = "before it", .described = true, .scanned = true, .stepped_back = true, .last_ts = 5001},
-        {.what = "after it", .described = false, .scanned = false, .stepped_back = false, .last_ts = 4999},
-        {.what = "no time known",
-         .described = true,
-         .scanned = true,
-         .stepped_back = true,
-         .timestamp = UINT32_MAX - 1},
-        {.what = "the last of all", .described = true, .scanned = false, .stepped_back = true, .timestamp = UINT32_MAX},
-        {.what = "size of all data", .described = false, .scanned = false, .stepped_back = true, .data_end = 5},
-        {.what = "a byte less", .described = true, .scanned = true, .stepped_back = true, .data_end = 6},
-        {.what = "type 5", .described = true, .scanned = true, .stepped_back = true, .data = avc5, .video = 7},
-        {.what = "type 6", .described = false, .scanned = false, .stepped_back = false, .data = avc6, .video = 7},
-        {.what = "type 6, any", .described = true, .scanned = true, .stepped_back = true, .data = avc6},
-        {.what = "codec 15", .described = true, .scanned = true, .stepped_back = true, .data = last5, .video = 15},
-        {.what = "type 6 of 0",
-         .described = false,
-         .scanned = false,
-         .stepped_back = false,
-         .data = first6,
-         .video = 0},
-        {.what = "low bits", .described = true, .scanned = true, .stepped_back = true, .video = 0x37},
-        {.what = "codec", .described = false, .scanned = false, .stepped_back = false, .video = 6},
-        {.what = "sound", .described = true, .scanned = true, .stepped_back = true, .audio = 0x17, .type = 8},
-        {.what = "its rate", .described = false, .scanned = false, .stepped_back = false, .audio = 0x13, .type = 8},
-        {.what = "type 10", .described = false, .scanned = false, .stepped_back = false, .type = 10},
+        {.what = "at the last time", .taken = STANDING | BACKWARD, .last_ts = 5000},
+        {.what = "before it", .taken = ALL, .last_ts = 5001},
+        {.what = "after it", .taken = NONE, .last_ts = 4999},
+        {.what = "no time known", .taken = ALL, .timestamp = UINT32_MAX - 1},
+        {.what = "the last time of all", .taken = STANDING | BACKWARD, .timestamp = UINT32_MAX},
+        {.what = "size of all data", .taken = BACKWARD, .data_end = 5},
+        {.what = "one byte less", .taken = ALL, .data_end = 6},
+        {.what = "frame type 5", .taken = ALL, .data = avc5, .video = 7},
+        {.what = "frame type 6", .taken = NONE, .data = avc6, .video = 7},
+        {.what = "frame type 6, no filter", .taken = ALL, .data = avc6},
+        {.what = "frame type 5, codec 15", .taken = ALL, .data = last5, .video = 15},
+        {.what = "frame type 6, codec 0", .taken = NONE, .data = first6, .video = 0},
+        {.what = "filter of another frame type", .taken = ALL, .video = 0x37},
+        {.what = "filter of another codec", .taken = NONE, .video = 6},
+        {.what = "audio", .taken = ALL, .audio = 0x17, .type = 8},
+        {.what = "audio, filter of another rate", .taken = NONE, .audio = 0x13, .type = 8},
+        {.what = "tag type 10", .taken = NONE, .type = 10},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.what);
         Reader r(Zeros(FIRST_TAG) + Tag{row.type, row.timestamp, row.data});
         std::tie(r.ctx.last_ts, r.ctx.data_end) = std::tie(row.last_ts, row.data_end);
         std::tie(r.ctx.video_codec_filter, r.ctx.audio_format_filter) = std::tie(row.video, row.audio);
-        EXPECT_EQ(std::get<0>(r.at(FIRST_TAG).trust(ANY)), row.described ? 0 : ENDED);
-        EXPECT_EQ(r.at(FIRST_TAG).find(), row.scanned ? 0 : NOT_FOUND);
-        EXPECT_EQ(std::get<0>(r.at(r.end).prev(ANY)), row.stepped_back ? 0 : FLVD_ERR_AT_FIRST_TAG);
+        EXPECT_EQ(std::get<0>(r.at(FIRST_TAG).trust(ANY)), (row.taken & STANDING) != 0 ? 0 : ENDED);
+        EXPECT_EQ(r.at(FIRST_TAG).find(), (row.taken & SCANNING) != 0 ? 0 : NOT_FOUND);
+        EXPECT_EQ(std::get<0>(r.at(r.end).prev(ANY)), (row.taken & BACKWARD) != 0 ? 0 : FLVD_ERR_AT_FIRST_TAG);
     }
 }
 
@@ -152,7 +140,7 @@ TEST(TagHeaders, OfTheFirstScriptTagNeedNoBackPointer)
         {.what = "large", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG, .taken = true},
         {.what = "large, a byte after", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG + 1, .taken = false},
         {.what = "beyond the end", .tag = {18, 0, Noise(100), 7, 9000}, .at = FIRST_TAG, .taken = true},
-        {.what = "picture", .tag = {9, 0, AvcNalu(true, Noise(100)), 7}, .at = FIRST_TAG, .taken = false},
+        {.what = "video", .tag = {9, 0, AvcNalu(true, Noise(100)), 7}, .at = FIRST_TAG, .taken = false},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
@@ -163,30 +151,52 @@ TEST(TagHeaders, OfTheFirstScriptTagNeedNoBackPointer)
     }
 }
 
+// The kind reported depends on what is wanted, and on the direction.
 TEST(TagKinds, AreReportedInBothDirections)
 {
-    const Bytes script = Amf("1");
-    FlvBuilder builder;
-    builder.script(script).add(g_avc).add(g_aac).add(Picture()).video(1, AvcNalu(false, Noise(60))).add(Sound());
-    builder.video(2, Concat({{0x27, 0, 0, 0, 0}, Noise(70)})); // a sequence header in an inter frame
-    builder.video(3, Concat({{0x47, 1, 0, 0, 0}, Noise(80)})); // a generated keyframe
-    builder.video(4, VideoData(1, CODEC_H263, Noise(90))).video(5, VideoData(2, CODEC_H263, Noise(40)));
-    const Flv flv = builder.audio(6, AudioData(SOUND_MP3, Noise(50))).video(7, g_avc_end).script(script).build();
-    constexpr uint32_t s = SCRIPT, k = KEY, vc = VIDEO | CONFIG, kc = KEY | CONFIG, ac = AUDIO | CONFIG;
-    // The kinds reported when such tags are wanted, on the way forward and on the way backward.
-    using Kinds = std::vector<uint32_t>;
-    const std::tuple<uint32_t, Kinds, Kinds> cases[] = {
-        {ANY, {s, kc, ac, k, 1, 2, vc, k, kc, vc, ac, k, s, 0}, {s, 1, 2, 1, 1, 1, 1, 2, 1, 1, 2, 1, s, 0}},
-        {vc | ac, {vc, ac, vc, kc, vc, ac, 0}, {2, 1, 1, vc, ac, vc, 0}},
-        {kc | AUDIO, {k, ac, k, k, k, ac, k, 0}, {k, 2, k, k, k, ac, k, 0}}};
-    for (const auto& [wanted, forward, backward] : cases) {
+    constexpr uint32_t s = SCRIPT, v = VIDEO, a = AUDIO, k = KEY;
+    constexpr uint32_t vc = VIDEO | CONFIG, kc = KEY | CONFIG, ac = AUDIO | CONFIG;
+    struct Kinds {
+        uint32_t next = 0, previous = 0; // 0: such a tag is passed
+    };
+    struct Row {
+        const char* what;
+        Tag tag;
+        Kinds any = {}, config = {}, keyframe = {}; // when all tags, configurations, or keyframes are wanted
+    };
+    const Row rows[] = {
+        {.what = "script data", .tag = g_meta, .any = {s, s}},
+        {.what = "AVC configuration", .tag = g_avc, .any = {kc, v}, .config = {vc, vc}, .keyframe = {k, k}},
+        {.what = "AAC configuration", .tag = g_aac, .any = {ac, a}, .config = {ac, ac}, .keyframe = {ac, ac}},
+        {.what = "AVC keyframe", .tag = VideoTag(), .any = {k, v}, .keyframe = {k, k}},
+        {.what = "AVC inter frame", .tag = {9, 1, AvcNalu(false, Noise(60))}, .any = {v, v}},
+        {.what = "AAC frame", .tag = AudioTag(), .any = {a, a}},
+        {.what = "configuration as inter frame", .tag = {9, 2, {0x27, 0, 0}}, .any = {vc, v}, .config = {vc, vc}},
+        {.what = "generated keyframe", .tag = {9, 3, {0x47, 1, 0}}, .any = {k, v}, .keyframe = {k, k}},
+        {.what = "H.263 keyframe", .tag = {9, 4, {0x12, 5}}, .any = {kc, v}, .config = {kc, v}, .keyframe = {k, k}},
+        {.what = "H.263 inter frame", .tag = {9, 5, {0x22, 5}}, .any = {vc, v}, .config = {vc, v}},
+        {.what = "MP3", .tag = {8, 6, {SOUND_MP3, 5}}, .any = {ac, a}, .config = {ac, a}, .keyframe = {ac, a}},
+        {.what = "AVC end of sequence", .tag = {9, 7, g_avc_end}, .any = {k, v}, .keyframe = {k, k}},
+        {.what = "script data at the end", .tag = g_meta, .any = {s, s}},
+    };
+    Tags tags;
+    for (const Row& row : rows)
+        tags.push_back(row.tag);
+    const Flv flv = File(tags);
+    for (const auto& [wanted, column] :
+         {std::pair(ANY, &Row::any), {vc | ac, &Row::config}, {kc | AUDIO, &Row::keyframe}}) {
         Reader r(flv.bytes);
         r.at(DATA_OFFSET);
-        for (const uint32_t kind : forward)
-            EXPECT_EQ(std::get<2>(r.next(wanted)), kind);
+        const auto expect = [&](Step step, size_t i, uint32_t kind) {
+            EXPECT_TRUE(kind == 0 || (r.*step)(wanted) == Found(0, flv.tags[i].offset, kind)) << rows[i].what;
+        };
+        for (size_t i = 0; i < tags.size(); ++i)
+            expect(&Reader::next, i, (rows[i].*column).next);
+        EXPECT_EQ(r.next(wanted), Found(ENDED, 0, 0));
         r.at(r.end);
-        for (const uint32_t kind : backward)
-            EXPECT_EQ(std::get<2>(r.prev(wanted)), kind);
+        for (size_t i = tags.size(); i-- > 0;)
+            expect(&Reader::prev, i, (rows[i].*column).previous);
+        EXPECT_EQ(r.prev(wanted), Found(FLVD_ERR_AT_FIRST_TAG, 0, 0));
     }
 }
 
@@ -195,7 +205,7 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
     const auto find = [](int64_t distance, int64_t limit) {
         SCOPED_TRACE(testing::PrintToString(std::pair(distance, limit)));
         const bool covered = distance < (limit + WINDOW - 1) / WINDOW * WINDOW; // whole windows are looked at
-        Reader r(Zeros(100 + distance) + Sound(), CACHE, 16);
+        Reader r(Zeros(100 + distance) + AudioTag(), CACHE, 16);
         EXPECT_EQ(r.at(100).find(limit), covered ? distance : NOT_FOUND);
         EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), 16u);
         const auto reads = static_cast<int64_t>(r.host.calls(HostFn::Read));
@@ -204,49 +214,74 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
     for (const int64_t distance : {int64_t{0}, int64_t{1}, WINDOW - 1, WINDOW, SCANNED - 1, SCANNED})
         for (const int64_t limit : {int64_t{0}, int64_t{1}, WINDOW, WINDOW + 1, MIB})
             find(distance, limit);
-    EXPECT_EQ(Reader(Bytes() + Sound(), 12).at(0).find(), NOT_FOUND); // no header fits this cache
+    EXPECT_EQ(Reader(Bytes() + AudioTag(), 12).at(0).find(), NOT_FOUND); // no header fits this cache
 }
 
-// A sound tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
+// An audio tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
 const Tag BAD{8, 0, Bytes{0xAF, 1, 0xEE, 0xEE, 0xEE}, 0xEEEEEEEE};
 constexpr int64_t BAD_SIZE = 20, CHECKS = 16384; // of which one search makes so many
 const auto Bad = [](int64_t count) { return File(std::vector(static_cast<size_t>(count), BAD)).body(); };
 
+// From place 100 on, damage and then the wanted tag, which begins at `found`; else each search ends with a result.
 TEST(Resynchronisation, CoversOneMiBInAll)
 {
-    // Where each step finds the wanted picture from place 100 on, or what it returns.
-    const auto expect = [](const Bytes& damage, const std::array<int64_t, 3>& results) {
-        SCOPED_TRACE(damage.size());
-        Reader r(Concat({Zeros(100), damage}));
-        for (size_t i = 0; i < results.size(); ++i) {
-            const auto [rc, pos, kind] = (r.at(100).*FORWARD[i])(VIDEO);
-            EXPECT_EQ(rc + pos, results[i]) << i;
-        }
-    };
-    const auto all = [&expect](const Bytes& damage, int64_t result) { expect(damage, {result, result, result}); };
-    all(Zeros(MIB) + Picture(), 100 + MIB);
-    all(Zeros(MIB + 1) + Picture(), NOT_FOUND);
-    all(Zeros(MIB / 2), ENDED);
-    const int64_t far = MIB / 2 + 1000, second = 100 + far + 115 + far; // a sound tag restores the careful budget alone
-    expect(Concat({Zeros(far) + Sound(), Zeros(far) + Picture()}), {second, NOT_FOUND, second});
-    // A failed check costs no distance: with one every 64 bytes all of the MiB is crossed.
+    const Bytes half = Zeros(MIB / 2 + 1000), two_gaps = Concat({half + AudioTag(), half});
+    const Bytes failed = Concat({Bad(CHECKS), Zeros(30)});
+    // With a failed check every 64 bytes all of the MiB is crossed: such a check costs no distance.
     const Bytes sparse = Concat(std::vector<Bytes>(MIB / 64 - 1, Concat({Bad(1), Zeros(64 - BAD_SIZE)})));
-    all(sparse + Picture(), 100 + MIB - 64);
-    all(Bad(CHECKS - 1) + Picture(), 100 + (CHECKS - 1) * BAD_SIZE);
-    expect(Bad(CHECKS) + Picture(), {NOT_FOUND, 100 + CHECKS * BAD_SIZE, NOT_FOUND});
     // Nor does one after which the scan finds nothing: the whole MiB is left.
     const Bytes gap = Concat({Bad(1), Zeros(1 + SCANNED - BAD_SIZE + MIB)});
-    expect(gap + Picture(), {101 + SCANNED + MIB, NOT_FOUND, 101 + SCANNED + MIB});
-    all(Concat({gap, {0}}) + Picture(), NOT_FOUND);
+    const struct {
+        const char* what;
+        Bytes damage;
+        int32_t careful = 0, trusting = 0; // 0: the tag is found
+        bool tag = true;                   // follows the damage
+    } rows[] = {
+        {.what = "one MiB", .damage = Zeros(MIB)},
+        {.what = "one byte more", .damage = Zeros(MIB + 1), .careful = NOT_FOUND, .trusting = NOT_FOUND},
+        {.what = "data ends", .damage = Zeros(MIB / 2), .careful = ENDED, .trusting = ENDED, .tag = false},
+        {.what = "a valid tag restores the budget of a careful search", .damage = two_gaps, .trusting = NOT_FOUND},
+        {.what = "failed checks all over it", .damage = sparse},
+        {.what = "all checks but one fail", .damage = Bad(CHECKS - 1)},
+        {.what = "all checks fail", .damage = Bad(CHECKS), .careful = NOT_FOUND},
+        {.what = "then data end", .damage = failed, .careful = NOT_FOUND, .trusting = ENDED, .tag = false},
+        {.what = "one MiB after a failed scan", .damage = gap, .trusting = NOT_FOUND},
+        {.what = "one byte more after it", .damage = Concat({gap, {0}}), .careful = NOT_FOUND, .trusting = NOT_FOUND},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        const Bytes before = Concat({Zeros(100), row.damage});
+        Reader r(row.tag ? before + VideoTag() : before);
+        const auto expect = [&](const Step step, int32_t rc) {
+            const auto [result, place, kind] = (r.at(100).*step)(VIDEO);
+            EXPECT_EQ(result, rc);
+            EXPECT_EQ(place, rc == 0 ? static_cast<int64_t>(before.size()) : 0);
+        };
+        expect(&Reader::verify, row.careful);
+        expect(&Reader::next, row.careful);
+        expect(&Reader::trust, row.trusting);
+    }
+}
+
+// The limit counts when the data ends with it: of the last 12 bytes none can begin a header.
+TEST(Resynchronisation, TellsTheLimitFromTheEndOfTheData)
+{
+    for (const auto& [size, rc] : {std::pair(MIB + 12, ENDED), {MIB + 13, NOT_FOUND}}) {
+        Reader r(Zeros(FIRST_TAG + size));
+        EXPECT_EQ(r.at(FIRST_TAG).verify(ANY), Found(rc, 0, 0)) << size;
+        EXPECT_EQ(r.at(FIRST_TAG).trust(ANY), Found(rc, 0, 0)) << size;
+    }
 }
 
 TEST(Resynchronisation, CountsFailedChecksAnewInEachSearch)
 {
-    Reader r(Concat({Zeros(100), Bad(2 * CHECKS - 1)}) + Picture());
+    const Bytes before = Concat({Zeros(100), Bad(2 * CHECKS - 1)});
+    Reader r(before + VideoTag());
     for (const Step step : {&Reader::verify, &Reader::next}) {
         EXPECT_EQ((r.at(100).*step)(VIDEO), Found(NOT_FOUND, 0, 0));
-        const auto [rc, pos, kind] = (r.*step)(VIDEO); // on from there
-        EXPECT_EQ(rc + pos, 100 + (2 * CHECKS - 1) * BAD_SIZE);
+        const auto [rc, place, kind] = (r.*step)(VIDEO); // goes on from there
+        EXPECT_EQ(rc, 0);
+        EXPECT_EQ(place, static_cast<int64_t>(before.size()));
     }
 }
 
@@ -271,28 +306,29 @@ TEST(Resynchronisation, ForgetsAnEndOfDataThatWasNone)
 
 TEST(Position, ThatDoesNotAdvanceEndsASearch)
 {
-    // A picture of 65 bytes and 15 more, audio of 115 bytes in all, a picture; the first starts at FIRST_TAG.
-    const Bytes bytes = Zeros(FIRST_TAG) + Picture(65) + Sound() + Picture();
+    // Video of 65 bytes and 15 more, audio of 115 bytes in all, video; the first tag starts at FIRST_TAG.
+    const Bytes bytes = Zeros(FIRST_TAG) + VideoTag(65) + AudioTag() + VideoTag();
     const int64_t audio = FIRST_TAG + 80, last = audio + 115;
     const Step describe = &Reader::verify, next = &Reader::next, prev = &Reader::prev;
     const Found none(NOT_FOUND, 0, 0);
     const struct {
+        const char* what;
         Step step;
         int64_t from;
         uint64_t nth; // position query
         int64_t error;
         Found found;
     } rows[] = {
-        {.step = describe, .from = audio, .nth = 2, .error = -1, .found = none},   // the tag starts before the search
-        {.step = describe, .from = audio, .nth = 3, .error = -115, .found = none}, // after the tag: where it starts
-        {.step = describe, .from = audio, .nth = 3, .error = -114, .found = {0, last, 0}}, // a byte on
-        {.step = next, .from = audio, .nth = 3, .error = -115, .found = none},
-        {.step = next, .from = audio, .nth = 3, .error = -114, .found = {0, last, KEY}},
-        {.step = prev, .from = last, .nth = 2, .error = 115, .found = none}, // before the tag: where it ends
-        {.step = prev, .from = last, .nth = 2, .error = 114, .found = {0, FIRST_TAG, VIDEO}}, // a byte back
+        {.what = "before the search", .step = describe, .from = audio, .nth = 2, .error = -1, .found = none},
+        {.what = "after a tag: its start", .step = describe, .from = audio, .nth = 3, .error = -115, .found = none},
+        {.what = "a byte on", .step = describe, .from = audio, .nth = 3, .error = -114, .found = {0, last, 0}},
+        {.what = "its start, stepping", .step = next, .from = audio, .nth = 3, .error = -115, .found = none},
+        {.what = "a byte on, stepping", .step = next, .from = audio, .nth = 3, .error = -114, .found = {0, last, KEY}},
+        {.what = "before a tag: its end", .step = prev, .from = last, .nth = 2, .error = 115, .found = none},
+        {.what = "a byte back", .step = prev, .from = last, .nth = 2, .error = 114, .found = {0, FIRST_TAG, VIDEO}},
     };
     for (const auto& row : rows) {
-        SCOPED_TRACE(&row - rows);
+        SCOPED_TRACE(row.what);
         Reader r(bytes);
         r.at(row.from);
         std::tie(r.host.nth, r.host.error) = std::tie(row.nth, row.error);
@@ -302,37 +338,50 @@ TEST(Position, ThatDoesNotAdvanceEndsASearch)
 
 TEST(PrevTag, SlidesBackOneMiBInAll)
 {
-    Reader r(Zeros(FIRST_TAG) + Sound() + Picture() + Sound());
+    Reader r(Zeros(FIRST_TAG) + AudioTag() + VideoTag() + AudioTag());
     r.at(r.end).host.fail_nth(HostFn::Tell, 2);
     EXPECT_EQ(r.prev(VIDEO), Found(NOT_FOUND, 0, 0));
-    Reader twice(Concat({Zeros(FIRST_TAG) + Sound(), Zeros(MIB - 1) + Picture(), {0}}), CACHE, 16);
-    EXPECT_EQ(twice.at(twice.end).prev(AUDIO), Found(0, FIRST_TAG, AUDIO)); // the picture restores the budget
+    Reader twice(Concat({Zeros(FIRST_TAG) + AudioTag(), Zeros(MIB - 1) + VideoTag(), {0}}), CACHE, 16);
+    EXPECT_EQ(twice.at(twice.end).prev(AUDIO), Found(0, FIRST_TAG, AUDIO)); // the valid tag restores the budget
     Reader just(Zeros(DATA_OFFSET + MIB + 4), CACHE, 16);
     EXPECT_EQ(just.at(just.end).prev(ANY), Found(FLVD_ERR_AT_FIRST_TAG, 0, 0));
-    Reader spent(Concat({Zeros(FIRST_TAG) + Sound(), Zeros(MIB)}), CACHE, 16);
+    Reader spent(Concat({Zeros(FIRST_TAG) + AudioTag(), Zeros(MIB)}), CACHE, 16);
     EXPECT_EQ(spent.at(spent.end).prev(ANY), Found(NOT_FOUND, 0, 0));
 }
 
 TEST(HostCalls, OfTheBackPointerCheck)
 {
-    const auto check = [](size_t size, uint32_t quantum, const std::string& log, uint32_t most = CACHE) {
-        Reader r(Zeros(FIRST_TAG) + Sound(size) + Picture(), CACHE, quantum);
-        r.at(FIRST_TAG).host.limit_reads(most);
+    const std::string begin = "tell64()=13 eof()=0 read(",
+                      cache = begin + "4096)=", whole = cache + "4096 tell64()=4109";
+    const std::string back = " seek64(13,0)=0"; // to the tag
+    const std::string cut = cache + "50 tell64()=63 read(4046)=50 read(3996)=50" + back;
+    const std::string narrow = begin + "16)=16 tell64()=29 seek64(95,1)=0 read(16)=16" + back;
+    const std::string narrower = begin + "13)=13 tell64()=26 seek64(98,1)=0 read(5)=5" + back;
+    const struct {
+        const char* what;
+        size_t size;
+        std::string log;                    // begins so; no seek follows
+        uint32_t quantum = 0, most = CACHE; // of each read
+    } rows[] = {
+        {.what = "cached", .size = 100, .log = cache + "230 tell64()=243"},
+        {.what = "as large as the cache", .size = 4081, .log = whole},
+        {.what = "one byte larger", .size = 4082, .log = whole + " read(1)=1" + back},
+        {.what = "larger", .size = 5000, .log = whole + " seek64(915,1)=0 read(4)=4" + back},
+        {.what = "in short reads", .size = 100, .log = cut, .most = 50},
+        {.what = "narrow reads", .size = 100, .log = narrow, .quantum = 16},
+        {.what = "narrower than a header", .size = 100, .log = narrower, .quantum = 5},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.what);
+        Reader r(Zeros(FIRST_TAG) + AudioTag(row.size) + VideoTag(), CACHE, row.quantum);
+        r.at(FIRST_TAG).host.limit_reads(row.most);
         r.host.start_log();
         EXPECT_EQ(FLVD_GetCurrTagInfo(&r.ctx, r.file, &r.info, AUDIO, 1), 0);
         const std::string calls = r.host.take_log();
-        EXPECT_EQ(calls.substr(0, log.size()), log);
-        EXPECT_EQ(calls.find("seek", log.size()), std::string::npos);
-        EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), quantum != 0 ? quantum : CACHE);
-    };
-    const std::string whole = "tell64()=13 eof()=0 read(4096)=4096 tell64()=4109";
-    check(100, 0, "tell64()=13 eof()=0 read(4096)=230 tell64()=243");
-    check(4081, 0, whole);
-    check(4082, 0, whole + " read(1)=1 seek64(13,0)=0");
-    check(5000, 0, whole + " seek64(915,1)=0 read(4)=4 seek64(13,0)=0");
-    check(100, 0, "tell64()=13 eof()=0 read(4096)=50 tell64()=63 read(4046)=50 read(3996)=50 seek64(13,0)=0", 50);
-    check(100, 16, "tell64()=13 eof()=0 read(16)=16 tell64()=29 seek64(95,1)=0 read(16)=16 seek64(13,0)=0");
-    check(100, 5, "tell64()=13 eof()=0 read(13)=13 tell64()=26 seek64(98,1)=0 read(5)=5 seek64(13,0)=0");
+        EXPECT_EQ(calls.substr(0, row.log.size()), row.log);
+        EXPECT_EQ(calls.find("seek", row.log.size()), std::string::npos);
+        EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), row.quantum != 0 ? row.quantum : CACHE);
+    }
 }
 
 TEST(HostCalls, ASeekBackToATagIsTriedOnce)
@@ -345,42 +394,55 @@ TEST(HostCalls, ASeekBackToATagIsTriedOnce)
     } rows[] = {{.what = "describing", .step = &Reader::verify, .from = FIRST_TAG, .seek = 2},
                 {.what = "stepping", .step = &Reader::next, .from = DATA_OFFSET, .seek = 3}};
     for (const auto& row : rows) {
-        Reader r(Zeros(FIRST_TAG) + Sound(5000) + Picture());
+        Reader r(Zeros(FIRST_TAG) + AudioTag(5000) + VideoTag());
         r.at(row.from).host.fail_nth(HostFn::Seek, row.seek);
         EXPECT_EQ((r.*row.step)(AUDIO), Found(NOT_FOUND, 0, 0)) << row.what;
         EXPECT_EQ(r.host.calls(HostFn::Seek), row.seek) << row.what;
     }
 }
 
-// What opening finds out: end of the valid data, last timestamp, seek method, index entries, time of the last keyframe.
-using Extent = std::tuple<int64_t, uint32_t, uint32_t, uint32_t, uint32_t>;
-Extent Probe(const Bytes& file, const OpenOptions& open = {})
+// What opening finds out.
+struct Extent {
+    int64_t end; // of the valid data
+    uint32_t last_ts;
+    uint32_t method = FLVD_SEEK_BY_SCAN;
+    uint32_t entries = 0, last_key_ms = 0; // of the keyframe index
+};
+void ExpectExtent(const char* what, const Bytes& file, const OpenOptions& open, const Extent& expected)
 {
+    SCOPED_TRACE(what);
     FakeHost host(file);
     Session session(host, open);
-    EXPECT_TRUE(session.opened());
-    const flvd_ctx_t ctx = session.opened() ? *session.ctx() : flvd_ctx_t{};
-    EXPECT_EQ(ctx.last_keyframe_ms, ctx.video_info.last_key_time_ms);
-    return {ctx.data_end, ctx.last_ts, ctx.seek_method, ctx.keyframe_index.entry_count, ctx.last_keyframe_ms};
+    ASSERT_TRUE(session.opened());
+    const flvd_ctx_t& ctx = *session.ctx();
+    EXPECT_EQ(ctx.data_end, expected.end);
+    EXPECT_EQ(ctx.last_ts, expected.last_ts);
+    EXPECT_EQ(ctx.seek_method, expected.method);
+    EXPECT_EQ(ctx.keyframe_index.entry_count, expected.entries);
+    EXPECT_EQ(ctx.last_keyframe_ms, expected.last_key_ms);
+    EXPECT_EQ(ctx.video_info.last_key_time_ms, expected.last_key_ms);
 }
-const OpenOptions QUICK{0, true};
 
-// Pictures every 40 ms, each second one a keyframe, sound up to 782 ms.
+// Video every 40 ms, each second frame a keyframe, audio up to 782 ms.
 const ChainOptions CHAIN = {true, true, false, false, 20, 2};
 const auto Indexed = [](const IndexHook& hook) { return MakeChain({true, true, true, true, 20, 2, 0, hook}); };
 
 TEST(Extent, EndsWithTheLastTag)
 {
+    const OpenOptions QUICK{0, true};
     const Flv flv = MakeChain(CHAIN);
-    const auto behind = [&flv](const Bytes& more) { return Concat({flv.bytes, more}); };
-    for (const Bytes& more : {Bytes(), Bytes(100, 0xEE), Bad(3 * MIB / BAD_SIZE)})
-        EXPECT_EQ(Probe(behind(more)), Extent(flv.size(), 782, FLVD_SEEK_BY_SCAN, 0, 0));
-    EXPECT_EQ(Probe(behind(Bytes(15, 0xEE)), QUICK), Extent(flv.size(), 782, FLVD_SEEK_NONE, 0, 0));
-    EXPECT_EQ(Probe(behind(Bytes(16, 0xEE)), QUICK), Extent(flv.size() + 16, 0, FLVD_SEEK_NONE, 0, 0));
-    const Bytes half = File(std::vector(20, Sound(100000)), 4).bytes + Sound();
-    EXPECT_EQ(Probe(Concat({half, Zeros(3 * MIB)})), Extent(half.size(), 5, FLVD_SEEK_BY_SCAN, 0, 0));
+    const auto with = [&flv](const Bytes& more) { return Concat({flv.bytes, more}); };
+    const Bytes half = File(std::vector(20, AudioTag(100000)), 4).bytes + AudioTag();
+    const int64_t end = flv.size(), half_end = static_cast<int64_t>(half.size());
+    ExpectExtent("nothing after the tags", flv.bytes, {}, {.end = end, .last_ts = 782});
+    ExpectExtent("100 bytes after them", with(Bytes(100, 0xEE)), {}, {.end = end, .last_ts = 782});
+    ExpectExtent("3 MiB of bad tags", with(Bad(3 * MIB / BAD_SIZE)), {}, {.end = end, .last_ts = 782});
+    ExpectExtent("zeros in the second half", Concat({half, Zeros(3 * MIB)}), {}, {.end = half_end, .last_ts = 5});
+    // Opened for information.
+    ExpectExtent("15 bytes", with(Bytes(15, 0xEE)), QUICK, {.end = end, .last_ts = 782, .method = FLVD_SEEK_NONE});
+    ExpectExtent("16 bytes", with(Bytes(16, 0xEE)), QUICK, {.end = end + 16, .last_ts = 0, .method = FLVD_SEEK_NONE});
     for (uint64_t nth = 255; nth < 275; ++nth) { // a seek of the tail, of the halving or of the last places
-        FakeHost host(behind(Zeros(3 * MIB)));
+        FakeHost host(with(Zeros(3 * MIB)));
         host.fail_nth(HostFn::Seek, nth);
         Session session(host);
         EXPECT_TRUE(session.failed_as_listed(Op::Open, session.open_rc())) << nth;
@@ -389,38 +451,42 @@ TEST(Extent, EndsWithTheLastTag)
 
 TEST(Extent, TakesTheLargestTimeOfTheLastTags)
 {
-    const auto last = [](std::vector<Tag> tags, uint32_t sounds) {
-        for (uint32_t i = 0; i < sounds; ++i)
+    const auto expect = [](const char* what, Tags tags, uint32_t audio, uint32_t last_ts) {
+        for (uint32_t i = 0; i < audio; ++i)
             tags.push_back(Pcm(900 - i));
-        return std::get<1>(Probe(File(tags).bytes));
+        const Flv flv = File(tags);
+        ExpectExtent(what, flv.bytes, {}, {.end = flv.size(), .last_ts = last_ts});
     };
-    const Tag picture{9, 1700, VideoData(2, CODEC_SCREEN, Noise(50))};
-    EXPECT_EQ(last({Screen(0), Screen(700)}, 1), 900u);
-    EXPECT_EQ(last({Screen(0), picture}, 9), 1700u);
-    EXPECT_EQ(last({Screen(0), picture}, 10), 900u); // the eleventh from the end
-    EXPECT_EQ(last({}, 2), 899u);                    // sound alone: the last tag decides
+    const Tag inter{9, 1700, VideoData(2, CODEC_SCREEN, Noise(50))};
+    expect("audio is later", {Screen(0), Screen(700)}, 1, 900);
+    expect("video is later, the tenth tag from the end", {Screen(0), inter}, 9, 1700);
+    expect("the eleventh", {Screen(0), inter}, 10, 900);
+    expect("audio alone: the last tag decides", {}, 2, 899);
 }
 
 TEST(Extent, TrimsAKeyframeIndexToTheData)
 {
     const Flv flv = Indexed({});
-    const auto cut = [&flv](size_t tag) { // 20 bytes into it
+    const auto cut = [&flv](size_t tag) {
         return Bytes(flv.bytes.data(), flv.bytes.data() + flv.tags[tag].offset + 20);
     };
-    const Bytes cut_key = cut(31), cut_picture = cut(34);
-    const Bytes last = Indexed([](auto&, auto& at) { at.back() = -5; }).bytes; // no matter: all entries are inside
+    const Bytes negative = Indexed([](auto&, auto& at) { at.back() = -5; }).bytes; // no matter: all entries are inside
     const Bytes astray =
         Indexed([&](auto&, auto& at) { at[3] = static_cast<double>(flv.size()) + 24, at[4] = 1e12; }).bytes;
-    // Neither the last position inside the file nor the bytes behind its tags lead to a tag.
+    // Neither the last position inside the file nor the bytes after its tags lead to a tag.
     const Bytes no_step = Concat({astray, Bytes(20, 0xEE), {0, 0, 0, 7, 0xEE}});
-    for (const uint32_t options : {INDEX, 0u}) {
-        const auto extent = [options](const Bytes& file) { return Probe(file, {options}); };
-        for (const Bytes& whole : {flv.bytes, last})
-            EXPECT_EQ(extent(whole), Extent(flv.size(), 782, FLVD_SEEK_BY_INDEX, 10, 720));
-        // One entry behind the end stays.
-        EXPECT_EQ(extent(cut_picture), Extent(cut_picture.size() - 20, 437, FLVD_SEEK_BY_INDEX, 7, 480));
-        EXPECT_EQ(extent(cut_key), Extent(cut_key.size() - 20, 391, FLVD_SEEK_BY_INDEX, 6, 400));
-        EXPECT_EQ(extent(no_step), Extent(flv.size(), 782, FLVD_SEEK_BY_INDEX, 4, 240));
+    for (const OpenOptions& open : {OpenOptions{INDEX}, OpenOptions{}}) {
+        SCOPED_TRACE(open.options);
+        const auto expect = [&](const char* what, const Bytes& file, int64_t end, uint32_t last_ts, uint32_t entries,
+                                uint32_t last_key) {
+            ExpectExtent(what, file, open, {end, last_ts, FLVD_SEEK_BY_INDEX, entries, last_key});
+        };
+        expect("whole", flv.bytes, flv.size(), 782, 10, 720);
+        expect("the last entry before the file", negative, flv.size(), 782, 10, 720);
+        // One entry past the end stays.
+        expect("cut in a frame", cut(34), flv.tags[34].offset, 437, 7, 480);
+        expect("cut in a keyframe", cut(31), flv.tags[31].offset, 391, 6, 400);
+        expect("entries astray", no_step, flv.size(), 782, 4, 240);
     }
 }
 

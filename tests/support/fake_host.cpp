@@ -125,10 +125,10 @@ FakeHost::Handle& FakeHost::handle(void* pointer)
 void FakeHost::check_range(const char* what, const void* pointer, uint32_t count)
 {
     const auto* const begin = static_cast<const uint8_t*>(pointer);
-    const auto behind = m_blocks.upper_bound(begin);
-    if (behind == m_blocks.begin())
+    const auto after = m_blocks.upper_bound(begin);
+    if (after == m_blocks.begin())
         return;
-    const auto& [block, size] = *std::prev(behind);
+    const auto& [block, size] = *std::prev(after);
     const auto offset = static_cast<size_t>(begin - block);
     if (offset < size && count > size - offset)
         violation(std::string(what) + " " + std::to_string(count) + " bytes at " + std::to_string(offset) + " of " +

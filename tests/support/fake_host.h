@@ -74,7 +74,7 @@ public:
     flvd_init_t init(uint32_t options = 0, uint32_t cache_size = 0, uint32_t scan_read_size = 0,
                      const char* path = DEFAULT_FILE) const;
     fio_funcs_t funcs() const;
-    /** Leaves out the 64-bit functions; the 32-bit ones then fail behind 2 GiB. Set before init() or funcs(). */
+    /** Leaves out the 64-bit functions; the 32-bit ones then fail beyond 2 GiB. Set before init() or funcs(). */
     void use_32_bit_only() { m_only_32 = true; }
 
     /** The library's file layer gets this host's functions and opens the file, for the caller to close. */

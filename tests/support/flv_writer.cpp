@@ -259,12 +259,12 @@ Flv MakeChain(const ChainOptions& options)
         builder.video(options.first_ts, AvcConfig(SmallAvcRecord()));
     if (options.audio)
         builder.audio(options.first_ts, AacConfig({0x12, 0x10}));
-    for (uint32_t picture = 0, sounds = 0; picture < options.pictures; ++picture) {
+    for (uint32_t picture = 0, audio = 0; picture < options.pictures; ++picture) {
         const Bytes data = AvcNalu(picture % options.gop == 0, Noise(300 + picture * 37 % 101, picture));
         if (options.video)
             builder.video(options.first_ts + picture * 40, data);
-        for (; options.audio && sounds * 23 < (picture + 1) * 40; ++sounds)
-            builder.audio(options.first_ts + sounds * 23, AacRaw(Noise(80 + sounds * 13 % 29, 1000 + sounds)));
+        for (; options.audio && audio * 23 < (picture + 1) * 40; ++audio)
+            builder.audio(options.first_ts + audio * 23, AacRaw(Noise(80 + audio * 13 % 29, 1000 + audio)));
     }
     return builder.build();
 }

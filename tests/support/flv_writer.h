@@ -41,7 +41,7 @@ Bytes Bits(const std::string& words);
 
 /**
  * AMF0 values from words: numbers, nan among them; 'text; "long string; { key: value ... } object; < key: value ... >
- * ECMA array; [3 and the three elements; %byte.byte... as they are; ! a long string that fails right behind its length.
+ * ECMA array; [3 and the three elements; %byte.byte... as they are; ! a long string that fails right after its length.
  * c^n is the character n times. Nothing need match.
  */
 Bytes Amf(const std::string& words);
@@ -77,7 +77,7 @@ inline Bytes AacRaw(const Bytes& payload, uint8_t header = 0xAF)
     return Concat({{header, 1}, payload});
 }
 
-/* Codec payloads, behind the codec header bytes. */
+/* Codec payloads, after the codec header bytes. */
 
 /** AVCDecoderConfigurationRecord with the given parameter sets. */
 Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
@@ -111,14 +111,14 @@ struct Tag {
     uint8_t type = 0;
     uint32_t timestamp = 0;
     Bytes data;
-    std::optional<uint32_t> back_pointer = {}; /**< PreviousTagSize behind it; default: data size + 11 */
+    std::optional<uint32_t> back_pointer = {}; /**< PreviousTagSize after it; default: data size + 11 */
     std::optional<uint32_t> data_size = {};    /**< DataSize in the header; default: that of the data */
     uint32_t stream_id = 0;
     int64_t offset = 0; /**< of the tag header; filled by build() */
 
     int64_t size() const { return static_cast<int64_t>(data.size()) + 15; } /**< header, data and back-pointer */
     int64_t end() const { return offset + size(); }
-    /** Codec header bytes in front of the frame: 5, 2 or 1. */
+    /** Codec header bytes before the frame: 5, 2 or 1. */
     size_t codec_bytes() const;
     /** It carries a frame: no script data, no configuration packet, not too short. */
     bool is_frame() const;
@@ -127,7 +127,14 @@ struct Tag {
     uint32_t stream() const { return type == 9 ? 1u : 2u; }
 };
 
-/* Tags of noise, and the configurations in front of them. The makers are objects: a test hands them on as they are. */
+using Tags = std::vector<Tag>;
+inline Tags operator+(Tags first, const Tags& more)
+{
+    first.insert(first.end(), more.begin(), more.end());
+    return first;
+}
+
+/* Tags of noise, and the configurations before them. The makers are objects: a test hands them on as they are. */
 
 inline const auto Screen = [](uint32_t ts, size_t size = 60) {
     return Tag{9, ts, VideoData(1, CODEC_SCREEN, Noise(size))};
@@ -146,7 +153,7 @@ struct Flv {
     std::vector<Tag> tags; /**< in file order, with their offsets */
 
     int64_t size() const { return static_cast<int64_t>(bytes.size()); }
-    /** The tags without the file header, in front of which nothing stands. */
+    /** The tags without the file header, before which nothing stands. */
     Bytes body() const { return {bytes.begin() + 13, bytes.end()}; }
 
     /** Smallest timestamp among the frames: what the library takes as first_ts when all frames count. */
@@ -162,7 +169,7 @@ using IndexHook = std::function<void(std::vector<double>& times, std::vector<dou
 /** Collects tags and builds the file. All adders return the builder. */
 class FlvBuilder {
 public:
-    /** flags: of the file header (1 video, 4 audio); data_offset: as written; prefix: in front of the file header. */
+    /** flags: of the file header (1 video, 4 audio); data_offset: as written; prefix: before the file header. */
     explicit FlvBuilder(uint8_t flags = 5, uint32_t data_offset = 9, Bytes prefix = {}, std::vector<Tag> tags = {})
         : m_flags(flags), m_data_offset(data_offset), m_prefix(std::move(prefix)), m_tags(std::move(tags))
     {
@@ -178,7 +185,7 @@ public:
     FlvBuilder& script(Bytes data, uint32_t timestamp = 0) { return add({18, timestamp, std::move(data)}); }
     /** onMetaData without keyframe index. */
     FlvBuilder& metadata(const std::string& properties) { return script(OnMetaData(properties)); }
-    /** onMetaData with "keyframes" behind the given properties: every keyframe of the file, at its real place. */
+    /** onMetaData with "keyframes" after the given properties: every keyframe of the file, at its real place. */
     FlvBuilder& indexed_metadata(const std::string& properties, IndexHook hook = {});
 
     Flv build() const;
@@ -198,12 +205,12 @@ private:
     } m_index;
 };
 
-/** A file of these tags; DataOffset leaves room for a file header of `header` bytes behind the prefix. */
+/** A file of these tags; DataOffset leaves room for a file header of `header` bytes after the prefix. */
 Flv File(const std::vector<Tag>& tags, uint8_t flags = 5, const Bytes& prefix = {}, uint32_t header = 9);
 
 /**
- * An ordinary file: AVC and AAC, one keyframe every `gop` pictures, pictures and sound interleaved by time. Pictures
- * have 300 to 400 bytes, sound frames, one every 23 ms, about 90.
+ * An ordinary file: AVC and AAC, one keyframe every `gop` frames, both interleaved by time. Video
+ * frames have 300 to 400 bytes, audio frames, one every 23 ms, about 90.
  */
 struct ChainOptions {
     bool video = true;

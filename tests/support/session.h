@@ -3,6 +3,8 @@
 
 #include "fake_host.h"
 
+#include <optional>
+
 namespace flvd_test {
 
 constexpr uint32_t SEPARATE = FLVD_OPT_SEPARATE_AUDIO_READER, USER = FLVD_OPT_USER_BUFFER;
@@ -20,17 +22,40 @@ inline std::vector<uint32_t> Streams(uint32_t options)
     return (options & SEPARATE) != 0 ? std::vector{VIDEO, AUDIO} : std::vector{BOTH};
 }
 
-/** What may fail: opening, a frame, a time seek, a frame seek; and what opening or a frame records besides. */
-enum class Op { Open, Frame, Seek, FrameSeek, Inside };
+/**
+ * What fails at a place: a call without an instance, an open, a frame request, a time seek, a frame seek. Besides these
+ * an open records why a tag does not describe its stream and why it finds no end, a request why it delivers no tag.
+ */
+enum class Op { Call, Open, Codec, Extent, Tag, Frame, Seek, FrameSeek };
 
-/** A place of failure. */
-struct Place {
-    Op op;
-    int32_t rc, code, line; /**< result, error code and line; rc is 0 for what is recorded besides */
-    std::string by;         /**< of alloc, open, read, seek, tell the initials of those whose failure leads there */
+/** The places of failure, named as in the library's table of them. */
+enum class Site : uint8_t {
+#define FLVD_SITE(operation, name, code, line, growing_line) name,
+#include "flvdmx/common/sites.def"
+#undef FLVD_SITE
 };
-/** All of them. */
+struct Place {
+    Site site;
+    Op op;
+    int32_t code, line, growing_line; /**< error code; lines, growing_line 0 when it is the same in a growing file */
+
+    bool records(int32_t error, int32_t error_line) const
+    {
+        return code == error && error_line != 0 && (line == error_line || growing_line == error_line);
+    }
+    int32_t line_of(uint32_t options) const
+    {
+        return (options & GROWING) != 0 && growing_line != 0 ? growing_line : line;
+    }
+    /** What an operation returns that fails here. */
+    int32_t result() const;
+};
+/** All places, in the order of their sites. */
 const std::vector<Place>& Places();
+inline const Place& At(Site site)
+{
+    return Places().at(static_cast<size_t>(site));
+}
 bool IsListed(Op op, int32_t rc, int32_t code, int32_t line);
 
 struct OpenOptions {
@@ -67,6 +92,11 @@ public:
     int32_t last_error() { return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr); }
     /** Line of the last failure: the instance's, or the global one after a failed open. */
     int32_t error_line() const { return m_ctx != nullptr ? m_ctx->error_line : g_flvd_lErrorLine; }
+    /** The last failure is that of a place, or there is none. */
+    bool recorded(std::optional<Site> site)
+    {
+        return last_error() == (site ? At(*site).code : 0) && error_line() == (site ? At(*site).line_of(m_options) : 0);
+    }
     /** The last failure is one that such an operation may have. */
     bool failed_as_listed(Op op, int32_t rc) { return IsListed(op, rc, last_error(), error_line()); }
     /** Also done at the end. */
@@ -76,6 +106,7 @@ private:
     flvd_ctx_t* m_ctx = nullptr;
     flvd_open_info_t m_info{};
     Bytes m_user_buffer;
+    const uint32_t m_options;
     int32_t m_open_rc = 0;
 };
 
