@@ -72,10 +72,10 @@ Bytes Repeat(const Bytes& pattern, size_t size)
 WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost pass)
 {
     const auto audio = [](uint32_t first_ts) {
-        FlvBuilder builder(4);
+        Tags tags;
         for (uint32_t i = 0; i < 20; ++i)
-            builder.audio(first_ts + 40 * i, AudioData(8, Noise(200)));
-        return builder.build();
+            tags.push_back({8, first_ts + 40 * i, AudioData(8, Noise(200))});
+        return File(tags, 4);
     };
     const Bytes file = Concat({audio(0).bytes, Repeat({8}, 600000), audio(0x10000000).body()});
     return {name, file, options, cache, 2 * pass, pass, 2 * pass};
@@ -101,15 +101,14 @@ WorkCase Slide(const char* name, size_t size, uint64_t quantum, size_t times = 1
 WorkCase ManyTags(const char* name, bool video, size_t size, bool index, Cost tag, uint32_t options = 0)
 {
     constexpr uint64_t count = 500;
-    FlvBuilder builder;
-    if (index)
-        builder.indexed_metadata("", [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; });
+    const auto beyond = [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; };
+    Tags tags;
     for (uint32_t i = 0; i < count; ++i) {
         if (video)
-            builder.add(Screen(2 * i, 20));
-        builder.add(Pcm(2 * i, size));
+            tags.push_back(Screen(2 * i, 20));
+        tags.push_back(Pcm(2 * i, size));
     }
-    const Bytes file = builder.build().bytes;
+    const Bytes file = (index ? IndexedFile(tags, beyond) : File(tags)).bytes;
     const Cost pass = Forward(file.size()) + count * (TAG + tag);
     return {name, file, options, CACHE, 2 * pass, pass, Forward(file.size()) + 2 * count * WALKED_TAG};
 }
@@ -121,7 +120,7 @@ WorkCase ManyTags(const char* name, bool video, size_t size, bool index, Cost ta
 WorkCase Metadata(const char* name, const Bytes& head, const Bytes& pattern, uint32_t options = 0)
 {
     const Bytes payload = Concat({Amf("'onMetaData"), head, Repeat(pattern, MIB)});
-    const Bytes file = Concat({FlvBuilder().script(payload).build().bytes, MakeChain().body()});
+    const Bytes file = Concat({File({{18, 0, payload}}).bytes, MakeChain().body()});
     const Cost pass = Forward(file.size()), script = Forward(2 * payload.size()) + Cost{payload.size() / 8, 0};
     return {name, file, options, CACHE, script + 4 * pass, pass, 3 * pass};
 }
@@ -331,15 +330,10 @@ TEST(Work, CostsLittleOnValidFiles)
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        FlvBuilder builder(1);
-        if (row.script.empty())
-            builder.indexed_metadata("");
-        else
-            builder.script(row.script);
-        builder.add(g_avc);
+        Tags video = {g_avc};
         for (uint32_t i = 0; i < FRAMES; ++i)
-            builder.video(40 * i, AvcNalu(i % 20 == 0, Noise(row.size, i + 1)));
-        FakeHost host(builder.build().bytes);
+            video.push_back({9, 40 * i, AvcNalu(i % 20 == 0, Noise(row.size, i + 1))});
+        FakeHost host((row.script.empty() ? IndexedFile(video) : File(Tags{{18, 0, row.script}} + video, 1)).bytes);
         Session session(host, {row.options});
         for (int i = 0; i < row.before; ++i)
             session.frame();
