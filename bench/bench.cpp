@@ -155,6 +155,9 @@ void RegisterAll()
 {
     for (const char* const medium : {"small", "hd"})
         RegisterPlay(medium, true, PLAYS);
+    for (const HostKind& kind : g_hosts)
+        Register(std::string("play/small/header-") + kind.name, "small", Play, PLAYS,
+                 [=] { return std::make_unique<HeaderPlayer>(MakeHost(kind)); });
     RegisterPlay("long", true, LONG_PLAYS);
     for (const char* const medium : {"damaged", "tail"})
         RegisterPlay(medium, false, PLAYS);

@@ -45,4 +45,24 @@ bool FlvdmxPlayer::seek_only(int32_t time_ms, uint32_t mode)
     return QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) == 0;
 }
 
+bool HeaderPlayer::open(const std::string& path)
+{
+    m_file = *flvdmx::File::open(path, m_host);
+    return m_file.is_open();
+}
+
+Tally HeaderPlayer::play()
+{
+    Tally tally;
+    for (const flvdmx::Frame& frame : m_file.frames())
+        tally.add(static_cast<uint32_t>(frame.data.size()));
+    return tally;
+}
+
+uint32_t HeaderPlayer::seek(int32_t time_ms)
+{
+    const bool reached = static_cast<bool>(m_file.seek(flvdmx::Milliseconds(time_ms), flvdmx::SeekMode::backward));
+    return reached ? static_cast<uint32_t>((*m_file.next_frame()).data.size()) : 0;
+}
+
 } // namespace flvd_bench

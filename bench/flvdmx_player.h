@@ -1,9 +1,10 @@
-/* The library itself as a player, on any host. */
+/* The library itself as a player, on any host, through its C entry point or through flvdmx.hpp. */
 #pragma once
 
 #include "player.h"
 
 #include "flvdmx/flvdmx.h"
+#include "flvdmx/flvdmx.hpp"
 
 namespace flvd_bench {
 
@@ -31,6 +32,21 @@ private:
     flvd_init_t m_init;
     std::string m_path;
     flvd_ctx_t* m_instance = nullptr;
+};
+
+/** Through flvdmx.hpp: with all that it tells of a frame. */
+class HeaderPlayer : public Player {
+public:
+    explicit HeaderPlayer(const flvd_init_t& host) : m_host(host) {}
+
+    bool open(const std::string& path) override;
+    void close() override { m_file.close(); }
+    Tally play() override;
+    uint32_t seek(int32_t time_ms) override;
+
+private:
+    flvdmx::Host m_host;
+    flvdmx::File m_file;
 };
 
 } // namespace flvd_bench

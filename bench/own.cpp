@@ -1,6 +1,7 @@
-// Opens and plays a file in memory, each in a function of its own, so that a profiler can count what the library itself
-// does in either. flvdmx-own FILE prints the number of frames.
+// Opens and plays a file in memory, also through flvdmx.hpp, each in a function of its own, so that a profiler can
+// count what the library itself does in it. flvdmx-own FILE prints the number of frames.
 
+#include "flvdmx/flvdmx.hpp"
 #include "flvdmx/memory_host.h"
 
 #include <cinttypes>
@@ -26,6 +27,14 @@ extern "C" {
         ++frames;
     return frames;
 }
+
+[[gnu::noinline]] uint32_t PlayByHeader(flvdmx::File* file)
+{
+    uint32_t frames = 0;
+    for (const flvdmx::Frame& frame : file->frames())
+        frames += frame.data.empty() ? 0U : 1U;
+    return frames;
+}
 }
 
 int main(int argc, char** argv)
@@ -42,8 +51,12 @@ int main(int argc, char** argv)
     flvd_ctx_t* instance = nullptr;
     if (OpenFile(&instance, &init) != 0)
         return 1;
-    std::printf("%" PRIu32 "\n", PlayAll(&instance));
+    const uint32_t frames = PlayAll(&instance);
     QVX_FLV_DMX(FLVD_OP_CLOSE, &instance, nullptr, nullptr);
+    auto opened = flvdmx::File::open(file.name, flvdmx::Host(init));
+    const bool same = PlayByHeader(&*opened) == frames;
+    opened->close();
     flvd_memory_host_remove(&file);
-    return 0;
+    std::printf("%" PRIu32 "\n", frames);
+    return same ? 0 : 1;
 }

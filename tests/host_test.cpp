@@ -1,5 +1,6 @@
 // The hosts of the kit keep the contract of the public header, all on the same bytes.
 
+#include "flvdmx/callback_host.h"
 #include "flvdmx/error_text.h"
 #include "flvdmx/memory_host.h"
 #include "flvdmx/posix_host.h"
@@ -21,8 +22,10 @@ using namespace flvd_test;
 
 namespace {
 
-const std::map<std::string, void (*)(flvd_init_t*)> g_fill = {
-    {"stdio", flvd_stdio_host_fill}, {"posix", flvd_posix_host_fill}, {"memory", flvd_memory_host_fill}};
+const std::map<std::string, void (*)(flvd_init_t*)> g_fill = {{"stdio", flvd_stdio_host_fill},
+                                                              {"posix", flvd_posix_host_fill},
+                                                              {"memory", flvd_memory_host_fill},
+                                                              {"callbacks", flvd_callback_host_fill}};
 constexpr int64_t SIZE = 200000, FAR = (int64_t{1} << 32) + 12345; // SIZE: three windows and a bit
 
 class Host : public testing::TestWithParam<std::string> {
@@ -32,13 +35,25 @@ protected:
         g_fill.at(GetParam())(&t);
         append(file, bytes);
         flvd_memory_host_add(&memory);
-        handle = t.file_open(file.c_str(), "rb");
+        flvd_callback_host_add(&callbacks);
+        name = GetParam() == "callbacks" ? callbacks.name : file;
+        handle = t.file_open(name.c_str(), "rb");
     }
     ~Host() override
     {
         EXPECT_EQ(t.file_close(handle), 0);
         flvd_memory_host_remove(&memory);
+        flvd_callback_host_remove(&callbacks);
         std::filesystem::remove_all(folder);
+    }
+    static int64_t Size(void* user) { return static_cast<int64_t>(static_cast<flvd_memory_file_t*>(user)->size); }
+    // Gives little at a time, as a socket does.
+    static uint32_t ReadAt(void* user, int64_t position, void* buffer, uint32_t size)
+    {
+        const int64_t n = std::clamp<int64_t>(Size(user) - position, 0, std::min<int64_t>(size, 1000));
+        std::copy_n(static_cast<const char*>(static_cast<flvd_memory_file_t*>(user)->data) + (n != 0 ? position : 0), n,
+                    static_cast<char*>(buffer));
+        return static_cast<uint32_t>(n);
     }
     static void append(const std::string& path, const std::string& s) { std::ofstream(path, std::ios::app) << s; }
     std::string read(size_t n) const
@@ -53,6 +68,8 @@ protected:
     // mkdtemp takes the six letters for its own, so that tests that run at the same time do not meet.
     const std::string folder = mkdtemp((testing::TempDir() + "host.XXXXXX").data()), file = folder + "/file";
     flvd_memory_file_t memory = {file.c_str(), bytes.data(), SIZE, nullptr};
+    flvd_callback_file_t callbacks = {ReadAt, Size, &memory, "", nullptr};
+    std::string name;
     void* handle = nullptr;
 };
 class FileHost : public Host {};
@@ -149,7 +166,7 @@ TEST_P(FileHost, TellsWhereAnAppendEnded)
 }
 
 INSTANTIATE_TEST_SUITE_P(Kit, FileHost, testing::Values("stdio", "posix"));
-INSTANTIATE_TEST_SUITE_P(Kit, Host, testing::Values("stdio", "posix", "memory"));
+INSTANTIATE_TEST_SUITE_P(Kit, Host, testing::Values("stdio", "posix", "memory", "callbacks"));
 
 // The table of texts against the list of codes in the public header.
 TEST(ErrorText, HasEveryCodeOfTheHeader)
@@ -168,6 +185,8 @@ TEST(ErrorText, HasEveryCodeOfTheHeader)
         EXPECT_TRUE(texts.insert(flvd_error_text(number)).second) << name << " has no text of its own";
     }
     EXPECT_GT(texts.size(), 20U) << "the list of codes was not read";
+    EXPECT_STREQ(flvd_error_name(FLVD_ERR_HOST_IN_USE), "FLVD_ERR_HOST_IN_USE");
+    EXPECT_TRUE(texts.insert(flvd_error_text(FLVD_ERR_HOST_IN_USE)).second);
     EXPECT_STREQ(flvd_error_name(1), "unknown");
 }
 

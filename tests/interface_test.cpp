@@ -1,11 +1,18 @@
 // The C++ interface: what it adds to the C interface, on samples with known contents and on files in memory.
 
+#include "flvdmx/callback_host.h"
 #include "flvdmx/flvdmx.hpp"
 #include "flvdmx/memory_host.h"
+#include "flvdmx/posix_host.h"
 #include "support/expected.h"
+#include "support/report.h"
+#include "support/session.h"
+#include "support/sweep.h"
+#include "tools/crc32.h"
 
 #include <algorithm>
-#include <gtest/gtest.h>
+#include <cerrno>
+#include <sstream>
 
 using namespace flvd_test;
 using namespace std::chrono_literals;
@@ -14,6 +21,7 @@ using flvdmx::Kind, flvdmx::SeekMode, flvdmx::Stream;
 namespace {
 
 const std::string g_data = FLVDMX_TEST_DATA "/";
+const flvdmx::Host g_memory = flvdmx::make_host(flvd_memory_host_fill);
 
 struct Memory : flvd_memory_file_t {
     Memory(const char* path, const Bytes& bytes) : flvd_memory_file_t{path, bytes.data(), bytes.size(), nullptr}
@@ -23,10 +31,46 @@ struct Memory : flvd_memory_file_t {
     ~Memory() { flvd_memory_host_remove(this); }
 };
 
-flvd_test::Frame Copy(const flvdmx::Frame& frame)
+// All that is told of a frame, in a line. Times in ms: decoding, presentation.
+std::string Line(Stream stream, int64_t time, int64_t presentation, bool keyframe, int64_t position, const Bytes& data)
 {
-    return {static_cast<uint32_t>(frame.stream), static_cast<uint32_t>(frame.time.count()),
-            Bytes(frame.data.begin(), frame.data.end())};
+    std::ostringstream line;
+    line << (stream == Stream::video ? "video " : "audio ") << time << ' ' << presentation << (keyframe ? " key" : "")
+         << " @" << position << ' ' << data.size() << " bytes " << tool::Crc32(data.data(), data.size());
+    return line.str();
+}
+
+std::string Line(const flvdmx::Frame& frame)
+{
+    return Line(frame.stream, frame.time.count(), frame.presentation_time().count(), frame.keyframe, frame.position,
+                Bytes(frame.data.begin(), frame.data.end()));
+}
+
+using Lines = std::vector<std::string>;
+
+// What the prober found of the streams asked for, in a sample that begins at 0 ms.
+Lines ExpectedLines(const Expected& sample, Stream asked = Stream::any)
+{
+    Lines lines;
+    for (size_t i = 0; i < sample.tags.size(); ++i) {
+        const Tag& tag = sample.tags[i];
+        const Bytes data(tag.data.begin() + static_cast<std::ptrdiff_t>(tag.codec_bytes()), tag.data.end());
+        if (asked == Stream::any || static_cast<uint32_t>(asked) == tag.stream())
+            lines.push_back(Line(static_cast<Stream>(tag.stream()), tag.timestamp, sample.packets[i].presentation,
+                                 sample.packets[i].keyframe, tag.offset, data));
+    }
+    return lines;
+}
+
+// Times in ms and positions.
+using Keyframes = std::vector<std::pair<int64_t, int64_t>>;
+
+Keyframes List(const flvdmx::result<std::vector<flvdmx::Keyframe>>& list)
+{
+    Keyframes keyframes;
+    for (const flvdmx::Keyframe& keyframe : *list)
+        keyframes.emplace_back(keyframe.time.count(), keyframe.position);
+    return keyframes;
 }
 
 // A range-for over the frames of a file that is gone by then does not compile.
@@ -34,34 +78,445 @@ template <typename R, typename = void> constexpr bool g_has_frames = false;
 template <typename R> constexpr bool g_has_frames<R, std::void_t<decltype(std::declval<R>()->frames())>> = true;
 static_assert(g_has_frames<flvdmx::result<flvdmx::File>&> && !g_has_frames<flvdmx::result<flvdmx::File>>);
 
+void ExpectDescribed(const flvdmx::Info& info, const ExpectedStream& stream)
+{
+    static const std::map<std::string, std::string> names = {
+        {"h264", "H.264 (AVC)"}, {"flv1", "Sorenson H.263"},          {"flashsv", "screen video"}, {"aac", "AAC"},
+        {"mp3", "MP3"},          {"pcm_s16le", "PCM, little-endian"}, {"speex", "Speex"}};
+    const bool video = stream.stream == FLVD_STREAM_VIDEO;
+    ASSERT_TRUE(video ? info.video.has_value() : info.audio.has_value());
+    EXPECT_EQ(video ? name(info.video->codec) : name(info.audio->codec), names.at(stream.codec));
+    EXPECT_EQ(video ? info.video->config : info.audio->config, stream.extradata);
+    const bool known = stream.codec != "speex"; // whose rate is not in the file
+    EXPECT_EQ(video ? info.video->width : info.audio->sample_rate, video   ? stream.width
+                                                                   : known ? stream.sample_rate
+                                                                           : 11025);
+}
+
 class Sample : public testing::TestWithParam<std::string> {};
-// All frames and what is known of the file, against what another demuxer found; one reader, and two with an own buffer.
+// All frames and what is known of the file, against what another demuxer found: one reader, and two with an own buffer;
+// complete and growing. The lists that are asked for in the middle leave the frames as they are.
 TEST_P(Sample, IsDescribedAndPlayed)
 {
     const Expected expected = ReadExpected(GetParam());
+    Keyframes keyframes;
+    for (size_t i = 0; i < expected.tags.size(); ++i)
+        if (expected.tags[i].type == 9 && expected.packets[i].keyframe)
+            keyframes.emplace_back(expected.tags[i].timestamp, expected.tags[i].offset);
     Bytes buffer(1u << 16);
     const flvdmx::Options apart = {0, 2000, true, false, true, false, buffer.data(), 1u << 16};
-    for (const Stream asked : {Stream::any, Stream::video, Stream::audio}) {
-        auto file = flvdmx::File::open(g_data + GetParam() + ".flv", asked == Stream::any ? flvdmx::Options() : apart);
-        ASSERT_TRUE(file) << file.error().text();
-        const flvdmx::Info info = file->info();
-        EXPECT_EQ(info.size, expected.size());
-        for (const ExpectedStream& stream : expected.streams) {
-            const bool video = stream.stream == FLVD_STREAM_VIDEO;
-            const flvdmx::Bytes config = video ? info.video->config : info.audio->config;
-            EXPECT_EQ(Bytes(config.begin(), config.end()), stream.extradata);
-            EXPECT_EQ(video ? info.video->width : info.audio->sample_rate, video ? stream.width : stream.sample_rate);
+    for (const bool growing : {false, true})
+        for (const Stream asked : {Stream::any, Stream::video, Stream::audio}) {
+            if (growing && GetParam() == "damaged")
+                continue; // nothing tells damage from what has not been written yet
+            SCOPED_TRACE(testing::Message() << static_cast<uint32_t>(asked) << (growing ? " growing" : ""));
+            flvdmx::Options options = asked == Stream::any ? flvdmx::Options() : apart;
+            options.growing = growing;
+            auto file = flvdmx::File::open(g_data + GetParam() + ".flv", options);
+            ASSERT_TRUE(file) << file.error().text();
+            const flvdmx::Info info = file->info();
+            EXPECT_EQ(info.size, growing ? 0 : expected.size());
+            EXPECT_EQ(info.start_time, 0ms);
+            for (const ExpectedStream& stream : expected.streams)
+                ExpectDescribed(info, stream);
+            flvdmx::File moved(std::move(*file));
+            const Lines wanted = ExpectedLines(expected, asked);
+            Lines lines;
+            for (auto frame = moved.next_frame(asked); frame; frame = moved.next_frame(asked)) {
+                lines.push_back(Line(*frame));
+                if (lines.size() != wanted.size() / 2)
+                    continue;
+                const Keyframes list = List(moved.keyframes());
+                const bool by_index = info.seek_method == flvdmx::SeekMethod::by_index; // whose times are the index's
+                EXPECT_EQ(list.size(), keyframes.size());
+                EXPECT_TRUE(by_index || list == keyframes);
+                EXPECT_NE((*moved.metadata()).find(info.video ? "width" : "audiocodecid"), nullptr);
+            }
+            EXPECT_EQ(lines, wanted);
+            EXPECT_EQ(moved.last_error().kind(), wanted.empty() ? Kind::failed : growing ? Kind::not_yet : Kind::end);
         }
-        flvd_test::Frames frames;
-        flvdmx::File moved(std::move(*file));
-        for (const flvdmx::Frame& frame : moved.frames(asked))
-            frames.push_back(Copy(frame));
-        EXPECT_EQ(frames, expected.frames(asked == Stream::any ? 3 : static_cast<uint32_t>(asked), 0));
-        EXPECT_EQ(moved.last_error().kind(), Kind::end);
-        EXPECT_STREQ(file->next_frame().error().name(), "FLVD_ERR_NO_INSTANCE");
+}
+INSTANTIATE_TEST_SUITE_P(Interface, Sample,
+                         testing::Values("aac_only", "avc_aac", "avc_aac_index", "avc_bframes_aac", "avc_only",
+                                         "damaged", "h263_mp3", "mp3_only", "pcm_only", "screen", "speex_only",
+                                         "truncated"));
+
+// What the fields hold beside the samples' values: negative offsets, FrameTypes, extended timestamps, a first timestamp
+// that is not 0, script data and damage in between; sizes below and above the cache.
+TEST(Interface, TellsOfEachFrame)
+{
+    const auto picture = [](uint32_t ts, int32_t offset, size_t size) {
+        return Tag{9, ts, AvcNalu(false, Noise(size), offset)};
+    };
+    Tag bad = Raw(0x1000020);
+    bad.back_pointer = 0;
+    const Flv flv = File({g_meta, g_avc, g_aac, Nalu(0x1000000), picture(0x1000008, -8, 60), Raw(0x1000010), g_meta,
+                          bad, picture(0x1000028, 0x7FFFFF, 5000), picture(0x1000030, -0x800000, 70000),
+                          Raw(0x1000040, 0), Tag{9, 0x1000048, g_avc_end}, Nalu(0x1000050)});
+    struct Wanted {
+        size_t tag;
+        int64_t time, offset;
+        bool keyframe;
+    };
+    const Wanted wanted[] = {{3, 0, 0, true},           {4, 8, -8, false}, {5, 16, 0, true}, {8, 40, 0x7FFFFF, false},
+                             {9, 48, -0x800000, false}, {10, 64, 0, true}, {12, 80, 0, true}};
+    const Memory memory("memory", flv.bytes);
+    for (const bool apart : {false, true}) {
+        flvdmx::Options options;
+        options.separate_audio_reader = apart;
+        auto file = flvdmx::File::open("memory", g_memory, options);
+        EXPECT_EQ(file->info().start_time.count(), 0x1000000);
+        for (const Wanted& frame : wanted) {
+            const Tag& tag = flv.tags[frame.tag];
+            const auto got = file->next_frame(static_cast<Stream>(tag.stream()));
+            EXPECT_EQ(got->time.count(), frame.time);
+            EXPECT_EQ(got->composition_offset.count(), frame.offset) << frame.tag;
+            EXPECT_EQ(got->keyframe, frame.keyframe) << frame.tag;
+            EXPECT_EQ(got->position, tag.offset) << frame.tag;
+        }
     }
 }
-INSTANTIATE_TEST_SUITE_P(Interface, Sample, testing::Values("avc_aac", "h263_mp3"));
+
+// The configurations "A", the first one, "B" and "C", each given with the first frame after it.
+TEST(Interface, ReportsChangedConfigurations)
+{
+    const auto avc = [](uint8_t level) {
+        Bytes record = SmallAvcRecord();
+        record[3] = level;
+        return record;
+    };
+    const Bytes a = avc(40), b = avc(41), c = avc(42), aac = {0x12, 0x10, 0x56, 0xE5, 0x00}, other_aac = {0x11, 0x90};
+    const auto video = [](const Bytes& record) { return Tag{9, 0, AvcConfig(record)}; };
+    const Flv flv = File({video(a),
+                          g_aac,
+                          Nalu(0),
+                          Raw(10),
+                          video(a),
+                          g_aac,
+                          Nalu(40),
+                          Raw(50),
+                          video(b),
+                          Raw(70),
+                          Nalu(80),
+                          Raw(90),
+                          Tag{8, 0, AacConfig(other_aac)},
+                          video(b),
+                          Nalu(120),
+                          Raw(130),
+                          video(a),
+                          video(c),
+                          Nalu(160),
+                          Raw(170)});
+    const std::vector<std::pair<int64_t, Bytes>> first = {{80, b}, {130, other_aac}, {160, c}}, again = {{0, a}};
+    const Memory memory("memory", flv.bytes);
+    for (const auto& [apart, growing] : {std::pair(false, false), {false, true}, {true, false}, {true, true}}) {
+        SCOPED_TRACE(testing::Message() << (apart ? "two readers" : "one reader") << (growing ? ", growing" : ""));
+        auto file = flvdmx::File::open("memory", g_memory, {0, 0, apart, growing});
+        std::vector<std::pair<int64_t, Bytes>> changes;
+        const auto play = [&, apart = apart] {
+            changes.clear();
+            for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
+                for (const flvdmx::Frame& frame : file->frames(stream))
+                    if (frame.config_changed())
+                        changes.emplace_back(frame.time.count(),
+                                             Bytes(frame.new_config.begin(), frame.new_config.end()));
+            std::sort(changes.begin(), changes.end());
+        };
+        play();
+        EXPECT_EQ(changes, first);
+        if (growing)
+            continue; // no seeking without an index
+        ASSERT_TRUE(file->seek(0ms));
+        play();
+        EXPECT_EQ(changes,
+                  (std::vector<std::pair<int64_t, Bytes>>{{0, a}, {10, aac}, {80, b}, {130, other_aac}, {160, c}}));
+    }
+}
+
+// A recording that began anew: most of its frames are later than the last ones.
+TEST(Interface, DeliversAllFramesOfRestartingTimestamps)
+{
+    const Flv flv = File({g_meta, Pcm(0), Pcm(500), Pcm(1000), Pcm(1500), Pcm(20), Pcm(100)});
+    const Memory memory("memory", flv.bytes);
+    for (const bool restarting : {false, true}) {
+        flvdmx::Options options;
+        options.restarting_timestamps = restarting;
+        auto file = flvdmx::File::open("memory", g_memory, options);
+        EXPECT_EQ(file->info().seek_method, restarting ? flvdmx::SeekMethod::none : flvdmx::SeekMethod::by_scan);
+        std::vector<int64_t> times;
+        for (const flvdmx::Frame& frame : file->frames())
+            times.push_back(frame.time.count());
+        EXPECT_EQ(times, restarting ? std::vector<int64_t>({0, 500, 1000, 1500, 20, 100})
+                                    : std::vector<int64_t>({0, 20, 100}));
+        EXPECT_EQ(file->seek(50ms).error().code(), restarting ? FLVD_ERR_NOT_SEEKABLE : FLVD_ERR_NONE);
+    }
+}
+
+// By the index as it is, in the file and in memory; without one by a walk, which damage does not end and the caller
+// can.
+TEST(Interface, ListsKeyframes)
+{
+    ChainOptions chain;
+    chain.index = true;
+    chain.first_ts = 1000;
+    chain.hook = [](auto& times, auto&) { times[1] += 0.0035; };
+    const Flv indexed = MakeChain(chain);
+    const Memory memory("indexed", indexed.bytes);
+    Keyframes wanted;
+    for (const Tag& tag : indexed.tags)
+        if (tag.is_keyframe())
+            wanted.emplace_back(tag.timestamp - 1000, tag.offset);
+    Keyframes in_index = wanted;
+    in_index[1].first += 3;
+    for (const bool in_memory : {false, true}) {
+        flvdmx::Options options;
+        options.index_in_memory = in_memory;
+        EXPECT_EQ(List((*flvdmx::File::open("indexed", g_memory, options)).keyframes()), in_index);
+    }
+    Flv plain = MakeChain({.pictures = 40, .first_ts = 1000});
+    wanted.clear();
+    for (const Tag& tag : plain.tags)
+        if (tag.is_keyframe())
+            wanted.emplace_back(tag.timestamp - 1000, tag.offset);
+    std::fill_n(plain.bytes.begin() + wanted[2].second, 100, uint8_t{0});
+    wanted.erase(wanted.begin() + 2);
+    const Memory other("plain", plain.bytes);
+    auto file = flvdmx::File::open("plain", g_memory);
+    std::vector<int64_t> reached;
+    const auto stop_after = [&](size_t n) {
+        return [&reached, &plain, n](int64_t position, int64_t size) {
+            reached.push_back(position);
+            return size == plain.size() && reached.size() < n;
+        };
+    };
+    EXPECT_EQ(List(file->keyframes(stop_after(100))), wanted);
+    EXPECT_EQ(reached.size(), wanted.size());
+    reached.clear();
+    EXPECT_EQ(List(file->keyframes(stop_after(2))), Keyframes(wanted.begin(), wanted.begin() + 2));
+}
+
+std::string Text(const flvdmx::Property& property)
+{
+    std::ostringstream text;
+    text << property.name << '=';
+    if (const auto* const date = std::get_if<flvdmx::Date>(&property.value))
+        text << date->milliseconds << "ms" << std::showpos << date->zone_minutes;
+    else if (const auto* const string = std::get_if<std::string>(&property.value))
+        text << '\'' << *string << '\'';
+    else if (const auto* const flag = std::get_if<bool>(&property.value))
+        text << (*flag ? "true" : "false");
+    else
+        text << std::get<double>(property.value);
+    return text.str() + ' ';
+}
+
+// Script data in the words of Amf(), and what is read of it.
+TEST(Interface, ReadsMetadata)
+{
+    const std::string date = "%11.66.117.211.239.121.128.0.0.0.60", flag = "%1.1", deep = "a: { a: { a: { a: { ";
+    struct Case {
+        const char* name;
+        std::string script, text;
+    };
+    const Case cases[] = {
+        {"kinds", "'onMetaData < title: 'A width: 320 long: \"B on: " + flag + " at: " + date + " none: %5 last: 1 >",
+         "title='A' width=320 long='B' on=true at=1.5e+12ms+60 last=1 "},
+        {"nested", "'onMetaData { a: { b: [2 'x { c: 3 } } d: 4 }", "a.b.0='x' a.b.1.c=3 d=4 "},
+        {"index_is_left_out", "'onMetaData < keyframes: { times: [2 1 2 filepositions: [2 3 4 } a.keyframes: 5 >",
+         "a.keyframes=5 "},
+        {"other_event", "'onCuePoint { name: 'x time: 2 } 'onMetaData { a: 1 } 7",
+         "onCuePoint.name='x' onCuePoint.time=2 a=1 =7 "},
+        {"cut_short", "'onMetaData < a: 1 b: %0.1.2", "a=1 "},
+        {"unknown_kind", "'onMetaData < a: 1 b: %4 c: 2 >", "a=1 "},
+        {"too_long", "'onMetaData < a: 1 b: %2.255.255.65 >", "a=1 "},
+        {"wrong_count", "'onMetaData < a: [3 1 2", "a.0=1 a.1=2 "},
+        {"sixteen_levels", "'x { " + deep + deep + deep + "a: { a: { a: { b: 1 } } } }",
+         "x.a.a.a.a.a.a.a.a.a.a.a.a.a.a.a.b=1 "},
+        {"seventeen_levels", "'x { c: 2 " + deep + deep + deep + "a: { a: { a: { a: { b: 1 } } } } }", "x.c=2 "}};
+    for (const Case& test : cases) {
+        SCOPED_TRACE(test.name);
+        const Flv flv = File({Tag{18, 0, Amf(test.script)}, Pcm(0), Tag{18, 0, Amf("'second 1")}, Pcm(20)});
+        const Memory memory("memory", flv.bytes);
+        std::string text;
+        const auto metadata = (*flvdmx::File::open("memory", g_memory)).metadata();
+        for (const flvdmx::Property& property : *metadata)
+            text += Text(property);
+        EXPECT_EQ(text, test.text + "second=1 ");
+    }
+}
+
+// Names that repeat in every property, properties without end.
+TEST(Interface, BoundsMetadata)
+{
+    const std::string name(60000, 'n');
+    Bytes script = Amf("'onMetaData");
+    for (int depth = 0; depth < 10; ++depth)
+        Append(script, Concat({{3}, BigEndian(name.size(), 2), {name.begin(), name.end()}}));
+    script.push_back(10);
+    Append(script, Concat({BigEndian(0xFFFFFFFF, 4), Bytes(400000, 5), Amf("1 2 3")}));
+    flvdmx::Metadata metadata;
+    metadata.add_script_data({script.data(), script.size()});
+    EXPECT_EQ(metadata.size(), 1u) << "600 KB of names, of which 1 MiB is kept";
+    Bytes many = Amf("[5000");
+    many.insert(many.end(), 45000, 0);
+    flvdmx::Metadata numbers;
+    numbers.add_script_data({many.data(), many.size()});
+    EXPECT_EQ(numbers.size(), flvdmx::Metadata::max_properties);
+}
+
+// A second host while files of the first are open, and what lets no host do.
+TEST(Interface, KeepsToOneHostAtATime)
+{
+    const std::string path = g_data + "avc_aac.flv";
+    const flvdmx::Host posix = flvdmx::make_host(flvd_posix_host_fill);
+    auto file = flvdmx::File::open(path);
+    auto second = flvdmx::File::open(path);
+    const auto refused = flvdmx::File::open(path, posix);
+    EXPECT_STREQ(refused.error().name(), "FLVD_ERR_HOST_IN_USE");
+    EXPECT_EQ(refused.error().kind(), Kind::failed);
+    EXPECT_TRUE(second && file->next_frame());
+    *file = flvdmx::File();
+    EXPECT_FALSE(flvdmx::File::open(path, posix));
+    EXPECT_TRUE(second->next_frame());
+    second->close();
+    EXPECT_TRUE(flvdmx::File::open(path, posix));
+    EXPECT_TRUE(flvdmx::File::open(path)) << "that one was closed at once";
+    flvd_init_t functions = posix.functions();
+    functions.file_eof = nullptr;
+    for (const flvdmx::Host& host : {flvdmx::Host(functions), flvdmx::make_host(nullptr)})
+        EXPECT_STREQ(flvdmx::File::open(path, host).error().name(), "FLVD_ERR_HOST_INCOMPLETE");
+}
+
+TEST(Interface, TellsWhyAFileDidNotOpen)
+{
+    for (const auto& [fill, is_file] : {std::pair(&flvd_stdio_host_fill, true),
+                                        {flvd_posix_host_fill, true},
+                                        {flvd_memory_host_fill, false},
+                                        {flvd_callback_host_fill, false}}) {
+        const flvdmx::Host host = flvdmx::make_host(fill);
+        EXPECT_EQ(flvdmx::File::open(g_data + "absent", host).error().system_error(), ENOENT);
+        EXPECT_EQ(flvdmx::File::open(g_data, host).error().system_error(), is_file ? EISDIR : ENOENT);
+    }
+    const auto text = flvdmx::File::open(g_data + "script_data.txt");
+    EXPECT_EQ(text.error().code(), FLVD_ERR_FILE_HEADER);
+    EXPECT_EQ(text.error().system_error(), 0) << "it was opened";
+}
+
+// What a program may get wrong, and what it gets.
+TEST(Interface, SurvivesMisuse)
+{
+    flvdmx::result<flvdmx::File> absent = flvdmx::File::open("absent");
+    flvdmx::File closed, moved_to(std::move(closed));
+    auto opened = flvdmx::File::open(g_data + "avc_aac.flv");
+    const flvdmx::Frame frame = *opened->next_frame();
+    EXPECT_EQ(frame.data[frame.data.size()], 0);
+    for (const flvdmx::Frame& each : opened->frames()) {
+        opened->close();
+        EXPECT_EQ(each.stream, Stream::video);
+    }
+    for (flvdmx::File* const file : {&*absent, &closed, &moved_to, &*opened}) {
+        EXPECT_FALSE(file->is_open());
+        for (const auto& error :
+             {file->next_frame().error(), file->seek(0ms).error(), file->metadata().error(), file->keyframes().error(),
+              file->follow([] { return true; }).error(), file->last_error()})
+            EXPECT_STREQ(error.name(), "FLVD_ERR_NO_INSTANCE");
+        EXPECT_TRUE((*file->next_frame()).data.empty());
+        EXPECT_EQ(*file->seek(1s), 0ms);
+        EXPECT_FALSE(file->info().video || file->info().audio);
+        flvdmx::FrameRange range = file->frames();
+        EXPECT_TRUE((*range.begin()).data.empty());
+        file->close();
+    }
+    flvdmx::Options options;
+    options.separate_audio_reader = true;
+    auto apart = flvdmx::File::open(g_data + "avc_aac.flv", options);
+    for (const Stream stream : {Stream::any, static_cast<Stream>(7)})
+        EXPECT_STREQ(apart->next_frame(stream).error().name(), "FLVD_ERR_BAD_STREAM");
+    EXPECT_EQ((*apart->next_frame(Stream::video)).position, 495) << "nothing was lost";
+}
+
+// All that a program does with a file. Of each frame that comes the tag must be the one that carries it.
+void UseAll(flvdmx::result<flvdmx::File> file, const Lines& whole)
+{
+    const auto play = [&](int frames) {
+        for (auto frame = file->next_frame(); frame && --frames >= 0; frame = file->next_frame())
+            EXPECT_TRUE(frame->position < 0 || std::count(whole.begin(), whole.end(), Line(*frame)) != 0)
+                << Line(*frame);
+    };
+    play(3);
+    (void)file->metadata();
+    (void)file->keyframes();
+    play(3);
+    (void)file->seek(300ms, SeekMode::backward);
+    play(1000);
+}
+
+// Each function of the host fails once, at each of its calls.
+TEST(Interface, SurvivesEveryHostFailure)
+{
+    const Expected sample = ReadExpected("avc_bframes_aac");
+    const Lines whole = ExpectedLines(sample);
+    Sweep sweep;
+    for (const bool growing : {false, true}) {
+        flvdmx::Options options = {};
+        options.growing = growing;
+        uint64_t calls = 1;
+        for (uint64_t n = 0; n <= calls; ++n) {
+            if (!sweep.takes_next() && n != 0)
+                continue;
+            SCOPED_TRACE(testing::Message() << "call " << n << (growing ? ", growing" : ""));
+            FakeHost host(sample.bytes);
+            host.fail_nth_call(n); // none at first
+            UseAll(flvdmx::File::open(FakeHost::DEFAULT_FILE, flvdmx::Host(host.init()), options), whole);
+            calls = n == 0 ? host.failable_calls() : calls;
+            EXPECT_EQ(host.live_blocks(), 0u);
+        }
+    }
+}
+
+// The same for the two callbacks of a file; a name that is gone is not opened.
+TEST(Interface, SurvivesEveryCallbackFailure)
+{
+    struct Source {
+        const Bytes& bytes;
+        int calls = 0, failing = 0;
+        bool fails() { return ++calls == failing; }
+    };
+    const Expected sample = ReadExpected("avc_bframes_aac");
+    const Lines whole = ExpectedLines(sample);
+    const flvdmx::Host host = flvdmx::make_host(flvd_callback_host_fill);
+    Sweep sweep;
+    int calls = 1;
+    for (int n = 0; n <= calls; ++n) {
+        if (!sweep.takes_next())
+            continue;
+        SCOPED_TRACE(n);
+        Source source{sample.bytes, 0, n};
+        flvd_callback_file_t file{};
+        file.read_at = [](void* user, int64_t position, void* buffer, uint32_t size) {
+            auto& from = *static_cast<Source*>(user);
+            const auto end = static_cast<int64_t>(from.bytes.size());
+            const auto left = from.fails() ? 0 : std::max<int64_t>(end - position, 0);
+            const auto count = std::min<int64_t>({left, size, 1000}); // short reads are no end
+            std::copy_n(from.bytes.begin() + position * (left != 0), count, static_cast<uint8_t*>(buffer));
+            return static_cast<uint32_t>(count);
+        };
+        file.get_size = [](void* user) {
+            auto& from = *static_cast<Source*>(user);
+            return from.fails() ? -1 : static_cast<int64_t>(from.bytes.size());
+        };
+        file.user = &source;
+        const std::string path = flvd_callback_host_add(&file);
+        auto opened = flvdmx::File::open(path, host);
+        flvd_callback_host_remove(&file);
+        EXPECT_EQ(flvdmx::File::open(path, host).error().system_error(), ENOENT);
+        EXPECT_TRUE(n != 0 || opened);
+        UseAll(std::move(opened), whole);
+        calls = n == 0 ? source.calls : calls;
+    }
+    flvd_callback_file_t incomplete{};
+    EXPECT_EQ(flvd_callback_host_add(&incomplete), nullptr);
+}
 
 // Keyframes every 0.4 s: the index counts from 0, the tags from 23 ms.
 TEST(Interface, SeeksAsNamed)
@@ -94,29 +549,28 @@ TEST(Interface, FollowsAGrowingFile)
 {
     const Expected sample = ReadExpected("avc_aac"), another = ReadExpected("mp3_only");
     Memory growing("growing", sample.bytes), other("other", another.bytes);
-    const flvdmx::Host memory = flvdmx::make_host(flvd_memory_host_fill);
     const flvdmx::Options options = {8192, 0, false, true};
     for (growing.size = 0; growing.size <= 258; ++growing.size) { // there begins the first media tag
-        EXPECT_EQ(flvdmx::File::open("growing", memory, options).error().kind(), Kind::not_yet) << growing.size;
-        EXPECT_EQ(flvdmx::File::open("growing", memory, {}).error().kind(), Kind::failed) << growing.size;
+        EXPECT_EQ(flvdmx::File::open("growing", g_memory, options).error().kind(), Kind::not_yet) << growing.size;
+        EXPECT_EQ(flvdmx::File::open("growing", g_memory, {}).error().kind(), Kind::failed) << growing.size;
     }
     growing.size = 2500;
     const std::lock_guard lock(flvdmx::open_mutex); // opens and closes all the same
-    auto file = flvdmx::File::open("growing", memory, options);
-    auto second = flvdmx::File::open("other", memory);
+    auto file = flvdmx::File::open("growing", g_memory, options);
+    auto second = flvdmx::File::open("other", g_memory);
     ASSERT_TRUE(file && second);
     const auto wait = [&] {
         growing.size = std::min<uint64_t>(growing.size + 100, sample.bytes.size());
         return growing.size < sample.bytes.size();
     };
-    flvd_test::Frames frames, others;
+    Lines frames, others;
     for (auto frame = file->follow(wait); frame; frame = file->follow(wait)) {
-        frames.push_back(Copy(*frame));
+        frames.push_back(Line(*frame));
         if (const auto beside = second->next_frame())
-            others.push_back(Copy(*beside));
+            others.push_back(Line(*beside));
     }
-    EXPECT_EQ(frames, sample.frames());
-    EXPECT_EQ(others, another.frames());
+    EXPECT_EQ(frames, ExpectedLines(sample));
+    EXPECT_EQ(others, ExpectedLines(another));
     EXPECT_EQ(file->last_error().kind(), Kind::not_yet);
 }
 
@@ -132,7 +586,7 @@ TEST(Interface, CrossesTagsWithoutAFrame)
     for (const auto& [apart, growing] : {std::pair(false, false), {false, true}, {true, false}, {true, true}}) {
         SCOPED_TRACE(testing::Message() << (apart ? "two readers" : "one reader") << (growing ? ", growing" : ""));
         const flvdmx::Options options = {0, 0, apart, growing};
-        auto file = flvdmx::File::open("memory", flvdmx::make_host(flvd_memory_host_fill), options);
+        auto file = flvdmx::File::open("memory", g_memory, options);
         std::vector<int64_t> times;
         for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
             for (const flvdmx::Frame& frame : file->frames(stream))

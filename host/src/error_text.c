@@ -38,6 +38,8 @@ static const error_text_t texts[] = {
     {FLVD_ERR_SHORT_DATA, "FLVD_ERR_SHORT_DATA", "the data ended"},
     {FLVD_ERR_NOT_SEEKABLE, "FLVD_ERR_NOT_SEEKABLE",
      "the file cannot be seeked in: it has no usable keyframe index and cannot be scanned"},
+    {FLVD_ERR_HOST_IN_USE, "FLVD_ERR_HOST_IN_USE", "a file that was opened through another host is still open"},
+    {FLVD_ERR_HOST_INCOMPLETE, "FLVD_ERR_HOST_INCOMPLETE", "the host lacks a function that the library calls"},
     {0, "unknown", "unknown error"},
 };
 

@@ -72,23 +72,28 @@ static int64_t size_of(void* handle)
     return size;
 }
 
+/* Null, for this reason. */
+static void* refuse(int reason)
+{
+    open_error = reason;
+    errno = reason;
+    return NULL;
+}
+
 static void* open_file(const char* path, const char* mode)
 {
-    if (!flvd_counted_only_reads(mode)) {
-        open_error = EACCES;
-        return NULL;
-    }
+    if (!flvd_counted_only_reads(mode))
+        return refuse(EACCES);
     const int descriptor = open_descriptor(path);
-    open_error = descriptor < 0 ? errno : 0;
     if (descriptor < 0)
-        return NULL;
+        return refuse(errno);
     const bool directory = is_directory(descriptor);
     posix_file_t* const file = directory ? NULL : calloc(1, sizeof *file);
     if (file == NULL) {
-        open_error = directory ? EISDIR : ENOMEM;
         close(descriptor);
-        return NULL;
+        return refuse(directory ? EISDIR : ENOMEM);
     }
+    open_error = 0;
     file->counted.size = size_of;
     file->descriptor = descriptor;
     return file;

@@ -53,19 +53,26 @@ static int is_directory(FILE* file)
     return fstat(fileno(file), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
+/* Null, for this reason. */
+static void* refuse(int reason)
+{
+    open_error = reason;
+    errno = reason;
+    return NULL;
+}
+
 static void* open_stream(const char* path, const char* mode)
 {
     FILE* const file = fopen(path, mode);
-    open_error = file == NULL ? errno : 0;
     if (file == NULL)
-        return NULL;
+        return refuse(errno);
     const int directory = is_directory(file);
     stream_t* const stream = directory ? NULL : malloc(sizeof *stream);
     if (stream == NULL) {
-        open_error = directory ? EISDIR : ENOMEM;
         fclose(file);
-        return NULL;
+        return refuse(directory ? EISDIR : ENOMEM);
     }
+    open_error = 0;
     setvbuf(file, NULL, _IONBF, 0); /* the library has a cache of its own */
     *stream = (stream_t){file, UNKNOWN};
     return stream;

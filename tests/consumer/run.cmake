@@ -29,13 +29,13 @@ run(${CC} ${doc}/examples/copy_frames.c -o ${work}/copy_frames ${flags})
 run(${work}/copy_frames ${SAMPLE} audio ${work}/copied)
 expect("109 frames, 10189 bytes")
 
-foreach(pair IN ITEMS "C list.c H264" "CXX seek.cpp reached 1")
-    separate_arguments(pair)
-    list(POP_FRONT pair language source expected)
-    run(${CMAKE_COMMAND} -S ${SOURCES}/tests/consumer -B ${work}/${language} -G Ninja -DCMAKE_PREFIX_PATH=${prefix}
+foreach(example IN ITEMS "C list.c H264" "CXX seek.cpp reached 1" "CXX second_half.cpp keyframe ${work}/frames")
+    separate_arguments(example)
+    list(POP_FRONT example language source expected)
+    run(${CMAKE_COMMAND} -S ${SOURCES}/tests/consumer -B ${work}/${source} -G Ninja -DCMAKE_PREFIX_PATH=${prefix}
         -DLANGUAGE=${language} -DSOURCE=${doc}/examples/${source})
-    run(${CMAKE_COMMAND} --build ${work}/${language})
-    run(${work}/${language}/consumer ${SAMPLE} ${pair})
+    run(${CMAKE_COMMAND} --build ${work}/${source})
+    run(${work}/${source}/consumer ${SAMPLE} ${example})
     expect(${expected})
 endforeach()
 

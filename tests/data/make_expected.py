@@ -3,7 +3,7 @@
 
 file    size= duration_ms=           duration as ffprobe reports it (0: unknown)
 stream  kind= codec= width= height= rate= channels= extradata=
-packet  kind= pos= dts= size= crc= key=   in file order; pos is the tag's start, dts the tag's timestamp in ms
+packet  kind= pos= dts= pts= size= crc= key=   in file order; pos is the tag's start, dts the tag's timestamp in ms
 
 Every packet is compared with the tag at its position, so that no change by the prober goes unnoticed. The truncated
 and the damaged sample are expected to give the packets of avc_aac.flv whose tags are whole and untouched.
@@ -75,7 +75,8 @@ def packet_line(packet, tag):
     crc, key = packet["data_hash"].split(":")[1], int(packet["flags"][0] == "K")
     found = (packet["codec_type"], packet["dts"], int(packet["size"]), int(crc, 16))
     assert found == (kind, timestamp, len(frame), zlib.crc32(frame)), packet
-    return f"packet kind={kind} pos={packet['pos']} dts={timestamp} size={len(frame)} crc={crc} key={key}"
+    return (f"packet kind={kind} pos={packet['pos']} dts={timestamp} pts={packet['pts']} size={len(frame)} crc={crc} "
+            f"key={key}")
 
 
 def sound_file(path):

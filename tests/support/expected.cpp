@@ -45,7 +45,7 @@ Expected ReadExpected(const std::string& name)
 {
     const std::string sample = ReadData(name + ".flv");
     std::istringstream in(ReadData("expected/" + name + ".txt"));
-    Expected out{{Bytes(sample.begin(), sample.end()), {}}, name, {}};
+    Expected out{{Bytes(sample.begin(), sample.end()), {}}, name, {}, {}};
     for (std::string text, kind; std::getline(in, text);) {
         std::istringstream line(text);
         std::map<std::string, std::string> fields;
@@ -57,7 +57,8 @@ Expected ReadExpected(const std::string& name)
         };
         const bool video = fields["kind"] == "video";
         if (kind == "stream")
-            out.streams.push_back({video ? 1u : 2u, number("width"), number("rate"), FromHex(fields.at("extradata"))});
+            out.streams.push_back(
+                {video ? 1u : 2u, fields["codec"], number("width"), number("rate"), FromHex(fields.at("extradata"))});
         if (kind == "file")
             Require(number("size") == out.bytes.size(), name + " has another size");
         if (kind != "packet")
@@ -72,6 +73,7 @@ Expected ReadExpected(const std::string& name)
                     Crc32(&data[tag.codec_bytes()], size) == number("crc", 16),
                 name + ": another packet at " + fields["pos"]);
         out.tags.push_back(tag);
+        out.packets.push_back({number("pts"), number("key") != 0});
     }
     return out;
 }

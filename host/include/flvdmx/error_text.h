@@ -1,5 +1,6 @@
 /*
- * Names and texts of the error codes, FLVD_ERR_* as they are recorded in flvd_ctx_t::error and g_flvd_lLastError.
+ * Names and texts of the error codes, FLVD_ERR_* as they are recorded in flvd_ctx_t::error and g_flvd_lLastError,
+ * and those that flvdmx.hpp adds.
  *
  * Usable from C11 and C++17; link flvdmx-host, which needs the C library alone.
  */
@@ -11,6 +12,12 @@
 #ifdef __cplusplus
 extern "C" {
 #endif
+
+/** Error codes of flvdmx.hpp, beside those of flvdmx.h. */
+enum {
+    FLVD_ERR_HOST_IN_USE = -20001,    /**< a file that was opened through other host functions is still open */
+    FLVD_ERR_HOST_INCOMPLETE = -20002 /**< the host lacks a function that the library calls */
+};
 
 /** @return the name of an error code, such as "FLVD_ERR_SEEK"; "unknown" for any other number. Never released. */
 const char* flvd_error_name(int32_t code);

@@ -4,18 +4,29 @@
  *     auto file = flvdmx::File::open("clip.flv");
  *     if (!file)
  *         return std::fprintf(stderr, "%s\n", file.error().text());
- *     for (const flvdmx::Frame& frame : file->frames())
- *         play(frame.stream, frame.time, frame.data);
+ *     for (const flvdmx::Frame& frame : file->frames()) {
+ *         if (frame.config_changed())
+ *             configure(frame.stream, frame.new_config);
+ *         play(frame.stream, frame.presentation_time(), frame.data);
+ *     }
  *
- * Nothing here throws, and nothing needs exceptions or run-time type information: what can fail returns a result<T>.
+ * What can fail returns a result<T>. Nothing needs exceptions or run-time type information; only texts, lists and codec
+ * configurations take memory from operator new, which may throw. All else comes from the host.
+ *
+ * MISTAKES
+ *
+ * A File that is not open (closed, moved from, never opened) answers every call with FLVD_ERR_NO_INSTANCE, a result
+ * without a value holds an empty one, and an open that would break files that are open already is refused. What must be
+ * kept in mind is how long Frame::data is valid, and the rules for threads.
  *
  * THE PROCESS-WIDE TABLES
  *
  * The library calls the memory and file functions of its host. They carry no context, so there is one set of them for
  * the process: every open overwrites it, and all files that are open already go on with the newest functions. Hence:
  *
- * - Give every open the same functions. File::open(path) takes those of the stdio host; the other hosts of the kit, and
- *   hosts of your own, are passed as a Host. Files opened through different hosts must not be open at the same time.
+ * - Files that are open at the same time have one host. File::open(path) takes the stdio host; the other hosts of the
+ *   kit, and hosts of your own, are passed as a Host. While a File is open, an open through other functions returns
+ *   FLVD_ERR_HOST_IN_USE. What differs from file to file belongs into a callback file (flvdmx/callback_host.h).
  * - Opening and closing hold open_mutex, so threads may open files, look at their Info and let them go as they like.
  *   All other calls take no lock, and an open must not run beside them, on whatever File: when threads play files while
  *   others open some, they hold open_mutex around their own calls as well.
@@ -24,21 +35,35 @@
 #ifndef FLVDMX_FLVDMX_HPP
 #define FLVDMX_FLVDMX_HPP
 
+#if __cplusplus < 201703L
+#error "flvdmx.hpp needs C++17"
+#endif
+
 #include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
+#include "flvdmx/layers.h"
+#include "flvdmx/metadata.hpp"
 #include "flvdmx/next_frame.h"
+#include "flvdmx/result.hpp"
 #include "flvdmx/stdio_host.h"
 
+#include <algorithm>
+#include <array>
+#include <cerrno>
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <limits>
 #include <memory>
 #include <mutex>
 #include <new>
 #include <optional>
+#include <string>
 #include <string_view>
+#include <tuple>
 #include <utility>
+#include <vector>
 
 namespace flvdmx {
 
@@ -53,93 +78,43 @@ using Milliseconds = std::chrono::milliseconds;
 
 /** The host's functions. */
 class Host {
+    // What the library calls.
+    static auto called(const flvd_init_t& f)
+    {
+        return std::tie(f.mem_alloc, f.mem_free, f.mem_copy, f.mem_set, f.file_open, f.file_read, f.file_close,
+                        f.file_eof, f.file_seek, f.file_tell, f.file_seek64, f.file_tell64, f.file_flush, f.file_write);
+    }
+
 public:
     /** From a block of which all but the functions is ignored. */
     explicit Host(const flvd_init_t& functions) : m_functions(functions) {}
     const flvd_init_t& functions() const { return m_functions; } /**< the block */
 
+    /** True when all functions that the library calls are there. */
+    bool is_complete() const
+    {
+        const flvd_init_t& f = m_functions;
+        return f.mem_alloc != nullptr && f.mem_free != nullptr && f.mem_copy != nullptr && f.mem_set != nullptr &&
+               f.file_open != nullptr && f.file_read != nullptr && f.file_close != nullptr && f.file_eof != nullptr &&
+               f.file_seek != nullptr && f.file_tell != nullptr;
+    }
+
+    /** True for a host with the same functions. */
+    bool operator==(const Host& other) const { return called(m_functions) == called(other.m_functions); }
+    bool operator!=(const Host& other) const { return !(*this == other); } /**< true for a host with others */
+
 private:
     flvd_init_t m_functions;
 };
 
-/** A Host from a function of the host kit, such as flvd_posix_host_fill. */
+/** A Host from a function of the host kit, such as flvd_posix_host_fill; an incomplete one from null. */
 inline Host make_host(void (*fill)(flvd_init_t*))
 {
     flvd_init_t functions{};
-    fill(&functions);
+    if (fill != nullptr)
+        fill(&functions);
     return Host(functions);
 }
-
-/** Bytes that belong to somebody else. */
-class Bytes {
-public:
-    constexpr Bytes() = default;
-    /** Borrows `size` bytes from `data` on. */
-    constexpr Bytes(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
-    constexpr const uint8_t* data() const { return m_data; }           /**< the first; null when there is none */
-    constexpr size_t size() const { return m_size; }                   /**< their number */
-    constexpr bool empty() const { return m_size == 0; }               /**< true without bytes */
-    constexpr const uint8_t* begin() const { return m_data; }          /**< the first */
-    constexpr const uint8_t* end() const { return m_data + m_size; }   /**< behind the last */
-    constexpr uint8_t operator[](size_t i) const { return m_data[i]; } /**< byte `i`, not checked */
-
-private:
-    const uint8_t* m_data = nullptr;
-    size_t m_size = 0;
-};
-
-/* ------------------------------------------------------------------------------------------ errors */
-
-/** What a failure means for the caller. */
-enum class Kind {
-    none,    /**< no failure */
-    end,     /**< the end of the data */
-    not_yet, /**< a growing file holds no more so far: ask, or open it, again later */
-    miss,    /**< a seek found nothing to land on; playing goes on where it was */
-    failed   /**< anything else */
-};
-
-/** A failure: the library's code and line, and what they mean. */
-class error {
-public:
-    constexpr error() = default;
-    /** From the library's code and line. */
-    constexpr error(Kind kind, int32_t code, int32_t line) : m_kind(kind), m_code(code), m_line(line) {}
-
-    constexpr Kind kind() const { return m_kind; }    /**< what it means for the caller */
-    constexpr int32_t code() const { return m_code; } /**< FLVD_ERR_* */
-    constexpr int32_t line() const { return m_line; } /**< number of the place of failure, the same in every release */
-    const char* name() const { return flvd_error_name(m_code); } /**< such as "FLVD_ERR_SEEK" */
-    const char* text() const { return flvd_error_text(m_code); } /**< what happened, for people */
-
-private:
-    Kind m_kind = Kind::none;
-    int32_t m_code = FLVD_ERR_NONE;
-    int32_t m_line = 0;
-};
-
-/**
- * A value, or the error that took its place. Access to a value that is not there is undefined: test first. Of a
- * temporary, `->` is refused: nobody can have tested it, and a range-for over what it leads to would outlive it.
- */
-template <typename T> class [[nodiscard]] result {
-public:
-    result(T value) : m_value(std::move(value)) {}         /**< success */
-    result(const flvdmx::error& error) : m_error(error) {} /**< failure */
-
-    explicit operator bool() const { return m_value.has_value(); } /**< true when there is a value */
-    T& operator*() & { return *m_value; }                          /**< the value */
-    const T& operator*() const& { return *m_value; }               /**< the value */
-    T&& operator*() && { return std::move(*m_value); }             /**< the value, to be taken */
-    T* operator->() & { return &*m_value; }                        /**< of the value */
-    const T* operator->() const& { return &*m_value; }             /**< of the value */
-    T* operator->() && = delete;                                   /**< refused */
-    flvdmx::error error() const { return m_error; }                /**< of Kind::none when there is a value */
-
-private:
-    std::optional<T> m_value;
-    flvdmx::error m_error;
-};
 
 /* --------------------------------------------------------------------------------- what a file holds */
 
@@ -150,31 +125,111 @@ enum class Stream : uint32_t {
     audio = FLVD_STREAM_AUDIO  /**< audio */
 };
 
-/** One frame, as the codec wants it: without FLV's headers. */
+/**
+ * One frame, without the headers of FLV. AVC: NAL units, each after its length, a big-endian number of as many bytes as
+ * the configuration says (mostly 4), and no parameter sets: those are in the configuration. AAC: a raw access unit,
+ * without ADTS. VP6: the bytes of FLV that tell how the picture is cropped come first.
+ */
 struct Frame {
     Stream stream = Stream::any; /**< video or audio */
-    Milliseconds time{}; /**< from the file's first timestamp, in decoding order; negative: a tag in front of that */
-    Bytes data;          /**< valid until the next call on the file */
+    Milliseconds time{}; /**< when to decode it, from the first timestamp of the file; negative: a tag before that */
+    Bytes data;          /**< valid until the next call on the file other than info() */
+    Milliseconds composition_offset{}; /**< from decoding to showing it, may be negative; 0 unless the codec is AVC */
+    bool keyframe = false; /**< it can be decoded without the frames before it; true for every audio frame */
+    int64_t position = -1; /**< byte in the file where its tag begins; -1 when the host failed to tell */
+    Bytes new_config;      /**< the stream's configuration from this frame on, when another held for the frame before;
+                                else empty. Valid as long as `data`. */
+
+    Milliseconds presentation_time() const { return time + composition_offset; } /**< when to show it */
+    bool config_changed() const { return !new_config.empty(); } /**< true: give `new_config` to the decoder first */
 };
+
+/** CodecID of video tags (FLV file format, version 10.1, annex E.4.3.1). Files may hold other numbers. */
+enum class VideoCodec : uint32_t {
+    unknown = 0,        /**< none */
+    jpeg = 1,           /**< JPEG */
+    sorenson_h263 = 2,  /**< Sorenson H.263 */
+    screen_video = 3,   /**< screen video */
+    vp6 = 4,            /**< On2 VP6 */
+    vp6_alpha = 5,      /**< On2 VP6 with an alpha channel */
+    screen_video_2 = 6, /**< screen video, version 2 */
+    avc = 7             /**< AVC, H.264 */
+};
+
+/** SoundFormat of audio tags (the same, annex E.4.2.1). Files may hold other numbers. */
+enum class AudioCodec : uint32_t {
+    pcm = 0,               /**< linear PCM in the byte order of the machine that wrote it */
+    adpcm = 1,             /**< ADPCM */
+    mp3 = 2,               /**< MP3 */
+    pcm_little_endian = 3, /**< linear PCM, little-endian */
+    nellymoser_16khz = 4,  /**< Nellymoser, 16 kHz, mono */
+    nellymoser_8khz = 5,   /**< Nellymoser, 8 kHz, mono */
+    nellymoser = 6,        /**< Nellymoser */
+    a_law = 7,             /**< G.711 A-law */
+    mu_law = 8,            /**< G.711 mu-law */
+    unknown = 9,           /**< reserved in the format */
+    aac = 10,              /**< AAC */
+    speex = 11,            /**< Speex */
+    mp3_8khz = 14,         /**< MP3, 8 kHz */
+    device_specific = 15   /**< whatever a device wrote */
+};
+
+/** @return the codec's name for people; "unknown" for a number that the format does not define */
+constexpr const char* name(VideoCodec codec)
+{
+    constexpr std::array names = {"unknown", "JPEG",           "Sorenson H.263", "screen video",
+                                  "VP6",     "VP6 with alpha", "screen video 2", "H.264 (AVC)"};
+    const auto number = static_cast<size_t>(codec);
+    return number < names.size() ? names[number] : names[0];
+}
+
+/** @return as for video */
+constexpr const char* name(AudioCodec codec)
+{
+    constexpr std::array names = {"PCM",
+                                  "ADPCM",
+                                  "MP3",
+                                  "PCM, little-endian",
+                                  "Nellymoser 16 kHz mono",
+                                  "Nellymoser 8 kHz mono",
+                                  "Nellymoser",
+                                  "G.711 A-law",
+                                  "G.711 mu-law",
+                                  "unknown",
+                                  "AAC",
+                                  "Speex",
+                                  "unknown",
+                                  "unknown",
+                                  "MP3 8 kHz",
+                                  "device-specific sound"};
+    const auto number = static_cast<size_t>(codec);
+    return number < names.size() ? names[number] : "unknown";
+}
 
 /** The video stream; 0 in all that the file does not tell. */
 struct VideoInfo {
-    uint32_t width = 0;           /**< pixels */
-    uint32_t height = 0;          /**< pixels */
-    double frame_rate = 0.0;      /**< frames a second, from the metadata */
-    std::string_view fourcc;      /**< as in flvd_video_info_t, empty for an unknown codec */
-    Bytes config;                 /**< AVC: AVCDecoderConfigurationRecord */
-    Milliseconds last_keyframe{}; /**< file timestamp, from the index or the metadata */
+    VideoCodec codec = VideoCodec::unknown; /**< what its frames are */
+    uint32_t width = 0;                     /**< pixels */
+    uint32_t height = 0;                    /**< pixels */
+    double frame_rate = 0.0;                /**< frames per second, from the metadata */
+    std::string fourcc;                     /**< as in flvd_video_info_t, empty for an unknown codec */
+    std::vector<uint8_t> config;            /**< AVC: the first AVCDecoderConfigurationRecord (ISO/IEC 14496-15) */
+    Milliseconds last_keyframe{};           /**< file timestamp, from the index or the metadata */
 };
 
-/** The audio stream; 0 in all that the file does not tell. */
+/**
+ * The audio stream; 0 in all that the file does not tell. Sample rate, sample size and channels of AAC and MP3 are the
+ * codec's own. Those of all other codecs are the tag header's, which knows 5.5, 11, 22 and 44.1 kHz alone and can be
+ * wrong: Speex has 16 kHz and one channel, A-law, mu-law and Nellymoser mostly 8 or 16 kHz, whatever stands there.
+ */
 struct AudioInfo {
-    uint32_t sample_rate = 0; /**< Hz */
-    uint32_t sample_size = 0; /**< bits */
-    uint32_t channels = 0;    /**< their number */
-    uint32_t format_tag = 0;  /**< FLVD_AUDIO_TAG_*, 0 for every other format */
-    uint32_t data_rate = 0;   /**< kbit/s */
-    Bytes config;             /**< AAC: AudioSpecificConfig */
+    AudioCodec codec = AudioCodec::unknown; /**< what its frames are */
+    uint32_t sample_rate = 0;               /**< Hz */
+    uint32_t sample_size = 0;               /**< bits */
+    uint32_t channels = 0;                  /**< their number */
+    uint32_t format_tag = 0;                /**< FLVD_AUDIO_TAG_*, 0 for every other format */
+    uint32_t data_rate = 0;                 /**< kbit/s */
+    std::vector<uint8_t> config;            /**< AAC: the first AudioSpecificConfig (ISO/IEC 14496-3) */
 };
 
 /** How a file can be seeked in. */
@@ -184,14 +239,22 @@ enum class SeekMethod : uint32_t {
     by_scan = FLVD_SEEK_BY_SCAN    /**< by stepping from tag to tag */
 };
 
-/** What is known of a file; views of it are valid until the file is closed. */
+/** What was known of a file when it had been opened. A copy: it stays as it is. */
 struct Info {
-    std::string_view path;                     /**< as given to open() */
-    Milliseconds duration{};                   /**< 0 when unknown, as of a growing file */
-    int64_t size = 0;                          /**< bytes, 0 for a growing file */
+    std::string path;          /**< as given to open() */
+    Milliseconds start_time{}; /**< first timestamp of the file, from which all times count; 0 for a
+                                    growing file */
+    Milliseconds duration{};   /**< last timestamp less the first; 0 when unknown, as of a growing file */
+    int64_t size = 0;          /**< bytes, 0 for a growing file */
     SeekMethod seek_method = SeekMethod::none; /**< how to seek in it */
     std::optional<VideoInfo> video;            /**< the video stream, if there is one */
     std::optional<AudioInfo> audio;            /**< the audio stream, if there is one */
+};
+
+/** A keyframe of the list. */
+struct Keyframe {
+    Milliseconds time{};  /**< from the first timestamp of the file */
+    int64_t position = 0; /**< byte in the file where its tag begins */
 };
 
 /* -------------------------------------------------------------------------------- how it is opened */
@@ -199,7 +262,7 @@ struct Info {
 /** How a file is opened. */
 struct Options {
     uint32_t cache_size = 0;            /**< bytes of each reader's cache; 0: the library's choice */
-    uint32_t scan_read_size = 0;        /**< bytes a read while scanning; 0: the library's choice */
+    uint32_t scan_read_size = 0;        /**< bytes per read while scanning; 0: the library's choice */
     bool separate_audio_reader = false; /**< audio and video are asked for apart, each at its own pace */
     bool growing = false;               /**< the file may still be written: see File::follow() */
     bool index_in_memory = false;       /**< keep the keyframe index in memory: faster seeks */
@@ -208,6 +271,9 @@ struct Options {
     uint8_t* buffer = nullptr;  /**< the caller's frame buffer, which must outlive the file; null: the library's
                                      own, which grows as needed. Frames that do not fit are passed over. */
     uint32_t buffer_size = 0;   /**< its bytes */
+    bool restarting_timestamps = false; /**< deliver all frames, also those later than the file's last timestamp, as a
+                                             recording has whose timestamps start again; times may jump back, and
+                                             nothing can be seeked */
 };
 
 /** How to seek; modes are combined with |. */
@@ -231,14 +297,17 @@ constexpr SeekMode operator|(SeekMode a, SeekMode b)
 
 class FrameRange;
 
-/** An open file. Moved, not copied; closes itself. A File that was moved from or closed answers FLVD_ERR_NO_INSTANCE.
- */
+/** An open file. Moved, not copied; closes itself. */
 class File {
 public:
+    /** A File that is not open. */
+    File() = default;
+
     /**
      * Opens a file through the functions of `host`; they stay the process's, see above. The path is copied.
      * @return the file; Kind::not_yet when a growing file does not hold a file header and the beginning of a stream,
-     *         which more bytes may bring; Kind::failed
+     *         which more bytes may bring; Kind::failed, with the system's reason when it could not be opened;
+     *         FLVD_ERR_HOST_IN_USE, FLVD_ERR_HOST_INCOMPLETE
      * @note What the open did not find is not found later: look at info() for the streams that are awaited, and open
      *       a growing file again while one is missing.
      */
@@ -250,12 +319,9 @@ public:
             return error(Kind::failed, FLVD_ERR_INSTANCE_MEMORY, 0);
         path.copy(file.m_path.get(), path.size());
         file.m_path[path.size()] = '\0';
-        file.m_request = {options.buffer, options.buffer_size, 0};
-        const flvd_init_t init = file.fill_init(host, options);
-        const uint32_t operation = options.for_info_only ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN;
-        const std::lock_guard<std::recursive_mutex> lock(open_mutex);
-        if (QVX_FLV_DMX(operation, &file.m_instance, &init, &file.m_info) != 0)
-            return error(kind_of(g_flvd_lLastError, options.growing), g_flvd_lLastError, g_flvd_lErrorLine);
+        const error failure = file.open_instance(host, options);
+        if (failure.kind() != Kind::none)
+            return failure;
         return result<File>(std::move(file));
     }
 
@@ -278,7 +344,7 @@ public:
     File& operator=(const File&) = delete;
     ~File() { close(); } /**< closes the file */
 
-    /** Closes the file; all views of it end. */
+    /** Closes the file; the data of its frames is gone. */
     void close()
     {
         if (m_instance == nullptr)
@@ -286,7 +352,7 @@ public:
         const std::lock_guard<std::recursive_mutex> lock(open_mutex);
         QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
         m_instance = nullptr;
-        m_info = {};
+        --m_open_files;
     }
 
     bool is_open() const { return m_instance != nullptr; } /**< false when closed or moved from */
@@ -300,30 +366,83 @@ public:
         Info info;
         if (m_instance == nullptr)
             return info;
-        info.path = m_info.file_info->file_name;
-        info.duration = Milliseconds(m_info.file_info->duration_ms);
-        info.size = m_info.file_info->file_size;
-        info.seek_method = static_cast<SeekMethod>(m_info.file_info->seek_method);
-        if (m_info.video_info != nullptr)
-            info.video = describe(*m_info.video_info);
-        if (m_info.audio_info != nullptr)
-            info.audio = describe(*m_info.audio_info);
+        info.path = m_path.get();
+        info.start_time = Milliseconds(m_instance->first_ts);
+        info.duration = Milliseconds(m_instance->duration_ms);
+        info.size = m_instance->file_size;
+        info.seek_method = static_cast<SeekMethod>(m_instance->seek_method);
+        if ((m_instance->streams & FLVD_STREAM_VIDEO) != 0)
+            info.video = describe_video();
+        if ((m_instance->streams & FLVD_STREAM_AUDIO) != 0)
+            info.audio = describe_audio();
         return info;
     }
 
     /**
+     * The script data at the beginning of the file: the script tags among the first 102 tags, of each the first MiB.
+     * Playing goes on where it was.
+     * @return the properties, none when the file has none; Kind::failed
+     */
+    result<Metadata> metadata()
+    {
+        fio_file_t* const reader = reader_of(Stream::any);
+        const result<int64_t> start = leave(reader);
+        if (!start)
+            return start.error();
+        Metadata metadata;
+        if (move_to(reader, m_instance->data_offset))
+            read_script_tags(reader, metadata);
+        go_back(reader, *start);
+        return metadata;
+    }
+
+    /**
+     * All keyframes of the video, those of a growing file so far. They are taken from the keyframe index when the file
+     * is seeked by one, as it tells them; otherwise the whole file is walked, tag by tag. Playing goes on where it was.
+     *
+     * @param progress bool(int64_t reached, int64_t size): called after each keyframe on that walk, with the bytes
+     *                 walked and those of the file, 0 for a growing one; when it returns false the list ends there
+     * @return the keyframes in file order, none without video; Kind::failed
+     */
+    template <typename Progress> result<std::vector<Keyframe>> keyframes(Progress&& progress)
+    {
+        fio_file_t* const reader = reader_of(Stream::any);
+        const result<int64_t> start = leave(reader);
+        if (!start)
+            return start.error();
+        std::vector<Keyframe> list;
+        if ((m_instance->streams & FLVD_STREAM_VIDEO) != 0) {
+            if (m_instance->seek_method == FLVD_SEEK_BY_INDEX)
+                list = read_index(reader);
+            if (list.empty() && move_to(reader, m_instance->data_offset))
+                list = walk_keyframes(reader, progress);
+        }
+        go_back(reader, *start);
+        return list;
+    }
+
+    /** The same without a report of progress. */
+    result<std::vector<Keyframe>> keyframes()
+    {
+        return keyframes([](int64_t, int64_t) { return true; });
+    }
+
+    /**
      * The next frame, as flvd_next_frame() finds it: damaged stretches of any length are crossed.
+     *
+     * A codec configuration that differs from the one before it is reported with the first frame after it; a copy of
+     * the same configuration is not. A seek back to frames that were played before reports theirs again. What a seek
+     * jumps over is not looked at: until playing has passed it, a change in there is not known.
      *
      * @param stream with a separate audio reader video or audio; without one it is not looked at
      * @return the frame; Kind::end, for a growing file Kind::not_yet; Kind::failed
      */
     result<Frame> next_frame(Stream stream = Stream::any)
     {
-        m_request.stream = static_cast<uint32_t>(stream);
-        flvd_frame_t frame{};
-        if (flvd_next_frame(m_instance, &m_request, &frame) != 0)
-            return failure();
-        return describe(frame);
+        result<Frame> frame{Frame()};
+        if (!take(stream, *frame))
+            return m_return.reader != nullptr ? unreadable() : failure();
+        return frame;
     }
 
     /**
@@ -350,6 +469,11 @@ public:
     /**
      * Seeks to a keyframe, without video to an audio frame. After a miss or a failure playing goes on where it was.
      *
+     * At and before time 0 the first tag is gone to, whatever its time. By an index, whose times muxers round or count
+     * from elsewhere, "at or before" holds for the times of the index: the frame can be a few milliseconds later.
+     * A growing file is seeked in only when its timestamps begin at 0, it has video and Options::index_in_memory is
+     * set.
+     *
      * @param time from the first timestamp; with SeekMode::relative from the current position. What does not fit 32
      *             bits counts as the greatest or least time that does.
      * @param mode how to get there
@@ -357,7 +481,10 @@ public:
      */
     result<Milliseconds> seek(Milliseconds time, SeekMode mode = SeekMode::automatic)
     {
-        const flvd_seek_request_t request = {clamp(time), static_cast<uint32_t>(mode)};
+        if (!can_read())
+            return unreadable();
+        m_next = {-1, -1};
+        const flvd_seek_request_t request = {clamp<int32_t>(time.count()), static_cast<uint32_t>(mode)};
         int32_t reached = 0;
         if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) != 0)
             return failure();
@@ -368,14 +495,121 @@ public:
     error last_error() const { return failure(); }
 
 private:
-    File() = default;
+    friend FrameRange; // takes frames without a copy
+
+    // Of a tag (FLV file format, version 10.1, annex E.4).
+    static constexpr uint32_t tag_header_size = 11;
+    static constexpr uint32_t back_pointer_size = 4;
+    static constexpr uint32_t metadata_tags = 102;        // as many as an open looks at
+    static constexpr uint32_t script_data_max = 1u << 20; // bytes read of one script tag
+    static constexpr size_t changes_max = 256;            // configurations remembered
+
+    // A tag header and the five bytes after it, of which a codec header has 1, 2 or 5.
+    class Tag {
+    public:
+        int64_t position = -1; // in the file; -1: no tag
+
+        Tag() = default;
+        // The tag at the reader's position, which is given. None when fewer bytes than a tag has are left.
+        Tag(fio_file_t* reader, int64_t at)
+        {
+            const uint8_t* bytes = reader->cache + reader->head; // seen without a call when it is cached
+            const bool cached = reader->count >= sizeof m_bytes;
+            if (!cached && __FLV_DMX__fioShowBytesByPtr(&bytes, sizeof m_bytes, reader) < sizeof m_bytes)
+                return;
+            std::memcpy(m_bytes, bytes, sizeof m_bytes);
+            position = at;
+        }
+
+        bool is_video() const { return m_bytes[0] == FLVD_TAG_TYPE_VIDEO; }
+        bool is_audio() const { return m_bytes[0] == FLVD_TAG_TYPE_AUDIO; }
+        Stream stream() const { return is_video() ? Stream::video : is_audio() ? Stream::audio : Stream::any; }
+        uint32_t data_size() const { return word(0) & 0xFFFFFF; }
+        uint32_t timestamp() const { return word(4) >> 8 | uint32_t{m_bytes[7]} << 24; }
+        int64_t end() const { return position + tag_header_size + data_size() + back_pointer_size; }
+        bool is_keyframe() const { return is_audio() || m_bytes[11] >> 4 == 1 || m_bytes[11] >> 4 == 4; }
+
+        uint32_t codec_header_size() const { return is_avc() ? 5 : is_aac() ? 2 : 1; }
+        // What the packet type of AVC and AAC says: a configuration, a frame, or neither.
+        bool is_config() const { return (is_avc() || is_aac()) && m_bytes[12] == 0; }
+        bool has_frame() const { return !is_config() && !(is_avc() && m_bytes[12] == 2); }
+        int32_t composition_offset() const
+        {
+            constexpr int32_t sign = 1 << 23;
+            return is_avc() ? (static_cast<int32_t>(word(12) & 0xFFFFFF) ^ sign) - sign : 0;
+        }
+
+        // True when the frame, after which its reader stands at `frame_end`, is that of this tag.
+        bool carries(const flvd_frame_t& frame, int64_t frame_end) const
+        {
+            const uint32_t type = frame.stream == FLVD_STREAM_VIDEO ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
+            return word(0) == (type << 24 | (frame.size + codec_header_size())) && end() == frame_end;
+        }
+
+    private:
+        bool is_avc() const { return is_video() && (m_bytes[11] & 15) == static_cast<uint8_t>(VideoCodec::avc); }
+        bool is_aac() const { return is_audio() && m_bytes[11] >> 4 == static_cast<uint8_t>(AudioCodec::aac); }
+        uint32_t word(size_t at) const
+        {
+            return uint32_t{m_bytes[at]} << 24 | uint32_t{m_bytes[at + 1]} << 16 | uint32_t{m_bytes[at + 2]} << 8 |
+                   m_bytes[at + 3];
+        }
+
+        uint8_t m_bytes[tag_header_size + 5]{};
+    };
+
+    // A configuration that differs from the one before it, and where its tag begins.
+    struct Change {
+        int64_t position;
+        Stream stream;
+        std::vector<uint8_t> config;
+    };
+
+    // Where a reader is to go before it is used again, when it could not be put there at once.
+    struct Return {
+        fio_file_t* reader = nullptr;
+        int64_t position = 0;
+    };
 
     void swap(File& other) noexcept
     {
         std::swap(m_path, other.m_path);
         std::swap(m_instance, other.m_instance);
-        std::swap(m_info, other.m_info);
         std::swap(m_request, other.m_request);
+        std::swap(m_return, other.m_return);
+        std::swap(m_changes, other.m_changes);
+        std::swap(m_given, other.m_given);
+        std::swap(m_next, other.m_next);
+    }
+
+    /* Opening. */
+
+    error open_instance(const Host& host, const Options& options)
+    {
+        m_request = {options.buffer, options.buffer_size, 0};
+        const flvd_init_t init = fill_init(host, options);
+        const uint32_t operation = options.for_info_only ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN;
+        flvd_open_info_t info;
+        const std::lock_guard<std::recursive_mutex> lock(open_mutex);
+        if (!host.is_complete())
+            return {Kind::failed, FLVD_ERR_HOST_INCOMPLETE, 0};
+        if (m_open_files != 0 && host != m_host)
+            return {Kind::failed, FLVD_ERR_HOST_IN_USE, 0};
+        errno = 0;
+        if (QVX_FLV_DMX(operation, &m_instance, &init, &info) != 0)
+            return open_failure(options.growing, errno);
+        m_host = host;
+        ++m_open_files;
+        if (options.restarting_timestamps)
+            accept_all_times();
+        return {};
+    }
+
+    static error open_failure(bool growing, int reason)
+    {
+        const int32_t code = g_flvd_lLastError;
+        const bool refused = code == FLVD_ERR_OPEN_MAIN || code == FLVD_ERR_OPEN_AUDIO;
+        return {kind_of(code, growing), code, g_flvd_lErrorLine, refused ? reason : 0};
     }
 
     static constexpr uint32_t bits_if(bool set, uint32_t bits) { return set ? bits : 0; }
@@ -392,6 +626,15 @@ private:
                        bits_if(options.index_in_memory, FLVD_OPT_INDEX_IN_MEMORY);
         return init;
     }
+
+    // Without a last timestamp a tag may have any; a seek would take it for the end of the file.
+    void accept_all_times()
+    {
+        m_instance->last_ts = 0;
+        m_instance->seek_method = FLVD_SEEK_NONE;
+    }
+
+    /* Failures. */
 
     static Kind kind_of(int32_t code, bool growing)
     {
@@ -410,51 +653,334 @@ private:
         }
     }
 
+    bool is_growing() const { return (m_instance->options & FLVD_OPT_PROGRESSIVE) != 0; }
+
     error failure() const
     {
         if (m_instance == nullptr)
             return {Kind::failed, FLVD_ERR_NO_INSTANCE, 0};
-        const bool growing = (m_instance->options & FLVD_OPT_PROGRESSIVE) != 0;
-        return {kind_of(m_instance->error, growing), m_instance->error, m_instance->error_line};
+        return {kind_of(m_instance->error, is_growing()), m_instance->error, m_instance->error_line};
     }
 
-    // Only a tag before the first timestamp wraps, and every tag that is taken lies at or before the last one.
-    Frame describe(const flvd_frame_t& frame) const
+    /* Moving the readers, which go back to where playing is. */
+
+    fio_file_t* reader_of(Stream stream) const
     {
-        const bool wrapped = m_instance->first_ts != 0 && frame.timestamp_ms > m_instance->duration_ms;
-        const int64_t time = int64_t{frame.timestamp_ms} - (wrapped ? int64_t{1} << 32 : 0);
-        return {static_cast<Stream>(frame.stream), Milliseconds(time), Bytes(frame.data, frame.size)};
+        if (m_instance == nullptr)
+            return nullptr;
+        return stream == Stream::audio ? m_instance->audio_reader : m_instance->main_reader;
     }
 
-    static VideoInfo describe(const flvd_video_info_t& video)
+    static bool move_to(fio_file_t* reader, int64_t position)
     {
-        const size_t fourcc = video.fourcc[0] == '\0' ? 0 : sizeof video.fourcc;
-        return {video.width,
-                video.height,
-                video.frame_rate / 1000.0,
-                {video.fourcc, fourcc},
-                {video.config, video.config_size},
-                Milliseconds(video.last_key_time_ms)};
+        return __FLV_DMX__fioSeek64(reader, position, FIO_SEEK_SET) == 0;
     }
 
-    static AudioInfo describe(const flvd_audio_info_t& audio)
+    void go_back(fio_file_t* reader, int64_t position)
     {
-        return {audio.sample_rate, audio.sample_size, audio.channels,
-                audio.format_tag,  audio.data_rate,   {audio.config, audio.config_size}};
+        m_return = move_to(reader, position) ? Return() : Return{reader, position};
     }
 
-    static int32_t clamp(Milliseconds time)
+    // False when nothing is open or a reader is not where playing is.
+    bool can_read()
     {
-        using Limits = std::numeric_limits<int32_t>;
-        if (time.count() > Limits::max())
+        if (m_return.reader != nullptr)
+            go_back(m_return.reader, m_return.position);
+        return m_instance != nullptr && m_return.reader == nullptr;
+    }
+
+    error unreadable() const { return {Kind::failed, m_instance == nullptr ? FLVD_ERR_NO_INSTANCE : FLVD_ERR_SEEK, 0}; }
+
+    // Where to go back to after the reader was used for something else.
+    result<int64_t> leave(fio_file_t* reader)
+    {
+        if (!can_read())
+            return unreadable();
+        const int64_t position = __FLV_DMX__fioTell64(reader);
+        if (position < 0)
+            return error(Kind::failed, FLVD_ERR_POSITION, 0);
+        return position;
+    }
+
+    // The first tag of a wanted kind from the reader's position on, by the library's own rules.
+    Tag find_tag(fio_file_t* reader, uint32_t wanted) const
+    {
+        flvd_tag_info_t info;
+        if (FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1) != 0)
+            return {};
+        return {reader, __FLV_DMX__fioTell64(reader)};
+    }
+
+    /* Frames. */
+
+    // The next frame, all its fields. False when there is none.
+    bool take(Stream stream, Frame& frame)
+    {
+        if (!can_read())
+            return false;
+        const bool audio = stream == Stream::audio;
+        fio_file_t* const reader = audio ? m_instance->audio_reader : m_instance->main_reader;
+        int64_t begin = std::exchange(m_next[audio ? 1 : 0], -1);
+        if (begin < 0)
+            begin = __FLV_DMX__fioTell64(reader);
+        Tag ahead(reader, begin);
+        if (m_instance->main_reader != m_instance->audio_reader && !go_to_stream(reader, stream, ahead))
+            return false;
+        m_request.stream = static_cast<uint32_t>(stream);
+        flvd_frame_t taken;
+        if (request(taken) != 0)
+            return false;
+        const int64_t end = __FLV_DMX__fioTell64(reader);
+        frame.stream = static_cast<Stream>(taken.stream);
+        frame.time = time_of(taken.timestamp_ms + m_instance->first_ts);
+        frame.data = {taken.data, taken.size};
+        if (!ahead.carries(taken, end))
+            ahead = look_again(taken, reader, ahead.position, end);
+        frame.composition_offset = Milliseconds(ahead.composition_offset());
+        frame.keyframe = ahead.is_keyframe();
+        frame.position = ahead.position;
+        frame.new_config = m_changes.empty() ? Bytes() : changed_config(frame.stream, ahead.position);
+        m_next[audio ? 1 : 0] = end;
+        return true;
+    }
+
+    // Most requests bring a frame: flvd_next_frame only goes on where one does not.
+    int32_t request(flvd_frame_t& frame)
+    {
+        const int32_t result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &m_request, &frame);
+        return result == FLVD_RET_END ? flvd_next_frame(m_instance, &m_request, &frame) : result;
+    }
+
+    // With two readers the tags of the other stream come first: the library would cross them as well, and goes on from
+    // the tag after them. False when the reader is no longer where playing is.
+    [[gnu::noinline]] bool go_to_stream(fio_file_t* reader, Stream stream, Tag& ahead)
+    {
+        const bool found = (m_instance->streams & static_cast<uint32_t>(stream)) != 0;
+        if (!found || ahead.position < 0 || ahead.stream() == stream)
+            return true;
+        const int64_t begin = ahead.position;
+        ahead = find_tag(reader, stream == Stream::video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO);
+        if (ahead.position < 0)
+            go_back(reader, begin);
+        return m_return.reader == nullptr;
+    }
+
+    // Of a file timestamp. One before the first is negative.
+    Milliseconds time_of(uint32_t timestamp) const
+    {
+        return Milliseconds(int64_t{timestamp} - int64_t{m_instance->first_ts});
+    }
+
+    // After a frame before which tags were passed over: its tag, and what configurations are between. `from` is where
+    // the reader stood before, `end` where it stands now.
+    [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, fio_file_t* reader, int64_t from, int64_t end)
+    {
+        const Tag tag = tag_before(frame, reader, end);
+        if (from >= 0 && from < tag.position && move_to(reader, from))
+            learn_configs(reader, tag.position);
+        go_back(reader, end);
+        return tag;
+    }
+
+    // The tag that ends at `end` and carries the frame.
+    static Tag tag_before(const flvd_frame_t& frame, fio_file_t* reader, int64_t end)
+    {
+        for (const uint32_t codec_header : {5U, 2U, 1U}) {
+            const int64_t begin = end - back_pointer_size - frame.size - codec_header - tag_header_size;
+            const Tag tag = begin >= 0 && move_to(reader, begin) ? Tag(reader, begin) : Tag();
+            if (tag.carries(frame, end))
+                return tag;
+        }
+        return {};
+    }
+
+    void learn_configs(fio_file_t* reader, int64_t end)
+    {
+        for (int64_t reached = -1;;) {
+            const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO);
+            if (tag.position <= reached || tag.position >= end)
+                return;
+            if (tag.is_config())
+                learn_config(reader, tag);
+            reached = tag.position;
+            if (!move_to(reader, tag.end()))
+                return;
+        }
+    }
+
+    // One that does not fit the cache of the reader is none: they have a few dozen bytes.
+    void learn_config(fio_file_t* reader, const Tag& tag)
+    {
+        const uint32_t headers = tag_header_size + tag.codec_header_size();
+        const uint32_t size = tag_header_size + tag.data_size();
+        const uint8_t* bytes = nullptr;
+        if (size <= headers || __FLV_DMX__fioShowBytesByPtr(&bytes, size, reader) < size)
+            return;
+        const Bytes config(bytes + headers, size - headers);
+        const Bytes before = config_at(change_at(tag.stream(), tag.position), tag.stream());
+        if (std::equal(config.begin(), config.end(), before.begin(), before.end()))
+            return;
+        if (m_changes.size() == changes_max)
+            m_changes.erase(m_changes.begin());
+        const auto is_later = [&tag](const Change& change) { return change.position > tag.position; };
+        m_changes.insert(std::find_if(m_changes.begin(), m_changes.end(), is_later),
+                         {tag.position, tag.stream(), {config.begin(), config.end()}});
+    }
+
+    // The last change of a stream before a position; null: the configuration that the open found still holds.
+    const Change* change_at(Stream stream, int64_t position) const
+    {
+        const Change* last = nullptr;
+        for (const Change& change : m_changes)
+            if (change.stream == stream && change.position <= position)
+                last = &change;
+        return last;
+    }
+
+    Bytes config_at(const Change* change, Stream stream) const
+    {
+        if (change != nullptr)
+            return {change->config.data(), change->config.size()};
+        return stream == Stream::video ? Bytes(m_instance->video_info.config, m_instance->video_info.config_size)
+                                       : Bytes(m_instance->audio_info.config, m_instance->audio_info.config_size);
+    }
+
+    // The configuration of a frame, when it is not the one that was given last.
+    [[gnu::noinline]] Bytes changed_config(Stream stream, int64_t position)
+    {
+        const Change* const change = change_at(stream, position);
+        int64_t& given = m_given[stream == Stream::video ? 0 : 1];
+        const int64_t now = change != nullptr ? change->position : -1;
+        if (position < 0 || now == given)
+            return {};
+        given = now;
+        return config_at(change, stream);
+    }
+
+    /* What the file says of itself. */
+
+    VideoInfo describe_video() const
+    {
+        const flvd_video_info_t& video = m_instance->video_info;
+        VideoInfo info;
+        info.codec = static_cast<VideoCodec>(m_instance->video_codec_filter & 15); // the low half of the codec byte
+        info.width = video.width;
+        info.height = video.height;
+        info.frame_rate = video.frame_rate / 1000.0;
+        if (video.fourcc[0] != '\0')
+            info.fourcc.assign(video.fourcc, sizeof video.fourcc);
+        info.config.assign(video.config, video.config + video.config_size);
+        info.last_keyframe = Milliseconds(video.last_key_time_ms);
+        return info;
+    }
+
+    AudioInfo describe_audio() const
+    {
+        const flvd_audio_info_t& audio = m_instance->audio_info;
+        AudioInfo info;
+        info.codec = static_cast<AudioCodec>(m_instance->audio_format_filter >> 4 & 15); // the high half
+        info.sample_rate = audio.sample_rate;
+        info.sample_size = audio.sample_size;
+        info.channels = audio.channels;
+        info.format_tag = audio.format_tag;
+        info.data_rate = audio.data_rate;
+        info.config.assign(audio.config, audio.config + audio.config_size);
+        return info;
+    }
+
+    void read_script_tags(fio_file_t* reader, Metadata& metadata) const
+    {
+        for (uint32_t tags = 0; tags < metadata_tags; ++tags) {
+            const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT);
+            if (tag.position < 0)
+                return;
+            if (tag.stream() == Stream::any)
+                read_script_tag(reader, tag, metadata);
+            if (!move_to(reader, tag.end()))
+                return;
+        }
+    }
+
+    static void read_script_tag(fio_file_t* reader, const Tag& tag, Metadata& metadata)
+    {
+        std::vector<uint8_t> payload(std::min(tag.data_size(), script_data_max));
+        __FLV_DMX__fioSkipBytes(tag_header_size, reader);
+        const uint32_t size = __FLV_DMX__fioRead(payload.data(), 1, static_cast<uint32_t>(payload.size()), reader);
+        metadata.add_script_data({payload.data(), size});
+    }
+
+    template <typename Progress> std::vector<Keyframe> walk_keyframes(fio_file_t* reader, Progress& progress) const
+    {
+        std::vector<Keyframe> list;
+        for (int64_t reached = -1;;) {
+            flvd_tag_info_t info;
+            const uint32_t wanted = FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME;
+            const bool found = FLVD_MoveToNextTag(m_instance, reader, &info, wanted, nullptr) == 0;
+            const int64_t position = __FLV_DMX__fioTell64(reader);
+            if (position <= reached || (!found && position >= m_instance->data_end))
+                return list; // else the walk crosses damage
+            reached = position;
+            const Tag tag = found ? Tag(reader, position) : Tag();
+            if (tag.position < 0 || !tag.has_frame())
+                continue;
+            list.push_back({time_of(tag.timestamp()), position});
+            if (!progress(position, m_instance->file_size))
+                return list;
+        }
+    }
+
+    std::vector<Keyframe> read_index(fio_file_t* reader) const
+    {
+        std::vector<Keyframe> list;
+        const flvd_keyframe_arrays_t& arrays = m_instance->keyframe_arrays;
+        for (size_t i = 0; i < std::min(arrays.times_count, arrays.positions_count); ++i)
+            list.push_back({time_of(arrays.times_ms[i]), arrays.positions[i]});
+        if (!list.empty())
+            return list;
+        const flvd_keyframe_index_t& index = m_instance->keyframe_index;
+        const std::vector<double> times = read_numbers(reader, index.times_offset, index.entry_count);
+        const std::vector<double> positions = read_numbers(reader, index.positions_offset, index.entry_count);
+        for (size_t i = 0; i < std::min(times.size(), positions.size()); ++i)
+            list.push_back({time_of(clamp<uint32_t>(times[i] * 1000.0)), clamp<int64_t>(positions[i])});
+        return list;
+    }
+
+    // Up to `count` elements of a strict array of AMF0; what is no number ends it.
+    static std::vector<double> read_numbers(fio_file_t* reader, int64_t from, uint32_t count)
+    {
+        constexpr size_t element_size = 1 + sizeof(double); // marker 0, big-endian number
+        std::vector<double> numbers;
+        uint8_t element[element_size];
+        if (from <= 0 || !move_to(reader, from))
+            return numbers;
+        while (numbers.size() < count && __FLV_DMX__fioRead(element, element_size, 1, reader) == 1 && element[0] == 0) {
+            uint64_t bits = 0;
+            for (size_t i = 1; i < element_size; ++i)
+                bits = bits << 8 | element[i];
+            std::memcpy(&numbers.emplace_back(), &bits, sizeof bits);
+        }
+        return numbers;
+    }
+
+    // What does not fit becomes the greatest or least number that does, what is no number the least.
+    template <typename To, typename From> static To clamp(From value)
+    {
+        using Limits = std::numeric_limits<To>;
+        if (value >= static_cast<From>(Limits::max()))
             return Limits::max();
-        return time.count() < Limits::min() ? Limits::min() : static_cast<int32_t>(time.count());
+        return value > static_cast<From>(Limits::min()) ? static_cast<To>(value) : Limits::min();
     }
+
+    inline static Host m_host = make_host(nullptr); // of the files that are open, both under open_mutex
+    inline static size_t m_open_files = 0;
 
     std::unique_ptr<char[]> m_path; // the library keeps the address
     flvd_ctx_t* m_instance = nullptr;
-    flvd_open_info_t m_info{};
     flvd_frame_request_t m_request{};
+    Return m_return;
+    std::vector<Change> m_changes;          // in file order
+    std::array<int64_t, 2> m_given{-1, -1}; // positions of the changes that video and audio had last; -1: none
+    std::array<int64_t, 2> m_next{-1, -1};  // where the main and the audio reader stand, when that is known; else -1
 };
 
 /** The frames of a file from where it stands, for one range-for. */
@@ -466,17 +992,17 @@ public:
     /** The place in the range; all of them of one range are the same place. */
     class Iterator {
     public:
-        explicit Iterator(FrameRange* range) : m_range(range) {}       /**< of a range whose frame was taken */
-        const Frame& operator*() const { return *m_range->m_frame; }   /**< the frame */
-        const Frame* operator->() const { return &*m_range->m_frame; } /**< of the frame */
+        explicit Iterator(FrameRange* range) : m_range(range) {}      /**< of a range whose frame was taken */
+        const Frame& operator*() const { return m_range->m_frame; }   /**< the frame; an empty one after the last */
+        const Frame* operator->() const { return &m_range->m_frame; } /**< of the frame */
         /** Takes the next frame. */
         Iterator& operator++()
         {
             m_range->advance();
             return *this;
         }
-        bool operator!=(Sentinel) const { return static_cast<bool>(m_range->m_frame); } /**< true at a frame */
-        bool operator==(Sentinel) const { return !m_range->m_frame; }                   /**< true behind the last */
+        bool operator!=(Sentinel) const { return m_range->m_has_frame; }  /**< true at a frame */
+        bool operator==(Sentinel) const { return !m_range->m_has_frame; } /**< true after the last */
 
     private:
         FrameRange* m_range;
@@ -492,11 +1018,17 @@ public:
     static Sentinel end() { return {}; } /**< where every range ends */
 
 private:
-    void advance() { m_frame = m_file.next_frame(m_stream); }
+    void advance()
+    {
+        m_has_frame = m_file.take(m_stream, m_frame);
+        if (!m_has_frame)
+            m_frame = Frame();
+    }
 
     File& m_file;
     Stream m_stream;
-    result<Frame> m_frame = flvdmx::error();
+    Frame m_frame;
+    bool m_has_frame = false;
 };
 
 inline FrameRange File::frames(Stream stream) &

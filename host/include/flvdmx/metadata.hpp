@@ -1,0 +1,266 @@
+/*
+ * The metadata of a file as flvdmx::File::metadata() returns it: the properties of its script data, read as AMF0
+ * ("Action Message Format, AMF 0"). Usable from C++17.
+ */
+#ifndef FLVDMX_METADATA_HPP
+#define FLVDMX_METADATA_HPP
+
+#include "flvdmx/result.hpp"
+
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <variant>
+#include <vector>
+
+namespace flvdmx {
+
+/** A date of the metadata. */
+struct Date {
+    double milliseconds = 0;  /**< since the beginning of 1970, UTC; as the file says, which may be no number */
+    int16_t zone_minutes = 0; /**< what the file says of the time zone, mostly 0; not part of `milliseconds` */
+};
+
+/** One property. */
+struct Property {
+    std::string name;                                    /**< nested names joined by dots: "cuePoints.0.name" */
+    std::variant<double, bool, std::string, Date> value; /**< text is UTF-8 when the file keeps the rules */
+};
+
+/**
+ * Properties in file order: title, creator, encoder and the like. Those of "onMetaData" go by their bare names, those
+ * of other script data by a name that begins with that of the data; elements of arrays are numbered from 0. The
+ * keyframe index is left out: see File::keyframes().
+ *
+ * Whatever the file holds, there are at most 1000 properties, 16 levels deep, with at most 1 MiB of names and texts;
+ * what comes after that is left out.
+ */
+class Metadata {
+public:
+    static constexpr size_t max_properties = 1000; /**< kept */
+    static constexpr size_t max_text = 1u << 20;   /**< bytes of names and texts kept */
+    static constexpr int max_depth = 16;           /**< levels of objects and arrays followed */
+
+    std::vector<Property>::const_iterator begin() const { return m_properties.begin(); } /**< the first property */
+    std::vector<Property>::const_iterator end() const { return m_properties.end(); }     /**< after the last */
+    size_t size() const { return m_properties.size(); }                                  /**< their number */
+
+    /** @return the first property of that name, null without one; valid while the Metadata lives */
+    const Property* find(std::string_view name) const
+    {
+        for (const Property& property : m_properties)
+            if (property.name == name)
+                return &property;
+        return nullptr;
+    }
+
+    /** @return the text of the property of that name; empty when there is none or when it is no text */
+    std::string_view text(std::string_view name) const
+    {
+        const Property* const property = find(name);
+        const auto* const value = property != nullptr ? std::get_if<std::string>(&property->value) : nullptr;
+        return value != nullptr ? std::string_view(*value) : std::string_view();
+    }
+
+    /** Adds the properties of one script tag. What is damaged or cut short ends it; the properties before that count.
+     */
+    void add_script_data(Bytes payload)
+    {
+        Reader reader(*this, payload);
+        while (reader.read_event())
+            ;
+    }
+
+private:
+    // Reads AMF0 values. Whatever cannot be read ends the payload.
+    class Reader {
+    public:
+        Reader(Metadata& metadata, Bytes payload) : m_metadata(metadata), m_rest(payload) {}
+
+        // One value that is not inside another. A text there names the values after it.
+        bool read_event()
+        {
+            if (m_rest[0] != string)
+                return read_value(0);
+            take(1);
+            m_name = take_text(2);
+            if (m_name == "onMetaData")
+                m_name.clear();
+            return !m_failed;
+        }
+
+    private:
+        // Type markers.
+        static constexpr uint8_t number = 0, boolean = 1, string = 2, object = 3, null = 5, undefined = 6,
+                                 reference = 7, ecma_array = 8, object_end = 9, strict_array = 10, date = 11,
+                                 long_string = 12, unsupported = 13, xml_document = 15, typed_object = 16;
+
+        // The next bytes; none when there are not so many, and the payload has ended.
+        Bytes take(size_t size)
+        {
+            m_failed = m_failed || size > m_rest.size();
+            const Bytes taken(m_rest.data(), m_failed ? 0 : size);
+            m_rest = m_failed ? Bytes() : Bytes(m_rest.data() + size, m_rest.size() - size);
+            return taken;
+        }
+
+        uint64_t take_integer(size_t size)
+        {
+            uint64_t value = 0;
+            for (const uint8_t byte : take(size))
+                value = value << 8 | byte;
+            return value;
+        }
+
+        double take_number()
+        {
+            const uint64_t bits = take_integer(sizeof(double));
+            double value = 0;
+            static_assert(sizeof value == sizeof bits);
+            std::memcpy(&value, &bits, sizeof value);
+            return value;
+        }
+
+        Date take_date()
+        {
+            const double milliseconds = take_number();
+            return {milliseconds, static_cast<int16_t>(take_integer(2))};
+        }
+
+        // A text after its length, which has so many bytes.
+        std::string_view take_text(size_t length_size)
+        {
+            const Bytes text = take(static_cast<size_t>(take_integer(length_size)));
+            return {reinterpret_cast<const char*>(text.data()), text.size()};
+        }
+
+        bool keep_text(size_t length_size)
+        {
+            const std::string_view text = take_text(length_size);
+            return keep(std::string(text), text.size());
+        }
+
+        // False when there is no room, which ends the payload as well.
+        template <typename Value> bool keep(Value value, size_t text_size = 0)
+        {
+            if (m_failed || m_skips)
+                return !m_failed;
+            const size_t size = m_name.size() + text_size;
+            if (m_metadata.size() == max_properties || size > max_text - m_metadata.m_text)
+                return false;
+            m_metadata.m_text += size;
+            m_metadata.m_properties.push_back({m_name, std::move(value)});
+            return true;
+        }
+
+        bool pass(size_t size)
+        {
+            take(size);
+            return !m_failed;
+        }
+
+        bool read_member(std::string_view key, int depth)
+        {
+            const size_t outer = m_name.size();
+            if (outer != 0)
+                m_name += '.';
+            m_name.append(key);
+            const bool read = read_value(depth);
+            m_name.resize(outer);
+            return read;
+        }
+
+        // Members up to an empty name with the end marker.
+        bool read_object(int depth)
+        {
+            while (!m_failed) {
+                const std::string_view key = take_text(2);
+                if (key.empty() && m_rest[0] == object_end)
+                    return pass(1);
+                if (!read_member(key, depth))
+                    return false;
+            }
+            return false;
+        }
+
+        bool read_array(int depth)
+        {
+            const uint64_t count = take_integer(4);
+            for (uint64_t i = 0; i < count; ++i)
+                if (!read_member(std::to_string(i), depth))
+                    return false;
+            return !m_failed;
+        }
+
+        bool read_members(uint8_t marker, int depth)
+        {
+            if (marker == strict_array)
+                return read_array(depth);
+            if (marker == ecma_array)
+                take(4); // a count that need not be right
+            if (marker == typed_object)
+                take_text(2);
+            return read_object(depth);
+        }
+
+        bool read_container(uint8_t marker, int depth)
+        {
+            if (depth == max_depth)
+                return false;
+            const bool skipped = std::exchange(m_skips, m_skips || m_name == "keyframes"); // numbers by the thousand
+            const bool read = read_members(marker, depth + 1);
+            m_skips = skipped;
+            return read;
+        }
+
+        bool read_value(int depth)
+        {
+            const Bytes marker = take(1);
+            if (m_failed)
+                return false;
+            switch (marker[0]) {
+            case number:
+                return keep(take_number());
+            case boolean:
+                return keep(take_integer(1) != 0);
+            case string:
+                return keep_text(2);
+            case long_string:
+            case xml_document:
+                return keep_text(4);
+            case date:
+                return keep(take_date());
+            case object:
+            case ecma_array:
+            case strict_array:
+            case typed_object:
+                return read_container(marker[0], depth);
+            case reference:
+                return pass(2);
+            case null:
+            case undefined:
+            case unsupported:
+            case object_end:
+                return true;
+            default:
+                return false;
+            }
+        }
+
+        Metadata& m_metadata;
+        Bytes m_rest;
+        std::string m_name; // of the value being read, those of the containers around it included
+        bool m_skips = false;
+        bool m_failed = false;
+    };
+
+    std::vector<Property> m_properties;
+    size_t m_text = 0;
+};
+
+} // namespace flvdmx
+
+#endif /* FLVDMX_METADATA_HPP */
