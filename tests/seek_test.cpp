@@ -216,10 +216,10 @@ TEST(Seek, LandsWhereTheRulesSay)
         all.emplace_back(flv);
     for (const Media& media : all)
         for (const uint32_t options : {ONE, TWO, INDEX, INDEX | TWO, GROWING, GROWING | TWO})
-            for (const uint32_t quantum : {0u, 4096u}) { // of scanning: the usual one, the whole cache
+            for (const uint32_t read_size : {0u, 4096u}) { // of scanning: the usual one, the whole cache
                 SCOPED_TRACE(testing::PrintToString(std::pair(&media - all.data(), options)));
                 if (media.by_index ? (options & GROWING) == 0 || media.first_ts == 0 : (options | TWO) == TWO)
-                    SeekAround(media, {options, false, 0, quantum});
+                    SeekAround(media, {options, false, 0, read_size});
             }
 }
 

@@ -44,10 +44,10 @@ struct Reader {
     flvd_tag_info_t info{};
     uint32_t kind = 0;
 
-    explicit Reader(const Bytes& bytes, uint32_t cache = CACHE, uint32_t quantum = 0)
+    explicit Reader(const Bytes& bytes, uint32_t cache = CACHE, uint32_t read_size = 0)
         : host(bytes), file(host.open_reader({cache}))
     {
-        __FLV_DMX__fioSetCacheReadSize(file, quantum);
+        __FLV_DMX__fioSetCacheReadSize(file, read_size);
         ctx.cache_size = cache;
         ctx.data_offset = static_cast<int32_t>(DATA_OFFSET);
         ctx.data_end = end = static_cast<int64_t>(bytes.size());
@@ -372,27 +372,27 @@ TEST(HostCalls, OfTheBackPointerCheck)
     const struct {
         const char* what;
         size_t size;
-        std::string log;                    // begins so; no seek follows
-        uint32_t quantum = 0, most = CACHE; // of each read
+        std::string log;                      // begins so; no seek follows
+        uint32_t read_size = 0, most = CACHE; // of each read
     } rows[] = {
         {.what = "cached", .size = 100, .log = cache + "230 tell64()=243"},
         {.what = "as large as the cache", .size = 4081, .log = whole},
         {.what = "one byte larger", .size = 4082, .log = whole + " read(1)=1" + back},
         {.what = "larger", .size = 5000, .log = whole + " seek64(915,1)=0 read(4)=4" + back},
         {.what = "in short reads", .size = 100, .log = cut, .most = 50},
-        {.what = "narrow reads", .size = 100, .log = narrow, .quantum = 16},
-        {.what = "narrower than a header", .size = 100, .log = narrower, .quantum = 5},
+        {.what = "narrow reads", .size = 100, .log = narrow, .read_size = 16},
+        {.what = "narrower than a header", .size = 100, .log = narrower, .read_size = 5},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        Reader r(Zeros(FIRST_TAG) + AudioTag(row.size) + VideoTag(), CACHE, row.quantum);
+        Reader r(Zeros(FIRST_TAG) + AudioTag(row.size) + VideoTag(), CACHE, row.read_size);
         r.at(FIRST_TAG).host.limit_reads(row.most);
         r.host.start_log();
         EXPECT_EQ(FLVD_GetCurrTagInfo(&r.ctx, r.file, &r.info, AUDIO, 1), 0);
         const std::string calls = r.host.take_log();
         EXPECT_EQ(calls.substr(0, row.log.size()), row.log);
         EXPECT_EQ(calls.find("seek", row.log.size()), std::string::npos);
-        EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), row.quantum != 0 ? row.quantum : CACHE);
+        EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), row.read_size != 0 ? row.read_size : CACHE);
     }
 }
 
@@ -406,18 +406,8 @@ TEST(HostCalls, ASeekBackToATagOrPastItIsTriedOnce)
         uint64_t seek; // that fails, and is the last
         int32_t rc;
     } rows[] = {
-        {.what = "back, describing",
-         .step = &Reader::verify,
-         .from = FIRST_TAG,
-         .wanted = AUDIO,
-         .seek = 2,
-         .rc = NOT_FOUND},
-        {.what = "back, stepping",
-         .step = &Reader::next,
-         .from = DATA_OFFSET,
-         .wanted = AUDIO,
-         .seek = 3,
-         .rc = NOT_FOUND},
+        {.what = "back to it", .step = &Reader::verify, .from = FIRST_TAG, .wanted = AUDIO, .seek = 2, .rc = NOT_FOUND},
+        {.what = "stepping", .step = &Reader::next, .from = DATA_OFFSET, .wanted = AUDIO, .seek = 3, .rc = NOT_FOUND},
         {.what = "past it", .step = &Reader::trust, .from = FIRST_TAG, .wanted = VIDEO, .seek = 1, .rc = ENDED},
     };
     for (const auto& row : rows) {

@@ -14,11 +14,10 @@ namespace {
 
 constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20;
-constexpr uint64_t REQUEST_CHECKS = 16384;               // that may fail in one request, in all its turns together
-constexpr uint64_t REQUEST_TURNS = 102;                  // of one request
-constexpr uint64_t MOST_CALLS = 100000;                  // of one request, on any file
-constexpr uint64_t TAIL_CURSORS = MIB + 256;             // places tried in the search for the last tag
-constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000; // of valid files; the cache does not hold BIG
+constexpr uint64_t REQUEST_CHECKS = 16384, REQUEST_TURNS = 102; // checks may fail in all turns of a request together
+constexpr uint64_t MOST_CALLS = 100000;                         // of one request, on the worst file that we know
+constexpr uint64_t TAIL_CURSORS = MIB + 256;                    // places tried in the search for the last tag
+constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000;        // of valid files; the cache does not hold BIG
 
 struct Cost {
     uint64_t calls = 0, bytes = 0;
@@ -32,11 +31,11 @@ Cost operator*(uint64_t n, Cost a)
     return {n * a.calls, n * a.bytes};
 }
 
-constexpr Cost FALSE_HEADER = {5, 0}; // position, skip to the back-pointer, its read, seek back, read; bytes: Forward()
-constexpr Cost TAG = {5, 0};          // cached: two position queries, two of the end, one for its share of the caches
-constexpr Cost LARGE_TAG = {10, 2 * CACHE + NARROW}; // also skip, read, seek back and two reads: it is looked at first
-constexpr Cost WALKED_TAG = {12, 6 * NARROW};        // in a seek by scanning: each way two looks, with a seek for each
-constexpr Cost AT_END = {5 * REQUEST_TURNS, 0};      // end flag, position, read, skip over nothing, which is a seek
+constexpr Cost FALSE_HEADER = {5, 0}; // position, seek to its back-pointer, read, seek back, refill; bytes: Forward()
+constexpr Cost TAG = {5, 0};          // positions before and after it; at a refill two queries of the end and a read
+constexpr Cost LARGE_TAG = {10, 2 * CACHE + NARROW}; // also to its back-pointer and back, a refill each
+constexpr Cost WALKED_TAG = {12, 6 * NARROW};        // in a seek by scanning: three looks each way, a seek for each
+constexpr Cost AT_END = {5 * REQUEST_TURNS, 0};      // twice the end, position, read, seek past the end
 constexpr uint64_t FEW = 100;                        /**< tags that every file has */
 
 /** Going forward over so many bytes, of which some begin false headers, and over a few tags. */
@@ -46,9 +45,9 @@ Cost Forward(uint64_t bytes, uint64_t false_headers = 0, uint64_t cache = CACHE)
            false_headers * FALSE_HEADER + FEW * WALKED_TAG;
 }
 /** Going backward, byte by byte. */
-Cost Backward(uint64_t bytes, uint64_t quantum = NARROW)
+Cost Backward(uint64_t bytes, uint64_t read_size = NARROW)
 {
-    return bytes * Cost{4, 2 * std::max(quantum, NARROW)};
+    return bytes * Cost{4, 2 * std::max(read_size, NARROW)};
 }
 
 struct WorkCase {
@@ -89,12 +88,12 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
 }
 
 /** Bytes whose every fourth place leads back a little, then audio alone; that several times. */
-WorkCase Slide(const char* name, size_t size, uint64_t quantum, size_t times = 1)
+WorkCase Slide(const char* name, size_t size, uint64_t read_size, size_t times = 1)
 {
     const Bytes stretch = Concat({Repeat({0, 0, 0, 15}, size), MakeChain({false, true}).body()});
     const Bytes file = Concat({MakeChain().bytes, Repeat(stretch, times * stretch.size())});
-    const Cost pass = Forward(file.size()), back = times * Backward(size + 256, quantum);
-    return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * quantum}, quantum};
+    const Cost pass = Forward(file.size()), back = times * Backward(size + 256, read_size);
+    return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * read_size}, read_size};
 }
 
 /** Many valid tags. The index, when there is one, leads past the end of the file. */
