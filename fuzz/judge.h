@@ -16,7 +16,7 @@ using namespace flvd_test;
 void require(bool holds, const char* what);
 
 /**
- * What the fuzzer gave: a payload, control bytes, and in the last byte their number. The payload stands in front so
+ * What the fuzzer gave: a payload, control bytes, and in the last byte their number. The payload comes first so
  * that its offsets stay when commands are added.
  */
 class Input {

@@ -1,6 +1,6 @@
 // Tag navigation against a second writing of its rules over a plain array: every call must give the same result, tag
 // and place. The host is honest, the description of the file is whatever the input says. The second writing has no
-// cache and no budgets: no input is long enough for one.
+// cache and no budgets: no input is long enough for 1 MiB without a tag or for 16,384 checks that fail.
 
 #include "judge.h"
 
@@ -9,9 +9,9 @@ using namespace flvd_fuzz;
 namespace {
 
 constexpr uint32_t ANY_CODEC = 0xFFFF;
-constexpr int64_t BEYOND = 64; // how far behind the end of the file a reader is put
+constexpr int64_t BEYOND = 64; // how far past the end of the file a reader is put
 constexpr flvd_tag_info_t UNTOUCHED = {0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A};
-constexpr int32_t UNKNOWN = 1; // the host was asked to go in front of the file: nothing is said of what follows
+constexpr int32_t UNKNOWN = 1; // the host was asked to go before the file: nothing is said of what follows
 
 struct Found {
     int32_t rc = FLVD_ERR_END_OF_DATA;
@@ -90,7 +90,7 @@ private:
             ++position;
         return read_tag(m_file, position, &tag) ? position : std::max(position, m_host.visible());
     }
-    // Behind the tag when it is one, else where the next may be.
+    // After the tag when it is one, else where the next may be.
     int64_t pass(int64_t position, const FileTag& tag, bool verify) const
     {
         return taken(position, tag, verify) ? position + 15 + tag.size : scan(position + 1);

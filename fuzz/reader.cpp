@@ -1,5 +1,5 @@
-// The cached file and its bit reader against a plain array and a bit position: whatever the cache, the quantum and the
-// order of calls, they must be the same.
+// The cached file and its bit reader against a plain array and a bit position: whatever the cache, the read size and
+// the order of calls, they must be the same.
 
 #include "judge.h"
 
@@ -21,7 +21,7 @@ public:
 
     void call(uint8_t code, uint32_t n)
     {
-        m_host.begin(1200); // over-reading by a quantum of one byte costs a call for each
+        m_host.begin(1200); // over-reading with a read size of one byte costs a call for each byte
         apply(code, n);
         require(__FLV_DMX__fioTell64(m_file) == m_position, "another position");
         require(uint64_t{m_file->head} + m_file->count <= m_room, "more cached than there is room for");
@@ -59,7 +59,7 @@ private:
             return seek(code / 8 % 3, n);
         case 4:
             return require((__FLV_DMX__fioSetCacheReadSize(m_file, n % 80) == 1) == (n % 80 <= m_file->capacity),
-                           "quantum");
+                           "the read size");
         case 5:
             __FLV_DMX__bitInit(m_file);
             m_bits_valid = m_room >= BIT_READER_CACHE;

@@ -21,14 +21,14 @@ Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length
     host.begin(2000 + 30 * host.contents().size());
     const int32_t rc = FLVD_ReadMetadata(&ctx, length);
     require(rc == 0 || rc == -1, "a result that reading of metadata has not");
-    require(host.position(ctx.cur_reader) == int64_t{START} + length, "the reader is not behind the payload");
+    require(host.position(ctx.cur_reader) == int64_t{START} + length, "the reader is not after the payload");
 
     const auto& [index, arrays] = std::tie(ctx.keyframe_index, ctx.keyframe_arrays);
-    const auto end = host.visible() + 5; // a key in the last bytes announces an array behind them
+    const auto end = host.visible() + 5; // a key in the last bytes announces an array after them
     require(index.times_offset <= end && index.positions_offset <= end, "an index outside the file");
     require(arrays.times_count <= length && arrays.positions_count <= length, "an array larger than the payload");
     const bool kept = (options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
-    require(kept || arrays.times_ms == nullptr, "an index in memory that was not asked for");
+    require(kept || arrays.times_ms == nullptr, "an index in memory that was not requested");
     const Bytes values = Concat({bytes_of(rc), copy_of(arrays.times_ms, arrays.times_count * sizeof *arrays.times_ms),
                                  copy_of(arrays.positions, arrays.positions_count * sizeof *arrays.positions)});
     init.mem_free(arrays.times_ms);
@@ -44,10 +44,10 @@ void run(Input& input)
 {
     Bytes file = Concat({Bytes(START, 0x11), input.payload()});
     const uint32_t options = input.byte() & 0x0Fu;
-    const uint32_t behind = input.byte(); // bytes of the file that are not the payload's
+    const uint32_t more = input.byte(); // bytes of the file that are not the payload's
     const uint32_t cache_size = 256u + 16u * input.byte();
     const auto size = static_cast<uint32_t>(input.payload().size());
-    const uint32_t length = behind < size ? size - behind : size + behind + 1;
+    const uint32_t length = more < size ? size - more : size + more + 1;
     Host host(std::move(file));
     require(outcome(host, options, 4096, length) == outcome(host, options, cache_size, length),
             "values that depend on the cache");

@@ -13,7 +13,7 @@ using namespace flvd_fuzz;
 
 namespace {
 
-constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // frames asked for behind the commands
+constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // frames requested after the commands
 constexpr uint64_t PATIENCE = 2000; // of most hosts that lie: they may lead through whole budgets, which takes long
 constexpr uint64_t BUDGETS = 30'000'000; // calls that a patient one may cost
 constexpr uint8_t POISON = 0x5A;
@@ -139,14 +139,14 @@ private:
     }
 
     // While calls fail the way over the back-pointer may have failed too: then the tag may be anywhere.
-    void judge_frame(const flvd_frame_t& frame, int64_t behind) const
+    void judge_frame(const flvd_frame_t& frame, int64_t end) const
     {
         require(m_buffer.empty() || (frame.data == m_buffer.data() && frame.size <= m_buffer.size()), "another buffer");
         copy_of(frame.data, frame.size);
-        behind = m_faulty ? m_host.visible() : behind;
-        while (m_faulty && behind > 0 && !is_tag_of(frame, behind))
-            --behind;
-        require(m_lied || is_tag_of(frame, behind), "a frame that is not a tag of the file");
+        end = m_faulty ? m_host.visible() : end;
+        while (m_faulty && end > 0 && !is_tag_of(frame, end))
+            --end;
+        require(m_lied || is_tag_of(frame, end), "a frame that is not a tag of the file");
     }
 
     // Whether the file holds this frame, as the data of a tag of its kind, size and time that ends there.

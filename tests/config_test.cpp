@@ -101,11 +101,10 @@ TEST(VideoConfig, IsWhatTheTableSays)
 // What an open learns of the stream of some tags of a type: codec, sizes, bytes of its configuration.
 std::string Probe(uint8_t type, const std::vector<Bytes>& tags)
 {
-    FlvBuilder builder;
-    builder.add(type == 9 ? Pcm(0) : Screen(0));
+    Tags all = {type == 9 ? Pcm(0) : Screen(0)};
     for (const Bytes& data : tags)
-        builder.add({type, 0, data});
-    FakeHost host(builder.build().bytes);
+        all.push_back({type, 0, data});
+    FakeHost host(File(all).bytes);
     Session session(host);
     EXPECT_TRUE(session.opened());
     const auto& [video, audio] = std::tie(session.ctx()->video_info, session.ctx()->audio_info);
@@ -272,7 +271,7 @@ TEST(ScriptValue, IsBounded)
 TEST(KeyframeIndex, DecidesHowToSeekAndTheLastTime)
 {
     const auto expect = [](const std::string& indices, uint32_t method, uint32_t last, uint32_t options = 0) {
-        FakeHost host(FlvBuilder(4).metadata(indices).add(Pcm(5)).build().bytes);
+        FakeHost host(File({{18, 0, OnMetaData(indices)}, Pcm(5)}, 4).bytes);
         const Session session(host, {options});
         EXPECT_EQ(session.ctx()->seek_method, method) << indices;
         EXPECT_EQ(session.ctx()->last_keyframe_ms, last) << indices;
@@ -287,7 +286,7 @@ TEST(KeyframeIndex, DecidesHowToSeekAndTheLastTime)
     expect(two, FLVD_SEEK_BY_INDEX, 1000, INDEX);
     expect(std::regex_replace(two, std::regex("\\[1 1"), "[0"), FLVD_SEEK_BY_INDEX, 0, INDEX);
     const std::string at_end = "keyframes: { times: [9 1 1 1 1 1 1 1 1 1 filepositions: [9 13 2 2 }";
-    FakeHost host(FlvBuilder(4).add(Pcm(5)).metadata(at_end).build().bytes);
+    FakeHost host(File({Pcm(5), {18, 0, OnMetaData(at_end)}}, 4).bytes);
     EXPECT_EQ(Session(host).open_rc(), -1); // it ends with the file
     EXPECT_EQ(g_flvd_lLastError, FLVD_ERR_EXTENT);
 }

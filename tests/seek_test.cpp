@@ -216,10 +216,10 @@ TEST(Seek, LandsWhereTheRulesSay)
         all.emplace_back(flv);
     for (const Media& media : all)
         for (const uint32_t options : {ONE, TWO, INDEX, INDEX | TWO, GROWING, GROWING | TWO})
-            for (const uint32_t quantum : {0u, 4096u}) { // of scanning: the usual one, the whole cache
+            for (const uint32_t read_size : {0u, 4096u}) { // of scanning: the usual one, the whole cache
                 SCOPED_TRACE(testing::PrintToString(std::pair(&media - all.data(), options)));
                 if (media.by_index ? (options & GROWING) == 0 || media.first_ts == 0 : (options | TWO) == TWO)
-                    SeekAround(media, {options, false, 0, quantum});
+                    SeekAround(media, {options, false, 0, read_size});
             }
 }
 
@@ -229,10 +229,8 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
     const Flv scan = Chain(0, false), index = Chain(0, true), audio = Chain(0, false, false);
     const Flv one_entry = Chain(0, true, true, 50, 50);
     // The tags at 0, 200, 400, 600 and 2000 ms; the index gives the last four other times, and the last another place.
-    FlvBuilder builder;
-    builder.indexed_metadata("", [](auto& t, auto& p) { t[2] = 1.4, t[3] = 1.6015, t[4] = 1.8, p[4] = 1e9; });
-    builder.add(g_avc).add(Nalu(0)).add(Nalu(200)).add(Nalu(400)).add(Nalu(600)).add(Nalu(2000));
-    const Flv odd = builder.build();
+    const Flv odd = IndexedFile({g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(2000)},
+                                [](auto& t, auto& p) { t[2] = 1.4, t[3] = 1.6015, t[4] = 1.8, p[4] = 1e9; });
     // Of the two arrays the second has more entries.
     const auto uneven = [](const std::string& two, const std::string& five) {
         return File({{18, 0, OnMetaData(two + " keyframes: { " + five + " }")}, Screen(0)}, 1);
@@ -242,13 +240,12 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
     // The entry at 200 ms leads to place 5, where the file header reads as a tag of 0 ms.
     const Flv in_header = MakeChain({true, true, true, true, 50, 5, 0, [](auto&, auto& p) { p[1] = 5; }});
     // The first tag of one stream is later than the file's last time, so that none is found; the other begins at 1538.
-    const auto without = [](FlvBuilder late, const auto& tag) {
+    const auto without = [](Tags late, const auto& tag) {
         for (uint32_t time = 1538; time <= 1978; time += 40)
-            late.add(tag(time, 60));
-        return late.build();
+            late.push_back(tag(time, 60));
+        return File(late);
     };
-    const Flv no_video = without(FlvBuilder().add(Screen(90000)), Pcm);
-    const Flv no_audio = without(FlvBuilder().add(g_avc).add(Pcm(90000)), Nalu);
+    const Flv no_video = without({Screen(90000)}, Pcm), no_audio = without({g_avc, Pcm(90000)}, Nalu);
     const Flv ended = Configured(); // audio up to 1978 ms, video up to 2360
     const int64_t end = ended.size();
     Flv text = index; // the positions have a string at 800 ms, the times one in the place of 1600 ms
@@ -417,6 +414,44 @@ TEST(Seek, GoesBackToAPlaceThatItCouldNotGoBackToBefore)
     }
 }
 
+// A host whose position stays the same, once it is told to.
+class StuckHost : public FakeHost {
+public:
+    using FakeHost::FakeHost;
+    std::optional<int64_t> stuck_at;
+
+protected:
+    int64_t tell(void* pointer, bool wide) override
+    {
+        const int64_t position = FakeHost::tell(pointer, wide);
+        return stuck_at.value_or(position);
+    }
+};
+
+// Every step of a walk begins at the same place then, and may find the same tag again. One of these never ended.
+TEST(Seek, EndsOnAHostWhosePositionStaysTheSame)
+{
+    constexpr uint64_t many = 100000; // 200 tags are walked over with a few thousand calls
+    std::vector<Tag> tags;
+    for (uint32_t i = 0; i < 200; ++i)
+        tags.push_back({9, 40 * i, Concat({{0x13}, Bytes(49, 0x55)})}); // 65 bytes in all
+    const auto before = tags.begin() + 50;
+    const Bytes file = Concat({File({tags.begin(), before}, 1).bytes, {0x55}, File({before, tags.end()}, 1).body()});
+    for (const int32_t time : {40, 560, 1080})
+        for (int64_t stuck_at = 13; stuck_at < static_cast<int64_t>(file.size()); stuck_at += 997) {
+            StuckHost host(file);
+            Session session(host);
+            host.stuck_at = stuck_at;
+            uint64_t calls = 0;
+            host.on_call = [&](HostFn) {
+                if (++calls == many)
+                    host.fail_from(HostFn::Read, 1); // which ends it at last
+            };
+            session.seek(time, BACK);
+            EXPECT_LT(calls, many) << time << " ms, position " << stuck_at;
+        }
+}
+
 // The file loses its end after opening, and with it elements of the times, which are its last bytes; or no byte can be
 // read any more. Elements without a byte count as 0.0; with two of them in a row the index ends with its last entry, at
 // 0 s, which is near enough to its tag at 800 ms.
@@ -472,14 +507,15 @@ TEST(Seek, BeyondFourGiB)
     constexpr uint32_t PICTURE = 12u << 20, SECONDS = 360;
     constexpr int64_t SECOND = PICTURE + 36;
     int64_t head = 0;
-    FlvBuilder builder;
-    builder.indexed_metadata("", [&head](auto& times, auto& positions) {
-        for (uint32_t i = 0; i < SECONDS; i += 3) {
-            times.push_back(i);
-            positions.push_back(static_cast<double>(head + i * SECOND));
-        }
-    });
-    head = static_cast<int64_t>(builder.add(g_avc).add(g_aac).build().bytes.size());
+    const auto begin = [&head] {
+        return IndexedFile({g_avc, g_aac}, [&head](auto& times, auto& positions) {
+            for (uint32_t i = 0; i < SECONDS; i += 3) {
+                times.push_back(i);
+                positions.push_back(static_cast<double>(head + i * SECOND));
+            }
+        });
+    };
+    head = begin().size();
     std::map<int64_t, Bytes> extents;
     for (uint32_t i = 0; i < SECONDS; ++i) {
         const Tag picture = {9, i * 1000, AvcNalu(i % 3 == 0, {7}), PICTURE + 11, PICTURE};
@@ -490,7 +526,7 @@ TEST(Seek, BeyondFourGiB)
     }
     for (const uint32_t options : {INFO, ONE, INDEX, GROWING}) { // the first without index
         SCOPED_TRACE(options);
-        extents[0] = (options == INFO ? WithoutIndex(builder.build()) : builder.build()).bytes;
+        extents[0] = (options == INFO ? WithoutIndex(begin()) : begin()).bytes;
         FakeHost host;
         host.add_sparse_file(FakeHost::DEFAULT_FILE, head + SECONDS * SECOND, extents);
         Session session(host, {options & ~INFO});

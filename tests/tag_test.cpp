@@ -44,10 +44,10 @@ struct Reader {
     flvd_tag_info_t info{};
     uint32_t kind = 0;
 
-    explicit Reader(const Bytes& bytes, uint32_t cache = CACHE, uint32_t quantum = 0)
+    explicit Reader(const Bytes& bytes, uint32_t cache = CACHE, uint32_t read_size = 0)
         : host(bytes), file(host.open_reader({cache}))
     {
-        __FLV_DMX__fioSetCacheReadSize(file, quantum);
+        __FLV_DMX__fioSetCacheReadSize(file, read_size);
         ctx.cache_size = cache;
         ctx.data_offset = static_cast<int32_t>(DATA_OFFSET);
         ctx.data_end = end = static_cast<int64_t>(bytes.size());
@@ -236,6 +236,7 @@ TEST(Resynchronisation, CoversOneMiBInAll)
         Bytes damage;
         int32_t careful = 0, trusting = 0; // 0: the tag is found
         bool tag = true;                   // follows the damage
+        int64_t data_end = 0;              // 0: of the file
     } rows[] = {
         {.what = "one MiB", .damage = Zeros(MIB)},
         {.what = "one byte more", .damage = Zeros(MIB + 1), .careful = NOT_FOUND, .trusting = NOT_FOUND},
@@ -245,6 +246,7 @@ TEST(Resynchronisation, CoversOneMiBInAll)
         {.what = "all checks but one fail", .damage = Bad(CHECKS - 1)},
         {.what = "all checks fail", .damage = Bad(CHECKS), .careful = NOT_FOUND},
         {.what = "then data end", .damage = failed, .careful = NOT_FOUND, .trusting = ENDED, .tag = false},
+        {.what = "one byte after a bad tag", .damage = {8}, .trusting = ENDED, .data_end = MIB}, // of 0x090000 bytes
         {.what = "one MiB after a failed scan", .damage = gap, .trusting = NOT_FOUND},
         {.what = "one byte more after it", .damage = Concat({gap, {0}}), .careful = NOT_FOUND, .trusting = NOT_FOUND},
     };
@@ -252,6 +254,7 @@ TEST(Resynchronisation, CoversOneMiBInAll)
         SCOPED_TRACE(row.what);
         const Bytes before = Concat({Zeros(100), row.damage});
         Reader r(row.tag ? before + VideoTag() : before);
+        r.ctx.data_end = row.data_end != 0 ? row.data_end : r.end;
         const auto expect = [&](const Step step, int32_t rc) {
             const auto [result, place, kind] = (r.at(100).*step)(VIDEO);
             EXPECT_EQ(result, rc);
@@ -336,6 +339,15 @@ TEST(Position, ThatDoesNotAdvanceEndsASearch)
     }
 }
 
+TEST(PrevTag, IsNoneBeforeTheFirst)
+{
+    Reader r(Bytes() + AudioTag()); // nor does a back-pointer to the start of the file lead to one
+    for (const int64_t from : {DATA_OFFSET, r.end}) {
+        EXPECT_EQ(r.at(from).prev(ANY), Found(FLVD_ERR_AT_FIRST_TAG, 0, 0));
+        EXPECT_EQ(__FLV_DMX__fioTell64(r.file), DATA_OFFSET);
+    }
+}
+
 TEST(PrevTag, SlidesBackOneMiBInAll)
 {
     Reader r(Zeros(FIRST_TAG) + AudioTag() + VideoTag() + AudioTag());
@@ -360,43 +372,48 @@ TEST(HostCalls, OfTheBackPointerCheck)
     const struct {
         const char* what;
         size_t size;
-        std::string log;                    // begins so; no seek follows
-        uint32_t quantum = 0, most = CACHE; // of each read
+        std::string log;                      // begins so; no seek follows
+        uint32_t read_size = 0, most = CACHE; // of each read
     } rows[] = {
         {.what = "cached", .size = 100, .log = cache + "230 tell64()=243"},
         {.what = "as large as the cache", .size = 4081, .log = whole},
         {.what = "one byte larger", .size = 4082, .log = whole + " read(1)=1" + back},
         {.what = "larger", .size = 5000, .log = whole + " seek64(915,1)=0 read(4)=4" + back},
         {.what = "in short reads", .size = 100, .log = cut, .most = 50},
-        {.what = "narrow reads", .size = 100, .log = narrow, .quantum = 16},
-        {.what = "narrower than a header", .size = 100, .log = narrower, .quantum = 5},
+        {.what = "narrow reads", .size = 100, .log = narrow, .read_size = 16},
+        {.what = "narrower than a header", .size = 100, .log = narrower, .read_size = 5},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        Reader r(Zeros(FIRST_TAG) + AudioTag(row.size) + VideoTag(), CACHE, row.quantum);
+        Reader r(Zeros(FIRST_TAG) + AudioTag(row.size) + VideoTag(), CACHE, row.read_size);
         r.at(FIRST_TAG).host.limit_reads(row.most);
         r.host.start_log();
         EXPECT_EQ(FLVD_GetCurrTagInfo(&r.ctx, r.file, &r.info, AUDIO, 1), 0);
         const std::string calls = r.host.take_log();
         EXPECT_EQ(calls.substr(0, row.log.size()), row.log);
         EXPECT_EQ(calls.find("seek", row.log.size()), std::string::npos);
-        EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), row.quantum != 0 ? row.quantum : CACHE);
+        EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), row.read_size != 0 ? row.read_size : CACHE);
     }
 }
 
-TEST(HostCalls, ASeekBackToATagIsTriedOnce)
+TEST(HostCalls, ASeekBackToATagOrPastItIsTriedOnce)
 {
     const struct {
         const char* what;
         Step step;
         int64_t from;
-        uint64_t seek; // the one that goes back to the tag
-    } rows[] = {{.what = "describing", .step = &Reader::verify, .from = FIRST_TAG, .seek = 2},
-                {.what = "stepping", .step = &Reader::next, .from = DATA_OFFSET, .seek = 3}};
+        uint32_t wanted;
+        uint64_t seek; // that fails, and is the last
+        int32_t rc;
+    } rows[] = {
+        {.what = "back to it", .step = &Reader::verify, .from = FIRST_TAG, .wanted = AUDIO, .seek = 2, .rc = NOT_FOUND},
+        {.what = "stepping", .step = &Reader::next, .from = DATA_OFFSET, .wanted = AUDIO, .seek = 3, .rc = NOT_FOUND},
+        {.what = "past it", .step = &Reader::trust, .from = FIRST_TAG, .wanted = VIDEO, .seek = 1, .rc = ENDED},
+    };
     for (const auto& row : rows) {
         Reader r(Zeros(FIRST_TAG) + AudioTag(5000) + VideoTag());
         r.at(row.from).host.fail_nth(HostFn::Seek, row.seek);
-        EXPECT_EQ((r.*row.step)(AUDIO), Found(NOT_FOUND, 0, 0)) << row.what;
+        EXPECT_EQ((r.*row.step)(row.wanted), Found(row.rc, 0, 0)) << row.what;
         EXPECT_EQ(r.host.calls(HostFn::Seek), row.seek) << row.what;
     }
 }
@@ -438,6 +455,9 @@ TEST(Extent, EndsWithTheLastTag)
     ExpectExtent("100 bytes after them", with(Bytes(100, 0xEE)), {}, {.end = end, .last_ts = 782});
     ExpectExtent("3 MiB of bad tags", with(Bad(3 * MIB / BAD_SIZE)), {}, {.end = end, .last_ts = 782});
     ExpectExtent("zeros in the second half", Concat({half, Zeros(3 * MIB)}), {}, {.end = half_end, .last_ts = 5});
+    // The name and the version of the file header read as a tag size, and the last four bytes agree with it.
+    const Bytes far = Concat({Zeros(0x4C5601 + 11 - end), {0, 0x4C, 0x56, 0x0C}});
+    ExpectExtent("a back-pointer to the start of the file", with(far), {}, {.end = end, .last_ts = 782});
     // Opened for information.
     ExpectExtent("15 bytes", with(Bytes(15, 0xEE)), QUICK, {.end = end, .last_ts = 782, .method = FLVD_SEEK_NONE});
     ExpectExtent("16 bytes", with(Bytes(16, 0xEE)), QUICK, {.end = end + 16, .last_ts = 0, .method = FLVD_SEEK_NONE});
@@ -473,6 +493,7 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
     const Bytes negative = Indexed([](auto&, auto& at) { at.back() = -5; }).bytes; // no matter: all entries are inside
     const Bytes astray =
         Indexed([&](auto&, auto& at) { at[3] = static_cast<double>(flv.size()) + 24, at[4] = 1e12; }).bytes;
+    const Bytes fewer = Concat({Indexed([](auto& times, auto&) { times.resize(3); }).bytes, Bytes(100, 0xEE)});
     // Neither the last position inside the file nor the bytes after its tags lead to a tag.
     const Bytes no_step = Concat({astray, Bytes(20, 0xEE), {0, 0, 0, 7, 0xEE}});
     for (const OpenOptions& open : {OpenOptions{INDEX}, OpenOptions{}}) {
@@ -486,6 +507,7 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
         // One entry past the end stays.
         expect("cut in a frame", cut(34), flv.tags[34].offset, 437, 7, 480);
         expect("cut in a keyframe", cut(31), flv.tags[31].offset, 391, 6, 400);
+        expect("fewer times than places", fewer, flv.size() - 7 * 9, 782, 3, 160);
         expect("entries astray", no_step, flv.size(), 782, 4, 240);
     }
 }

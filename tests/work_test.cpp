@@ -14,11 +14,10 @@ namespace {
 
 constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20;
-constexpr uint64_t REQUEST_CHECKS = 16384;               // that may fail in one request, in all its turns together
-constexpr uint64_t REQUEST_TURNS = 102;                  // of one request
-constexpr uint64_t MOST_CALLS = 100000;                  // of one request, on any file
-constexpr uint64_t TAIL_CURSORS = MIB + 256;             // places tried in the search for the last tag
-constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000; // of valid files; the cache does not hold BIG
+constexpr uint64_t REQUEST_CHECKS = 16384, REQUEST_TURNS = 102; // checks may fail in all turns of a request together
+constexpr uint64_t MOST_CALLS = 100000;                         // of one request, on the worst file that we know
+constexpr uint64_t TAIL_CURSORS = MIB + 256;                    // places tried in the search for the last tag
+constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000;        // of valid files; the cache does not hold BIG
 
 struct Cost {
     uint64_t calls = 0, bytes = 0;
@@ -32,11 +31,11 @@ Cost operator*(uint64_t n, Cost a)
     return {n * a.calls, n * a.bytes};
 }
 
-constexpr Cost FALSE_HEADER = {5, 0}; // position, skip to the back-pointer, its read, seek back, read; bytes: Forward()
-constexpr Cost TAG = {5, 0};          // cached: two position queries, two of the end, one for its share of the caches
-constexpr Cost LARGE_TAG = {10, 2 * CACHE + NARROW}; // also skip, read, seek back and two reads: it is looked at first
-constexpr Cost WALKED_TAG = {12, 6 * NARROW};        // in a seek by scanning: each way two looks, with a seek for each
-constexpr Cost AT_END = {5 * REQUEST_TURNS, 0};      // end flag, position, read, skip over nothing, which is a seek
+constexpr Cost FALSE_HEADER = {5, 0}; // position, seek to its back-pointer, read, seek back, refill; bytes: Forward()
+constexpr Cost TAG = {5, 0};          // positions before and after it; at a refill two queries of the end and a read
+constexpr Cost LARGE_TAG = {10, 2 * CACHE + NARROW}; // also to its back-pointer and back, a refill each
+constexpr Cost WALKED_TAG = {12, 6 * NARROW};        // in a seek by scanning: three looks each way, a seek for each
+constexpr Cost AT_END = {5 * REQUEST_TURNS, 0};      // twice the end, position, read, seek past the end
 constexpr uint64_t FEW = 100;                        /**< tags that every file has */
 
 /** Going forward over so many bytes, of which some begin false headers, and over a few tags. */
@@ -46,9 +45,9 @@ Cost Forward(uint64_t bytes, uint64_t false_headers = 0, uint64_t cache = CACHE)
            false_headers * FALSE_HEADER + FEW * WALKED_TAG;
 }
 /** Going backward, byte by byte. */
-Cost Backward(uint64_t bytes, uint64_t quantum = NARROW)
+Cost Backward(uint64_t bytes, uint64_t read_size = NARROW)
 {
-    return bytes * Cost{4, 2 * std::max(quantum, NARROW)};
+    return bytes * Cost{4, 2 * std::max(read_size, NARROW)};
 }
 
 struct WorkCase {
@@ -72,10 +71,10 @@ Bytes Repeat(const Bytes& pattern, size_t size)
 WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost pass)
 {
     const auto audio = [](uint32_t first_ts) {
-        FlvBuilder builder(4);
+        Tags tags;
         for (uint32_t i = 0; i < 20; ++i)
-            builder.audio(first_ts + 40 * i, AudioData(8, Noise(200)));
-        return builder.build();
+            tags.push_back({8, first_ts + 40 * i, AudioData(8, Noise(200))});
+        return File(tags, 4);
     };
     const Bytes file = Concat({audio(0).bytes, Repeat({8}, 600000), audio(0x10000000).body()});
     return {name, file, options, cache, 2 * pass, pass, 2 * pass};
@@ -89,27 +88,26 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
 }
 
 /** Bytes whose every fourth place leads back a little, then audio alone; that several times. */
-WorkCase Slide(const char* name, size_t size, uint64_t quantum, size_t times = 1)
+WorkCase Slide(const char* name, size_t size, uint64_t read_size, size_t times = 1)
 {
     const Bytes stretch = Concat({Repeat({0, 0, 0, 15}, size), MakeChain({false, true}).body()});
     const Bytes file = Concat({MakeChain().bytes, Repeat(stretch, times * stretch.size())});
-    const Cost pass = Forward(file.size()), back = times * Backward(size + 256, quantum);
-    return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * quantum}, quantum};
+    const Cost pass = Forward(file.size()), back = times * Backward(size + 256, read_size);
+    return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * read_size}, read_size};
 }
 
 /** Many valid tags. The index, when there is one, leads past the end of the file. */
 WorkCase ManyTags(const char* name, bool video, size_t size, bool index, Cost tag, uint32_t options = 0)
 {
     constexpr uint64_t count = 500;
-    FlvBuilder builder;
-    if (index)
-        builder.indexed_metadata("", [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; });
+    const auto beyond = [](auto& times, auto& places) { times = {0, 1, 2}, places = {400, 1e9, 1e9}; };
+    Tags tags;
     for (uint32_t i = 0; i < count; ++i) {
         if (video)
-            builder.add(Screen(2 * i, 20));
-        builder.add(Pcm(2 * i, size));
+            tags.push_back(Screen(2 * i, 20));
+        tags.push_back(Pcm(2 * i, size));
     }
-    const Bytes file = builder.build().bytes;
+    const Bytes file = (index ? IndexedFile(tags, beyond) : File(tags)).bytes;
     const Cost pass = Forward(file.size()) + count * (TAG + tag);
     return {name, file, options, CACHE, 2 * pass, pass, Forward(file.size()) + 2 * count * WALKED_TAG};
 }
@@ -121,7 +119,7 @@ WorkCase ManyTags(const char* name, bool video, size_t size, bool index, Cost ta
 WorkCase Metadata(const char* name, const Bytes& head, const Bytes& pattern, uint32_t options = 0)
 {
     const Bytes payload = Concat({Amf("'onMetaData"), head, Repeat(pattern, MIB)});
-    const Bytes file = Concat({FlvBuilder().script(payload).build().bytes, MakeChain().body()});
+    const Bytes file = Concat({File({{18, 0, payload}}).bytes, MakeChain().body()});
     const Cost pass = Forward(file.size()), script = Forward(2 * payload.size()) + Cost{payload.size() / 8, 0};
     return {name, file, options, CACHE, script + 4 * pass, pass, 3 * pass};
 }
@@ -331,15 +329,10 @@ TEST(Work, CostsLittleOnValidFiles)
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
-        FlvBuilder builder(1);
-        if (row.script.empty())
-            builder.indexed_metadata("");
-        else
-            builder.script(row.script);
-        builder.add(g_avc);
+        Tags video = {g_avc};
         for (uint32_t i = 0; i < FRAMES; ++i)
-            builder.video(40 * i, AvcNalu(i % 20 == 0, Noise(row.size, i + 1)));
-        FakeHost host(builder.build().bytes);
+            video.push_back({9, 40 * i, AvcNalu(i % 20 == 0, Noise(row.size, i + 1))});
+        FakeHost host((row.script.empty() ? IndexedFile(video) : File(Tags{{18, 0, row.script}} + video, 1)).bytes);
         Session session(host, {row.options});
         for (int i = 0; i < row.before; ++i)
             session.frame();

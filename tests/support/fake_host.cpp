@@ -144,7 +144,6 @@ void* FakeHost::alloc(uint32_t size)
         return nullptr;
     std::memset(memory, FRESH_MEMORY, size);
     m_blocks[static_cast<uint8_t*>(memory)] = size;
-    m_live_bytes += size;
     return memory;
 }
 
@@ -160,7 +159,6 @@ void FakeHost::release(void* memory)
     if (on_release)
         on_release(memory, block->second);
     std::memset(memory, RELEASED_MEMORY, block->second);
-    m_live_bytes -= block->second;
     m_blocks.erase(block);
     std::free(memory);
 }
@@ -189,7 +187,6 @@ void* FakeHost::set(void* destination, int value, uint32_t count)
 
 void* FakeHost::open(const char* path, const char* mode)
 {
-    m_open_modes.emplace_back(mode);
     const bool allowed = begin(HostFn::Open);
     if (allowed && mode[0] == 'w')
         add_file(path, {});

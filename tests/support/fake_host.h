@@ -126,10 +126,7 @@ public:
         return held != m_blocks.end() ? held->second : 0;
     }
     size_t live_blocks() const { return m_blocks.size(); }
-    size_t live_bytes() const { return m_live_bytes; }
     size_t open_handles() const { return m_handles.size(); }
-    /** All file_open modes so far, successful or not. */
-    const std::vector<std::string>& open_modes() const { return m_open_modes; }
 
 protected:
     virtual int32_t eof(void* pointer);
@@ -192,10 +189,8 @@ private:
     std::map<const void*, Handle> m_handles;
     std::deque<uint8_t> m_pointers; // one for each handle ever, so that a closed one is never taken for another
     std::map<const uint8_t*, uint32_t> m_blocks;
-    size_t m_live_bytes = 0;
     Counts m_counts;
     Faults m_faults;
-    std::vector<std::string> m_open_modes;
     Handle m_none = {std::make_shared<File>()}; // what stands for a handle that is not open
     bool m_only_32 = false, m_logging = false, m_log_memory = false;
     std::string m_log;

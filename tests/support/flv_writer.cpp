@@ -185,13 +185,7 @@ Frames Flv::frames(uint32_t streams, uint32_t first) const
     return out;
 }
 
-FlvBuilder& FlvBuilder::indexed_metadata(const std::string& properties, IndexHook hook)
-{
-    m_index = {m_tags.size(), properties, std::move(hook)};
-    return script({});
-}
-
-Bytes FlvBuilder::index_data(const std::vector<Tag>& tags) const
+static Bytes IndexData(const Tags& tags, const IndexHook& hook, const std::string& properties)
 {
     std::vector<double> times, positions;
     for (const Tag& tag : tags)
@@ -199,10 +193,10 @@ Bytes FlvBuilder::index_data(const std::vector<Tag>& tags) const
             times.push_back(tag.timestamp / 1000.0);
             positions.push_back(static_cast<double>(tag.offset));
         }
-    if (m_index.hook)
-        m_index.hook(times, positions);
+    if (hook)
+        hook(times, positions);
     std::ostringstream words;
-    words << std::setprecision(17) << m_index.properties << " keyframes: { ";
+    words << std::setprecision(17) << properties << " keyframes: { ";
     for (const auto& [key, numbers] : {std::pair("times: [", times), {"filepositions: [", positions}}) {
         words << key << numbers.size();
         for (const double number : numbers)
@@ -213,11 +207,12 @@ Bytes FlvBuilder::index_data(const std::vector<Tag>& tags) const
     return OnMetaData(words.str());
 }
 
-Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
+Flv File(const Tags& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
 {
-    Flv flv{Concat({m_prefix, {'F', 'L', 'V', 1, m_flags}, BigEndian(m_data_offset, 4)}), std::move(tags)};
-    if (flv.bytes.size() < m_data_offset && m_data_offset < 0x10000)
-        flv.bytes.resize(m_data_offset);
+    const uint32_t data_offset = static_cast<uint32_t>(prefix.size()) + header;
+    Flv flv{Concat({prefix, {'F', 'L', 'V', 1, flags}, BigEndian(data_offset, 4)}), tags};
+    if (flv.bytes.size() < data_offset && data_offset < 0x10000)
+        flv.bytes.resize(data_offset);
     Put(flv.bytes, 0, 4);
     for (Tag& tag : flv.tags) {
         const size_t size = tag.data.size();
@@ -233,40 +228,34 @@ Flv FlvBuilder::lay_out(std::vector<Tag> tags) const
 }
 
 // Numbers of AMF0 have a fixed size, so the index does not change the layout once it has its entries.
-Flv FlvBuilder::build() const
+Flv IndexedFile(const Tags& tags, const IndexHook& hook, const std::string& properties, uint8_t flags)
 {
-    Flv flv = lay_out(m_tags);
-    for (int pass = 0; pass < 2 && m_index.tag < m_tags.size(); ++pass) {
-        flv.tags[m_index.tag].data = index_data(flv.tags);
-        flv = lay_out(std::move(flv.tags));
+    Flv flv = File(Tags{{18, 0, {}}} + tags, flags);
+    for (int pass = 0; pass < 2; ++pass) {
+        flv.tags[0].data = IndexData(flv.tags, hook, properties);
+        flv = File(flv.tags, flags);
     }
     return flv;
 }
 
-Flv File(const std::vector<Tag>& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
-{
-    return FlvBuilder(flags, static_cast<uint32_t>(prefix.size()) + header, prefix, tags).build();
-}
-
 Flv MakeChain(const ChainOptions& options)
 {
-    FlvBuilder builder(static_cast<uint8_t>((options.video ? 1 : 0) | (options.audio ? 4 : 0)));
-    if (options.index)
-        builder.indexed_metadata("width: 320 height: 240", options.hook);
-    else if (options.metadata)
-        builder.metadata("width: 320 height: 240 framerate: 25");
+    Tags tags;
+    if (options.metadata && !options.index)
+        tags.push_back({18, 0, OnMetaData("width: 320 height: 240 framerate: 25")});
     if (options.video)
-        builder.video(options.first_ts, AvcConfig(SmallAvcRecord()));
+        tags.push_back({9, options.first_ts, AvcConfig(SmallAvcRecord())});
     if (options.audio)
-        builder.audio(options.first_ts, AacConfig({0x12, 0x10}));
+        tags.push_back({8, options.first_ts, AacConfig({0x12, 0x10})});
     for (uint32_t picture = 0, audio = 0; picture < options.pictures; ++picture) {
         const Bytes data = AvcNalu(picture % options.gop == 0, Noise(300 + picture * 37 % 101, picture));
         if (options.video)
-            builder.video(options.first_ts + picture * 40, data);
+            tags.push_back({9, options.first_ts + picture * 40, data});
         for (; options.audio && audio * 23 < (picture + 1) * 40; ++audio)
-            builder.audio(options.first_ts + audio * 23, AacRaw(Noise(80 + audio * 13 % 29, 1000 + audio)));
+            tags.push_back({8, options.first_ts + audio * 23, AacRaw(Noise(80 + audio * 13 % 29, 1000 + audio))});
     }
-    return builder.build();
+    const auto flags = static_cast<uint8_t>((options.video ? 1 : 0) | (options.audio ? 4 : 0));
+    return options.index ? IndexedFile(tags, options.hook, "width: 320 height: 240", flags) : File(tags, flags);
 }
 
 } // namespace flvd_test

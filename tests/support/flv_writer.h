@@ -114,7 +114,7 @@ struct Tag {
     std::optional<uint32_t> back_pointer = {}; /**< PreviousTagSize after it; default: data size + 11 */
     std::optional<uint32_t> data_size = {};    /**< DataSize in the header; default: that of the data */
     uint32_t stream_id = 0;
-    int64_t offset = 0; /**< of the tag header; filled by build() */
+    int64_t offset = 0; /**< of the tag header; filled by File() */
 
     int64_t size() const { return static_cast<int64_t>(data.size()) + 15; } /**< header, data and back-pointer */
     int64_t end() const { return offset + size(); }
@@ -166,47 +166,11 @@ struct Flv {
 /** Changes the keyframe index before it is written: times in seconds, positions in bytes. */
 using IndexHook = std::function<void(std::vector<double>& times, std::vector<double>& positions)>;
 
-/** Collects tags and builds the file. All adders return the builder. */
-class FlvBuilder {
-public:
-    /** flags: of the file header (1 video, 4 audio); data_offset: as written; prefix: before the file header. */
-    explicit FlvBuilder(uint8_t flags = 5, uint32_t data_offset = 9, Bytes prefix = {}, std::vector<Tag> tags = {})
-        : m_flags(flags), m_data_offset(data_offset), m_prefix(std::move(prefix)), m_tags(std::move(tags))
-    {
-    }
-
-    FlvBuilder& add(Tag tag)
-    {
-        m_tags.push_back(std::move(tag));
-        return *this;
-    }
-    FlvBuilder& video(uint32_t timestamp, Bytes data) { return add({9, timestamp, std::move(data)}); }
-    FlvBuilder& audio(uint32_t timestamp, Bytes data) { return add({8, timestamp, std::move(data)}); }
-    FlvBuilder& script(Bytes data, uint32_t timestamp = 0) { return add({18, timestamp, std::move(data)}); }
-    /** onMetaData without keyframe index. */
-    FlvBuilder& metadata(const std::string& properties) { return script(OnMetaData(properties)); }
-    /** onMetaData with "keyframes" after the given properties: every keyframe of the file, at its real place. */
-    FlvBuilder& indexed_metadata(const std::string& properties, IndexHook hook = {});
-
-    Flv build() const;
-
-private:
-    Bytes index_data(const std::vector<Tag>& tags) const;
-    Flv lay_out(std::vector<Tag> tags) const;
-
-    uint8_t m_flags;
-    uint32_t m_data_offset;
-    Bytes m_prefix;
-    std::vector<Tag> m_tags;
-    struct Index {
-        size_t tag = SIZE_MAX;
-        std::string properties;
-        IndexHook hook;
-    } m_index;
-};
-
 /** A file of these tags; DataOffset leaves room for a file header of `header` bytes after the prefix. */
-Flv File(const std::vector<Tag>& tags, uint8_t flags = 5, const Bytes& prefix = {}, uint32_t header = 9);
+Flv File(const Tags& tags, uint8_t flags = 5, const Bytes& prefix = {}, uint32_t header = 9);
+
+/** The same after onMetaData with an index of every keyframe among them, at its real place. */
+Flv IndexedFile(const Tags& tags, const IndexHook& hook = {}, const std::string& properties = "", uint8_t flags = 5);
 
 /**
  * An ordinary file: AVC and AAC, one keyframe every `gop` frames, both interleaved by time. Video
