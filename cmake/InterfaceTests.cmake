@@ -12,7 +12,8 @@ foreach(header IN LISTS headers ITEMS flvdmx/flvdmx.h flvdmx/layers.h)
             COMMAND ${CMAKE_C_COMPILER} -std=c11 ${header_flags} -Wstrict-prototypes -include ${header} -x c /dev/null)
     endif()
     add_test(NAME ${FLVDMX_TEST_PREFIX}c++17/${header}
-        COMMAND ${CMAKE_CXX_COMPILER} -std=c++17 ${header_flags} -fno-exceptions -fno-rtti -include ${header} -x c++ /dev/null)
+        COMMAND ${CMAKE_CXX_COMPILER} -std=c++17 ${header_flags} -fno-exceptions -fno-rtti -include ${header}
+            -x c++ /dev/null)
 endforeach()
 
 # A sanitizer brings symbols of its own; without optimisation the compiler is free to call more of its library.

@@ -278,7 +278,7 @@ TEST(Interface, ListsKeyframes)
     for (const Tag& tag : plain.tags)
         if (tag.is_keyframe())
             wanted.emplace_back(tag.timestamp - 1000, tag.offset);
-    std::fill_n(plain.bytes.begin() + wanted[2].second, 100, uint8_t{0});
+    std::fill_n(&plain.bytes[static_cast<size_t>(wanted[2].second)], 100, uint8_t{0});
     wanted.erase(wanted.begin() + 2);
     const Memory other("plain", plain.bytes);
     auto file = flvdmx::File::open("plain", g_memory);
@@ -449,6 +449,8 @@ void UseAll(flvdmx::result<flvdmx::File> file, const Lines& whole)
     play(3);
     (void)file->seek(300ms, SeekMode::backward);
     play(1000);
+    file->close();
+    EXPECT_FALSE(file->next_frame());
 }
 
 // Each function of the host fails once, at each of its calls.
@@ -498,7 +500,7 @@ TEST(Interface, SurvivesEveryCallbackFailure)
             const auto end = static_cast<int64_t>(from.bytes.size());
             const auto left = from.fails() ? 0 : std::max<int64_t>(end - position, 0);
             const auto count = std::min<int64_t>({left, size, 1000}); // short reads are no end
-            std::copy_n(from.bytes.begin() + position * (left != 0), count, static_cast<uint8_t*>(buffer));
+            std::copy_n(from.bytes.data() + (left != 0 ? position : 0), count, static_cast<uint8_t*>(buffer));
             return static_cast<uint32_t>(count);
         };
         file.get_size = [](void* user) {

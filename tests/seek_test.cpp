@@ -414,6 +414,44 @@ TEST(Seek, GoesBackToAPlaceThatItCouldNotGoBackToBefore)
     }
 }
 
+// A host whose position stays the same, once it is told to.
+class StuckHost : public FakeHost {
+public:
+    using FakeHost::FakeHost;
+    std::optional<int64_t> stuck_at;
+
+protected:
+    int64_t tell(void* pointer, bool wide) override
+    {
+        const int64_t position = FakeHost::tell(pointer, wide);
+        return stuck_at.value_or(position);
+    }
+};
+
+// Every step of a walk begins at the same place then, and may find the same tag again. One of these never ended.
+TEST(Seek, EndsOnAHostWhosePositionStaysTheSame)
+{
+    constexpr uint64_t many = 100000; // 200 tags are walked over with a few thousand calls
+    std::vector<Tag> tags;
+    for (uint32_t i = 0; i < 200; ++i)
+        tags.push_back({9, 40 * i, Concat({{0x13}, Bytes(49, 0x55)})}); // 65 bytes in all
+    const auto before = tags.begin() + 50;
+    const Bytes file = Concat({File({tags.begin(), before}, 1).bytes, {0x55}, File({before, tags.end()}, 1).body()});
+    for (const int32_t time : {40, 560, 1080})
+        for (int64_t stuck_at = 13; stuck_at < static_cast<int64_t>(file.size()); stuck_at += 997) {
+            StuckHost host(file);
+            Session session(host);
+            host.stuck_at = stuck_at;
+            uint64_t calls = 0;
+            host.on_call = [&](HostFn) {
+                if (++calls == many)
+                    host.fail_from(HostFn::Read, 1); // which ends it at last
+            };
+            session.seek(time, BACK);
+            EXPECT_LT(calls, many) << time << " ms, position " << stuck_at;
+        }
+}
+
 // The file loses its end after opening, and with it elements of the times, which are its last bytes; or no byte can be
 // read any more. Elements without a byte count as 0.0; with two of them in a row the index ends with its last entry, at
 // 0 s, which is near enough to its tag at 800 ms.

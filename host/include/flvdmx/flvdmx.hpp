@@ -232,7 +232,7 @@ struct AudioInfo {
     std::vector<uint8_t> config;            /**< AAC: the first AudioSpecificConfig (ISO/IEC 14496-3) */
 };
 
-/** How a file can be seeked in. */
+/** How seeks find their way. */
 enum class SeekMethod : uint32_t {
     none = FLVD_SEEK_NONE,         /**< not at all */
     by_index = FLVD_SEEK_BY_INDEX, /**< by the metadata's keyframe index */
@@ -246,7 +246,7 @@ struct Info {
                                     growing file */
     Milliseconds duration{};   /**< last timestamp less the first; 0 when unknown, as of a growing file */
     int64_t size = 0;          /**< bytes, 0 for a growing file */
-    SeekMethod seek_method = SeekMethod::none; /**< how to seek in it */
+    SeekMethod seek_method = SeekMethod::none; /**< how seeks find their way */
     std::optional<VideoInfo> video;            /**< the video stream, if there is one */
     std::optional<AudioInfo> audio;            /**< the audio stream, if there is one */
 };
@@ -273,7 +273,7 @@ struct Options {
     uint32_t buffer_size = 0;   /**< its bytes */
     bool restarting_timestamps = false; /**< deliver all frames, also those later than the file's last timestamp, as a
                                              recording has whose timestamps start again; times may jump back, and
-                                             nothing can be seeked */
+                                             seeking is refused */
 };
 
 /** How to seek; modes are combined with |. */
@@ -352,6 +352,7 @@ public:
         const std::lock_guard<std::recursive_mutex> lock(open_mutex);
         QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
         m_instance = nullptr;
+        m_return = {};
         --m_open_files;
     }
 
@@ -385,20 +386,18 @@ public:
      */
     result<Metadata> metadata()
     {
-        fio_file_t* const reader = reader_of(Stream::any);
-        const result<int64_t> start = leave(reader);
-        if (!start)
-            return start.error();
+        if (const error failed = leave(); failed.kind() != Kind::none)
+            return failed;
         Metadata metadata;
-        if (move_to(reader, m_instance->data_offset))
-            read_script_tags(reader, metadata);
-        go_back(reader, *start);
+        if (move_to(m_return.reader, m_instance->data_offset))
+            read_script_tags(m_return.reader, metadata);
+        go_back();
         return metadata;
     }
 
     /**
-     * All keyframes of the video, those of a growing file so far. They are taken from the keyframe index when the file
-     * is seeked by one, as it tells them; otherwise the whole file is walked, tag by tag. Playing goes on where it was.
+     * All keyframes of the video, those of a growing file so far. A file that seeks by its keyframe index has them
+     * there, as the index tells them; else the whole file is walked, tag by tag. Playing goes on where it was.
      *
      * @param progress bool(int64_t reached, int64_t size): called after each keyframe on that walk, with the bytes
      *                 walked and those of the file, 0 for a growing one; when it returns false the list ends there
@@ -406,10 +405,9 @@ public:
      */
     template <typename Progress> result<std::vector<Keyframe>> keyframes(Progress&& progress)
     {
-        fio_file_t* const reader = reader_of(Stream::any);
-        const result<int64_t> start = leave(reader);
-        if (!start)
-            return start.error();
+        if (const error failed = leave(); failed.kind() != Kind::none)
+            return failed;
+        fio_file_t* const reader = m_return.reader;
         std::vector<Keyframe> list;
         if ((m_instance->streams & FLVD_STREAM_VIDEO) != 0) {
             if (m_instance->seek_method == FLVD_SEEK_BY_INDEX)
@@ -417,7 +415,7 @@ public:
             if (list.empty() && move_to(reader, m_instance->data_offset))
                 list = walk_keyframes(reader, progress);
         }
-        go_back(reader, *start);
+        go_back();
         return list;
     }
 
@@ -441,7 +439,7 @@ public:
     {
         result<Frame> frame{Frame()};
         if (!take(stream, *frame))
-            return m_return.reader != nullptr ? unreadable() : failure();
+            return failure();
         return frame;
     }
 
@@ -469,10 +467,9 @@ public:
     /**
      * Seeks to a keyframe, without video to an audio frame. After a miss or a failure playing goes on where it was.
      *
-     * At and before time 0 the first tag is gone to, whatever its time. By an index, whose times muxers round or count
-     * from elsewhere, "at or before" holds for the times of the index: the frame can be a few milliseconds later.
-     * A growing file is seeked in only when its timestamps begin at 0, it has video and Options::index_in_memory is
-     * set.
+     * Time 0, and whatever is before it, is the first tag, whatever its time. By an index, whose times muxers round or
+     * count from elsewhere, "at or before" holds for the times of the index: the frame can be a few milliseconds later.
+     * In a growing file seeking needs timestamps that begin at 0, video, and Options::index_in_memory.
      *
      * @param time from the first timestamp; with SeekMode::relative from the current position. What does not fit 32
      *             bits counts as the greatest or least time that does.
@@ -482,7 +479,7 @@ public:
     result<Milliseconds> seek(Milliseconds time, SeekMode mode = SeekMode::automatic)
     {
         if (!can_read())
-            return unreadable();
+            return failure();
         m_next = {-1, -1};
         const flvd_seek_request_t request = {clamp<int32_t>(time.count()), static_cast<uint32_t>(mode)};
         int32_t reached = 0;
@@ -565,7 +562,7 @@ private:
         std::vector<uint8_t> config;
     };
 
-    // Where a reader is to go before it is used again, when it could not be put there at once.
+    // Where playing is when a reader is used for something else, or could not be put back.
     struct Return {
         fio_file_t* reader = nullptr;
         int64_t position = 0;
@@ -659,47 +656,42 @@ private:
     {
         if (m_instance == nullptr)
             return {Kind::failed, FLVD_ERR_NO_INSTANCE, 0};
+        if (m_return.reader != nullptr)
+            return {Kind::failed, FLVD_ERR_SEEK, 0};
         return {kind_of(m_instance->error, is_growing()), m_instance->error, m_instance->error_line};
     }
 
-    /* Moving the readers, which go back to where playing is. */
-
-    fio_file_t* reader_of(Stream stream) const
-    {
-        if (m_instance == nullptr)
-            return nullptr;
-        return stream == Stream::audio ? m_instance->audio_reader : m_instance->main_reader;
-    }
+    /* Moving a reader and going back to where playing is, at the latest before the next call that reads. */
 
     static bool move_to(fio_file_t* reader, int64_t position)
     {
         return __FLV_DMX__fioSeek64(reader, position, FIO_SEEK_SET) == 0;
     }
 
-    void go_back(fio_file_t* reader, int64_t position)
+    void go_back()
     {
-        m_return = move_to(reader, position) ? Return() : Return{reader, position};
+        if (move_to(m_return.reader, m_return.position))
+            m_return = {};
     }
 
     // False when nothing is open or a reader is not where playing is.
     bool can_read()
     {
         if (m_return.reader != nullptr)
-            go_back(m_return.reader, m_return.position);
+            go_back();
         return m_instance != nullptr && m_return.reader == nullptr;
     }
 
-    error unreadable() const { return {Kind::failed, m_instance == nullptr ? FLVD_ERR_NO_INSTANCE : FLVD_ERR_SEEK, 0}; }
-
-    // Where to go back to after the reader was used for something else.
-    result<int64_t> leave(fio_file_t* reader)
+    // The main reader is going to be used for something else than playing.
+    error leave()
     {
         if (!can_read())
-            return unreadable();
-        const int64_t position = __FLV_DMX__fioTell64(reader);
+            return failure();
+        const int64_t position = __FLV_DMX__fioTell64(m_instance->main_reader);
         if (position < 0)
-            return error(Kind::failed, FLVD_ERR_POSITION, 0);
-        return position;
+            return {Kind::failed, FLVD_ERR_POSITION, 0};
+        m_return = {m_instance->main_reader, position};
+        return {};
     }
 
     // The first tag of a wanted kind from the reader's position on, by the library's own rules.
@@ -758,11 +750,12 @@ private:
         const bool found = (m_instance->streams & static_cast<uint32_t>(stream)) != 0;
         if (!found || ahead.position < 0 || ahead.stream() == stream)
             return true;
-        const int64_t begin = ahead.position;
+        const Return begin = {reader, ahead.position};
         ahead = find_tag(reader, stream == Stream::video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO);
-        if (ahead.position < 0)
-            go_back(reader, begin);
-        return m_return.reader == nullptr;
+        if (ahead.position >= 0)
+            return true;
+        m_return = begin;
+        return can_read();
     }
 
     // Of a file timestamp. One before the first is negative.
@@ -775,10 +768,11 @@ private:
     // the reader stood before, `end` where it stands now.
     [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, fio_file_t* reader, int64_t from, int64_t end)
     {
+        m_return = {reader, end};
         const Tag tag = tag_before(frame, reader, end);
         if (from >= 0 && from < tag.position && move_to(reader, from))
             learn_configs(reader, tag.position);
-        go_back(reader, end);
+        go_back();
         return tag;
     }
 
