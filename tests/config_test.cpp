@@ -51,7 +51,7 @@ TEST(AudioConfig, OfAac)
     const std::string program = "1/1 5/4 3/2 9/4 2/4 4/4 1/4 1/2", core = " 1/1 1/1 5461/14 ", no_core = " 1/1 0/1 ";
     for (uint32_t type = 0; type < 96; ++type) {
         const std::string object = type < 31 ? std::to_string(type) + "/5" : "31/5 " + std::to_string(type - 32) + "/6";
-        const uint32_t channels = general.count(type) != 0 ? 8 : 0;
+        const uint32_t channels = general.contains(type) ? 8 : 0;
         if (type == 5 || type == 31)
             continue;
         expect({object, " 4/4 0/4", type % 2 != 0 ? core : no_core, program}, 44100, channels);

@@ -346,17 +346,17 @@ TEST(Faults, AreSurvivedAtEveryCall)
     for (const auto& [fn, sites] : g_ledTo)
         for (const Site site : sites) {
             const Place& place = At(site);
-            EXPECT_EQ(seen[place.line].count(fn), 1u) << place.line;
-            EXPECT_TRUE(place.growing_line == 0 || seen[place.growing_line].count(fn) == 1) << place.growing_line;
+            EXPECT_TRUE(seen[place.line].contains(fn)) << place.line;
+            EXPECT_TRUE(place.growing_line == 0 || seen[place.growing_line].contains(fn)) << place.growing_line;
         }
 }
 
 TEST(Faults, LeadToEveryPlaceOrTheFileAloneDoes)
 {
     for (const Place& place : Places()) {
-        const auto leads = [&place](const auto& led) { return led.second.count(place.site) != 0; };
+        const auto leads = [&place](const auto& led) { return led.second.contains(place.site); };
         const bool fault = std::any_of(g_ledTo.begin(), g_ledTo.end(), leads);
-        EXPECT_NE(fault, g_withoutFault.count(place.site) != 0) << place.line;
+        EXPECT_NE(fault, g_withoutFault.contains(place.site)) << place.line;
     }
 }
 

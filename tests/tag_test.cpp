@@ -187,8 +187,8 @@ TEST(TagKinds, AreReportedInBothDirections)
          {std::pair(ANY, &Row::any), {vc | ac, &Row::config}, {kc | AUDIO, &Row::keyframe}}) {
         Reader r(flv.bytes);
         r.at(DATA_OFFSET);
-        const auto expect = [&](Step step, size_t i, uint32_t kind) {
-            EXPECT_TRUE(kind == 0 || (r.*step)(wanted) == Found(0, flv.tags[i].offset, kind)) << rows[i].what;
+        const auto expect = [&, all = wanted](Step step, size_t i, uint32_t kind) {
+            EXPECT_TRUE(kind == 0 || (r.*step)(all) == Found(0, flv.tags[i].offset, kind)) << rows[i].what;
         };
         for (size_t i = 0; i < tags.size(); ++i)
             expect(&Reader::next, i, (rows[i].*column).next);
@@ -507,7 +507,8 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
         // One entry past the end stays.
         expect("cut in a frame", cut(34), flv.tags[34].offset, 437, 7, 480);
         expect("cut in a keyframe", cut(31), flv.tags[31].offset, 391, 6, 400);
-        expect("fewer times than places", fewer, flv.size() - 7 * 9, 782, 3, 160);
+        // Seven times of nine bytes less.
+        expect("fewer times than places", fewer, flv.size() - 63, 782, 3, 160);
         expect("entries astray", no_step, flv.size(), 782, 4, 240);
     }
 }
