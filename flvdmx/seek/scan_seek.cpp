@@ -61,8 +61,8 @@ int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
     const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
-    // More than the file has room for: a host that lies about positions could keep a walk busy for ever.
-    const int64_t most_steps = scan->ctx->data_end / FLVD_TAG_OVERHEAD;
+    // More tags than the data has room for: a host that lies about positions could keep a walk busy for ever.
+    const int64_t most_steps = scan->ctx->data_end >> 3;
     for (scan->steps = 0;;) {
         if (FLVD_FioAtEnd(scan->file))
             return scan->steps != 0 && forward ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;

@@ -90,7 +90,6 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
 int64_t FLVD_Scan(flvd_search_t* search)
 {
     const int64_t distance = FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW);
-    search->data_ended = false;
     if (distance > 0)
         search->budget -= static_cast<int32_t>(std::min<int64_t>(distance, FLVD_RESYNC_WINDOW));
     return distance;
