@@ -31,7 +31,7 @@ void FLVD_StoreElement(flvd_ctx_t* ctx, FlvdArray array, uint32_t entry, double 
 // True when the index has entries to seek by, and lies inside the file.
 bool FLVD_IsIndexUsable(const flvd_ctx_t* ctx);
 
-// Finds the last position before the first one that lies outside the file; 0 when there is none. `all_inside` tells
+// Finds the last position before the first one outside the file; 0 when there is none. `all_inside` tells
 // whether no position but perhaps the last one lies outside.
 int32_t FLVD_FindLastInside(flvd_ctx_t* ctx, int64_t* last, bool* all_inside);
 

@@ -61,7 +61,7 @@ int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
     const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
-    // More tags than the data has room for: a host that lies about positions could keep a walk busy for ever.
+    // More tags than the data has room for: a host with wrong positions could keep a walk running forever.
     const int64_t most_steps = scan->ctx->data_end >> 3;
     for (scan->steps = 0;;) {
         if (FLVD_FioAtEnd(scan->file))

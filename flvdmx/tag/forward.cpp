@@ -109,7 +109,7 @@ void FLVD_Resynchronise(flvd_search_t* search)
 // Both searches.
 
 // Takes the position. False when the host cannot tell it, or tells one before the last: a search only moves forward,
-// and a host that lies could keep it busy for ever.
+// and a host with wrong positions could keep it running forever.
 bool FLVD_TakePosition(flvd_search_t* search)
 {
     const int64_t position = FLVD_FioTell(search->file);

@@ -1,7 +1,7 @@
 /*
  * Host over two functions of the caller with a user pointer: read at a position, tell the size. What the library's file
- * functions lack, a context, is put behind a name that the kit generates; opening, positions, the end flag and the way
- * threads get along are the kit's business.
+ * functions lack, a context, is found by a name that the kit generates. The kit handles opening, positions, the end
+ * flag and thread safety.
  *
  *     static uint32_t read_at(void* user, int64_t position, void* buffer, uint32_t size);
  *     static int64_t get_size(void* user);

@@ -20,7 +20,9 @@ public:
     /** Borrows `size` bytes from `data` on. */
     constexpr Bytes(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
     /** Borrows all bytes of a vector, such as VideoInfo::config. */
-    Bytes(const std::vector<uint8_t>& bytes) : m_data(bytes.data()), m_size(bytes.size()) {} // NOLINT: a view, as meant
+    // Implicit like std::string_view's, so that a function takes configurations and frames alike.
+    // NOLINTNEXTLINE(google-explicit-constructor,hicpp-explicit-conversions)
+    Bytes(const std::vector<uint8_t>& bytes) : m_data(bytes.data()), m_size(bytes.size()) {}
     constexpr const uint8_t* data() const { return m_data; }         /**< the first; null when there is none */
     constexpr size_t size() const { return m_size; }                 /**< their number */
     constexpr bool empty() const { return m_size == 0; }             /**< true without bytes */
