@@ -27,7 +27,7 @@ int main(int argc, char** argv)
         return complain(argv[1], file.error());
 
     const auto metadata = file->metadata();
-    const std::string title((*metadata).text("title"));
+    const std::string title = (*metadata).text("title");
     std::printf("title: %s\n", title.empty() ? "none" : title.c_str());
     const auto keyframes = file->keyframes();
     for (const flvdmx::Keyframe& keyframe : *keyframes)

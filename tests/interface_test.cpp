@@ -130,7 +130,8 @@ TEST_P(Sample, IsDescribedAndPlayed)
                 const bool by_index = info.seek_method == flvdmx::SeekMethod::by_index; // whose times are the index's
                 EXPECT_EQ(list.size(), keyframes.size());
                 EXPECT_TRUE(by_index || list == keyframes);
-                EXPECT_NE((*moved.metadata()).find(info.video ? "width" : "audiocodecid"), nullptr);
+                const auto metadata = moved.metadata();
+                EXPECT_NE(metadata->find(info.video ? "width" : "audiocodecid"), nullptr);
             }
             EXPECT_EQ(lines, wanted);
             EXPECT_EQ(moved.last_error().kind(), wanted.empty() ? Kind::failed : growing ? Kind::not_yet : Kind::end);
@@ -177,60 +178,158 @@ TEST(Interface, TellsOfEachFrame)
     }
 }
 
-// The configurations "A", the first one, "B" and "C", each given with the first frame after it.
+// Configurations by their letters: of AVC the capitals, of AAC the small ones. L does not fit the cache, X is too long.
+Bytes ConfigOf(char letter)
+{
+    Bytes config = letter < 'a' ? SmallAvcRecord() : Bytes{0x12, 0x10};
+    config.push_back(static_cast<uint8_t>(letter));
+    config.resize(letter == 'X' ? 65536 : letter == 'L' ? 5000 : config.size());
+    return config;
+}
+
+// A file of configurations, pictures (1), sounds (2) and holes of zeros (#), one every 10 ms.
+Flv ConfigFile(const std::string& letters)
+{
+    Tags tags;
+    for (const char letter : letters) {
+        const auto time = static_cast<uint32_t>(tags.size() * 10);
+        tags.push_back(letter == '1'   ? Nalu(time)
+                       : letter == '2' ? Raw(time)
+                       : letter == '#' ? Pcm(time, 5 << 19)
+                       : letter < 'a'  ? Tag{9, time, AvcConfig(ConfigOf(letter))}
+                                       : Tag{8, time, AacConfig(ConfigOf(letter))});
+    }
+    Flv flv = File(tags);
+    for (size_t i = 0; i < letters.size(); ++i)
+        if (letters[i] == '#')
+            std::fill_n(flv.bytes.begin() + flv.tags[i].offset, flv.tags[i].size(), uint8_t{0});
+    return flv;
+}
+
+// Plays a file; returns its letters with that of each reported configuration at the frame that brings it.
+std::string ReportedConfigs(flvdmx::File& file, const Flv& flv, const std::string& letters, bool apart,
+                            const std::function<bool()>& wait)
+{
+    std::string reported(letters.size(), '.');
+    for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
+        for (auto frame = file.follow(wait, stream); frame; frame = file.follow(wait, stream))
+            for (size_t i = 0; i < letters.size() && frame->config_changed(); ++i)
+                if (ConfigOf(letters[i]) == Bytes(frame->new_config.begin(), frame->new_config.end()))
+                    for (size_t tag = 0; tag < letters.size(); ++tag)
+                        if (flv.tags[tag].offset == frame->position)
+                            reported[tag] = letters[i];
+    return reported;
+}
+
+// Below each file: what is reported when it is played, and when it is played again from the beginning.
 TEST(Interface, ReportsChangedConfigurations)
 {
-    const auto avc = [](uint8_t level) {
-        Bytes record = SmallAvcRecord();
-        record[3] = level;
-        return record;
+    struct Case {
+        const char *name, *file, *first, *again;
     };
-    const Bytes a = avc(40), b = avc(41), c = avc(42), aac = {0x12, 0x10, 0x56, 0xE5, 0x00}, other_aac = {0x11, 0x90};
-    const auto video = [](const Bytes& record) { return Tag{9, 0, AvcConfig(record)}; };
-    const Flv flv = File({video(a),
-                          g_aac,
-                          Nalu(0),
-                          Raw(10),
-                          video(a),
-                          g_aac,
-                          Nalu(40),
-                          Raw(50),
-                          video(b),
-                          Raw(70),
-                          Nalu(80),
-                          Raw(90),
-                          Tag{8, 0, AacConfig(other_aac)},
-                          video(b),
-                          Nalu(120),
-                          Raw(130),
-                          video(a),
-                          video(c),
-                          Nalu(160),
-                          Raw(170)});
-    const std::vector<std::pair<int64_t, Bytes>> first = {{80, b}, {130, other_aac}, {160, c}}, again = {{0, a}};
-    const Memory memory("memory", flv.bytes);
-    for (const auto& [apart, growing] : {std::pair(false, false), {false, true}, {true, false}, {true, true}}) {
-        SCOPED_TRACE(testing::Message() << (apart ? "two readers" : "one reader") << (growing ? ", growing" : ""));
-        auto file = flvdmx::File::open("memory", g_memory, {0, 0, apart, growing});
-        std::vector<std::pair<int64_t, Bytes>> changes;
-        const auto play = [&, apart = apart] {
-            changes.clear();
-            for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
-                for (const flvdmx::Frame& frame : file->frames(stream))
-                    if (frame.config_changed())
-                        changes.emplace_back(frame.time.count(),
-                                             Bytes(frame.new_config.begin(), frame.new_config.end()));
-            std::sort(changes.begin(), changes.end());
-        };
-        play();
-        EXPECT_EQ(changes, first);
-        if (growing)
-            continue; // no seeking without an index
-        ASSERT_TRUE(file->seek(0ms));
-        play();
-        EXPECT_EQ(changes,
-                  (std::vector<std::pair<int64_t, Bytes>>{{0, a}, {10, aac}, {80, b}, {130, other_aac}, {160, c}}));
+    const Case cases[] = {
+        {.name = "a copy of the configuration in force is no change",
+         .file = "Aa12Aa12B212bB12AC12",
+         .first = "..........B....b..C.",
+         .again = "..Aa......B....b..C."},
+        {.name = "no frame needs the one between", .file = "A1BA1B1", .first = "......B", .again = ".A....B"},
+        {.name = "larger than the cache", .file = "A1L11B1", .first = "...L..B", .again = ".A.L..B"},
+        {.name = "above 64 KiB", .file = "A11X1B1", .first = "......B", .again = ".A....B"},
+        {.name = "after holes longer than a search", .file = "A121#B#12", .first = ".......B.", .again = ".A.....B."}};
+    for (const Case& test : cases) {
+        const Flv flv = ConfigFile(test.file);
+        Memory memory("memory", flv.bytes);
+        for (const auto& [apart, growing] : {std::pair(false, false), {false, true}, {true, false}, {true, true}}) {
+            SCOPED_TRACE(testing::Message()
+                         << test.name << (apart ? ", two readers" : "") << (growing ? ", growing" : ""));
+            memory.size = growing ? static_cast<uint64_t>(flv.tags[3].end()) : flv.bytes.size();
+            auto file = flvdmx::File::open("memory", g_memory, {1024, 0, apart, growing});
+            const auto grow = [&] {
+                memory.size = std::min<uint64_t>(memory.size + 7 + flv.bytes.size() / 200, flv.bytes.size());
+                return memory.size < flv.bytes.size();
+            };
+            EXPECT_EQ(ReportedConfigs(*file, flv, test.file, apart, grow), test.first);
+            if (growing)
+                continue; // no seeking without an index
+            ASSERT_TRUE(file->seek(0ms));
+            EXPECT_EQ(ReportedConfigs(*file, flv, test.file, apart, grow), test.again);
+        }
     }
+}
+
+// Of the changes that were forgotten a seek back reports none, rather than a wrong one.
+TEST(Interface, ForgetsEarlyConfigurations)
+{
+    Tags tags;
+    const auto config = [](uint32_t n) { return Concat({SmallAvcRecord(), BigEndian(n, 2)}); };
+    for (uint32_t n = 0; n < 300; ++n)
+        tags.insert(tags.end(), {Tag{9, n * 10, AvcConfig(config(n))}, Nalu(n * 10)});
+    const Flv flv = File(tags);
+    const Memory memory("memory", flv.bytes);
+    auto file = flvdmx::File::open("memory", g_memory);
+    const auto reported = [&] {
+        const auto frame = file->next_frame();
+        return Bytes(frame->new_config.begin(), frame->new_config.end());
+    };
+    EXPECT_EQ(reported(), Bytes());
+    for (uint32_t n = 1; n < 300; ++n)
+        EXPECT_EQ(reported(), config(n));
+    ASSERT_TRUE(file->seek(500ms));
+    EXPECT_EQ(reported(), Bytes());
+    EXPECT_EQ(reported(), config(51));
+    ASSERT_TRUE(file->seek(2800ms));
+    EXPECT_EQ(reported(), config(280));
+}
+
+// A host call that fails once delays a report at most.
+TEST(Interface, ReportsConfigurationsAfterAHostFailure)
+{
+    const Flv flv = ConfigFile("Aa12CB1cb2121212");
+    Sweep sweep;
+    for (const bool apart : {false, true}) {
+        uint64_t calls = 1;
+        for (uint64_t n = 0; n <= calls; ++n) {
+            if (!sweep.takes_next() && n != 0)
+                continue;
+            SCOPED_TRACE(testing::Message() << "call " << n << (apart ? ", two readers" : ""));
+            FakeHost host(flv.bytes);
+            host.fail_nth_call(n); // none at first
+            auto file = flvdmx::File::open(FakeHost::DEFAULT_FILE, flvdmx::Host(host.init()), {1024, 0, apart});
+            const flvdmx::Info info = file->info();
+            if (!info.video || !info.audio)
+                continue; // the open met the failure
+            Bytes video = info.video->config, audio = info.audio->config;
+            for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
+                for (int failures = 0; failures < 2;)
+                    if (const auto frame = file->next_frame(stream); !frame)
+                        ++failures;
+                    else if (frame->config_changed())
+                        (frame->stream == Stream::video ? video : audio)
+                            .assign(frame->new_config.begin(), frame->new_config.end());
+            EXPECT_EQ(video, ConfigOf('B'));
+            EXPECT_EQ(audio, ConfigOf('b'));
+            calls = n == 0 ? host.failable_calls() : calls;
+        }
+    }
+}
+
+// A list that could not be read is a failure, not an empty list; playing goes on where it was.
+TEST(Interface, ReportsListsThatCannotBeRead)
+{
+    const Expected sample = ReadExpected("avc_aac");
+    for (const auto& [function, code] : {std::pair(HostFn::Seek, FLVD_ERR_SEEK), {HostFn::Tell, FLVD_ERR_POSITION}}) {
+        FakeHost host(sample.bytes);
+        auto file = flvdmx::File::open(FakeHost::DEFAULT_FILE, flvdmx::Host(host.init()));
+        EXPECT_TRUE(file->next_frame());
+        host.fail_from(function, 1);
+        EXPECT_EQ(file->metadata().error().code(), code);
+        EXPECT_EQ(file->keyframes().error().code(), code);
+        host.fail_nothing();
+        EXPECT_EQ(Line(*file->next_frame()), ExpectedLines(sample)[1]);
+    }
+    auto file = flvdmx::File::open(g_data + "avc_aac.flv");
+    EXPECT_THROW((void)file->keyframes([](int64_t, int64_t) -> bool { throw 1; }), int);
+    EXPECT_EQ(Line(*file->next_frame()), ExpectedLines(sample)[0]);
 }
 
 // A recording that began anew: most of its frames are later than the last ones.
@@ -397,6 +496,8 @@ TEST(Interface, TellsWhyAFileDidNotOpen)
         EXPECT_EQ(flvdmx::File::open(g_data + "absent", host).error().system_error(), ENOENT);
         EXPECT_EQ(flvdmx::File::open(g_data, host).error().system_error(), is_file ? EISDIR : ENOENT);
     }
+    const auto cut = flvdmx::File::open(g_data + "avc_aac.flv" + '\0' + ".old");
+    EXPECT_EQ(cut.error().system_error(), EINVAL);
     const auto text = flvdmx::File::open(g_data + "script_data.txt");
     EXPECT_EQ(text.error().code(), FLVD_ERR_FILE_HEADER);
     EXPECT_EQ(text.error().system_error(), 0) << "it was opened";

@@ -33,6 +33,8 @@
  *   All other calls take no lock, and an open must not run beside them, on whatever File: when threads play files while
  *   others open some, they hold open_mutex around their own calls as well.
  * - One File is used by one thread at a time. Calls on different Files may run at the same time.
+ * - open_mutex and what else the header keeps for the process are inline variables. Shared objects that hide their
+ *   symbols have them once each: let only one of them open files.
  */
 #ifndef FLVDMX_FLVDMX_HPP
 #define FLVDMX_FLVDMX_HPP
@@ -280,11 +282,11 @@ struct Options {
 
 /** How to seek; modes are combined with |. */
 enum class SeekMode : uint32_t {
-    automatic = 0,                             /**< forward, unless the target is earlier than the current position */
-    absolute = 0,                              /**< the time counts from the file's first timestamp */
-    backward = FLVD_SEEK_BACKWARD,             /**< to the keyframe at or before the time */
-    forward = FLVD_SEEK_FORWARD,               /**< to the keyframe at or after the time */
-    relative = FLVD_SEEK_RELATIVE,             /**< the time counts from the current position */
+    automatic = 0,                 /**< backward when the time is earlier than the current position, else forward */
+    absolute = 0,                  /**< the time counts from the file's first timestamp */
+    backward = FLVD_SEEK_BACKWARD, /**< to the keyframe at or before the time */
+    forward = FLVD_SEEK_FORWARD,   /**< to the keyframe at or after the time */
+    relative = FLVD_SEEK_RELATIVE, /**< the time counts from the current position */
     to_end_on_miss = FLVD_SEEK_TO_END_ON_MISS, /**< after a miss go to the end */
     retry_backward = FLVD_SEEK_RETRY_BACKWARD  /**< after a miss try backward, the time being absolute */
 };
@@ -307,8 +309,9 @@ public:
 
     /**
      * Opens a file through the functions of `host`; they stay the process's, see above. The path is copied.
-     * @return the file; Kind::not_yet when a growing file does not hold a file header and the beginning of a stream,
-     *         which more bytes may bring; Kind::failed, with the system's reason when it could not be opened;
+     * @return the file; Kind::not_yet when a growing file does not yet hold a file header and the beginning of a
+     *         stream, which is also the answer for a growing file that is no FLV file: set a limit; Kind::failed, with
+     *         the system's reason when the host could not open the file, EINVAL for a path with a null character in it;
      *         FLVD_ERR_HOST_IN_USE, FLVD_ERR_HOST_INCOMPLETE
      * @note What the open did not find is not found later: look at info() for the streams that are awaited, and open
      *       a growing file again while one is missing.
@@ -316,6 +319,8 @@ public:
     static result<File> open(std::string_view path, const Host& host, const Options& options = {})
     {
         File file;
+        if (path.find('\0') != path.npos)
+            return error(Kind::failed, FLVD_ERR_OPEN_MAIN, 0, EINVAL);
         file.m_path.reset(new (std::nothrow) char[path.size() + 1]);
         if (file.m_path == nullptr)
             return error(Kind::failed, FLVD_ERR_INSTANCE_MEMORY, 0);
@@ -391,9 +396,10 @@ public:
         if (const error failed = leave(); failed.kind() != Kind::none)
             return failed;
         Metadata metadata;
-        if (move_to(m_return.reader, m_instance->data_offset))
-            read_script_tags(m_return.reader, metadata);
+        const int32_t code = read_script_tags(m_return.reader, metadata);
         go_back();
+        if (code != FLVD_ERR_NONE)
+            return error(Kind::failed, code, 0);
         return metadata;
     }
 
@@ -412,16 +418,16 @@ public:
             return failed;
         fio_file_t* const reader = m_return.reader;
         std::vector<Keyframe> list;
+        int32_t code = FLVD_ERR_NONE;
         if ((m_instance->streams & FLVD_STREAM_VIDEO) != 0) {
             if (m_instance->seek_method == FLVD_SEEK_BY_INDEX)
                 list = read_index(reader);
-            if (list.empty() && move_to(reader, m_instance->data_offset)) {
-                m_walking = true;
-                list = walk_keyframes(reader, progress);
-                m_walking = false;
-            }
+            if (list.empty())
+                code = walk_keyframes(reader, progress, list);
         }
         go_back();
+        if (code != FLVD_ERR_NONE)
+            return error(Kind::failed, code, 0);
         return list;
     }
 
@@ -434,9 +440,10 @@ public:
     /**
      * The next frame, as flvd_next_frame() finds it: damaged stretches of any length are crossed.
      *
-     * A codec configuration that differs from the one before it is reported with the first frame after it; a copy of
-     * the same configuration is not. A seek back to frames that were played before reports theirs again. What a seek
-     * jumps over is not looked at: until playing has passed it, a change in there is not known.
+     * A codec configuration that differs from the one in force is reported with the first frame after it. A seek back
+     * to frames that were played before reports theirs again. What a seek jumps over is not looked at: until playing
+     * has passed it, a change in there is not known. Configurations above 64 KiB are not reported; when a stream has
+     * more than 256 changes, earlier ones are forgotten, and a seek back to them reports none.
      *
      * @param stream with a separate audio reader video or audio; without one it is not looked at
      * @return the frame; Kind::end, for a growing file Kind::not_yet; Kind::failed
@@ -487,7 +494,7 @@ public:
     {
         if (!can_read())
             return failure();
-        m_next = {-1, -1};
+        m_readers = {};
         const flvd_seek_request_t request = {clamp<int32_t>(time.count()), static_cast<uint32_t>(mode)};
         int32_t reached = 0;
         if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) != 0)
@@ -506,7 +513,8 @@ private:
     static constexpr uint32_t back_pointer_size = 4;
     static constexpr uint32_t metadata_tags = 102;        // as many as an open looks at
     static constexpr uint32_t script_data_max = 1u << 20; // bytes read of one script tag
-    static constexpr size_t changes_max = 256;            // configurations remembered
+    static constexpr uint32_t config_max = 1u << 16;      // bytes of a configuration; longer ones are not reported
+    static constexpr size_t configs_max = 256;            // remembered of a stream
 
     // A tag header and the five bytes after it, of which a codec header has 1, 2 or 5.
     class Tag {
@@ -562,11 +570,86 @@ private:
         uint8_t m_bytes[tag_header_size + 5]{};
     };
 
-    // A configuration that differs from the one before it, and where its tag begins.
-    struct Change {
-        int64_t position;
-        Stream stream;
-        std::vector<uint8_t> config;
+    // The configurations of a stream where they are known to change, and the one that the decoder has. Empty until the
+    // first change: then the one that the open found holds everywhere.
+    class ConfigHistory {
+    public:
+        bool empty() const { return m_changes.empty(); }
+
+        // Adds a configuration, whose tag begins at `position`. When there is no room all others are forgotten, so that
+        // no frame gets a wrong one.
+        void add(int64_t position, std::vector<uint8_t> bytes, Bytes opened)
+        {
+            if (empty()) {
+                if (std::equal(bytes.begin(), bytes.end(), opened.begin(), opened.end()))
+                    return;
+                m_given = share({opened.begin(), opened.end()});
+                m_changes.push_back({-1, m_given});
+            }
+            const Change* const before = change_at(position);
+            if (before != nullptr && *before->config == bytes)
+                return;
+            Change change = {position, share(std::move(bytes))};
+            if (m_changes.size() == configs_max)
+                m_changes.clear();
+            m_changes.insert(after(position), std::move(change));
+        }
+
+        // The configuration of the frame whose tag begins at `position`, when the decoder has another; else empty.
+        Bytes take_changed(int64_t position)
+        {
+            const Change* const change = position >= 0 ? change_at(position) : nullptr;
+            if (change == nullptr || *change->config == *m_given)
+                return {};
+            m_given = change->config;
+            return *m_given;
+        }
+
+    private:
+        using Config = std::shared_ptr<const std::vector<uint8_t>>; // that of the decoder outlives what is forgotten
+        struct Change {
+            int64_t position;
+            Config config;
+        };
+
+        static Config share(std::vector<uint8_t> bytes)
+        {
+            return std::make_shared<const std::vector<uint8_t>>(std::move(bytes));
+        }
+
+        std::vector<Change>::const_iterator after(int64_t position) const
+        {
+            const auto is_before = [](int64_t at, const Change& change) { return at < change.position; };
+            return std::upper_bound(m_changes.begin(), m_changes.end(), position, is_before);
+        }
+
+        // The last change at or before a position; null when it was forgotten.
+        const Change* change_at(int64_t position) const
+        {
+            const auto next = after(position);
+            return next != m_changes.begin() ? &*(next - 1) : nullptr;
+        }
+
+        std::vector<Change> m_changes; // in file order
+        Config m_given;
+    };
+
+    // What is known of a reader between two requests; -1: not known.
+    struct ReaderState {
+        int64_t next = -1;    // where it stands
+        int64_t learned = -1; // up to here, from the last seek on, the configurations are in the history
+    };
+
+    // Refuses other calls while keyframes() walks, whatever its report throws.
+    class Walk {
+    public:
+        explicit Walk(bool& walking) : m_walking(walking) { m_walking = true; }
+        ~Walk() { m_walking = false; }
+        Walk(const Walk&) = delete;
+        Walk& operator=(const Walk&) = delete;
+
+    private:
+        bool& m_walking;
     };
 
     // Where playing is when a reader is used for something else, or could not be put back.
@@ -581,9 +664,9 @@ private:
         std::swap(m_instance, other.m_instance);
         std::swap(m_request, other.m_request);
         std::swap(m_return, other.m_return);
-        std::swap(m_changes, other.m_changes);
-        std::swap(m_given, other.m_given);
-        std::swap(m_next, other.m_next);
+        std::swap(m_readers, other.m_readers);
+        std::swap(m_video_configs, other.m_video_configs);
+        std::swap(m_audio_configs, other.m_audio_configs);
     }
 
     /* Opening. */
@@ -703,13 +786,17 @@ private:
         return {};
     }
 
-    // The first tag of a wanted kind from the reader's position on, by the library's own rules.
+    // Moves to the first tag of a wanted kind from the reader's position on, by the library's own rules.
+    int32_t get_tag(fio_file_t* reader, flvd_tag_info_t& info, uint32_t wanted) const
+    {
+        return FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1);
+    }
+
+    // The same; no tag when there is none or its position is not known.
     Tag find_tag(fio_file_t* reader, uint32_t wanted) const
     {
         flvd_tag_info_t info;
-        if (FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1) != 0)
-            return {};
-        return {reader, __FLV_DMX__fioTell64(reader)};
+        return get_tag(reader, info, wanted) == 0 ? Tag(reader, __FLV_DMX__fioTell64(reader)) : Tag();
     }
 
     /* Frames. */
@@ -719,13 +806,15 @@ private:
     {
         if (!can_read())
             return false;
-        const bool audio = stream == Stream::audio;
-        fio_file_t* const reader = audio ? m_instance->audio_reader : m_instance->main_reader;
-        int64_t begin = std::exchange(m_next[audio ? 1 : 0], -1);
+        fio_file_t* const reader = stream == Stream::audio ? m_instance->audio_reader : m_instance->main_reader;
+        ReaderState& state = m_readers[reader == m_instance->main_reader ? 0 : 1];
+        int64_t begin = std::exchange(state.next, -1);
         if (begin < 0)
             begin = __FLV_DMX__fioTell64(reader);
+        if (state.learned < 0)
+            state.learned = begin;
         Tag ahead(reader, begin);
-        if (m_instance->main_reader != m_instance->audio_reader && !go_to_stream(reader, stream, ahead))
+        if (m_instance->main_reader != m_instance->audio_reader && !go_to_stream(reader, stream, state, ahead))
             return false;
         m_request.stream = static_cast<uint32_t>(stream);
         flvd_frame_t taken;
@@ -735,13 +824,16 @@ private:
         frame.stream = static_cast<Stream>(taken.stream);
         frame.time = time_of(taken.timestamp_ms + m_instance->first_ts);
         frame.data = {taken.data, taken.size};
-        if (!ahead.carries(taken, end))
-            ahead = look_again(taken, reader, ahead.position, end);
+        if (ahead.carries(taken, end) && ahead.position == state.learned)
+            state.learned = end;
+        else
+            ahead = look_again(taken, {reader, begin}, end, state);
         frame.composition_offset = Milliseconds(ahead.composition_offset());
         frame.keyframe = frame.stream == Stream::audio || ahead.is_keyframe();
         frame.position = ahead.position;
-        frame.new_config = m_changes.empty() ? Bytes() : changed_config(frame.stream, ahead.position);
-        m_next[audio ? 1 : 0] = end;
+        ConfigHistory& configs = configs_of(frame.stream);
+        frame.new_config = configs.empty() ? Bytes() : configs.take_changed(ahead.position);
+        state.next = end;
         return true;
     }
 
@@ -754,15 +846,18 @@ private:
 
     // With two readers the tags of the other stream come first: the library would cross them as well, and goes on from
     // the tag after them. False when the reader is no longer where playing is.
-    [[gnu::noinline]] bool go_to_stream(fio_file_t* reader, Stream stream, Tag& ahead)
+    [[gnu::noinline]] bool go_to_stream(fio_file_t* reader, Stream stream, ReaderState& state, Tag& ahead)
     {
         const bool found = (m_instance->streams & static_cast<uint32_t>(stream)) != 0;
         if (!found || ahead.position < 0 || ahead.stream() == stream)
             return true;
         const Return begin = {reader, ahead.position};
         ahead = find_tag(reader, stream == Stream::video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO);
-        if (ahead.position >= 0)
+        if (ahead.position >= 0) {
+            if (state.learned == begin.position)
+                state.learned = ahead.position; // none of this stream is between
             return true;
+        }
         m_return = begin;
         return can_read();
     }
@@ -773,100 +868,81 @@ private:
         return Milliseconds(int64_t{timestamp} - int64_t{m_instance->first_ts});
     }
 
-    // After a frame before which tags were passed over: its tag, and what configurations are between. `from` is where
-    // the reader stood before, `end` where it stands now.
-    [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, fio_file_t* reader, int64_t from, int64_t end)
+    // After a frame that is not the first tag ahead, or before which an earlier request has crossed tags: finds its tag
+    // and learns the configurations before it. `begin` is where the request began, `end` where the reader stands.
+    [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, const Return& begin, int64_t end, ReaderState& state)
     {
-        m_return = {reader, end};
-        const Tag tag = tag_before(frame, reader, end);
-        if (from >= 0 && from < tag.position && move_to(reader, from))
-            learn_configs(reader, tag.position);
+        if (end < 0)
+            return {};
+        // A configuration takes memory. When that throws, the next request brings the frame again.
+        m_return = {begin.reader, begin.position < 0 ? end : begin.position};
+        const Tag tag = tag_before(frame, begin.reader, end);
+        if (state.learned < 0 || (tag.position >= 0 && learn_configs(begin.reader, state.learned, tag.position)))
+            state.learned = end; // else the host failed, and the next frame tries again
+        m_return.position = end;
         go_back();
         return tag;
     }
 
     // The tag that ends at `end` and carries the frame.
-    static Tag tag_before(const flvd_frame_t& frame, fio_file_t* reader, int64_t end)
+    Tag tag_before(const flvd_frame_t& frame, fio_file_t* reader, int64_t end) const
     {
-        for (const uint32_t codec_header : {5U, 2U, 1U}) {
-            const int64_t begin = end - back_pointer_size - frame.size - codec_header - tag_header_size;
-            const Tag tag = begin >= 0 && move_to(reader, begin) ? Tag(reader, begin) : Tag();
-            if (tag.carries(frame, end))
-                return tag;
-        }
-        return {};
+        const bool is_video = frame.stream == FLVD_STREAM_VIDEO;
+        const uint32_t codec_header =
+            is_video ? (video_codec() == VideoCodec::avc ? 5 : 1) : (audio_codec() == AudioCodec::aac ? 2 : 1);
+        const int64_t begin = end - back_pointer_size - frame.size - codec_header - tag_header_size;
+        const Tag tag = begin >= 0 && move_to(reader, begin) ? Tag(reader, begin) : Tag();
+        return tag.carries(frame, end) ? tag : Tag();
     }
 
-    void learn_configs(fio_file_t* reader, int64_t end)
+    // Learns the configurations of both streams in a part of the file. False when the host failed.
+    bool learn_configs(fio_file_t* reader, int64_t from, int64_t end)
     {
-        for (int64_t reached = -1;;) {
+        while (from < end) {
+            if (!move_to(reader, from))
+                return false;
             const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO);
-            if (tag.position <= reached || tag.position >= end)
-                return;
-            if (tag.is_config())
-                learn_config(reader, tag);
-            reached = tag.position;
-            if (!move_to(reader, tag.end()))
-                return;
+            const int64_t next = tag.position >= 0 ? tag.end() : __FLV_DMX__fioTell64(reader); // past the search
+            if (next <= from || (tag.is_config() && tag.position < end && !learn_config(reader, tag)))
+                return false;
+            from = next;
         }
+        return true;
     }
 
-    // One that does not fit the cache of the reader is none: they have a few dozen bytes.
-    void learn_config(fio_file_t* reader, const Tag& tag)
+    bool learn_config(fio_file_t* reader, const Tag& tag)
     {
-        const uint32_t headers = tag_header_size + tag.codec_header_size();
-        const uint32_t size = tag_header_size + tag.data_size();
-        const uint8_t* bytes = nullptr;
-        if (size <= headers || __FLV_DMX__fioShowBytesByPtr(&bytes, size, reader) < size)
-            return;
-        const Bytes config(bytes + headers, size - headers);
-        const Bytes before = config_at(change_at(tag.stream(), tag.position), tag.stream());
-        if (std::equal(config.begin(), config.end(), before.begin(), before.end()))
-            return;
-        if (m_changes.size() == changes_max)
-            m_changes.erase(m_changes.begin());
-        const auto is_later = [&tag](const Change& change) { return change.position > tag.position; };
-        m_changes.insert(std::find_if(m_changes.begin(), m_changes.end(), is_later),
-                         {tag.position, tag.stream(), {config.begin(), config.end()}});
+        const uint32_t headers = tag.codec_header_size();
+        if (tag.data_size() <= headers || tag.data_size() > config_max)
+            return true;
+        std::vector<uint8_t> config(tag.data_size() - headers);
+        const auto size = static_cast<uint32_t>(config.size());
+        __FLV_DMX__fioSkipBytes(tag_header_size + headers, reader);
+        if (__FLV_DMX__fioRead(config.data(), 1, size, reader) != size)
+            return false;
+        configs_of(tag.stream()).add(tag.position, std::move(config), opened_config(tag.stream()));
+        return true;
     }
 
-    // The last change of a stream before a position; null: the configuration that the open found still holds.
-    const Change* change_at(Stream stream, int64_t position) const
-    {
-        const Change* last = nullptr;
-        for (const Change& change : m_changes)
-            if (change.stream == stream && change.position <= position)
-                last = &change;
-        return last;
-    }
+    ConfigHistory& configs_of(Stream stream) { return stream == Stream::video ? m_video_configs : m_audio_configs; }
 
-    Bytes config_at(const Change* change, Stream stream) const
+    Bytes opened_config(Stream stream) const
     {
-        if (change != nullptr)
-            return {change->config.data(), change->config.size()};
         return stream == Stream::video ? Bytes(m_instance->video_info.config, m_instance->video_info.config_size)
                                        : Bytes(m_instance->audio_info.config, m_instance->audio_info.config_size);
     }
 
-    // The configuration of a frame, when it is not the one that was given last.
-    [[gnu::noinline]] Bytes changed_config(Stream stream, int64_t position)
-    {
-        const Change* const change = change_at(stream, position);
-        int64_t& given = m_given[stream == Stream::video ? 0 : 1];
-        const int64_t now = change != nullptr ? change->position : -1;
-        if (position < 0 || now == given)
-            return {};
-        given = now;
-        return config_at(change, stream);
-    }
-
     /* What the file says of itself. */
+
+    // CodecID and SoundFormat are the low and the high half of the first payload byte.
+    VideoCodec video_codec() const { return static_cast<VideoCodec>(m_instance->video_codec_filter & 15); }
+    AudioCodec audio_codec() const { return static_cast<AudioCodec>(m_instance->audio_format_filter >> 4 & 15); }
 
     VideoInfo describe_video() const
     {
         const flvd_video_info_t& video = m_instance->video_info;
         VideoInfo info;
-        info.codec = static_cast<VideoCodec>(m_instance->video_codec_filter & 15); // the low half of the codec byte
+        info.codec = video_codec();
         info.width = video.width;
         info.height = video.height;
         info.frame_rate = video.frame_rate / 1000.0;
@@ -881,7 +957,7 @@ private:
     {
         const flvd_audio_info_t& audio = m_instance->audio_info;
         AudioInfo info;
-        info.codec = static_cast<AudioCodec>(m_instance->audio_format_filter >> 4 & 15); // the high half
+        info.codec = audio_codec();
         info.sample_rate = audio.sample_rate;
         info.sample_size = audio.sample_size;
         info.channels = audio.channels;
@@ -891,17 +967,23 @@ private:
         return info;
     }
 
-    void read_script_tags(fio_file_t* reader, Metadata& metadata) const
+    int32_t read_script_tags(fio_file_t* reader, Metadata& metadata) const
     {
+        int64_t position = m_instance->data_offset;
         for (uint32_t tags = 0; tags < metadata_tags; ++tags) {
-            const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT);
+            if (!move_to(reader, position))
+                return FLVD_ERR_SEEK;
+            flvd_tag_info_t info;
+            if (get_tag(reader, info, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT) != 0)
+                return FLVD_ERR_NONE;
+            const Tag tag(reader, __FLV_DMX__fioTell64(reader));
             if (tag.position < 0)
-                return;
+                return FLVD_ERR_POSITION;
             if (tag.stream() == Stream::any)
                 read_script_tag(reader, tag, metadata);
-            if (!move_to(reader, tag.end()))
-                return;
+            position = tag.end();
         }
+        return FLVD_ERR_NONE;
     }
 
     static void read_script_tag(fio_file_t* reader, const Tag& tag, Metadata& metadata)
@@ -912,23 +994,28 @@ private:
         metadata.add_script_data({payload.data(), size});
     }
 
-    template <typename Progress> std::vector<Keyframe> walk_keyframes(fio_file_t* reader, Progress& progress) const
+    // Adds the keyframes that a walk from the first tag on finds; returns the code of a failure.
+    template <typename Report> int32_t walk_keyframes(fio_file_t* reader, Report& report, std::vector<Keyframe>& list)
     {
-        std::vector<Keyframe> list;
+        const Walk walk(m_walking);
+        if (!move_to(reader, m_instance->data_offset))
+            return FLVD_ERR_SEEK;
         for (int64_t reached = -1;;) {
             flvd_tag_info_t info;
             const uint32_t wanted = FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME;
             const bool found = FLVD_MoveToNextTag(m_instance, reader, &info, wanted, nullptr) == 0;
             const int64_t position = __FLV_DMX__fioTell64(reader);
+            if (position < 0)
+                return FLVD_ERR_POSITION;
             if (position <= reached || (!found && position >= m_instance->data_end))
-                return list; // else the walk crosses damage
+                return FLVD_ERR_NONE; // else the walk crosses damage
             reached = position;
             const Tag tag = found ? Tag(reader, position) : Tag();
             if (tag.position < 0 || !tag.has_frame())
                 continue;
             list.push_back({time_of(tag.timestamp()), position});
-            if (!progress(position, m_instance->file_size))
-                return list;
+            if (!report(position, m_instance->file_size))
+                return FLVD_ERR_NONE;
         }
     }
 
@@ -948,7 +1035,7 @@ private:
         return list;
     }
 
-    // Up to `count` elements of a strict array of AMF0; what is no number ends it.
+    // Up to `count` elements of a strict array of AMF0; another kind of value ends it.
     static std::vector<double> read_numbers(fio_file_t* reader, int64_t from, uint32_t count)
     {
         constexpr size_t element_size = 1 + sizeof(double); // marker 0, big-endian number
@@ -965,7 +1052,7 @@ private:
         return numbers;
     }
 
-    // What does not fit becomes the greatest or least number that does, what is no number the least.
+    // What does not fit becomes the greatest or least number that does; NaN becomes the least.
     template <typename To, typename From> static To clamp(From value)
     {
         using Limits = std::numeric_limits<To>;
@@ -981,10 +1068,10 @@ private:
     flvd_ctx_t* m_instance = nullptr;
     flvd_frame_request_t m_request{};
     Return m_return;
-    bool m_walking = false;                 // inside keyframes()
-    std::vector<Change> m_changes;          // in file order
-    std::array<int64_t, 2> m_given{-1, -1}; // positions of the changes that video and audio had last; -1: none
-    std::array<int64_t, 2> m_next{-1, -1};  // where the main and the audio reader stand, when that is known; else -1
+    bool m_walking = false;               // inside keyframes()
+    std::array<ReaderState, 2> m_readers; // of the main reader and of a separate audio reader
+    ConfigHistory m_video_configs;
+    ConfigHistory m_audio_configs;
 };
 
 /** The frames of a file from where it stands, for one range-for. */

@@ -20,8 +20,8 @@ namespace flvdmx {
 
 /** A date of the metadata. */
 struct Date {
-    double milliseconds = 0;  /**< since the beginning of 1970, UTC; as the file says, which may be no number */
-    int16_t zone_minutes = 0; /**< what the file says of the time zone, mostly 0; not part of `milliseconds` */
+    double milliseconds = 0;  /**< since the beginning of 1970, UTC, as in the file; NaN and infinity are possible */
+    int16_t zone_minutes = 0; /**< the time zone as in the file, mostly 0; not included in `milliseconds` */
 };
 
 /** One property. */
@@ -49,7 +49,7 @@ public:
     size_t size() const { return m_properties.size(); }                                  /**< their number */
 
     /** @return the first property of that name, null without one; valid while the Metadata lives */
-    const Property* find(std::string_view name) const
+    const Property* find(std::string_view name) const&
     {
         for (const Property& property : m_properties)
             if (property.name == name)
@@ -57,16 +57,17 @@ public:
         return nullptr;
     }
 
-    /** @return the text of the property of that name; empty when there is none or when it is no text */
-    std::string_view text(std::string_view name) const
+    const Property* find(std::string_view name) const&& = delete; /**< refused: the property would be gone at once */
+
+    /** @return a copy of the text of the property of that name; empty when there is none or it is not a text */
+    std::string text(std::string_view name) const
     {
         const Property* const property = find(name);
         const auto* const value = property != nullptr ? std::get_if<std::string>(&property->value) : nullptr;
-        return value != nullptr ? std::string_view(*value) : std::string_view();
+        return value != nullptr ? *value : std::string();
     }
 
-    /** Adds the properties of one script tag. What is damaged or cut short ends it; the properties before that count.
-     */
+    /** Adds the properties of one script tag, up to the first value that is damaged or cut short. */
     void add_script_data(Bytes payload)
     {
         Reader reader(*this, payload);
@@ -130,10 +131,10 @@ private:
             return {milliseconds, static_cast<int16_t>(take_integer(2))};
         }
 
-        // A text after its length, which has so many bytes.
+        // A text after its length, a number of 2 or 4 bytes.
         std::string_view take_text(size_t length_size)
         {
-            const Bytes text = take(static_cast<size_t>(take_integer(length_size)));
+            const Bytes text = take(static_cast<uint32_t>(take_integer(length_size)));
             return {reinterpret_cast<const char*>(text.data()), text.size()};
         }
 
