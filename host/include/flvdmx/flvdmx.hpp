@@ -494,7 +494,7 @@ public:
     {
         if (!can_read())
             return failure();
-        m_readers = {};
+        m_learned = {};
         const flvd_seek_request_t request = {clamp<int32_t>(time.count()), static_cast<uint32_t>(mode)};
         int32_t reached = 0;
         if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) != 0)
@@ -541,7 +541,6 @@ private:
         int64_t end() const { return position + tag_header_size + data_size() + back_pointer_size; }
         bool is_keyframe() const { return is_audio() || m_bytes[11] >> 4 == 1 || m_bytes[11] >> 4 == 4; }
 
-        uint32_t codec_header_size() const { return is_avc() ? 5 : is_aac() ? 2 : 1; }
         // What the packet type of AVC and AAC says: a configuration, a frame, or neither.
         bool is_config() const { return (is_avc() || is_aac()) && m_bytes[12] == 0; }
         bool has_frame() const { return !is_config() && !(is_avc() && m_bytes[12] == 2); }
@@ -551,11 +550,12 @@ private:
             return is_avc() ? (static_cast<int32_t>(word(12) & 0xFFFFFF) ^ sign) - sign : 0;
         }
 
-        // True when the frame, after which its reader stands at `frame_end`, is that of this tag.
-        bool carries(const flvd_frame_t& frame, int64_t frame_end) const
+        // True when a payload of this type and size, after which the reader stands at `payload_end`, is that of this
+        // tag.
+        bool has_payload(Stream of, uint32_t size, int64_t payload_end) const
         {
-            const uint32_t type = frame.stream == FLVD_STREAM_VIDEO ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
-            return word(0) == (type << 24 | (frame.size + codec_header_size())) && end() == frame_end;
+            const uint32_t type = of == Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
+            return word(0) == (type << 24 | size) && end() == payload_end;
         }
 
     private:
@@ -634,10 +634,10 @@ private:
         Config m_given;
     };
 
-    // What is known of a reader between two requests; -1: not known.
-    struct ReaderState {
-        int64_t next = -1;    // where it stands
-        int64_t learned = -1; // up to here, from the last seek on, the configurations are in the history
+    // How far a reader's tags have been looked at for configurations since the last seek; -1: not at all.
+    struct Learned {
+        int64_t end = -1;
+        bool is_position = false; // the reader stands there
     };
 
     // Refuses other calls while keyframes() walks, whatever its report throws.
@@ -664,7 +664,7 @@ private:
         std::swap(m_instance, other.m_instance);
         std::swap(m_request, other.m_request);
         std::swap(m_return, other.m_return);
-        std::swap(m_readers, other.m_readers);
+        std::swap(m_learned, other.m_learned);
         std::swap(m_video_configs, other.m_video_configs);
         std::swap(m_audio_configs, other.m_audio_configs);
     }
@@ -767,9 +767,7 @@ private:
     // False when nothing is open or a reader is not where playing is.
     bool can_read()
     {
-        if (m_walking)
-            return false;
-        if (m_return.reader != nullptr)
+        if (m_return.reader != nullptr && !m_walking)
             go_back();
         return m_instance != nullptr && m_return.reader == nullptr;
     }
@@ -807,14 +805,13 @@ private:
         if (!can_read())
             return false;
         fio_file_t* const reader = stream == Stream::audio ? m_instance->audio_reader : m_instance->main_reader;
-        ReaderState& state = m_readers[reader == m_instance->main_reader ? 0 : 1];
-        int64_t begin = std::exchange(state.next, -1);
-        if (begin < 0)
-            begin = __FLV_DMX__fioTell64(reader);
-        if (state.learned < 0)
-            state.learned = begin;
+        Learned& learned = m_learned[reader == m_instance->main_reader ? 0 : 1];
+        const int64_t begin = learned.is_position ? learned.end : __FLV_DMX__fioTell64(reader);
+        if (learned.end < 0)
+            learned.end = begin;
+        learned.is_position = false;
         Tag ahead(reader, begin);
-        if (m_instance->main_reader != m_instance->audio_reader && !go_to_stream(reader, stream, state, ahead))
+        if (m_instance->main_reader != m_instance->audio_reader && !go_to_stream(reader, stream, ahead))
             return false;
         m_request.stream = static_cast<uint32_t>(stream);
         flvd_frame_t taken;
@@ -824,16 +821,16 @@ private:
         frame.stream = static_cast<Stream>(taken.stream);
         frame.time = time_of(taken.timestamp_ms + m_instance->first_ts);
         frame.data = {taken.data, taken.size};
-        if (ahead.carries(taken, end) && ahead.position == state.learned)
-            state.learned = end;
+        const uint32_t payload = taken.size + codec_header_size(frame.stream);
+        if (!ahead.has_payload(frame.stream, payload, end) || ahead.position != learned.end)
+            ahead = look_again(frame.stream, payload, {reader, begin}, end, learned);
         else
-            ahead = look_again(taken, {reader, begin}, end, state);
+            learned = {end, true};
         frame.composition_offset = Milliseconds(ahead.composition_offset());
         frame.keyframe = frame.stream == Stream::audio || ahead.is_keyframe();
         frame.position = ahead.position;
         ConfigHistory& configs = configs_of(frame.stream);
         frame.new_config = configs.empty() ? Bytes() : configs.take_changed(ahead.position);
-        state.next = end;
         return true;
     }
 
@@ -846,7 +843,7 @@ private:
 
     // With two readers the tags of the other stream come first: the library would cross them as well, and goes on from
     // the tag after them. False when the reader is no longer where playing is.
-    [[gnu::noinline]] bool go_to_stream(fio_file_t* reader, Stream stream, ReaderState& state, Tag& ahead)
+    [[gnu::noinline]] bool go_to_stream(fio_file_t* reader, Stream stream, Tag& ahead)
     {
         const bool found = (m_instance->streams & static_cast<uint32_t>(stream)) != 0;
         if (!found || ahead.position < 0 || ahead.stream() == stream)
@@ -854,8 +851,9 @@ private:
         const Return begin = {reader, ahead.position};
         ahead = find_tag(reader, stream == Stream::video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO);
         if (ahead.position >= 0) {
-            if (state.learned == begin.position)
-                state.learned = ahead.position; // none of this stream is between
+            Learned& learned = m_learned[stream == Stream::audio ? 1 : 0];
+            if (learned.end == begin.position)
+                learned.end = ahead.position; // none of this stream is between
             return true;
         }
         m_return = begin;
@@ -870,29 +868,35 @@ private:
 
     // After a frame that is not the first tag ahead, or before which an earlier request has crossed tags: finds its tag
     // and learns the configurations before it. `begin` is where the request began, `end` where the reader stands.
-    [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, const Return& begin, int64_t end, ReaderState& state)
+    [[gnu::noinline]] Tag look_again(Stream stream, uint32_t payload, const Return& begin, int64_t end,
+                                     Learned& learned)
     {
         if (end < 0)
             return {};
         // A configuration takes memory. When that throws, the next request brings the frame again.
         m_return = {begin.reader, begin.position < 0 ? end : begin.position};
-        const Tag tag = tag_before(frame, begin.reader, end);
-        if (state.learned < 0 || (tag.position >= 0 && learn_configs(begin.reader, state.learned, tag.position)))
-            state.learned = end; // else the host failed, and the next frame tries again
+        const Tag tag = tag_before(begin.reader, end, stream, payload);
+        if (learned.end < 0 || (tag.position >= 0 && learn_configs(begin.reader, learned.end, tag.position)))
+            learned.end = end; // else the host failed, and the next frame tries again
         m_return.position = end;
         go_back();
         return tag;
     }
 
-    // The tag that ends at `end` and carries the frame.
-    Tag tag_before(const flvd_frame_t& frame, fio_file_t* reader, int64_t end) const
+    // The tag with this payload that ends at `end`; none when the host failed.
+    static Tag tag_before(fio_file_t* reader, int64_t end, Stream stream, uint32_t payload)
     {
-        const bool is_video = frame.stream == FLVD_STREAM_VIDEO;
-        const uint32_t codec_header =
-            is_video ? (video_codec() == VideoCodec::avc ? 5 : 1) : (audio_codec() == AudioCodec::aac ? 2 : 1);
-        const int64_t begin = end - back_pointer_size - frame.size - codec_header - tag_header_size;
-        const Tag tag = begin >= 0 && move_to(reader, begin) ? Tag(reader, begin) : Tag();
-        return tag.carries(frame, end) ? tag : Tag();
+        const int64_t begin = end - back_pointer_size - payload - tag_header_size;
+        const Tag tag = move_to(reader, begin) ? Tag(reader, begin) : Tag();
+        return tag.has_payload(stream, payload, end) ? tag : Tag();
+    }
+
+    // Codec header bytes before each frame of a stream, and before its configurations.
+    uint32_t codec_header_size(Stream stream) const
+    {
+        if (stream == Stream::video)
+            return video_codec() == VideoCodec::avc ? 5 : 1;
+        return audio_codec() == AudioCodec::aac ? 2 : 1;
     }
 
     // Learns the configurations of both streams in a part of the file. False when the host failed.
@@ -912,7 +916,7 @@ private:
 
     bool learn_config(fio_file_t* reader, const Tag& tag)
     {
-        const uint32_t headers = tag.codec_header_size();
+        const uint32_t headers = codec_header_size(tag.stream());
         if (tag.data_size() <= headers || tag.data_size() > config_max)
             return true;
         std::vector<uint8_t> config(tag.data_size() - headers);
@@ -1068,8 +1072,8 @@ private:
     flvd_ctx_t* m_instance = nullptr;
     flvd_frame_request_t m_request{};
     Return m_return;
-    bool m_walking = false;               // inside keyframes()
-    std::array<ReaderState, 2> m_readers; // of the main reader and of a separate audio reader
+    bool m_walking = false;           // inside keyframes()
+    std::array<Learned, 2> m_learned; // of the main reader and of a separate audio reader
     ConfigHistory m_video_configs;
     ConfigHistory m_audio_configs;
 };
