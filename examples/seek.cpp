@@ -11,8 +11,7 @@ constexpr int SHOWN = 5;
 
 int complain(const char* what, const flvdmx::error& error)
 {
-    std::fprintf(stderr, "seek: %s: %s (%s, line %d)\n", what, error.text(), error.name(),
-                 static_cast<int>(error.line()));
+    std::fprintf(stderr, "seek: %s: %s (%s)\n", what, error.text(), error.name());
     return 1;
 }
 
@@ -44,7 +43,8 @@ int main(int argc, char** argv)
     for (const flvdmx::Frame& frame : file->frames()) {
         show(frame);
         if (++shown == SHOWN)
-            break;
+            return 0;
     }
-    return 0;
+    const flvdmx::error end = file->last_error(); // why the loop ended
+    return end.kind() == flvdmx::Kind::end ? 0 : complain(argv[1], end);
 }

@@ -319,7 +319,7 @@ public:
     static result<File> open(std::string_view path, const Host& host, const Options& options = {})
     {
         File file;
-        if (path.find('\0') != path.npos)
+        if (path.find('\0') != std::string_view::npos)
             return error(Kind::failed, FLVD_ERR_OPEN_MAIN, 0, EINVAL);
         file.m_path.reset(new (std::nothrow) char[path.size() + 1]);
         if (file.m_path == nullptr)
@@ -550,12 +550,12 @@ private:
             return is_avc() ? (static_cast<int32_t>(word(12) & 0xFFFFFF) ^ sign) - sign : 0;
         }
 
-        // True when a payload of this type and size, after which the reader stands at `payload_end`, is that of this
+        // True when a payload of this stream and size, after which the reader stands at `payload_end`, is that of this
         // tag.
-        bool has_payload(Stream of, uint32_t size, int64_t payload_end) const
+        bool has_payload(Stream of, uint32_t payload, int64_t payload_end) const
         {
             const uint32_t type = of == Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
-            return word(0) == (type << 24 | size) && end() == payload_end;
+            return word(0) == (type << 24 | payload) && end() == payload_end;
         }
 
     private:
