@@ -1,6 +1,6 @@
-// Division by zero on 32-bit ARM. Division is a call there, and the compiler's own handlers would import raise();
-// these take their place, so that the library asks nothing of the C library but the memory functions. No input
-// leads here.
+// Handlers for division by zero on 32-bit ARM, where division is a function call. The compiler's own handlers would
+// import raise(); with these, the library needs nothing of the C library but memcpy and its relatives. No input makes
+// the library divide by zero.
 
 #include <cstdint>
 

@@ -1,5 +1,5 @@
-// Big-endian fields as an FLV file holds them. File bytes are never cast: a load at an odd address traps on some of the
-// targets, while compilers turn these into a load and a byte swap.
+// Loads the big-endian fields of an FLV file byte by byte. File bytes are never cast: an unaligned load traps on some
+// targets, and where it does not, compilers turn these functions into a load and a byte swap.
 #ifndef FLVDMX_COMMON_BYTES_H
 #define FLVDMX_COMMON_BYTES_H
 

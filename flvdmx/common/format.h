@@ -1,18 +1,18 @@
-// Numbers of the FLV format that several layers read (FLV file format, version 10.1, annex E).
+// Constants of the FLV format that several layers use (FLV file format, version 10.1, annex E).
 //
-// This folder holds what all layers share: beside this file the header of a tag (tag_header.h), big-endian fields
-// (bytes.h), questions about an instance (instance.h) and the places of failure (sites.def).
+// This folder holds what all layers share. Other files: tag_header.h (the header of a tag), bytes.h (big-endian
+// fields), instance.h (queries on an instance), sites.def (failure sites).
 #ifndef FLVDMX_COMMON_FORMAT_H
 #define FLVDMX_COMMON_FORMAT_H
 
 #include <cstdint>
 
-// A tag: header, DataSize bytes, and PreviousTagSize, the back-pointer, which is DataSize + 11 in a valid file.
+// A tag is a header, DataSize bytes of data, and the back-pointer (PreviousTagSize), DataSize + 11 in a valid file.
 constexpr uint32_t FLVD_TAG_HEADER_SIZE = 11;
 constexpr uint32_t FLVD_BACK_POINTER_SIZE = 4;
-constexpr uint32_t FLVD_TAG_OVERHEAD = FLVD_TAG_HEADER_SIZE + FLVD_BACK_POINTER_SIZE; // beside its data
+constexpr uint32_t FLVD_TAG_OVERHEAD = FLVD_TAG_HEADER_SIZE + FLVD_BACK_POINTER_SIZE; // all but the data
 
-// Codec byte of video: FrameType above CodecID.
+// Codec byte of video: FrameType in the high four bits, CodecID in the low four.
 constexpr uint32_t FLVD_FRAME_TYPE_SHIFT = 4;
 enum : uint32_t { FLVD_FRAME_TYPE_KEY = 1, FLVD_FRAME_TYPE_GENERATED_KEY = 4 };
 constexpr uint32_t FLVD_CODEC_BYTE_MAX = 0x5F; // FrameType 5, any CodecID
@@ -27,7 +27,7 @@ enum : uint32_t {
     FLVD_CODEC_AVC = 7
 };
 
-// Codec byte of audio: SoundFormat above SoundRate, SoundSize and SoundType.
+// Codec byte of audio: SoundFormat in the high four bits, then SoundRate, SoundSize and SoundType.
 constexpr uint32_t FLVD_SOUND_FORMAT_SHIFT = 4;
 enum : uint32_t { FLVD_SOUND_MP3 = 2, FLVD_SOUND_AAC = 10, FLVD_SOUND_MP3_8KHZ = 14 };
 
@@ -35,18 +35,18 @@ enum : uint32_t { FLVD_SOUND_MP3 = 2, FLVD_SOUND_AAC = 10, FLVD_SOUND_MP3_8KHZ =
 constexpr uint32_t FLVD_PACKET_SEQUENCE_HEADER = 0; // the codec configuration
 constexpr uint32_t FLVD_PACKET_END_OF_SEQUENCE = 2; // AVC only
 
-// Codec header bytes before a frame.
+// Bytes of the codec header between the tag header and the frame.
 constexpr uint32_t FLVD_AVC_HEADER_SIZE = 5; // codec byte, packet type, CompositionTime
 constexpr uint32_t FLVD_AAC_HEADER_SIZE = 2; // codec byte, packet type
 constexpr uint32_t FLVD_CODEC_HEADER_SIZE = 1;
 
-// An AVC packet without a picture.
+// True for AVC packets that carry no picture.
 constexpr bool FLVD_IsPicturelessPacket(uint32_t packet_type)
 {
     return packet_type == FLVD_PACKET_SEQUENCE_HEADER || packet_type == FLVD_PACKET_END_OF_SEQUENCE;
 }
 
-// Codec header bytes before the frame of a media tag; 0 when the tag carries a configuration and no frame.
+// Size of a media tag's codec header; 0 when the tag carries no frame (a configuration or an end of sequence).
 constexpr uint32_t FLVD_CodecHeaderSize(bool video, uint32_t codec_byte, uint32_t packet_type)
 {
     if (video) {

@@ -1,4 +1,4 @@
-// Questions about an instance that several layers ask.
+// Queries on an instance that several layers make.
 #ifndef FLVDMX_COMMON_INSTANCE_H
 #define FLVDMX_COMMON_INSTANCE_H
 
@@ -14,7 +14,7 @@ inline bool FLVD_HasUserBuffer(const flvd_ctx_t* ctx)
     return (ctx->options & FLVD_OPT_USER_BUFFER) != 0;
 }
 
-// True when audio is read through a reader of its own.
+// True when audio has a separate reader.
 inline bool FLVD_HasAudioReader(const flvd_ctx_t* ctx)
 {
     return ctx->opened_for_info == 0 && (ctx->options & FLVD_OPT_SEPARATE_AUDIO_READER) != 0;

@@ -1,4 +1,4 @@
-// The codes and lines of the places of failure, and where they are recorded.
+// The codes and line numbers of the failure sites, and the functions that record them.
 
 #include "flvdmx/common/sites.h"
 
@@ -14,7 +14,7 @@ namespace {
 struct flvd_site_row_t {
     int16_t code;
     uint16_t line;
-    uint16_t growing_line; // 0: as line
+    uint16_t growing_line; // in a growing file; 0: same as line
 };
 
 #define FLVD_SITE(operation, name, code, line, growing_line) {code, line, growing_line},

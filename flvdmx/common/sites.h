@@ -1,4 +1,4 @@
-// Places of failure by name. sites.def is the one table of their codes and lines.
+// Failure sites by name. sites.def is the only table of their codes and line numbers.
 #ifndef FLVDMX_COMMON_SITES_H
 #define FLVDMX_COMMON_SITES_H
 
@@ -6,25 +6,25 @@
 
 #define FLVD_SITE(operation, name, code, line, growing_line) FLVD_SITE_##name,
 enum flvd_site_t : uint8_t {
-    FLVD_SITE_NONE, // for functions that return where they failed: nowhere
+    FLVD_SITE_NONE, // success, for functions that return the site of their failure
 #include "flvdmx/common/sites.def"
 };
 #undef FLVD_SITE
 
-// Records where an operation on the instance failed.
+// Records the failure in the instance.
 void FLVD_Record(flvd_ctx_t* ctx, flvd_site_t site);
 
-// Records it where there is no instance to be read later.
+// Records the failure in the globals, for failures without an instance.
 void FLVD_RecordGlobal(flvd_site_t site, bool growing);
 
-// Records and returns the general failure.
+// Records the failure and returns -1.
 inline int32_t FLVD_Fail(flvd_ctx_t* ctx, flvd_site_t site)
 {
     FLVD_Record(ctx, site);
     return -1;
 }
 
-// Records data cut short and returns it as a place in the file.
+// Records the failure and returns the result for data that ends too early.
 inline int32_t FLVD_FailShort(flvd_ctx_t* ctx, flvd_site_t site)
 {
     FLVD_Record(ctx, site);

@@ -1,4 +1,4 @@
-// The header of a tag as read: its fields, and the two bytes after it that tell what the tag carries.
+// The header of a tag, parsed: its fields, and the two bytes after it that say what the tag carries.
 #ifndef FLVDMX_COMMON_TAG_HEADER_H
 #define FLVDMX_COMMON_TAG_HEADER_H
 
@@ -10,14 +10,14 @@
 constexpr uint32_t FLVD_DATA_SIZE_OFFSET = 1;    // 24 bits
 constexpr uint32_t FLVD_TIMESTAMP_OFFSET = 4;    // 24 bits, then TimestampExtended
 constexpr uint32_t FLVD_STREAM_ID_OFFSET = 8;    // 24 bits
-constexpr uint32_t FLVD_CODEC_BYTE_OFFSET = 11;  // first data byte: what the data is
+constexpr uint32_t FLVD_CODEC_BYTE_OFFSET = 11;  // first data byte: frame type and codec
 constexpr uint32_t FLVD_PACKET_TYPE_OFFSET = 12; // AAC and AVC only
 
-constexpr uint32_t FLVD_TAG_PEEK_SIZE = FLVD_PACKET_TYPE_OFFSET + 1; // what a header is read from
+constexpr uint32_t FLVD_TAG_PEEK_SIZE = FLVD_PACKET_TYPE_OFFSET + 1; // bytes needed to parse a header
 
 struct flvd_tag_header_t {
     flvd_tag_info_t info;
-    uint8_t codec_byte;  // FrameType and CodecID, or SoundFormat, rate, size and type
+    uint8_t codec_byte;  // video: FrameType, CodecID; audio: SoundFormat, SoundRate, SoundSize, SoundType
     uint8_t packet_type; // AVCPacketType or AACPacketType
 
     uint32_t CodecId() const { return codec_byte & FLVD_CODEC_ID_MASK; }
@@ -39,14 +39,14 @@ struct flvd_tag_header_t {
     uint32_t CodecHeaderSize() const { return FLVD_CodecHeaderSize(IsVideo(), codec_byte, packet_type); }
 };
 
-// Timestamp of the 11 header bytes: TimestampExtended, the top byte, stands after the other three.
+// Timestamp of an 11-byte tag header. TimestampExtended, its top byte, comes after the other three.
 [[gnu::always_inline]] constexpr uint32_t FLVD_TagTimestamp(const uint8_t* bytes)
 {
     const uint32_t field = FLVD_GetBE32(bytes + FLVD_TIMESTAMP_OFFSET);
     return field >> 8 | field << 24;
 }
 
-// Reads a header from FLVD_TAG_PEEK_SIZE bytes.
+// Parses a header from FLVD_TAG_PEEK_SIZE bytes.
 inline flvd_tag_header_t FLVD_ReadTagHeader(const uint8_t* bytes)
 {
     const uint32_t type_and_size = FLVD_GetBE32(bytes);
@@ -58,7 +58,7 @@ inline flvd_tag_header_t FLVD_ReadTagHeader(const uint8_t* bytes)
     };
 }
 
-// True when the four bytes of a back-pointer belong to a tag with so much data.
+// True when the four bytes are the back-pointer of a tag with data_size bytes of data.
 constexpr bool FLVD_IsBackPointer(const uint8_t* bytes, uint32_t data_size)
 {
     return FLVD_GetBE32(bytes) == data_size + FLVD_TAG_HEADER_SIZE;

@@ -1,4 +1,4 @@
-// Blocks of a cached file: peeking by copy, reading, writing, and the read size.
+// Block access to a cached file: peeking by copy, reading, writing, and the read size.
 
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/fio/tables.h"
@@ -7,13 +7,13 @@
 
 namespace {
 
-// Elements of no size, or more bytes than 32 bits can count, are not moved.
+// False for empty elements and for blocks whose size does not fit in 32 bits; those are neither read nor written.
 bool FLVD_FioIsBlock(uint32_t size, uint32_t count)
 {
     return size != 0 && uint64_t{size} * count <= UINT32_MAX;
 }
 
-// Moves n cached bytes to the destination and consumes them.
+// Copies n cached bytes to the destination and consumes them.
 void FLVD_FioTake(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
     if (n != 0)
@@ -21,7 +21,7 @@ void FLVD_FioTake(fio_file_t* file, uint8_t* destination, uint32_t n)
     FLVD_FioConsume(file, n);
 }
 
-// Reads up to n bytes with one refill of the empty cache by its read size. Returns what was missing.
+// Reads up to n bytes through the empty cache, with one host read of the read size. Returns the number still missing.
 uint32_t FLVD_FioReadThroughCache(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
     file->count = FLVD_FioHostRead(file, file->cache, file->read_size);
@@ -30,19 +30,21 @@ uint32_t FLVD_FioReadThroughCache(fio_file_t* file, uint8_t* destination, uint32
     return n - taken;
 }
 
-// Overread: whole quanta go straight to the destination, the rest through the cache. Returns what was missing.
+// With overread: reads pieces of the read size straight into the destination, and the rest through the cache. Returns
+// the number of bytes still missing.
 uint32_t FLVD_FioReadOver(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
     while (n > file->read_size) {
         const uint32_t got = FLVD_FioHostRead(file, destination, file->read_size);
         destination += got;
         n -= got;
-        if (got < file->read_size || got == 0) // 0: a file without a cache has a read size of 0
+        if (got < file->read_size || got == 0) // 0: without a cache the read size is 0
             break;
     }
     return FLVD_FioReadThroughCache(file, destination, n);
 }
 
+// Appends n bytes to the pending ones; there is room for them.
 void FLVD_FioPutPending(fio_file_t* file, const void* source, uint32_t n)
 {
     FLVD_FioCompact(file);

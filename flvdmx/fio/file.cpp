@@ -1,7 +1,7 @@
-// The cached file: opening, closing, positions, the refill rule, peeking and consuming.
+// The cached file: opening, closing, positions, refilling, peeking and consuming.
 //
-// While reading, the host's position is `count` bytes ahead of the logical one (read-ahead), while writing it is
-// `count` bytes behind (pending bytes). head + count never exceeds the bytes allocated for the cache.
+// While reading, the host's position is `count` bytes ahead of the logical one (read-ahead); while writing it is
+// `count` bytes behind (pending bytes). head + count never exceeds the size allocated for the cache.
 
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/fio/tables.h"
@@ -31,7 +31,7 @@ constexpr fio_access_t g_flvd_fioAccess[] = {
     {FIO_MODE_READ | FIO_MODE_APPEND, "a+"},
 };
 
-// Writes the mode string of fopen. False for a combination that it has no string for.
+// Builds the mode string for the host, as fopen takes it. False for a combination that fopen has no string for.
 bool FLVD_FioModeText(uint32_t mode, char (&text)[FIO_MODE_TEXT_MAX])
 {
     const auto* const access = std::find_if(std::begin(g_flvd_fioAccess), std::end(g_flvd_fioAccess),
@@ -48,7 +48,7 @@ bool FLVD_FioModeText(uint32_t mode, char (&text)[FIO_MODE_TEXT_MAX])
     return true;
 }
 
-// The object and its cache around an open handle. Without memory the handle is closed and null returned.
+// Allocates the file object and its cache for an open handle. Without memory, closes the handle and returns null.
 fio_file_t* FLVD_FioAllocate(uint32_t cache_size, uint32_t extra, void* handle)
 {
     auto* const file = static_cast<fio_file_t*>(g_flvd_fioFuncs.mem_alloc(sizeof(fio_file_t)));
@@ -73,7 +73,7 @@ int32_t FLVD_FioHostSeek(const fio_file_t* file, int64_t offset, int32_t whence,
 {
     if (width == FioWidth::Bits64 && g_flvd_fioFuncs.file_seek64 != nullptr)
         return g_flvd_fioFuncs.file_seek64(file->handle, offset, whence);
-    const auto low = static_cast<uint32_t>(static_cast<uint64_t>(offset)); // all that the narrow function can take
+    const auto low = static_cast<uint32_t>(static_cast<uint64_t>(offset)); // the 32-bit function takes no more
     return g_flvd_fioFuncs.file_seek(file->handle, static_cast<int32_t>(low), whence);
 }
 
@@ -144,7 +144,7 @@ int32_t __FLV_DMX__fioFlush(fio_file_t* file)
 int32_t __FLV_DMX__fioTell(fio_file_t* file)
 {
     const int64_t position = FLVD_FioLogical(file, g_flvd_fioFuncs.file_tell(file->handle));
-    return static_cast<int32_t>(std::max<int64_t>(position, INT32_MIN)); // above 2 GiB pending bytes make it negative
+    return static_cast<int32_t>(std::max<int64_t>(position, INT32_MIN)); // pending bytes past 2 GiB make it negative
 }
 
 int64_t __FLV_DMX__fioTell64(fio_file_t* file)
@@ -162,7 +162,7 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
     if (file->state == FIO_STATE_WRITE)
         return 0;
     file->state = FIO_STATE_READ;
-    const uint32_t allocated = file->capacity + file->overread_extra; // the sum was checked at open
+    const uint32_t allocated = file->capacity + file->overread_extra; // no overflow: checked at open
     n = std::min(n, allocated);
     if (n <= file->count)
         return n;
@@ -183,7 +183,7 @@ uint32_t __FLV_DMX__fioSkipBytes(uint32_t n, fio_file_t* file)
     if (file->state == FIO_STATE_WRITE)
         return FIO_SKIP_FAILED;
     if (file->bit_skip_pending != 0)
-        file->bit_skip_pending = 0; // the bit reader moves itself: its bits stay those at the position
+        file->bit_skip_pending = 0; // the bit reader itself moves: its bits stay valid
     else
         FLVD_FioDropBits(file);
     if (n <= file->count) {
@@ -194,7 +194,7 @@ uint32_t __FLV_DMX__fioSkipBytes(uint32_t n, fio_file_t* file)
     const uint32_t rest = n - cached;
     FLVD_FioEmpty(file);
     if (rest > INT32_MAX && g_flvd_fioFuncs.file_seek64 == nullptr)
-        return cached; // the narrow seek would take it as a way back
+        return cached; // the 32-bit seek would take it as a negative offset
     return FLVD_FioHostSeek(file, rest, FIO_SEEK_CUR, FioWidth::Bits64) == 0 ? n : cached;
 }
 

@@ -1,5 +1,5 @@
-// The cached file from inside the library: what its own files share, and the short ways that the layers above use where
-// the exported functions would cost a call. The guard narrows the read size for a while.
+// The cached file inside the library: functions shared by the files of this folder, inline versions of the exported
+// functions for the layers above, and a guard that changes the read size temporarily.
 //
 // Files: file.cpp (opening, positions, refill, peek, skip), block.cpp (reading and writing blocks), tables.cpp (the
 // process-wide host functions).
@@ -12,11 +12,10 @@
 #include <algorithm>
 #include <cstring>
 
-constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62; // a host that tells more has not told a position
-constexpr uint32_t FLVD_WHOLE_CACHE = 0;               // as a read size: the capacity of the file's cache
+constexpr int64_t FIO_POSITION_MAX = int64_t{1} << 62; // a host tell above this has failed
+constexpr uint32_t FLVD_WHOLE_CACHE = 0;               // read size that stands for the capacity of the cache
 
-// Reads up to n bytes from the host. One that claims more than it was asked for has failed: none of
-// its bytes count.
+// Reads up to n bytes from the host. A host that claims to have read more than n is broken: its result counts as 0.
 inline uint32_t FLVD_FioHostRead(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
     const uint32_t got = g_flvd_fioFuncs.file_read(destination, 1, n, file->handle);
@@ -32,35 +31,35 @@ inline void FLVD_FioCompact(fio_file_t* file)
     file->head = 0;
 }
 
-// Reads and consumes up to n bytes: what is cached, then with host reads. Returns how many there were.
+// Reads and consumes up to n bytes, first from the cache, then from the host. Returns the number of bytes read.
 uint32_t FLVD_FioReadBytes(fio_file_t* file, uint8_t* destination, uint32_t n);
 
-// What every access but a peek does: the bit reader's bits are no longer those at the position.
+// Invalidates the bit reader. Every access except a peek must call this, since it may move the position.
 inline void FLVD_FioDropBits(fio_file_t* file)
 {
     file->bits_left = 0;
     file->bits = 0;
 }
 
-// The cached bytes at the position, file->count of them while reading.
+// The cached bytes at the position; while reading there are file->count of them.
 [[gnu::always_inline]] inline const uint8_t* FLVD_FioCached(const fio_file_t* file)
 {
     return file->cache + file->head;
 }
 
-// Consumes n cached bytes, n being at most file->count.
+// Consumes n cached bytes; n is at most file->count.
 [[gnu::always_inline]] inline void FLVD_FioConsume(fio_file_t* file, uint32_t n)
 {
     file->count -= n;
     file->head = file->count == 0 ? 0 : file->head + n;
 }
 
-// Makes up to n bytes visible at cache + head with at most one host read; the logical position stays.
-// Returns how many are, or 0 in the writing state.
+// Makes up to n bytes available at cache + head with at most one host read; the logical position does not move.
+// Returns the number of bytes available, at most n; 0 while writing.
 uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
 
-// __FLV_DMX__fioShowBytesByPtr, without a call when the bytes are cached: most of the work on a frame is peeks and
-// skips. When it returns 0 because the file is being written, the pointer is not to be used.
+// __FLV_DMX__fioShowBytesByPtr without a call when the bytes are cached: most of the work per frame is peeks and skips.
+// Unlike there, *bytes is set even while writing, when the result is 0; do not use it then.
 [[gnu::always_inline]] inline uint32_t FLVD_FioPeek(const uint8_t** bytes, uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
@@ -69,7 +68,7 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n);
     return n;
 }
 
-// __FLV_DMX__fioSkipBytes in the same way. The bit reader's own skips do not come through here.
+// Likewise for __FLV_DMX__fioSkipBytes. The bit reader skips through the exported function only.
 inline uint32_t FLVD_FioSkip(uint32_t n, fio_file_t* file)
 {
     if (n > file->count || file->state != FIO_STATE_READ)
@@ -79,14 +78,14 @@ inline uint32_t FLVD_FioSkip(uint32_t n, fio_file_t* file)
     return n;
 }
 
-// __FLV_DMX__fioIsEof in the same way.
+// Likewise for __FLV_DMX__fioIsEof.
 inline bool FLVD_FioAtEnd(fio_file_t* file)
 {
     return file->count == 0 && __FLV_DMX__fioIsEof(file) != 0;
 }
 
-// Logical position from the host's. A position that no file can have is a failed query (-1), so that adding sizes to
-// positions never overflows; a negative one stays negative.
+// Converts the host's position to the logical one. A position that no file can have counts as a failed tell (-1), so
+// that positions plus sizes never overflow; a negative result of the host stays negative.
 inline int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
 {
     const bool reading = file->state == FIO_STATE_READ;
@@ -97,7 +96,7 @@ inline int64_t FLVD_FioLogical(const fio_file_t* file, int64_t host)
     return reading ? std::max(host, INT64_MIN + file->count) - file->count : host;
 }
 
-// __FLV_DMX__fioTell64 for the playing path, which asks twice per frame.
+// Inline __FLV_DMX__fioTell64, for frame delivery, which needs the position twice per frame.
 inline int64_t FLVD_FioTell(const fio_file_t* file)
 {
     const int64_t host = g_flvd_fioFuncs.file_tell64 != nullptr ? g_flvd_fioFuncs.file_tell64(file->handle)
@@ -120,8 +119,8 @@ inline void FLVD_FioEmpty(fio_file_t* file)
     file->count = 0;
 }
 
-// Read size for a while. `after` is part of each user's contract: the forward search puts back what it found,
-// the users that step through the file leave 0, the whole cache.
+// Changes the read size for one scope. `after` is part of the caller's contract: the forward search restores the size
+// it found, while the searches that step through the file leave the whole cache.
 class FLVD_ReadSizeGuard {
 public:
     FLVD_ReadSizeGuard(fio_file_t* file, uint32_t during, uint32_t after) : m_file(file), m_after(after)
