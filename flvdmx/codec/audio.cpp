@@ -1,4 +1,4 @@
-// Audio: the FLV audio tag header byte, the AAC AudioSpecificConfig and the MPEG audio frame header.
+// Audio: the codec byte of FLV audio tags, the AAC AudioSpecificConfig and the MPEG audio frame header.
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
@@ -11,15 +11,15 @@
 
 namespace {
 
-// How much of the tag is read.
+// Bytes of the tag that are examined.
 constexpr uint32_t FLVD_AUDIO_PEEK = FLVD_CODEC_BYTE_OFFSET + 1; // tag header and codec byte
-constexpr uint32_t FLVD_MP3_PEEK = 16;                           // tag header, audio byte and one MPEG frame header
+constexpr uint32_t FLVD_MP3_PEEK = 16;                           // tag header, codec byte and one MPEG frame header
 
-constexpr uint32_t FLVD_SAMPLE_BITS = 16; // whatever SoundSize says: it is the size after decoding
+constexpr uint32_t FLVD_SAMPLE_BITS = 16; // the size after decoding, whatever SoundSize says
 
 constexpr uint32_t g_flvd_soundRate[] = {5500, 11025, 22050, 44100};
 
-// ISO/IEC 14496-3: samplingFrequencyIndex 0 to 12; 13 and 14 are reserved, 15 is followed by the frequency itself.
+// ISO/IEC 14496-3, by samplingFrequencyIndex: 13 and 14 are reserved, 15 is followed by the frequency itself.
 constexpr uint32_t g_flvd_aacFrequency[] = {96000, 88200, 64000, 48000, 44100, 32000, 24000,
                                             22050, 16000, 12000, 11025, 8000,  7350};
 static_assert(std::size(g_flvd_aacFrequency) == 13, "one entry an index");
@@ -35,7 +35,7 @@ constexpr uint32_t FLVD_AAC_TYPES_GA = // bit n: type n carries a GASpecificConf
     1u << 1 | 1u << 2 | 1u << 3 | 1u << 4 | 1u << 6 | 1u << 7 | 1u << 17 | 1u << 19 | 1u << 20 | 1u << 21 | 1u << 22 |
     1u << 23;
 
-// ISO/IEC 11172-3 and 13818-3, indexed by the header's raw fields. Version: 0 MPEG-2.5, 1 reserved, 2 MPEG-2, 3 MPEG-1.
+// ISO/IEC 11172-3 and 13818-3, indexed by the raw header fields. Version: 0 MPEG-2.5, 1 reserved, 2 MPEG-2, 3 MPEG-1.
 // Layer: 0 reserved, 1 III, 2 II, 3 I.
 constexpr uint32_t FLVD_MPEG_VERSION_RESERVED = 1;
 constexpr uint32_t FLVD_MPEG_LAYER_RESERVED = 0;
@@ -71,7 +71,7 @@ uint32_t FLVD_GetObjectType(FLVD_BitStream* bits)
     return type == FLVD_AAC_ESCAPE ? 32 + bits->Get(6) : type;
 }
 
-// Sampling frequency after its index, 0 for a reserved one.
+// Reads a samplingFrequencyIndex and, if it follows, the explicit frequency. 0 for a reserved index.
 uint32_t FLVD_GetFrequency(FLVD_BitStream* bits)
 {
     const uint32_t index = bits->Get(4);
@@ -80,7 +80,7 @@ uint32_t FLVD_GetFrequency(FLVD_BitStream* bits)
     return index < std::size(g_flvd_aacFrequency) ? g_flvd_aacFrequency[index] : 0;
 }
 
-// Channel elements of a program_config_element; a channel pair counts as one.
+// Number of channel elements in a program_config_element. A channel pair counts as one element.
 uint32_t FLVD_GetProgramElements(FLVD_BitStream* bits)
 {
     bits->Skip(4 + 2 + 4); // element_instance_tag, object_type, sampling_frequency_index
@@ -91,7 +91,7 @@ uint32_t FLVD_GetProgramElements(FLVD_BitStream* bits)
     return front + side + back + lfe;
 }
 
-// AudioSpecificConfig, ISO/IEC 14496-3. A short one reads as if zeros followed.
+// Parses an AudioSpecificConfig (ISO/IEC 14496-3). A short one reads as if zeros followed.
 void FLVD_ParseAudioSpecificConfig(const uint8_t* data, uint32_t size, flvd_audio_info_t* info)
 {
     FLVD_BitStream bits(data, size);
@@ -100,7 +100,7 @@ void FLVD_ParseAudioSpecificConfig(const uint8_t* data, uint32_t size, flvd_audi
     const uint32_t configuration = bits.Get(4);
     info->channels = configuration < std::size(g_flvd_aacChannels) ? g_flvd_aacChannels[configuration] : 0;
     if (type == FLVD_AAC_SBR) {
-        FLVD_GetFrequency(&bits); // of the extension; the core's stays
+        FLVD_GetFrequency(&bits); // the extension's; the core's is reported
         type = FLVD_GetObjectType(&bits);
     }
     if (type >= 32 || (FLVD_AAC_TYPES_GA >> type & 1u) == 0)
@@ -112,7 +112,7 @@ void FLVD_ParseAudioSpecificConfig(const uint8_t* data, uint32_t size, flvd_audi
         info->channels = FLVD_GetProgramElements(&bits);
 }
 
-// The frame header at p, when it is one.
+// Parses the frame header at p. False, with nothing written, when there is none.
 bool FLVD_ReadMpegHeader(const uint8_t* p, flvd_audio_info_t* info)
 {
     const uint32_t version = p[1] >> 3u & 3u;
@@ -151,7 +151,7 @@ int32_t FLVD_ProbeMp3(flvd_ctx_t* ctx, uint32_t format, flvd_site_t short_site, 
     return 0;
 }
 
-// Copies and reads the AudioSpecificConfig when the tag is a sequence header.
+// When the tag is a sequence header, copies and parses its AudioSpecificConfig.
 int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 {
     flvd_audio_info_t& info = ctx->audio_info;

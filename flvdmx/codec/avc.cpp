@@ -1,5 +1,5 @@
-// AVC: the AVCDecoderConfigurationRecord (ISO/IEC 14496-15) and the picture size of a sequence parameter set
-// (ISO/IEC 14496-10, 7.3.2.1.1). Nothing of them is validated: a damaged set gives a damaged size.
+// AVC: the AVCDecoderConfigurationRecord (ISO/IEC 14496-15) and the picture size in a sequence parameter set
+// (ISO/IEC 14496-10, 7.3.2.1.1). The fields of a set are not validated: a damaged set gives a wrong picture size.
 
 #include "flvdmx/codec/codec.h"
 #include "flvdmx/common/bytes.h"
@@ -16,7 +16,7 @@ constexpr uint32_t FLVD_AVCC_SPS_COUNT_MASK = 0x1F;
 
 constexpr uint8_t g_flvd_startCode[] = {0, 0, 0, 1};
 
-// A record being turned into start-code form. Counts and lengths are the record's claims.
+// Progress of converting a record to start codes. The record's counts and lengths are not trusted.
 struct flvd_avcc_t {
     const uint8_t* in;
     int32_t in_left;
@@ -49,9 +49,9 @@ constexpr int32_t FLVD_SPS_SEARCH_MIN = 5; // start code, NAL header and one byt
 constexpr uint32_t FLVD_NAL_TYPE_MASK = 0x1F;
 constexpr uint32_t FLVD_NAL_SPS = 7;
 constexpr uint32_t FLVD_UE_MAX_ZEROS = 32;
-constexpr uint32_t FLVD_UE_IN_WINDOW = 1u << 19; // at most 12 zeros: the code has no more than 25 bits
-constexpr uint32_t FLVD_UE_INVALID = 0xFFFFFFFF; // value of a code that no standard encoder writes
-constexpr uint32_t FLVD_SCALING_LISTS = 8;       // also for 4:4:4, where later editions have twelve
+constexpr uint32_t FLVD_UE_IN_WINDOW = 1u << 19; // at most 12 leading zeros, so the code has at most 25 bits
+constexpr uint32_t FLVD_UE_INVALID = 0xFFFFFFFF; // stands for a code longer than the standard allows
+constexpr uint32_t FLVD_SCALING_LISTS = 8;       // for 4:4:4 too, although later editions have twelve there
 constexpr uint32_t FLVD_SCALING_LISTS_4X4 = 6;
 constexpr uint32_t FLVD_POC_CYCLE_MAX = 255;
 constexpr uint32_t FLVD_CHROMA_420 = 1;
@@ -64,21 +64,21 @@ struct flvd_crop_unit_t {
 };
 constexpr flvd_crop_unit_t g_flvd_cropUnit[] = {{1, 1}, {2, 2}, {2, 1}, {1, 1}};
 
-// One reader for the process: opens do not run at the same time, and every parse sets it up anew.
+// Process-wide, which is safe because opens never run concurrently and every parse starts by resetting it.
 struct flvd_sps_bits_t {
     int32_t bit_pos;      // next bit, counted from start
     const uint8_t* start; // payload after the NAL header byte
 };
 flvd_sps_bits_t g_flvd_spsBits;
-int32_t g_flvd_spsSize; // bytes from start on, set with it; bits past them read as 0
+int32_t g_flvd_spsSize; // bytes from start on, set together with it; bits past them read as 0
 
 uint32_t FLVD_SpsByte(int32_t index)
 {
     return index < g_flvd_spsSize ? g_flvd_spsBits.start[index] : 0u;
 }
 
-// The next bits, from four bytes: 25 of them are exact at any position, low bits may be 0. In the second case at least
-// the fourth byte is past the end, and reads as 0.
+// The next bits, left-aligned, from the four bytes at the position: the upper 25 are exact at any bit position, the
+// rest may be 0. The second case loads three bytes, because there the fourth lies past the end and reads as 0.
 inline uint32_t FLVD_SpsWindow()
 {
     const int32_t byte = g_flvd_spsBits.bit_pos >> 3;
@@ -88,7 +88,7 @@ inline uint32_t FLVD_SpsWindow()
     return window << (static_cast<uint32_t>(g_flvd_spsBits.bit_pos) & 7u);
 }
 
-// u(n).
+// u(n). Exact up to 25 bits; in a longer field the low bits may read as 0.
 uint32_t FLVD_SpsGetBits(uint32_t n)
 {
     const uint32_t window = FLVD_SpsWindow();
@@ -112,7 +112,7 @@ uint32_t FLVD_SpsGetUE()
     return (1u << zeros) - 1 + FLVD_SpsGetBits(zeros);
 }
 
-// se(v), in 64 bits since the invalid code has no 32-bit value.
+// se(v), in 64 bits because FLVD_UE_INVALID maps to a value outside 32 bits.
 int64_t FLVD_SpsGetSE()
 {
     const int64_t k = FLVD_SpsGetUE();
@@ -138,7 +138,7 @@ void FLVD_SpsSkipScalingMatrix()
             FLVD_SpsSkipScalingList(i < FLVD_SCALING_LISTS_4X4 ? 16 : 64);
 }
 
-// The fields of the high profiles. Returns chroma_format_idc.
+// Reads the fields that only the high profiles have. Returns chroma_format_idc.
 uint32_t FLVD_SpsReadHighProfile()
 {
     const uint32_t chroma_format_idc = FLVD_SpsGetUE();
@@ -152,7 +152,7 @@ uint32_t FLVD_SpsReadHighProfile()
     return chroma_format_idc;
 }
 
-// False when the picture order count cycle is longer than the standard allows.
+// Skips the picture order count fields. False when the cycle is longer than the standard allows.
 bool FLVD_SpsSkipPictureOrder()
 {
     const uint32_t type = FLVD_SpsGetUE(); // pic_order_cnt_type
@@ -171,7 +171,7 @@ bool FLVD_SpsSkipPictureOrder()
     return true;
 }
 
-// From pic_width_in_mbs_minus1 on, in 32-bit unsigned arithmetic.
+// Reads the fields from pic_width_in_mbs_minus1 on. The arithmetic is unsigned, so damaged values wrap around.
 void FLVD_SpsReadSize(uint32_t chroma_format_idc, flvd_video_info_t* info)
 {
     const uint32_t width_in_mbs = FLVD_SpsGetUE() + 1;
@@ -195,7 +195,7 @@ void FLVD_SpsReadSize(uint32_t chroma_format_idc, flvd_video_info_t* info)
     info->height = 16 * fields * height_in_map_units - static_cast<uint32_t>(unit.y) * fields * crop_y;
 }
 
-// Offset of the first sequence parameter set's payload, or -1.
+// Offset of the first sequence parameter set after its NAL header byte, or -1.
 int32_t FLVD_FindSps(const uint8_t* data, int32_t length)
 {
     for (int32_t p = 0; p <= length - FLVD_SPS_SEARCH_MIN; ++p)

@@ -1,4 +1,4 @@
-// Reads bits from memory, most significant first; bits past the end read as 0.
+// Reads bits from memory, most significant bit first. Bits past the end read as 0.
 #ifndef FLVDMX_CODEC_BIT_STREAM_H
 #define FLVDMX_CODEC_BIT_STREAM_H
 

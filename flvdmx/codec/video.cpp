@@ -1,4 +1,4 @@
-// Video: the FLV video tag header byte and the picture headers of Sorenson H.263 and VP6. AVC is in avc.cpp.
+// Video: the codec byte of FLV video tags and the picture headers of Sorenson H.263 and VP6. AVC is in avc.cpp.
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
@@ -11,10 +11,11 @@
 
 namespace {
 
-constexpr uint32_t FLVD_VIDEO_PAYLOAD = FLVD_CODEC_BYTE_OFFSET + 1; // codecs without a packet type
-constexpr uint32_t FLVD_PICTURE_PEEK = 128; // as much of the tag as a picture header is looked for in
+constexpr uint32_t FLVD_VIDEO_PAYLOAD =
+    FLVD_CODEC_BYTE_OFFSET + 1;             // offset of the data of codecs without a packet type
+constexpr uint32_t FLVD_PICTURE_PEEK = 128; // bytes of the tag in which a picture header is searched
 
-constexpr int32_t FLVD_VIDEO_HEADER_MIN = 8; // less is no header of any codec
+constexpr int32_t FLVD_VIDEO_HEADER_MIN = 8; // no codec has a shorter header
 constexpr int32_t FLVD_AVC_OUT_CAPACITY = 128;
 
 // Sorenson H.263.
@@ -31,7 +32,7 @@ constexpr flvd_picture_size_t g_flvd_h263Size[] = {{352, 288}, {176, 144}, {128,
 
 constexpr uint32_t FLVD_MACROBLOCK = 16; // pixels
 
-// Start of the picture whose start code is found first, or -1.
+// Offset of the first picture start code, or -1.
 int32_t FLVD_FindH263Picture(const uint8_t* data, int32_t length)
 {
     for (int32_t p = 0; p <= length - FLVD_H263_HEADER_MIN; ++p)
@@ -85,7 +86,7 @@ void FLVD_SetFourcc(flvd_ctx_t* ctx, const char* fourcc)
     std::memcpy(ctx->video_info.fourcc, fourcc, sizeof ctx->video_info.fourcc);
 }
 
-// A codec whose picture header stands at the start of its data.
+// Probes a codec that has a picture header at the start of its data.
 int32_t FLVD_ProbePicture(flvd_ctx_t* ctx, uint32_t codec, const char* fourcc, flvd_site_t short_site,
                           flvd_site_t header_site)
 {
@@ -99,7 +100,7 @@ int32_t FLVD_ProbePicture(flvd_ctx_t* ctx, uint32_t codec, const char* fourcc, f
     return 0;
 }
 
-// Copies the AVCDecoderConfigurationRecord of a sequence header and reads its sequence parameter set.
+// Copies the AVCDecoderConfigurationRecord of a sequence header and parses its sequence parameter set.
 int32_t FLVD_ProbeAvc(flvd_ctx_t* ctx, uint32_t data_size)
 {
     flvd_video_info_t& info = ctx->video_info;
@@ -111,7 +112,7 @@ int32_t FLVD_ProbeAvc(flvd_ctx_t* ctx, uint32_t data_size)
                             FLVD_AVC_HEADER_SIZE))
         return FLVD_Fail(ctx, FLVD_SITE_AVC_MEMORY);
     uint8_t parameters[FLVD_AVC_OUT_CAPACITY];
-    const auto record_size = static_cast<int32_t>(info.config_size); // below DataSize, which has 24 bits
+    const auto record_size = static_cast<int32_t>(info.config_size); // smaller than DataSize, which has 24 bits
     const int32_t length = FLVD_GetAVCSeqHeaderFromAvcC(info.config, record_size, parameters, FLVD_AVC_OUT_CAPACITY);
     if (length <= 0)
         return FLVD_Fail(ctx, FLVD_SITE_AVC_CONFIG);

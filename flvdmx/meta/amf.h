@@ -31,7 +31,7 @@ inline double FLVD_GetDouble(const uint8_t* p)
     return value;
 }
 
-// A number of the metadata as an unsigned field: rounded toward zero, what does not fit is clamped, NaN is 0.
+// Converts a number of the metadata to an unsigned field: truncates, clamps to the range, maps NaN to 0.
 constexpr uint32_t FLVD_DoubleToU32(double value)
 {
     constexpr double above = 4294967296.0; // 2^32
@@ -40,7 +40,7 @@ constexpr uint32_t FLVD_DoubleToU32(double value)
     return value >= above ? UINT32_MAX : static_cast<uint32_t>(value);
 }
 
-// A number of the metadata as a file position: rounded toward zero, what does not fit is clamped, NaN is 0.
+// Converts a number of the metadata to a file position: truncates, clamps to the range, maps NaN to 0.
 constexpr int64_t FLVD_DoubleToI64(double value)
 {
     constexpr double above = 9223372036854775808.0; // 2^63

@@ -14,7 +14,7 @@ constexpr uint32_t FLVD_ELEMENT_SIZE = 1 + FLVD_AMF_NUMBER_SIZE; // type marker 
 flvd_mem_alloc_fn g_flvd_pfnMetaAlloc;
 flvd_mem_free_fn g_flvd_pfnMetaFree;
 
-// Replaces *array by one of `count` zeros, or by none.
+// Replaces *array by one of `count` zeros, or by null when `refused`, too large or out of memory.
 template <typename Element> void FLVD_Replace(Element** array, uint32_t* array_count, uint32_t count, bool refused)
 {
     if (*array != nullptr)
@@ -23,7 +23,7 @@ template <typename Element> void FLVD_Replace(Element** array, uint32_t* array_c
     *array_count = 0;
     if (refused || count > UINT32_MAX / sizeof(Element))
         return;
-    const auto size = static_cast<uint32_t>(count * sizeof(Element)); // compared above
+    const auto size = static_cast<uint32_t>(count * sizeof(Element)); // checked above
     *array = static_cast<Element*>(g_flvd_pfnMetaAlloc(size));
     if (*array == nullptr)
         return;
@@ -31,10 +31,10 @@ template <typename Element> void FLVD_Replace(Element** array, uint32_t* array_c
     *array_count = count;
 }
 
-// One element of an array in the file.
+// Result of reading one element of an array in the file.
 enum class FlvdElement { Number, NotANumber, Missing };
 
-// While the file is opened: all nine bytes must be there, else the element is missing and nothing is consumed.
+// For opening: an element of which not all nine bytes are there is missing. Only a number is consumed.
 FlvdElement FLVD_ReadWholeElement(fio_file_t* file, double* number)
 {
     const uint8_t* bytes = nullptr;
@@ -47,8 +47,8 @@ FlvdElement FLVD_ReadWholeElement(fio_file_t* file, double* number)
     return FlvdElement::Number;
 }
 
-// While seeking: bytes that are not there are passed all the same, and the number is 0.0 then. The element is missing
-// when not even its marker was there.
+// For seeking: consumes the element's nine bytes whether or not they exist; an incomplete number reads as 0.0. The
+// element is missing only when not even its marker exists. Something other than a number is not consumed.
 FlvdElement FLVD_ReadElementOrZero(fio_file_t* file, double* number)
 {
     const uint8_t* bytes = nullptr;
@@ -62,15 +62,15 @@ FlvdElement FLVD_ReadElementOrZero(fio_file_t* file, double* number)
     return marked ? FlvdElement::Number : FlvdElement::Missing;
 }
 
-// Positions in order, as far as they were read.
+// Result of reading positions in order.
 struct flvd_positions_t {
     uint32_t available;
-    uint32_t read; // the one outside included
+    uint32_t read; // including the one at or above the limit
     int64_t last_inside;
 };
 
-// Reads positions up to and including the first that is not below `limit`, from memory or from the current reader.
-// False when the array in the file runs out of data.
+// Reads positions, from memory or through the current reader, up to and including the first one that is not below
+// `limit`. False when an array in the file is cut short.
 bool FLVD_ReadPositionsBelow(const flvd_ctx_t* ctx, int64_t limit, flvd_positions_t* positions)
 {
     const bool memory = FLVD_IsIndexInMemory(ctx);
@@ -89,7 +89,7 @@ bool FLVD_ReadPositionsBelow(const flvd_ctx_t* ctx, int64_t limit, flvd_position
     return true;
 }
 
-// Puts the current reader on the positions of an index that is not in memory. 0, or -1 with the failure recorded.
+// Unless the index is in memory, moves the current reader to its positions. Returns 0, or -1 with the failure recorded.
 int32_t FLVD_GoToPositions(flvd_ctx_t* ctx, flvd_site_t site)
 {
     if (FLVD_IsIndexInMemory(ctx) ||
@@ -98,8 +98,8 @@ int32_t FLVD_GoToPositions(flvd_ctx_t* ctx, flvd_site_t site)
     return FLVD_Fail(ctx, site);
 }
 
-// Counts the entries before the end of the valid data and the one that crosses it, and cuts off the others, unless
-// there is nothing in memory to count.
+// Cuts off the entries past the end of the valid data, except the first of them, and returns how many remain in *count.
+// An index in memory without positions keeps its entry count.
 int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end, uint32_t* count)
 {
     uint32_t& entry_count = ctx->keyframe_index.entry_count;
@@ -111,13 +111,13 @@ int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end, uint32_t* count)
     flvd_positions_t positions = {};
     if (end >= 1 && !FLVD_ReadPositionsBelow(ctx, end, &positions))
         return -1;
-    *count = std::min(entry_count, positions.read); // the times may be the shorter array
+    *count = std::min(entry_count, positions.read); // the array of times may be shorter
     if (!FLVD_IsIndexInMemory(ctx) || positions.available != 0)
         entry_count = *count;
     return 0;
 }
 
-// Time of the last of so many entries in memory that has one.
+// Time of the last of the first `count` entries in memory that has a time, or 0.
 uint32_t FLVD_LastTimeInMemory(const flvd_ctx_t* ctx, uint32_t count)
 {
     count = std::min(count, ctx->keyframe_arrays.times_count);
@@ -143,7 +143,7 @@ int32_t FLVD_ReadLastTime(flvd_ctx_t* ctx, uint32_t count, uint32_t* time)
     return 0;
 }
 
-// Entries that both arrays in memory have.
+// Number of entries that have both a time and a position in memory.
 uint32_t FLVD_EntriesInMemory(const flvd_ctx_t* ctx)
 {
     const flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
@@ -152,16 +152,16 @@ uint32_t FLVD_EntriesInMemory(const flvd_ctx_t* ctx)
     return std::min({ctx->keyframe_index.entry_count, arrays.times_count, arrays.positions_count});
 }
 
-// The times in order.
+// Reads the times in order.
 struct flvd_times_t {
-    fio_file_t* file;         // read from here, unless
-    const uint32_t* times_ms; // they are in memory
+    fio_file_t* file;         // source when the times are not in memory
+    const uint32_t* times_ms; // in memory, or null
     uint32_t count;
-    bool missing; // the element read last was missing
+    bool missing; // the last element read was missing
 };
 
-// Time of entry *i, the next one. False when the array ends there. After two missing elements all others are taken to
-// be missing, the last one stands for them: a wrong count would cost a read for each.
+// Reads the time of entry *i, the next one. False when the array ends there. After two missing elements, skips to the
+// last entry: the others are missing too, and with a wrong count each would cost a read.
 bool FLVD_NextTime(flvd_times_t* times, uint32_t* i, uint32_t* time)
 {
     if (times->times_ms != nullptr) {
@@ -251,7 +251,7 @@ flvd_choice_t FLVD_ChooseEntry(const flvd_ctx_t* ctx, FlvdIndex index, uint32_t 
     for (; i < times.count; ++i) {
         uint32_t time = 0;
         if (!FLVD_NextTime(&times, &i, &time))
-            break; // the entries before it are the whole index
+            break; // the index ends with the entry before it
         const bool exact = time == target && i != 0;
         if (time >= target && (!backward || exact))
             return {FlvdChoice::Entry, i, time};
@@ -259,7 +259,7 @@ flvd_choice_t FLVD_ChooseEntry(const flvd_ctx_t* ctx, FlvdIndex index, uint32_t 
             break;
         before = time;
     }
-    // Above all times: the reader ends one element further on.
+    // The target is later than all times. The reader must still end one element past them.
     double unused = 0.0;
     if (index == FlvdIndex::InFile && i != 0 && i == times.count && !times.missing)
         FLVD_ReadElementOrZero(times.file, &unused);

@@ -9,7 +9,7 @@ struct flvd_meta_key_t {
     const char* name;
 };
 
-// Sorted by length; the last entry ends every search.
+// Sorted by length. No name has the length of the last entry, which ends every search.
 constexpr flvd_meta_key_t g_flvd_metaKeyTable[] = {
     {5, "times"},
     {5, "width"},
@@ -31,9 +31,9 @@ constexpr flvd_meta_key_t g_flvd_metaKeyTable[] = {
 };
 static_assert(std::size(g_flvd_metaKeyTable) == FLVD_META_KEY_NONE + 1, "one entry per key, and the end");
 
-constexpr uint8_t FLVD_CASE_BIT = 0x20; // set in small letters; no other byte becomes a letter by it
+constexpr uint8_t FLVD_CASE_BIT = 0x20; // set in lowercase letters; setting it makes no other byte a letter
 
-// True when the name, of the key's length, is the key in any case.
+// True when a name of the key's length is the key, ignoring case.
 bool FLVD_IsKey(const uint8_t* name, const flvd_meta_key_t& key)
 {
     for (uint32_t i = 0; i < key.length; ++i)
@@ -42,7 +42,7 @@ bool FLVD_IsKey(const uint8_t* name, const flvd_meta_key_t& key)
     return true;
 }
 
-// Index of the first key of a length, FLVD_META_KEY_NONE when there is none. Most names in files have another length.
+// Index of the first key of a length, or FLVD_META_KEY_NONE, which settles most names in files without a comparison.
 uint32_t FLVD_FirstKey(uint32_t length)
 {
     switch (length) {

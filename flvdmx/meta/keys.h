@@ -1,10 +1,10 @@
-// The properties of script data that the library knows.
+// The names of the script-data properties that the library knows.
 #ifndef FLVDMX_META_KEYS_H
 #define FLVDMX_META_KEYS_H
 
 #include <cstdint>
 
-// The index of a key in the table is its identity.
+// Indices into the table of keys in keys.cpp.
 enum : uint32_t {
     FLVD_META_KEY_TIMES,
     FLVD_META_KEY_WIDTH,
@@ -25,7 +25,7 @@ enum : uint32_t {
     FLVD_META_KEY_NONE
 };
 
-// The key of this name in any case, or FLVD_META_KEY_NONE.
+// Returns the key with this name, ignoring case, or FLVD_META_KEY_NONE.
 uint32_t FLVD_FindKey(const uint8_t* name, uint32_t length);
 
 #endif

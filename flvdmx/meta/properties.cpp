@@ -1,4 +1,4 @@
-// What the known properties set in the instance and its stream descriptions.
+// Stores the values of known properties in the instance and its stream descriptions.
 
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/meta/amf.h"
@@ -9,7 +9,7 @@ namespace {
 
 constexpr double FLVD_META_FRAME_RATE_UNIT = 1000.0; // frame_rate counts thousandths of a frame per second
 
-// Flags of a parse.
+// Bits of flvd_script_state_t::flags.
 constexpr uint32_t FLVD_META_IN_KEYFRAMES = 0x10;
 constexpr uint32_t FLVD_META_TIMES_SEEN = 0x20;
 constexpr uint32_t FLVD_META_POSITIONS_SEEN = 0x40;
@@ -31,7 +31,7 @@ void FLVD_AssignEntryCount(flvd_ctx_t* ctx, flvd_script_state_t* state)
         state->flags = 0;
 }
 
-// Inside "keyframes", remembers where the array after the key has its first element.
+// Inside "keyframes", records the position of the first element of the array that follows the key.
 void FLVD_NoteArray(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t seen, int64_t* offset)
 {
     if ((state->flags & FLVD_META_IN_KEYFRAMES) == 0)
@@ -104,6 +104,6 @@ void FLVD_MeetKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t key)
         FLVD_NoteArray(ctx, state, FLVD_META_POSITIONS_SEEN, &ctx->keyframe_index.positions_offset);
     } else if (key == FLVD_META_KEY_KEYFRAMES) {
         state->flags |= FLVD_META_IN_KEYFRAMES;
-        ctx->keyframe_index.entry_count = UINT32_MAX; // each array lowers it
+        ctx->keyframe_index.entry_count = UINT32_MAX; // lowered to the size of the smaller array
     }
 }

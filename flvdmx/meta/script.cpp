@@ -1,8 +1,8 @@
-// Script data: parses AMF0 values ("Action Message Format, AMF 0") and takes sixteen known properties, at any
-// depth and whatever the script object is called, into the instance and its stream descriptions.
+// Script data: parses AMF0 values ("Action Message Format, AMF 0") and stores sixteen known properties in the instance
+// and its stream descriptions. It takes them at any depth, whatever the name of the script object.
 //
-// Sizes are claims of the file: a value may not start past the payload, containers nest to a bound, and every loop
-// consumes at least a byte per turn.
+// No size in the file is trusted: a value may not start past the payload, the nesting depth is bounded, and every loop
+// consumes at least one byte per iteration.
 
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/meta/amf.h"
@@ -13,12 +13,12 @@
 namespace {
 
 constexpr uint32_t FLVD_META_CONTAINERS_MAX = 64;
-constexpr uint32_t FLVD_META_SIZE_MAX = 0x7FFFFFFF; // results are signed
-constexpr uint32_t FLVD_META_DATE_SIZE = 10;        // double and time zone
+constexpr uint32_t FLVD_META_SIZE_MAX = 0x7FFFFFFF; // sizes are returned as int32_t
+constexpr uint32_t FLVD_META_DATE_SIZE = 10;        // a double and the time zone
 constexpr uint32_t FLVD_META_END_SIZE = 3;          // 00 00 09
 constexpr uint32_t FLVD_META_END = 0x000009;
 
-// Reading. Each function fails when fewer bytes are left, and counts what it consumed.
+// Reading. Each function fails when fewer bytes are left; those that consume bytes count them.
 
 inline const uint8_t* FLVD_ScriptPeek(flvd_ctx_t* ctx, uint32_t n)
 {
@@ -26,7 +26,7 @@ inline const uint8_t* FLVD_ScriptPeek(flvd_ctx_t* ctx, uint32_t n)
     return FLVD_FioPeek(&bytes, n, ctx->cur_reader) == n ? bytes : nullptr;
 }
 
-// Consumes peeked bytes; they stay in the cache.
+// Consumes bytes that were peeked at. They stay in the cache until the next read.
 inline void FLVD_ScriptConsume(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
 {
     FLVD_FioDropBits(ctx->cur_reader);
@@ -56,7 +56,7 @@ bool FLVD_ScriptRead(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
     return read == n;
 }
 
-// Consumes a text without keeping it.
+// Consumes a string without keeping it.
 bool FLVD_ScriptPassText(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
 {
     if (length == 0)
@@ -64,13 +64,13 @@ bool FLVD_ScriptPassText(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t l
     return length <= FLVD_META_TEXT_MAX ? FLVD_ScriptRead(ctx, state, length) : FLVD_ScriptSkip(ctx, state, length);
 }
 
-// Payload bytes after the position; a value may run over the end.
+// Payload bytes left. A value may run past the payload; then there are none.
 uint64_t FLVD_ScriptLeft(const flvd_script_state_t* state)
 {
     return state->length > state->consumed ? state->length - state->consumed : 0;
 }
 
-// Values. Each function returns the bytes of the value, its marker included, 0 for a value that yields nothing, or -1.
+// Values. Each function returns the size of the value with its marker, 0 for a value without content, or -1 on failure.
 
 int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state);
 
@@ -128,9 +128,9 @@ int32_t FLVD_ParseDate(flvd_ctx_t* ctx, flvd_script_state_t* state)
     return FLVD_ScriptSkip(ctx, state, FLVD_META_DATE_SIZE) ? static_cast<int32_t>(1 + FLVD_META_DATE_SIZE) : -1;
 }
 
-// Begins the keyframe array that the pending property asks for: None when nothing is to be kept, or when so many
-// elements cannot be in the payload. All arrays together are bounded too: a payload full of arrays that each claim the
-// rest of it would cost the square of its size.
+// Allocates the keyframe array for the pending property. None when that is no index array, when the index is not kept
+// in memory, or when the payload cannot hold `count` elements. The sum over all arrays is bounded too, because a
+// payload full of arrays that each claim the rest of it would cost quadratic time.
 FlvdArray FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t count)
 {
     const bool times = state->pending_key == FLVD_META_KEY_TIMES;
@@ -143,7 +143,7 @@ FlvdArray FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, u
     return FLVD_ReplaceArray(ctx, times ? FlvdArray::Times : FlvdArray::Positions, count, refused);
 }
 
-// Not inlined: what it needs of the stack would be taken for every container that is nested in another.
+// Not inlined, so that its stack frame is not part of every nested container's.
 [[gnu::noinline]] int32_t FLVD_ParseStrictArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 4);
@@ -166,8 +166,7 @@ FlvdArray FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, u
 // How a property loop ended.
 enum class FlvdLoop { AtEnd, AtEmptyKey, Failed };
 
-// Reads a key of this length and does what meeting it does. One too long to be known is not met at all: it leaves the
-// pending property as it is.
+// Reads and handles a key. A key too long to be a known one is skipped, and leaves the pending property unchanged.
 bool FLVD_ParseKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
 {
     if (length > FLVD_META_TEXT_MAX)
@@ -178,7 +177,7 @@ bool FLVD_ParseKey(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
     return true;
 }
 
-// One property whose key has this length; adds its bytes to the sum.
+// Parses one property and adds its size to the sum.
 bool FLVD_ParseProperty(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t key_length, uint32_t* sum)
 {
     if (!FLVD_ParseKey(ctx, state, key_length))
@@ -194,7 +193,7 @@ bool FLVD_ParseProperty(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t ke
     return true;
 }
 
-// Properties up to the end marker or an empty key. An end of the data is a failure.
+// Parses properties up to the end marker or an empty key. Reaching the end of the data is a failure.
 FlvdLoop FLVD_ParseProperties(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t* sum)
 {
     for (;;) {
@@ -214,7 +213,7 @@ FlvdLoop FLVD_ParseProperties(flvd_ctx_t* ctx, flvd_script_state_t* state, uint3
     }
 }
 
-// An object or ECMA array after its header of so many bytes; `failed` is what a failure of it returns.
+// Parses an object or ECMA array after its header, which has `header` bytes. Returns `failed` on failure.
 int32_t FLVD_ParsePropertyList(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t header, int32_t failed)
 {
     uint32_t sum = 0;
@@ -232,7 +231,7 @@ int32_t FLVD_ParseEcmaArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
     return FLVD_ParsePropertyList(ctx, state, FLVD_META_ARRAY_HEADER, -1);
 }
 
-// The containers are the only values that hold values, so they bound the recursion.
+// Only containers hold other values, so bounding their depth bounds the recursion.
 int32_t FLVD_ParseContainer(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     if (state->containers == FLVD_META_CONTAINERS_MAX)
@@ -240,7 +239,7 @@ int32_t FLVD_ParseContainer(flvd_ctx_t* ctx, flvd_script_state_t* state)
     ++state->containers;
     int32_t size = 0;
     if (state->value_type == FLVD_AMF_OBJECT)
-        size = FLVD_ParsePropertyList(ctx, state, 1, 0); // its bytes are lost, what encloses it continues
+        size = FLVD_ParsePropertyList(ctx, state, 1, 0); // a failed object counts as empty; its container continues
     else if (state->value_type == FLVD_AMF_ECMA_ARRAY)
         size = FLVD_ParseEcmaArray(ctx, state);
     else
@@ -276,11 +275,11 @@ int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state)
     case FLVD_AMF_LONG_STRING:
         return FLVD_ParseLongString(ctx, state);
     default:
-        return 0; // null, undefined, object end, and what AMF0 does not know
+        return 0; // null, undefined, object end, and markers unknown to AMF0
     }
 }
 
-// Parses values until the payload is used up or one yields nothing. Returns the bytes they occupy.
+// Parses values until the payload is used up or a value fails or has no content. Returns the size of the values.
 uint64_t FLVD_ParseScriptValues(flvd_ctx_t* ctx, flvd_script_state_t* state, bool* stopped)
 {
     uint64_t total = 0;
