@@ -10,9 +10,9 @@
 
 namespace {
 
-constexpr uint32_t FLVD_INDEX_TOLERANCE_MS = 1000; // encoders write times some way off the tags'
+constexpr uint32_t FLVD_INDEX_TOLERANCE_MS = 1000; // encoders write times that differ from those of the tags
 
-// Failures by where the index is read from.
+// Failure sites, one set per source of the index.
 struct flvd_index_sites_t {
     flvd_site_t rewind;
     flvd_site_t seek;
@@ -32,8 +32,8 @@ int32_t FLVD_RewindByIndex(flvd_ctx_t* ctx, uint32_t* result, flvd_site_t site)
     return FLVD_SeekToFirstTag(ctx, ctx->main_reader) == 0 ? 0 : FLVD_Fail(ctx, site);
 }
 
-// Moves to a keyframe's position and takes the timestamp there, which must be near the index's: the only proof that the
-// index belongs to the file.
+// Moves to a keyframe's position and takes the timestamp there. It must be near the one in the index: that is the only
+// evidence that the index belongs to the file.
 int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, uint32_t* result,
                          const flvd_index_sites_t& sites)
 {

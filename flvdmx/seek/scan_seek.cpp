@@ -1,7 +1,8 @@
-// Frame seek by scanning: from the nearest of a few starting places, walks from tag to tag until the target is reached.
+// Frame seek by scanning: starts at the start of the file, its end or an estimated position, whichever is nearest, and
+// walks from tag to tag until it reaches the target.
 //
-// A walk never ends on an AVC configuration or end-of-sequence tag: they are keyframes by their FrameType, but no
-// picture. Forward means at or after the target, so only a backward seek may end before the first tag.
+// A walk never ends at an AVC configuration or end-of-sequence tag: its FrameType says keyframe, but it has no picture.
+// Forward means at or after the target, so only a backward seek may end before the first tag.
 
 #include "flvdmx/seek/seek.h"
 
@@ -12,27 +13,28 @@
 
 namespace {
 
-constexpr uint32_t FLVD_BYTE_RATE_MS = 1024; // byte_rate counts bytes per so many ms
-// A tag may hold 16 MiB, and one search for the next covers 1 MiB.
+constexpr uint32_t FLVD_BYTE_RATE_MS = 1024; // byte_rate is in bytes per 1024 ms
+
+// The estimated position may lie inside a tag of up to 16 MiB, and one search for the next tag covers 1 MiB.
 constexpr uint32_t FLVD_FIRST_STEP_TRIES = 16;
 
 // One scan seek.
 struct flvd_scan_t {
     flvd_ctx_t* ctx;
     fio_file_t* file;
-    uint32_t kind; // tags that walks stop at
+    uint32_t kind; // FLVD_TAG_* bits of the tags at which walks may end
     uint32_t target;
     uint32_t* result;
     bool backward;
     bool audio;
-    flvd_tag_info_t tag; // the tag reached last
-    int64_t steps;       // of the last walk
+    flvd_tag_info_t tag; // the last tag reached
+    int64_t steps;       // number of steps in the last walk
 };
 
 int32_t FLVD_SeekBackward(flvd_scan_t* scan);
 
-// The results of seeks made to start a walk are ignored: the walk then starts where the reader is, and answers on
-// the right side of the target all the same.
+// The result of the seek is ignored: if it fails, the walk starts where the reader stands and still ends on the correct
+// side of the target.
 void FLVD_StartAt(const flvd_scan_t* scan, int64_t position)
 {
     __FLV_DMX__fioSeek64(scan->file, position, FIO_SEEK_SET);
@@ -41,7 +43,8 @@ void FLVD_StartAt(const flvd_scan_t* scan, int64_t position)
 int32_t FLVD_FailWalk(const flvd_scan_t* scan, int32_t code)
 {
     FLVD_Record(scan->ctx, scan->audio ? FLVD_SITE_AUDIO_WALK : FLVD_SITE_VIDEO_WALK);
-    return code == FLVD_ERR_END_OF_DATA ? FLVD_ERR_NOT_FOUND : code; // data that ends on the way back is no miss
+    return code == FLVD_ERR_END_OF_DATA ? FLVD_ERR_NOT_FOUND
+                                        : code; // data that ends on the way back is a failure, not a miss
 }
 
 int32_t FLVD_Answer(const flvd_scan_t* scan)
@@ -57,11 +60,11 @@ int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
     return 0;
 }
 
-// Walks until the target is reached or passed. 0, or the code of the step that failed.
+// Walks until the target is reached or passed. Returns 0, or the result of the step that failed.
 int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
 {
     const auto step = forward ? FLVD_MoveToNextTag : FLVD_MoveToPrevTag;
-    // More tags than the data has room for: a host with wrong positions could keep a walk running forever.
+    // More steps than the data has room for tags: a host with wrong positions could keep a walk running forever.
     const int64_t most_steps = scan->ctx->data_end >> 3;
     for (scan->steps = 0;;) {
         if (FLVD_FioAtEnd(scan->file))
@@ -82,7 +85,7 @@ int32_t FLVD_Walk(flvd_scan_t* scan, bool forward)
     }
 }
 
-// The tags end before the target.
+// Answers when the tags end before the target. Audio then ends at the end of the data, which is not a miss.
 int32_t FLVD_SeekAtEnd(flvd_scan_t* scan)
 {
     FLVD_StartAt(scan, scan->ctx->data_end);
@@ -112,7 +115,7 @@ int32_t FLVD_SeekFromStart(flvd_scan_t* scan)
     return FLVD_SeekForward(scan);
 }
 
-// Answers after a backward walk that ended with this code.
+// Answers after a backward walk with this result.
 int32_t FLVD_EndBackwardWalk(flvd_scan_t* scan, int32_t code)
 {
     if (code == FLVD_ERR_AT_FIRST_TAG)
@@ -139,15 +142,15 @@ int32_t FLVD_SeekFromEnd(flvd_scan_t* scan)
     return scan->audio && after_last_tag ? FLVD_SeekAtEnd(scan) : FLVD_EndBackwardWalk(scan, code);
 }
 
-// From the tag at the position. When it has the target's time without being the answer, the answer may lie on either
-// side of it: the walk starts against the direction, so that coming back passes it.
+// Walks from the tag at the position and answers. When that tag has the target's time but is not the answer, the answer
+// may lie on either side: the walk then starts against the seek direction, so that the way back passes the tag again.
 int32_t FLVD_SeekFromTag(flvd_scan_t* scan)
 {
     const bool ahead = scan->target > scan->tag.timestamp || (scan->target == scan->tag.timestamp && scan->backward);
     return ahead ? FLVD_SeekForward(scan) : FLVD_SeekBackward(scan);
 }
 
-// Which of start, end and a known place in the file is nearest to the target.
+// Which place is nearest to the target in time: the start, the end, or a place in the file whose time is known.
 enum class FlvdNearest { Start, Known, End };
 
 FlvdNearest FLVD_Nearest(const flvd_scan_t* scan, uint32_t known)
@@ -158,8 +161,8 @@ FlvdNearest FLVD_Nearest(const flvd_scan_t* scan, uint32_t known)
     return int64_t{distance} >= int64_t{scan->ctx->last_ts} - scan->target ? FlvdNearest::End : FlvdNearest::Known;
 }
 
-// The first tag of a kind at or after an estimated place, else the last one of the file. 0 with the tag,
-// FLVD_ERR_AT_FIRST_TAG when there is none, or -1.
+// Finds the first tag of a kind at or after the reader's estimated position, or else the last one of the file. Returns
+// 0 with the tag, FLVD_ERR_AT_FIRST_TAG when there is none, or -1.
 int32_t FLVD_FirstTag(flvd_scan_t* scan, uint32_t kind, flvd_site_t site)
 {
     int32_t code = FLVD_ERR_NOT_FOUND;
@@ -196,7 +199,7 @@ int32_t FLVD_SeekFromFirstTag(flvd_scan_t* scan)
     }
 }
 
-// Audio with a reader of its own starts where the video seek has put the main reader.
+// A separate audio reader starts where the video seek left the main reader.
 int32_t FLVD_SeekAfterVideo(flvd_scan_t* scan)
 {
     const int64_t position = FLVD_FioTell(scan->ctx->main_reader);

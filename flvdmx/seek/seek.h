@@ -1,4 +1,4 @@
-// Seeking: the time seek of operation 3, and the frame seeks by which it puts the readers on a tag.
+// Seeking: the time seek of operation 3, and the frame seeks with which it moves the readers to a tag.
 //
 // Files: time_seek.cpp chooses the target and restores the readers after a failure, frame_seek.cpp seeks by the
 // keyframe index, scan_seek.cpp by walking from tag to tag.
@@ -7,17 +7,17 @@
 
 #include "flvdmx/flvdmx.h"
 
-// Direction of a frame seek; any value but the first is forward.
+// Direction of a frame seek. Any value but FLVD_DIRECTION_BACKWARD means forward.
 constexpr uint32_t FLVD_DIRECTION_BACKWARD = 1;
 constexpr uint32_t FLVD_DIRECTION_FORWARD = 0;
 
-// Time seek of operation 3, of a complete and of a growing file. `result` is written on success only.
-// 0, or -1 with error and error_line set.
+// Time seek of operation 3, for complete and for growing files. Return 0, or -1 with error and error_line set; `result`
+// is written on success only.
 int32_t FLVD_RunTimeSeek(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode);
 int32_t FLVD_RunTimeSeekProgressive(flvd_ctx_t* ctx, int32_t time, int32_t* result, uint32_t mode);
 
-// Frame seeks by scanning; results as FLVD_RunFrameSeek. Video on the main reader, audio on the audio reader, after the
-// main reader when it has one of its own.
+// Frame seeks by scanning; results as for FLVD_RunFrameSeek. Video moves the main reader, audio the audio reader. A
+// separate audio reader follows the main reader if the file has video.
 int32_t FLVD_RunVideoScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, uint32_t direction);
 int32_t FLVD_RunAudioScanSeek(flvd_ctx_t* ctx, uint32_t target, uint32_t* result, uint32_t direction);
 

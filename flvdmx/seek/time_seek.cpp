@@ -1,7 +1,7 @@
-// Time seek: turns the host's time into a target timestamp and a direction, moves the readers by frame seeks, and puts
-// them back when anything fails, so that delivery continues where it was.
+// Time seek: converts the host's time to a target timestamp and a direction, moves the readers with frame seeks, and
+// restores their positions if anything fails, so that delivery continues where it was.
 //
-// last_video_ts and last_audio_ts count from first_ts; frame seeks work on the file's own timestamps.
+// last_video_ts and last_audio_ts count from first_ts; frame seeks use the timestamps of the file.
 
 #include "flvdmx/seek/seek.h"
 
@@ -30,14 +30,14 @@ bool FLVD_IsByZero(const flvd_time_seek_t& seek)
     return (seek.mode & FLVD_SEEK_RELATIVE) != 0 && seek.time == 0;
 }
 
-// Current position, from first_ts.
+// Current position in ms from first_ts.
 uint32_t FLVD_CurrentTime(const flvd_time_seek_t& seek)
 {
     const flvd_ctx_t* const ctx = seek.ctx;
     return seek.growing || FLVD_HasVideo(ctx) ? ctx->last_video_ts : ctx->last_audio_ts;
 }
 
-// In 64 bits: a file's times may use all 32 of theirs.
+// Computes target and direction, in 64 bits because file timestamps may use all 32 bits.
 void FLVD_ChooseTarget(flvd_time_seek_t* seek)
 {
     const uint32_t current = FLVD_CurrentTime(*seek) + seek->ctx->first_ts;
@@ -55,7 +55,7 @@ void FLVD_ChooseTarget(flvd_time_seek_t* seek)
     seek->direction = backward ? FLVD_DIRECTION_BACKWARD : FLVD_DIRECTION_FORWARD;
 }
 
-// Remembers where a reader stands, unless a place to go back to is known. False when the position cannot be taken.
+// Saves a reader's position unless one is saved already. False when the tell fails.
 bool FLVD_SavePosition(fio_file_t* reader, int64_t* saved)
 {
     if (*saved != 0)
@@ -80,7 +80,7 @@ void FLVD_RestorePositions(flvd_ctx_t* ctx)
         FLVD_RestorePosition(ctx->audio_reader, &ctx->saved_audio_pos);
 }
 
-// To the first tag. A position that cannot be taken is no failure here, it only cannot be gone back to.
+// Moves the readers to the first tag. A tell that fails is no failure here; that position just cannot be restored.
 int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
 {
     flvd_ctx_t* const ctx = seek->ctx;
@@ -97,7 +97,7 @@ int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
     return 0;
 }
 
-// Saves a reader's position and moves it by a frame seek. The time found ends in seek->reached and becomes the
+// Saves a reader's position and moves the reader with a frame seek. Stores the time found in seek->reached and as the
 // stream's current position.
 int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, flvd_site_t position_site, flvd_site_t seek_site)
 {
@@ -128,7 +128,7 @@ int32_t FLVD_MoveOneReader(flvd_time_seek_t* seek)
     return result;
 }
 
-// Video first; the audio then goes to the time that the video reached. With video, that is the time to report.
+// Moves video first, then audio to the time that video reached, which is also the time to report.
 int32_t FLVD_MoveTwoReaders(flvd_time_seek_t* seek)
 {
     const flvd_ctx_t* const ctx = seek->ctx;
@@ -146,7 +146,7 @@ int32_t FLVD_MoveTwoReaders(flvd_time_seek_t* seek)
     return audio;
 }
 
-// Growing file: the audio reader, if there is one, follows the main reader; no audio tag is searched.
+// Growing file: moves the separate audio reader to where the main reader stands, without searching for an audio tag.
 int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
 {
     flvd_ctx_t* const ctx = seek.ctx;
@@ -169,14 +169,14 @@ int32_t FLVD_MoveGrowing(flvd_time_seek_t* seek)
     return result == 0 && follows ? FLVD_FollowVideo(*seek) : result;
 }
 
-// A target that the file cannot have. A growing file does not know its last timestamp: its index decides.
+// True when the target lies past the end. The last timestamp of a growing file is not known; there the index decides.
 bool FLVD_IsBeyondEnd(const flvd_time_seek_t& seek)
 {
     const bool unknown = seek.growing && seek.ctx->last_ts == 0;
     return seek.target > (unknown ? int64_t{UINT32_MAX} : int64_t{seek.ctx->last_ts});
 }
 
-// Everything up to the readers standing at their new places. 0, FLVD_MISS or another negative value.
+// Checks the request and moves the readers. Returns 0, FLVD_MISS or another negative value.
 int32_t FLVD_MoveReaders(flvd_time_seek_t* seek)
 {
     flvd_ctx_t* const ctx = seek->ctx;
@@ -198,7 +198,7 @@ int32_t FLVD_MoveReaders(flvd_time_seek_t* seek)
     return FLVD_HasAudioReader(ctx) ? FLVD_MoveTwoReaders(seek) : FLVD_MoveOneReader(seek);
 }
 
-// One attempt: moves the readers, or puts them back. 0, FLVD_MISS or another negative value.
+// Makes one attempt: moves the readers, or restores their positions. Returns 0, FLVD_MISS or another negative value.
 int32_t FLVD_Attempt(flvd_time_seek_t* seek, int32_t* result)
 {
     const int32_t moved = FLVD_MoveReaders(seek);
@@ -207,14 +207,14 @@ int32_t FLVD_Attempt(flvd_time_seek_t* seek, int32_t* result)
         return moved;
     }
     *result = static_cast<int32_t>(seek->reached - seek->ctx->first_ts);
-    if (!seek->growing || !FLVD_IsByZero(*seek)) { // a growing file's tag still waits to be retried
+    if (!seek->growing || !FLVD_IsByZero(*seek)) { // else keep it: an incomplete tag may wait for its retry
         seek->ctx->saved_main_pos = 0;
         seek->ctx->saved_audio_pos = 0;
     }
     return 0;
 }
 
-// After a miss: puts the readers at their end when asked to.
+// After a miss, moves the readers to the end of the file if the mode says so.
 void FLVD_SeekToEnd(const flvd_time_seek_t& seek)
 {
     if ((seek.mode & FLVD_SEEK_TO_END_ON_MISS) == 0)
@@ -230,7 +230,7 @@ int32_t FLVD_RunSeek(flvd_time_seek_t seek, int32_t* result)
     if (moved == FLVD_MISS) {
         FLVD_SeekToEnd(seek);
         if ((seek.mode & FLVD_SEEK_RETRY_BACKWARD) != 0) {
-            seek.mode = FLVD_SEEK_BACKWARD; // the time counts from the start then
+            seek.mode = FLVD_SEEK_BACKWARD; // no longer relative
             moved = FLVD_Attempt(&seek, result);
         }
     }

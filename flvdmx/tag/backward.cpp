@@ -1,7 +1,7 @@
-// Backward navigation: the four bytes before a tag give the size of the tag before it. Where they do not lead to
-// a consistent tag the cursor slides back byte by byte until some four bytes do.
+// Backward navigation: the four bytes before a tag give the size of the previous tag. Where they do not lead to a
+// consistent tag, the cursor slides back byte by byte until four bytes do.
 //
-// The seeks are not checked on the way: a failed one shows as a failed peek or test at the next step.
+// Results of seeks are ignored here: after a failed one, the next peek or header check fails.
 
 #include "flvdmx/tag/tag.h"
 
@@ -10,7 +10,7 @@
 
 namespace {
 
-// The four bytes at the cursor, where the reader stands, as a back-pointer; 0 when they cannot be one.
+// Reads the four bytes at the cursor, where the reader stands, as a back-pointer. 0 when they cannot be one.
 int32_t FLVD_PeekBackPointer(fio_file_t* file, int64_t cursor)
 {
     const uint8_t* bytes = nullptr;
@@ -20,7 +20,7 @@ int32_t FLVD_PeekBackPointer(fio_file_t* file, int64_t cursor)
     return value > 0 && value < cursor ? value : 0;
 }
 
-// A candidate's size is bounded by the back-pointer that led to it, so the end of the valid data is not consulted.
+// The back-pointer that led to a candidate bounds its size, so this needs no check against the end of the valid data.
 bool FLVD_IsPreviousTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header, int32_t back_pointer)
 {
     return header.info.data_size + FLVD_TAG_HEADER_SIZE == static_cast<uint32_t>(back_pointer) &&
@@ -44,7 +44,7 @@ uint32_t FLVD_BackwardKind(const flvd_tag_header_t& header, uint32_t wanted)
 
 enum class FlvdStepBack { Found, Unwanted, Inconsistent, ShortData };
 
-// Follows the back-pointer at the cursor. Found and Unwanted leave the reader on the start of the tag before it.
+// Follows the back-pointer at the cursor. With Found and Unwanted, the reader then stands at the start of its tag.
 FlvdStepBack FLVD_StepBack(fio_file_t* file, const flvd_tag_rules_t& rules, int64_t cursor, uint32_t wanted,
                            flvd_tag_header_t* header)
 {
@@ -59,7 +59,7 @@ FlvdStepBack FLVD_StepBack(fio_file_t* file, const flvd_tag_rules_t& rules, int6
     return FLVD_IsWantedTag(*header, wanted) ? FlvdStepBack::Found : FlvdStepBack::Unwanted;
 }
 
-// Finds the wanted tag before the back-pointer at `cursor`, on which the reader stands.
+// Finds the last wanted tag that ends at or before the back-pointer at `cursor`, where the reader stands.
 int32_t FLVD_SearchBack(fio_file_t* file, const flvd_ctx_t* ctx, int64_t cursor, uint32_t wanted,
                         flvd_tag_header_t* header)
 {
@@ -74,7 +74,7 @@ int32_t FLVD_SearchBack(fio_file_t* file, const flvd_ctx_t* ctx, int64_t cursor,
         case FlvdStepBack::Unwanted: {
             __FLV_DMX__fioSeek64(file, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_CUR);
             const int64_t before = FLVD_FioTell(file);
-            if (before < 0 || before >= cursor) // a host whose seeks fail would go round for ever
+            if (before < 0 || before >= cursor) // seeks that do not move would make this an endless loop
                 return FLVD_ERR_NOT_FOUND;
             cursor = before;
             budget = FLVD_RESYNC_WINDOW;

@@ -1,5 +1,5 @@
-// How far the valid data reaches and which timestamp its last tags carry. The file size is not taken as the end of
-// the tag chain: bytes that belong to no tag may follow the last one, and a download may have been cut short.
+// Finds the end of the valid data and the last timestamp. The file size is no substitute for that end: other bytes may
+// follow the last tag, and a download may have been cut off inside one.
 
 #include "flvdmx/tag/tag.h"
 
@@ -13,14 +13,14 @@ namespace {
 
 constexpr uint32_t FLVD_WALK_TAGS = 10;
 
-// End of the tag at the position, its PreviousTagSize included; negative when the position cannot be told.
+// End of the tag at the position, its PreviousTagSize included; negative when the tell fails.
 int64_t FLVD_TagEnd(fio_file_t* file, const flvd_tag_info_t& tag)
 {
     const int64_t start = FLVD_FioTell(file);
     return start < 0 ? start : start + tag.data_size + FLVD_TAG_OVERHEAD;
 }
 
-// From this tag, on which the reader stands, walks forward to the end of the last tag.
+// Walks forward to the end of the last tag, starting with `tag`, where the reader stands.
 int32_t FLVD_WalkToEnd(flvd_ctx_t* ctx, flvd_tag_info_t tag, int64_t* end)
 {
     do {
@@ -37,7 +37,8 @@ int32_t FLVD_LastTagEnd(flvd_ctx_t* ctx, flvd_site_t site, int64_t* end)
     return *end < 0 ? FLVD_Fail(ctx, site) : 0;
 }
 
-// No tag follows the last keyframe inside the file: the end of the nearest one before it.
+// Fallback when no tag is found at or after the last keyframe position inside the file: finds the end of the nearest
+// tag before that position.
 int32_t FLVD_StepBackToEnd(flvd_ctx_t* ctx, int64_t last, int64_t* end)
 {
     fio_file_t* const file = ctx->cur_reader;
@@ -51,7 +52,7 @@ int32_t FLVD_StepBackToEnd(flvd_ctx_t* ctx, int64_t last, int64_t* end)
     return *end < 0 ? FLVD_Fail(ctx, FLVD_SITE_INDEX_BACK_POSITION) : 0;
 }
 
-// The end of the valid data of a file with a keyframe index.
+// Finds the end of the valid data of a file with a keyframe index.
 int32_t FLVD_IndexedEnd(flvd_ctx_t* ctx, int64_t* end)
 {
     fio_file_t* const file = ctx->cur_reader;
@@ -69,7 +70,8 @@ int32_t FLVD_IndexedEnd(flvd_ctx_t* ctx, int64_t* end)
     return found ? FLVD_WalkToEnd(ctx, tag, end) : FLVD_StepBackToEnd(ctx, last, end);
 }
 
-// Backward walk: the largest timestamp of the last tags, until each stream was met.
+// Walks back over at most FLVD_WALK_TAGS tags, until every stream has been met, and stores the largest timestamp: the
+// last tag of one stream may be earlier than that of the other.
 int32_t FLVD_WalkBack(flvd_ctx_t* ctx, int64_t end, flvd_site_t seek_site, flvd_site_t step_site)
 {
     fio_file_t* const file = ctx->main_reader;
@@ -102,7 +104,7 @@ int32_t FLVD_ProbeExtentQuick(flvd_ctx_t* ctx)
     return FLVD_WalkBack(ctx, end, FLVD_SITE_QUICK_WALK_SEEK, FLVD_SITE_QUICK_WALK_STEP);
 }
 
-// The end of the valid data and the seek method, the index being trimmed to it.
+// Finds the end of the valid data, sets the seek method and trims the index to that end.
 int32_t FLVD_FindEnd(flvd_ctx_t* ctx, int64_t* end)
 {
     if (!FLVD_IsIndexUsable(ctx)) {

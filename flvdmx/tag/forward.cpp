@@ -1,4 +1,4 @@
-// Forward navigation: resynchronising after damage, the search for a tag, stepping to the next tag.
+// Forward navigation: resynchronising after damage, searching for a tag, stepping to the next tag.
 
 #include "flvdmx/tag/search.h"
 
@@ -6,29 +6,29 @@
 
 namespace {
 
-// Bytes read at first by a resynchronisation that finds nothing cached, whatever the cache holds.
+// Bytes that a resynchronisation with an empty cache reads first, however large the cache is.
 constexpr uint32_t FLVD_FIRST_LOOK = 4096;
 
-// The trusting search takes a position only once in so many tags passed: it has no budget for them, and a host whose
-// seek does not move could keep it busy for ever.
+// The trusting search checks once per this many skipped tags that the position advances. It has no budget for such
+// tags, so without the check a host whose seeks do not move could keep it running forever.
 constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x1000;
 
-// Results inside a search, beside those of the navigation functions.
-constexpr int32_t FLVD_SEARCH_ON = 1;    // go on after this tag
+// Internal results of a search, in addition to those of the navigation functions.
+constexpr int32_t FLVD_SEARCH_ON = 1;    // continue after this tag
 constexpr int32_t FLVD_BUDGET_SPENT = 2; // no tag within the budget
-constexpr int32_t FLVD_UNCHECKED = 3;    // as 0, but the back-pointer was not compared
+constexpr int32_t FLVD_UNCHECKED = 3;    // success, but the back-pointer was not checked
 
-// One search for a tag, from one position query to its result.
+// One search for a tag.
 struct flvd_search_t {
     flvd_ctx_t* ctx;
     fio_file_t* file;
     flvd_tag_rules_t rules;
     uint32_t wanted;
     int32_t budget;                   // bytes that resynchronisation may still cross
-    int64_t position;                 // the last position taken
-    bool data_ended;                  // the last resynchronisation ran out of data, not out of budget
+    int64_t position;                 // result of the last tell
+    bool data_ended;                  // the last resynchronisation ended at the end of the data, not of its budget
     uint32_t* checks_left;            // back-pointer checks that may still fail
-    const flvd_frame_search_t* frame; // the request it is for: some of its tags are delivered before they are checked
+    const flvd_frame_search_t* frame; // set for a frame request, which may take tags unchecked
 };
 
 flvd_search_t FLVD_MakeSearch(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted, int64_t position,
@@ -37,9 +37,9 @@ flvd_search_t FLVD_MakeSearch(flvd_ctx_t* ctx, fio_file_t* file, uint32_t wanted
     return {ctx, file, FLVD_TagRules(ctx), wanted, FLVD_RESYNC_WINDOW, position, false, checks_left, nullptr};
 }
 
-// Resynchronising.
+// Resynchronisation.
 
-// Index of the first candidate among the starts of a window, or `starts` when there is none.
+// Index of the first plausible header that begins in the first `starts` bytes of a window; `starts` when there is none.
 uint32_t FLVD_FindCandidate(const uint8_t* window, uint32_t starts, const flvd_tag_rules_t& rules)
 {
     for (uint32_t i = 0; i < starts; ++i) {
@@ -52,20 +52,21 @@ uint32_t FLVD_FindCandidate(const uint8_t* window, uint32_t starts, const flvd_t
     return starts;
 }
 
-// FLVD_FindNextTag, telling a spent limit (FLVD_ERR_NOT_FOUND) from the end of the data (FLVD_ERR_END_OF_DATA).
+// FLVD_FindNextTag with separate results for reaching the limit (FLVD_ERR_NOT_FOUND) and the end of the data
+// (FLVD_ERR_END_OF_DATA).
 int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
 {
     if (limit == 0)
         return FLVD_ERR_NOT_FOUND;
     if (ctx->cache_size < FLVD_TAG_PEEK_SIZE)
         return FLVD_ERR_END_OF_DATA;
-    constexpr uint32_t overlap = FLVD_TAG_PEEK_SIZE - 1; // the last bytes of a window begin the next one
+    constexpr uint32_t overlap = FLVD_TAG_PEEK_SIZE - 1; // the next window repeats the last bytes of this one
     flvd_tag_rules_t rules = FLVD_TagRules(ctx);
-    --rules.max_timestamp; // here alone the ceiling itself is out of reach; it is never 0
+    --rules.max_timestamp; // a timestamp equal to the ceiling is rejected here; the ceiling is never 0
     const uint32_t step = ctx->cache_size - overlap;
     const int64_t stop = int64_t{(limit - 1) / step} * step + step; // the limit, in whole windows
-    // What is cached comes first: after a false header that is nearly a window, and filling it up would cost a host
-    // call for each of many. With nothing cached the first look is a short one: the next false header is often near.
+    // Search what is cached first: after a false header almost a whole window is, and topping it up would cost one host
+    // call per false header. With an empty cache, read only a little: the next false header is often near.
     const uint32_t first = file->count >= FLVD_TAG_PEEK_SIZE ? file->count : FLVD_FIRST_LOOK;
     uint32_t size = std::min(first, ctx->cache_size);
     int64_t scanned = 0;
@@ -73,7 +74,7 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
         const FLVD_ReadSizeGuard window_size(file, std::min(size, file->capacity), file->read_size);
         const uint8_t* window = nullptr;
         const uint32_t available = FLVD_FioPeek(&window, size, file);
-        if (available < FLVD_TAG_PEEK_SIZE) // the last window was not a whole one
+        if (available < FLVD_TAG_PEEK_SIZE) // the previous window was the last, incomplete one
             return scanned < limit ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
         const auto starts = static_cast<uint32_t>(std::min<int64_t>(available - overlap, stop - scanned));
         const uint32_t found = FLVD_FindCandidate(window, starts, rules);
@@ -86,7 +87,7 @@ int64_t FLVD_ScanForTag(flvd_ctx_t* ctx, fio_file_t* file, uint32_t limit)
     return FLVD_ERR_NOT_FOUND;
 }
 
-// Scans for the next candidate and charges the search its distance, which is below 2 windows. Returns the result.
+// Scans for the next candidate and charges the distance to the search's budget. Returns the result of the scan.
 int64_t FLVD_Scan(flvd_search_t* search)
 {
     const int64_t distance = FLVD_ScanForTag(search->ctx, search->file, FLVD_RESYNC_WINDOW);
@@ -95,7 +96,7 @@ int64_t FLVD_Scan(flvd_search_t* search)
     return distance;
 }
 
-// Resynchronisation step: from the byte after the position to the next candidate. A failed one ends the search.
+// Moves to the next candidate after the byte at the position. A failure uses up the budget, which ends the search.
 void FLVD_Resynchronise(flvd_search_t* search)
 {
     FLVD_FioSkip(1, search->file);
@@ -108,8 +109,8 @@ void FLVD_Resynchronise(flvd_search_t* search)
 
 // Both searches.
 
-// Takes the position. False when the host cannot tell it, or tells one before the last: a search only moves forward,
-// and a host with wrong positions could keep it running forever.
+// Updates the position. False when the tell fails or returns a position before the last one: a search only moves
+// forward, and a host with wrong positions could keep it running forever.
 bool FLVD_TakePosition(flvd_search_t* search)
 {
     const int64_t position = FLVD_FioTell(search->file);
@@ -118,14 +119,14 @@ bool FLVD_TakePosition(flvd_search_t* search)
     return taken;
 }
 
-// The same after a tag: it must have moved.
+// Updates the position after a tag. False also when the position has not advanced.
 bool FLVD_TakeLaterPosition(flvd_search_t* search)
 {
     const int64_t before = search->position;
     return FLVD_TakePosition(search) && search->position > before;
 }
 
-// Peeks the next header. 0, or why the search ends.
+// Peeks at the next header. Returns 0, or the result that ends the search.
 int32_t FLVD_PeekNext(const flvd_search_t* search, flvd_tag_header_t* header)
 {
     if (FLVD_FioAtEnd(search->file))
@@ -135,7 +136,7 @@ int32_t FLVD_PeekNext(const flvd_search_t* search, flvd_tag_header_t* header)
     return FLVD_PeekTagHeader(search->file, header) ? 0 : FLVD_ERR_END_OF_DATA;
 }
 
-// What FLVD_GetCurrTagInfo returns for the result of a search.
+// Converts the result of a search to that of FLVD_GetCurrTagInfo.
 int32_t FLVD_TranslateSpent(const flvd_search_t* search, int32_t result)
 {
     if (result != FLVD_BUDGET_SPENT)
@@ -143,9 +144,9 @@ int32_t FLVD_TranslateSpent(const flvd_search_t* search, int32_t result)
     return search->data_ended ? FLVD_ERR_END_OF_DATA : FLVD_ERR_NOT_FOUND;
 }
 
-// The trusting search: the header alone decides.
+// The trusting search: only headers are checked.
 
-// Moves past an unwanted tag by its size. `passed` counts them. 0, or why the search ends.
+// Skips an unwanted tag by its size. `passed` counts such tags. Returns 0, or the result that ends the search.
 int32_t FLVD_PassBySize(flvd_search_t* search, const flvd_tag_header_t& header, uint32_t* passed)
 {
     const uint32_t size = header.info.data_size + FLVD_TAG_OVERHEAD;
@@ -157,7 +158,7 @@ int32_t FLVD_PassBySize(flvd_search_t* search, const flvd_tag_header_t& header, 
     return goes_on ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
-// 0 with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
+// Returns 0 with the header, where the reader then stands; a navigation result; or FLVD_BUDGET_SPENT.
 int32_t FLVD_SearchTrusting(flvd_search_t* search, flvd_tag_header_t* header)
 {
     for (uint32_t passed = 0;;) {
@@ -175,19 +176,19 @@ int32_t FLVD_SearchTrusting(flvd_search_t* search, flvd_tag_header_t* header)
     }
 }
 
-// The careful search: back-pointers count, and the position of every tag is taken.
+// The careful search: back-pointers must agree, and the position of every tag is recorded.
 
-// Outcome of a back-pointer check. In place, the reader still stands on the tag; else it stands after the tag's data.
+// Outcome of a back-pointer check. `in_place`: the reader still stands at the tag; otherwise after the tag's data.
 struct flvd_check_t {
     bool passed;
     bool in_place;
 };
 
-// Back-pointer check of the tag at the position. One that fits the cache is looked at in place.
+// Checks the back-pointer of the tag at the position, in place if the tag fits the cache.
 flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_info_t& tag)
 {
     fio_file_t* const file = search->file;
-    // Many muxers write a wrong size after the first script tag, which they fill in at the end.
+    // Many muxers write a wrong size after the first script tag, because they fill that tag in at the end.
     const bool exempt = tag.type == FLVD_TAG_TYPE_SCRIPT && search->position <= search->rules.first_tag;
     const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size <= file->capacity && file->read_size == file->capacity) {
@@ -195,15 +196,16 @@ flvd_check_t FLVD_CheckBackPointer(const flvd_search_t* search, const flvd_tag_i
         const uint32_t first = FLVD_FioPeek(&bytes, size, file);
         if (first == size)
             return {FLVD_IsBackPointer(bytes + size - FLVD_BACK_POINTER_SIZE, tag.data_size) || exempt, true};
-        // Where the data ends no more comes. Going past it would cost a whole cache for each false header there.
+        // If a second peek returns no more, the data ends here. Seeking past it instead would cost a whole cache for
+        // each false header near the end.
         if (FLVD_FioPeek(&bytes, size, file) == first)
             return {exempt, true};
     }
     return {FLVD_CheckPastData(file, tag.data_size) || exempt, false};
 }
 
-// After a tag whose back-pointer disagrees: the search goes on one byte after the tag's start. False when the reader
-// cannot be put there: no tag may be described where the reader does not stand.
+// Leaves a tag whose back-pointer disagrees: the search continues one byte after the tag's start. False when the reader
+// cannot be moved there, since a search must not report a tag at which the reader does not stand.
 bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
 {
     const int64_t next = search->position + 1;
@@ -217,7 +219,7 @@ bool FLVD_PassBadTag(flvd_search_t* search, bool in_place)
     return true;
 }
 
-// After a valid tag: the next one, with the whole budget.
+// Leaves a valid tag. The search continues after it with a full budget.
 bool FLVD_PassGoodTag(flvd_search_t* search, bool in_place, const flvd_tag_info_t& tag)
 {
     FLVD_FioSkip(in_place ? tag.data_size + FLVD_TAG_OVERHEAD : FLVD_BACK_POINTER_SIZE, search->file);
@@ -225,14 +227,14 @@ bool FLVD_PassGoodTag(flvd_search_t* search, bool in_place, const flvd_tag_info_
     return FLVD_TakeLaterPosition(search);
 }
 
-// Steps over the checked tag, whatever its kind. False: -1.
+// Steps over a checked tag, valid or not. False ends the search with FLVD_ERR_NOT_FOUND.
 bool FLVD_StepOver(flvd_search_t* search, flvd_check_t check, const flvd_tag_info_t& tag)
 {
     return check.passed ? FLVD_PassGoodTag(search, check.in_place, tag) : FLVD_PassBadTag(search, check.in_place);
 }
 
-// A plausible header at the position is taken when its kind is wanted and its back-pointer agrees, or is compared
-// later. 0, FLVD_UNCHECKED, FLVD_SEARCH_ON or FLVD_ERR_NOT_FOUND.
+// Takes the plausible header at the position if its kind is wanted and its back-pointer agrees or may be checked later.
+// Otherwise steps over it. Returns 0, FLVD_UNCHECKED, FLVD_SEARCH_ON or FLVD_ERR_NOT_FOUND.
 int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& header)
 {
     if (!FLVD_TakePosition(search))
@@ -247,7 +249,7 @@ int32_t FLVD_TakePlausible(flvd_search_t* search, const flvd_tag_header_t& heade
     return on_tag ? 0 : FLVD_ERR_NOT_FOUND;
 }
 
-// 0 or FLVD_UNCHECKED with the header and the reader on it, a navigation result, or FLVD_BUDGET_SPENT.
+// Returns 0 or FLVD_UNCHECKED with the header, where the reader then stands; a navigation result; or FLVD_BUDGET_SPENT.
 int32_t FLVD_SearchCareful(flvd_search_t* search, flvd_tag_header_t* header)
 {
     for (;;) {
@@ -266,7 +268,7 @@ int32_t FLVD_SearchCareful(flvd_search_t* search, flvd_tag_header_t* header)
     }
 }
 
-// The same with the results of FLVD_FindFrameTag.
+// FLVD_SearchCareful with the results of FLVD_FindFrameTag.
 int32_t FLVD_TakeFrameTag(flvd_search_t* search, flvd_found_tag_t* tag)
 {
     flvd_tag_header_t header;
@@ -302,10 +304,10 @@ uint32_t FLVD_ForwardKind(const flvd_tag_header_t& header, uint32_t wanted)
     return FLVD_TAG_SCRIPT;
 }
 
-// Moves from the tag at the position to where the next search begins. 0, or the result to return.
+// Moves from the tag at the position to where the search for the next one starts. Returns 0, or the result of the step.
 int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 {
-    if (search->position == search->ctx->data_offset) { // the first tag itself comes next
+    if (search->position == search->ctx->data_offset) { // the next tag is the first one
         FLVD_SkipFirstBackPointer(search->ctx, search->file, search->position);
         return FLVD_TakePosition(search) ? 0 : FLVD_ERR_NOT_FOUND;
     }
@@ -324,7 +326,7 @@ int32_t FLVD_LeaveCurrentTag(flvd_search_t* search)
 
 } // namespace
 
-// Neither is inlined: most frames are found without them, and with few registers to save.
+// Neither is inlined: FLVD_FindFrameTag finds most frames without them and stays small, with few registers to save.
 [[gnu::noinline]] int32_t FLVD_SearchFrameTag(flvd_frame_search_t* search, int64_t position, flvd_found_tag_t* tag)
 {
     flvd_search_t careful = FLVD_MakeSearch(search->ctx, search->file, search->wanted, position, &search->checks_left);

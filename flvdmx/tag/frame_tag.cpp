@@ -1,11 +1,11 @@
-// Finding the tag of the next frame: what playing does for every frame.
+// Finds the tag of the next frame. This runs for every frame delivered.
 
 #include "flvdmx/tag/search.h"
 
 namespace {
 
-// True when the tag at the position is cached far enough to be judged, plausible and wanted. Not for script data, whose
-// back-pointer need not agree.
+// True when enough of the tag at the position is cached to judge its header, and the tag is plausible and wanted. Never
+// true for script data: the back-pointer of the first script tag need not agree, which only the full search handles.
 bool FLVD_IsNextWanted(const flvd_frame_search_t& search, flvd_tag_header_t* header)
 {
     const fio_file_t* const file = search.file;
@@ -16,7 +16,7 @@ bool FLVD_IsNextWanted(const flvd_frame_search_t& search, flvd_tag_header_t* hea
            FLVD_IsWantedTag(*header, search.wanted);
 }
 
-// True when the tag at the position is cached whole and its back-pointer agrees.
+// True when the whole tag at the position is cached and its back-pointer agrees.
 bool FLVD_IsCachedAndValid(const fio_file_t* file, uint32_t data_size)
 {
     const uint32_t size = data_size + FLVD_TAG_OVERHEAD;

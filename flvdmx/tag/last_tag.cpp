@@ -1,5 +1,5 @@
-// The search for the end of the last tag: backward from the end of the file, then, when other bytes follow the last
-// tag, by halving the file.
+// Finds the end of the last tag: searches backward from the end of the file and, if other bytes follow the last tag,
+// bisects the file.
 
 #include "flvdmx/tag/tag.h"
 
@@ -10,14 +10,14 @@ constexpr uint32_t FLVD_TAIL_CURSORS = 256;
 constexpr uint32_t FLVD_SCAN_CURSORS = FLVD_RESYNC_WINDOW;
 constexpr int64_t FLVD_BISECTION_END = FLVD_RESYNC_WINDOW;
 
-// Results beside a position and FLVD_NO_LAST_TAG.
+// Results in addition to a position and FLVD_NO_LAST_TAG.
 constexpr int64_t FLVD_NO_POSITION = -1;
-constexpr int64_t FLVD_NO_SEEK = -2; // inside the search: ends it without a tag
+constexpr int64_t FLVD_NO_SEEK = -2; // internal: a seek failed, which ends the search without a tag
 
 enum class FlvdProbe { Found, Nothing, SeekFailed };
 
-// Back-pointer probe: do the four bytes at the cursor, where the reader stands, lead back to a header of that size?
-// The tag's type is not checked.
+// Checks whether the four bytes at the cursor, where the reader stands, are a back-pointer that leads to a header with
+// a matching size. The tag's type is not checked.
 FlvdProbe FLVD_ProbeBackPointer(fio_file_t* file, uint32_t max_timestamp, int64_t cursor)
 {
     const uint8_t* bytes = nullptr;
@@ -35,7 +35,7 @@ FlvdProbe FLVD_ProbeBackPointer(fio_file_t* file, uint32_t max_timestamp, int64_
     return agrees && FLVD_TagTimestamp(bytes) <= max_timestamp ? FlvdProbe::Found : FlvdProbe::Nothing;
 }
 
-// Tries so many cursors, from `cursor` downwards. The end of the tag found, FLVD_NO_LAST_TAG or FLVD_NO_SEEK.
+// Probes `cursors` places, from `cursor` downwards. Returns the end of the tag found, FLVD_NO_LAST_TAG or FLVD_NO_SEEK.
 int64_t FLVD_ProbeCursors(const flvd_ctx_t* ctx, int64_t cursor, uint32_t cursors)
 {
     fio_file_t* const file = ctx->cur_reader;
@@ -50,7 +50,7 @@ int64_t FLVD_ProbeCursors(const flvd_ctx_t* ctx, int64_t cursor, uint32_t cursor
     return FLVD_NO_LAST_TAG;
 }
 
-// Moves by a seek and tries so many cursors from there downwards. Results as above, or FLVD_NO_POSITION.
+// Seeks, then probes `cursors` places from there downwards. Results as above, or FLVD_NO_POSITION.
 int64_t FLVD_ProbeFrom(const flvd_ctx_t* ctx, int64_t offset, int32_t whence, uint32_t cursors)
 {
     if (__FLV_DMX__fioSeek64(ctx->cur_reader, offset, whence) != 0)
@@ -59,7 +59,7 @@ int64_t FLVD_ProbeFrom(const flvd_ctx_t* ctx, int64_t offset, int32_t whence, ui
     return cursor < 0 ? FLVD_NO_POSITION : FLVD_ProbeCursors(ctx, cursor, cursors);
 }
 
-// Halves the file until the end of its valid data lies within the last MiB before the result, or FLVD_NO_SEEK.
+// Bisects the file until the end of its valid data lies in the last MiB before the result. FLVD_NO_SEEK on failure.
 int64_t FLVD_Bisect(flvd_ctx_t* ctx)
 {
     fio_file_t* const file = ctx->cur_reader;

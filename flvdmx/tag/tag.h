@@ -1,10 +1,10 @@
-// Tag navigation: the rules that all its functions share, and what the layers above call beside the exported functions.
+// Tag navigation: the rules that all its functions share, and the internal functions that the layers above call.
 //
-// The chain of tags is never trusted. A header counts when it is plausible for this file, and in the careful paths only
-// when the back-pointer after its data agrees with its size.
+// The chain of tags is never trusted. A header must be plausible for this file, and in a careful search the
+// back-pointer after its data must agree with its size.
 //
 // Files: frame_tag.cpp finds the tag of the next frame, forward.cpp searches and steps forward, backward.cpp steps
-// back, last_tag.cpp finds the end of the last tag, extent.cpp measures a file that is opened.
+// back, last_tag.cpp finds the end of the last tag, extent.cpp finds the end of the valid data during an open.
 #ifndef FLVDMX_TAG_TAG_H
 #define FLVDMX_TAG_TAG_H
 
@@ -12,26 +12,26 @@
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/flvdmx.h"
 
-constexpr uint32_t FLVD_ANY_CODEC = 0xFFFF; // filter value: no tag of that kind has been probed
+constexpr uint32_t FLVD_ANY_CODEC = 0xFFFF; // filter value before a tag of that kind was probed
 
-// Resynchronisation covers so many bytes before it gives up.
+// Resynchronisation gives up after this many bytes.
 constexpr int32_t FLVD_RESYNC_WINDOW = 0x100000;
 
-// So many back-pointer checks may fail in one search, and in all searches of one frame request together. A MiB of
-// random bytes has some 12,300 plausible headers; a file made of them would cost four host calls for each of its bytes.
+// Back-pointer checks that may fail in one search, or in all searches of one frame request together. 1 MiB of random
+// bytes has some 12,300 plausible headers; without this bound, a file full of them would cost four host calls per byte.
 constexpr uint32_t FLVD_FAILED_CHECKS_MAX = 16384;
 
 constexpr uint32_t FLVD_TAG_MEDIA = FLVD_TAG_VIDEO | FLVD_TAG_AUDIO;
 constexpr uint32_t FLVD_TAG_ANY = FLVD_TAG_MEDIA | FLVD_TAG_SCRIPT;
 
-// Read size of the byte-by-byte paths: each look after a seek reads this much and not a whole cache.
+// Read size of the searches that move byte by byte: they need only this much after each seek, not a whole cache.
 constexpr uint32_t FLVD_NARROW_READ = 16;
 
-// What this file's headers must agree with, taken from the instance once per call.
+// What a plausible header of this file must agree with. Copied from the instance once per call.
 struct flvd_tag_rules_t {
-    int64_t data_end;       // DataSize must be below it
+    int64_t data_end;       // DataSize must be below this
     int64_t first_tag;      // start of the first tag
-    uint32_t max_timestamp; // a timestamp may not be above it
+    uint32_t max_timestamp; // the timestamp must not be above this
     uint32_t video_filter;
     uint32_t audio_filter;
 };
@@ -47,7 +47,7 @@ inline flvd_tag_rules_t FLVD_TagRules(const flvd_ctx_t* ctx)
     };
 }
 
-// Header test without the size: type, timestamp ceiling and stream filters.
+// Checks a header except for its size: type, timestamp ceiling, stream filters.
 inline bool FLVD_IsStreamTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header)
 {
     if (header.info.timestamp > rules.max_timestamp)
@@ -63,13 +63,13 @@ inline bool FLVD_IsStreamTag(const flvd_tag_rules_t& rules, const flvd_tag_heade
     return header.info.type == FLVD_TAG_TYPE_SCRIPT;
 }
 
-// Header test: plausible for this file.
+// Checks whether a header is plausible for this file.
 inline bool FLVD_IsPlausibleTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& header)
 {
     return int64_t{header.info.data_size} < rules.data_end && FLVD_IsStreamTag(rules, header);
 }
 
-// Wanted-kind filter.
+// Checks whether a tag is of a wanted kind (FLVD_TAG_* bits).
 inline bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted)
 {
     if (header.IsVideo()) {
@@ -87,7 +87,7 @@ inline bool FLVD_IsWantedTag(const flvd_tag_header_t& header, uint32_t wanted)
     return (wanted & FLVD_TAG_SCRIPT) != 0;
 }
 
-// Peeks a header at the position. False when fewer bytes than it needs are left.
+// Peeks at the header at the position. False when fewer than FLVD_TAG_PEEK_SIZE bytes are left.
 inline bool FLVD_PeekTagHeader(fio_file_t* file, flvd_tag_header_t* header)
 {
     const uint8_t* bytes = nullptr;
@@ -97,9 +97,9 @@ inline bool FLVD_PeekTagHeader(fio_file_t* file, flvd_tag_header_t* header)
     return true;
 }
 
-// Skips the four bytes after a tag's data when they are its back-pointer; anything else stays, for the next search to
-// cross. A back-pointer left there could be taken for a tag: its low byte may be 8, 9 or 18.
-// False when fewer than 4 bytes are there.
+// Skips the four bytes after a tag's data if they are its back-pointer, and leaves anything else to the next search.
+// A back-pointer must not stay: later searches could mistake it for a tag, since its low byte may be 8, 9 or 18.
+// False when fewer than 4 bytes are left.
 inline bool FLVD_SkipBackPointer(fio_file_t* file, uint32_t data_size)
 {
     const uint8_t* bytes = nullptr;
@@ -110,25 +110,25 @@ inline bool FLVD_SkipBackPointer(fio_file_t* file, uint32_t data_size)
     return true;
 }
 
-// Puts a reader before the first tag, on PreviousTagSize0. Returns the host's seek result.
+// Moves a reader before the first tag, to PreviousTagSize0. Returns the result of the host's seek.
 inline int32_t FLVD_SeekToFirstTag(const flvd_ctx_t* ctx, fio_file_t* file)
 {
     return __FLV_DMX__fioSeek64(file, ctx->data_offset, FIO_SEEK_SET);
 }
 
-// Skips PreviousTagSize0 when the reader stands on it.
+// Skips PreviousTagSize0 if that is where the reader stands.
 inline void FLVD_SkipFirstBackPointer(const flvd_ctx_t* ctx, fio_file_t* file, int64_t position)
 {
     if (position == ctx->data_offset)
         FLVD_FioSkip(FLVD_BACK_POINTER_SIZE, file);
 }
 
-// Moves from a tag's start past its data and compares the back-pointer there. The caller mostly goes back to the tag,
-// which empties the cache, so no more is read here than needed; a reader with a narrow read size keeps it: it steps
-// from tag to tag, and on from here.
+// Moves from a tag's start past its data and checks the back-pointer there. Callers usually seek back to the tag, which
+// empties the cache, so this reads no more than the back-pointer. A reader with a narrow read size keeps that size: it
+// steps from tag to tag and continues from here.
 bool FLVD_CheckPastData(fio_file_t* file, uint32_t data_size);
 
-// What a frame request is looking for.
+// What a frame request searches for.
 struct flvd_frame_search_t {
     flvd_ctx_t* ctx;
     fio_file_t* file;
@@ -136,15 +136,17 @@ struct flvd_frame_search_t {
     uint32_t checks_left; // back-pointer checks that may still fail
 };
 
-// A tag found for it. The reader stands on its header.
+// The tag found for it. The reader stands at its header.
 struct flvd_found_tag_t {
     uint32_t type;
     uint32_t data_size;
     uint32_t timestamp;
-    uint32_t codec_header; // bytes before the frame; 0: a configuration, no frame
-    bool checked;   // false: its back-pointer is still to be compared. When it disagrees, the search goes on from
-    int64_t start;  // this position of its header,
-    int32_t budget; // with so many bytes that resynchronisation may still cross
+    uint32_t codec_header; // bytes before the frame; 0: the tag carries no frame
+    // When it is not checked, the caller must check the back-pointer. If that disagrees, the search continues from
+    // `start`, the position of the header, with `budget` bytes that resynchronisation may still cross.
+    bool checked;
+    int64_t start;
+    int32_t budget;
 };
 
 inline flvd_found_tag_t FLVD_CheckedTag(const flvd_tag_header_t& header)
@@ -152,23 +154,23 @@ inline flvd_found_tag_t FLVD_CheckedTag(const flvd_tag_header_t& header)
     return {header.info.type, header.info.data_size, header.info.timestamp, header.CodecHeaderSize(), true, 0, 0};
 }
 
-// FLVD_GetCurrTagInfo in careful mode for a frame request, with a short way for a tag that ends the search at once, as
-// most do. Results as there. A tag larger than the cache may be found unchecked: going past its data and back would
-// cost two seeks and an empty cache per frame.
+// FLVD_GetCurrTagInfo in careful mode for a frame request, with a fast path for the usual case that the very next tag
+// is the one wanted. Same results. A tag larger than the cache may be found unchecked, because moving past its data and
+// back would cost two seeks and the cached bytes.
 int32_t FLVD_FindFrameTag(flvd_frame_search_t* search, flvd_found_tag_t* tag);
 
-// The same after a tag that was found unchecked and whose back-pointer disagrees.
+// Continues the search after a tag that was found unchecked and whose back-pointer turned out to disagree.
 int32_t FLVD_FindFrameTagAfterBad(flvd_frame_search_t* search, flvd_found_tag_t* tag);
 
 constexpr int64_t FLVD_NO_LAST_TAG = 0;
 
-// End of the last tag whose back-pointer and header agree (its PreviousTagSize included); FLVD_NO_LAST_TAG when there
-// is none or a seek failed, -1 when a position query failed. `quick` looks at the last few bytes only. The position is
-// left anywhere.
+// Returns the end of the last tag whose back-pointer and header agree (its PreviousTagSize included), FLVD_NO_LAST_TAG
+// when there is none or a seek failed, or -1 when a tell failed. `quick` examines only the last few bytes. The reader
+// may stand anywhere afterwards.
 int64_t FLVD_FindLastTagEnd(flvd_ctx_t* ctx, bool quick);
 
-// Finds the end of the valid data, the last timestamp and the seek method, and trims the keyframe index.
-// 0, or -1 with error and error_line set (unless an index read from the file ends early: no line then).
+// Finds the end of the valid data, the last timestamp and the seek method, and trims the keyframe index. Returns 0, or
+// -1 with error and error_line set, except when an index in the file ends early: that records nothing.
 int32_t FLVD_ProbeExtent(flvd_ctx_t* ctx, bool quick);
 
 #endif
