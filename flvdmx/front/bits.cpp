@@ -1,7 +1,7 @@
-// The file-backed bit reader. `bits` holds the next bits left-aligned and ends on a byte boundary; the file's byte
-// position is the first boundary at or after the bit position, so bits_left / 8 whole bytes of `bits` follow it.
+// The file-backed bit reader. `bits` holds the next bits left-aligned and ends at a byte boundary. The file's byte
+// position is the first byte boundary at or after the bit position, so bits_left / 8 whole bytes of `bits` follow it.
 //
-// A reader that another access has emptied (bits_left 0) continues to consume the file's bytes and stays empty.
+// A bit reader invalidated by another access (bits_left is 0) still consumes bytes of the file, and stays empty.
 
 #include "flvdmx/common/bytes.h"
 #include "flvdmx/fio/fio.h"
@@ -11,17 +11,17 @@
 namespace {
 
 constexpr uint32_t FLVD_BIT_CACHE = 64;
-constexpr uint32_t FLVD_BIT_REFILL = 32; // refilled when no more than these are left, and by as many
+constexpr uint32_t FLVD_BIT_REFILL = 32; // refilled by this many bits when no more than this many are left
 constexpr uint32_t FLVD_BIT_MAX = 32;    // the longest field
 
 void FLVD_BitConsumeBytes(fio_file_t* file, uint32_t n)
 {
     file->bit_skip_pending = 1;
     __FLV_DMX__fioSkipBytes(n, file);
-    file->bit_skip_pending = 0; // a skip that was refused leaves it set
+    file->bit_skip_pending = 0; // a skip that fails (while writing) leaves it set
 }
 
-// The four bytes from an index on; zeros stand for those that are not there.
+// The four bytes from an index on, with zeros in place of missing bytes.
 uint32_t FLVD_BitWord(const uint8_t* bytes, uint32_t from, uint32_t available)
 {
     if (available >= from + 4)
@@ -35,7 +35,7 @@ uint32_t FLVD_BitWord(const uint8_t* bytes, uint32_t from, uint32_t available)
 void FLVD_BitRefill(fio_file_t* file)
 {
     const auto left = static_cast<uint32_t>(file->bits_left);
-    const uint32_t held = left / 8; // whole bytes after the position that are in `bits` already
+    const uint32_t held = left / 8; // whole bytes after the position that `bits` already holds
     const uint8_t* bytes = nullptr;
     const uint32_t available = FLVD_FioPeek(&bytes, held + FLVD_BIT_REFILL / 8, file);
     const uint64_t word = FLVD_BitWord(bytes, held, available);
@@ -47,7 +47,7 @@ void FLVD_BitRefill(fio_file_t* file)
 void FLVD_BitConsume(fio_file_t* file, uint32_t n)
 {
     const bool empty = file->bits_left == 0;
-    const auto partial = static_cast<uint32_t>(file->bits_left) % 8; // bits of a byte already consumed
+    const auto partial = static_cast<uint32_t>(file->bits_left) % 8; // bits left of a byte that counts as consumed
     if (!empty) {
         file->bits <<= n;
         file->bits_left -= static_cast<int32_t>(n);
@@ -96,7 +96,7 @@ void __FLV_DMX__bitSkipBitsLong(fio_file_t* file, uint32_t n)
         FLVD_BitConsume(file, n);
         return;
     }
-    const uint32_t ahead = n - static_cast<uint32_t>(file->bits_left) % 8; // counted from the byte position
+    const uint32_t ahead = n - static_cast<uint32_t>(file->bits_left) % 8; // bits from the byte position on
     FLVD_BitConsumeBytes(file, ahead / 8);
     __FLV_DMX__bitInit(file);
     const uint32_t rest = ahead % 8;

@@ -1,4 +1,4 @@
-// The entry point: dispatch, and the translation of error codes into the few results that a host sees.
+// The entry point: dispatches operations and translates error codes into the four failure results that a host sees.
 
 #include "flvdmx/front/front.h"
 
@@ -7,11 +7,11 @@
 
 namespace {
 
-// Two ranges of error codes that the results tell apart.
+// The last codes of two ranges that translate to different results.
 constexpr int32_t FLVD_ERR_RESOURCE_LAST = -2002; // resources, file header and probing
-constexpr int32_t FLVD_ERR_PLACE_LAST = -2005;    // places that the data does not have
+constexpr int32_t FLVD_ERR_PLACE_LAST = -2005;    // places that do not exist in the file
 
-// What a host sees of a failure; `result` is the operation's own.
+// Translates a failure for the host; `result` is what the operation itself returned.
 int32_t FLVD_TranslateError(int32_t result, int32_t error)
 {
     if (error >= FLVD_ERR_RESOURCE_LAST && error <= -1)
@@ -33,7 +33,7 @@ int32_t FLVD_CallOpen(flvd_ctx_t** handle, const void* init, void* info, bool fo
     return *handle != nullptr ? 0 : FLVD_TranslateError(-1, g_flvd_lLastError);
 }
 
-// Operations that need an instance, without one.
+// Handles operations on a handle without an instance.
 int32_t FLVD_OperateOnNothing(uint32_t operation)
 {
     switch (operation) {
@@ -66,7 +66,7 @@ int32_t FLVD_CallSeek(flvd_ctx_t* ctx, const void* arguments, void* reached)
     return result >= 0 ? result : FLVD_TranslateError(result, ctx->error);
 }
 
-// Operations on an instance.
+// Handles operations on an instance.
 int32_t FLVD_Operate(uint32_t operation, flvd_ctx_t* ctx, const void* arg1, void* arg2)
 {
     if (ctx == nullptr)

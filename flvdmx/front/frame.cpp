@@ -1,7 +1,7 @@
-// Frame delivery: the next wanted tag's payload, without its codec header bytes, in the frame buffer.
+// Frame delivery: copies the payload of the next wanted tag, without its codec header, into the frame buffer.
 //
-// A growing file has a variant of its own: after a tag that is not yet whole in the file the reader goes back to the
-// position saved before it, and the next request tries again. A complete file skips such a tag.
+// Growing files are handled differently: when a tag is still incomplete, the reader moves back to the position saved
+// before that tag, and the next request tries again. In a complete file such a tag is skipped.
 
 #include "flvdmx/front/front.h"
 
@@ -12,14 +12,14 @@
 
 namespace {
 
-constexpr uint32_t FLVD_FRAME_BUFFER_STEP = 16384; // the frame buffer grows to multiples of it
+constexpr uint32_t FLVD_FRAME_BUFFER_STEP = 16384; // the size of a frame buffer that has grown is a multiple of this
 
-// Failures on one tag, by what it carries.
+// Failure sites of one tag, a set for each kind of payload.
 struct flvd_payload_sites_t {
     flvd_site_t headers_cut;
     flvd_site_t no_room;
     flvd_site_t cut;
-    flvd_site_t back_to_cut; // growing file: the way back to the tag failed
+    flvd_site_t back_to_cut; // growing file: moving back to the tag failed
     flvd_site_t back_without_back_pointer;
 };
 
@@ -33,15 +33,16 @@ constexpr flvd_payload_sites_t g_flvd_audioSites = {FLVD_SITE_AUDIO_HEADERS_CUT,
                                                     FLVD_SITE_AUDIO_CUT, FLVD_SITE_BACK_TO_CUT_AUDIO,
                                                     FLVD_SITE_BACK_TO_AUDIO_WITHOUT_BACK_POINTER};
 
-// One request.
+// State of one frame request.
 struct flvd_delivery_t {
     flvd_frame_search_t search;
     int64_t* saved; // growing file: position before the tag being delivered
     bool growing;
-    uint32_t passing_size; // data size of the last tag found, by which a place without tags is passed
+    uint32_t passing_size; // data size of the last tag found; a stretch without tags is skipped in steps of it
 };
 
-// What a tag led to: go on with the next, return 0, return -1 as recorded, or search on: it was no tag.
+// Outcome of handling a tag: continue with the next one, return 0, return -1 with the failure recorded, or continue the
+// search because it was no tag.
 enum class FlvdTurn { Next, Delivered, Failed, NoTag };
 
 const flvd_payload_sites_t& FLVD_PayloadSites(const flvd_found_tag_t& tag)
@@ -57,7 +58,7 @@ FlvdTurn FLVD_FailRequest(const flvd_delivery_t& delivery, flvd_site_t site)
     return FlvdTurn::Failed;
 }
 
-// Moves to the saved position, which is used up when that worked.
+// Moves to the saved position, and clears it on success.
 bool FLVD_GoBack(const flvd_delivery_t& delivery)
 {
     if (__FLV_DMX__fioSeek64(delivery.search.file, *delivery.saved, FIO_SEEK_SET) != 0)
@@ -66,19 +67,19 @@ bool FLVD_GoBack(const flvd_delivery_t& delivery)
     return true;
 }
 
-// Growing file: the next request tries again from the saved position.
+// Growing file: moves back to the saved position, where the next request tries again, and fails this request.
 FlvdTurn FLVD_RollBack(const flvd_delivery_t& delivery, flvd_site_t seek_failed)
 {
     return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? FLVD_SITE_FRAME_END : seek_failed);
 }
 
-// Leaves a tag that is cut short: a complete file goes on after it, a growing file rolls back.
+// Handles a tag that is cut short: a complete file continues after it, a growing file rolls back.
 FlvdTurn FLVD_LeaveCutTag(const flvd_delivery_t& delivery, flvd_site_t seek_failed)
 {
     return delivery.growing ? FLVD_RollBack(delivery, seek_failed) : FlvdTurn::Next;
 }
 
-// Passes the bytes that are left of a tag that is not delivered.
+// Skips the remaining `left` bytes of a tag that is not delivered, and its back-pointer.
 FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t left)
 {
     FLVD_FioSkip(left, delivery.search.file);
@@ -87,7 +88,7 @@ FlvdTurn FLVD_PassTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& t
     return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_without_back_pointer);
 }
 
-// Makes room for n bytes in the frame buffer, whose contents are lost. The caller's buffer cannot grow.
+// Ensures that the frame buffer holds n bytes. Growing loses its contents; the caller's own buffer cannot grow.
 bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
 {
     if (n <= ctx->frame_buffer_size)
@@ -101,7 +102,7 @@ bool FLVD_MakeRoom(flvd_ctx_t* ctx, uint32_t n)
     return ctx->frame_buffer != nullptr;
 }
 
-// Reports a frame of n bytes. The buffer may get them after that.
+// Fills the record of a frame of n bytes. The payload may be copied to the buffer afterwards.
 void FLVD_Report(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t n, flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.search.ctx;
@@ -115,8 +116,8 @@ void FLVD_Report(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, u
         *delivery.saved = 0;
 }
 
-// Delivers a frame that lies in the cache with its headers and back-pointer and fits the buffer, as most do. False when
-// this is none: nothing is done then.
+// Fast path for most frames: delivers a frame that fits the buffer from a tag that is cached whole. Otherwise returns
+// false and changes nothing.
 bool FLVD_DeliverCached(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, flvd_frame_t* frame)
 {
     flvd_ctx_t* const ctx = delivery.search.ctx;
@@ -130,24 +131,24 @@ bool FLVD_DeliverCached(const flvd_delivery_t& delivery, const flvd_found_tag_t&
     const uint8_t* const payload = FLVD_FioCached(reader) + FLVD_TAG_HEADER_SIZE + tag.codec_header;
     ctx->last_frame_size = n;
     FLVD_FioDropBits(reader);
-    FLVD_FioConsume(reader, size); // first: nothing need be kept for after the copy; the bytes stay in the cache
+    FLVD_FioConsume(reader, size); // before the copy: nothing stays live across it, and the bytes stay cached
     FLVD_Report(delivery, tag, n, frame);
     g_flvd_fioFuncs.mem_copy(ctx->frame_buffer, payload, n);
     return true;
 }
 
-// The check of a tag whose payload came up short before it: its back-pointer may be there all the same, when a read
-// failed. Leaves the reader where the payload ended, after `got` bytes.
+// Checks the back-pointer of a tag whose payload was cut short after `got` bytes: it may exist anyway if a host read
+// failed. On success the reader stands where the payload ended.
 bool FLVD_CheckCutTag(fio_file_t* reader, const flvd_found_tag_t& tag, uint32_t got)
 {
     const int64_t payload_end = tag.start + FLVD_TAG_HEADER_SIZE + tag.codec_header + got;
     if (__FLV_DMX__fioSeek64(reader, tag.start, FIO_SEEK_SET) != 0 || !FLVD_CheckPastData(reader, tag.data_size))
         return false;
-    __FLV_DMX__fioSeek64(reader, payload_end, FIO_SEEK_SET); // when it fails, the next tag begins here
+    __FLV_DMX__fioSeek64(reader, payload_end, FIO_SEEK_SET); // if this fails, the search continues from here
     return true;
 }
 
-// Delivers the n bytes at which the reader stands.
+// Delivers the n bytes of payload at the reader's position.
 FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag, uint32_t n,
                              flvd_frame_t* frame)
 {
@@ -176,7 +177,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
     return FlvdTurn::Delivered;
 }
 
-// Handles the media tag whose header the reader stands on, whatever of it is cached.
+// Handles the media tag at the reader's position, however much of it is cached.
 [[gnu::noinline]] FlvdTurn FLVD_DeliverTag(const flvd_delivery_t& delivery, const flvd_found_tag_t& tag,
                                            flvd_frame_t* frame)
 {
@@ -185,7 +186,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
     const uint32_t headers = FLVD_TAG_HEADER_SIZE + tag.codec_header;
     const uint8_t* bytes = nullptr;
     if (!tag.checked) {
-        FLVD_FioPeek(&bytes, headers, reader); // so that the skip finds them: it would seek
+        FLVD_FioPeek(&bytes, headers, reader); // so that the skip below does not seek
     } else if (FLVD_FioPeek(&bytes, FLVD_TAG_PEEK_SIZE, reader) < FLVD_TAG_PEEK_SIZE) {
         FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, reader);
         FLVD_Record(ctx, FLVD_PayloadSites(tag).headers_cut);
@@ -200,7 +201,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
     return FLVD_DeliverPayload(delivery, tag, tag.data_size - tag.codec_header, frame);
 }
 
-// Complete file: no tag was found. Passes what is there by the size of the last one.
+// Complete file, no tag found: skips ahead by the size of the last tag, unless the budget of failed checks is used up.
 FlvdTurn FLVD_PassPlace(const flvd_delivery_t& delivery)
 {
     const bool checks_used_up = delivery.search.checks_left == 0;
@@ -229,8 +230,8 @@ FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
     return FLVD_PassPlace(*delivery);
 }
 
-// Saves the position before the next tag. At the end of what was there the seek clears the host's end flag: the file
-// may have grown since.
+// Saves the position before the next tag. At the end of the file, seeks there to clear the host's end flag, since the
+// file may have grown.
 flvd_site_t FLVD_BeginTurn(const flvd_delivery_t& delivery)
 {
     fio_file_t* const reader = delivery.search.file;
@@ -253,7 +254,7 @@ flvd_site_t FLVD_BeginTurn(const flvd_delivery_t& delivery)
     const int32_t result = FLVD_GetCurrTagInfo(search.ctx, search.file, &info, search.wanted, 0);
     if (result == 0) {
         flvd_tag_header_t header = {};
-        FLVD_PeekTagHeader(search.file, &header); // cached: the search has just looked at it
+        FLVD_PeekTagHeader(search.file, &header); // cached, since the search has just examined it
         delivery->passing_size = info.data_size;
         return FLVD_DeliverTag(*delivery, FLVD_CheckedTag(header), frame);
     }
@@ -265,7 +266,8 @@ flvd_site_t FLVD_BeginTurn(const flvd_delivery_t& delivery)
     return FlvdTurn::Next;
 }
 
-// Chooses reader and tags by the request. Returns why it is refused.
+// With a separate audio reader, chooses the reader and the tags for the requested stream. Returns the site of a
+// refusal, or FLVD_SITE_NONE.
 flvd_site_t FLVD_ChooseStream(flvd_delivery_t* delivery, uint32_t stream)
 {
     flvd_ctx_t* const ctx = delivery->search.ctx;

@@ -1,4 +1,5 @@
-// The records are part of the interface: word by word on the 32-bit target, and for the two wide ones everywhere.
+// The layout of the records is part of the binary interface. All records are checked on the 32-bit target, and those
+// that are made of pointer-sized or fixed-width words everywhere.
 
 #include "flvdmx/flvdmx.h"
 
@@ -7,7 +8,7 @@
 
 namespace {
 
-// True when the offsets are those of consecutive words of a size, from the first on.
+// True when the offsets are those of consecutive words of `word` bytes; the first one is word number `first`.
 template <size_t N> constexpr bool FLVD_AreWords(const size_t (&offsets)[N], size_t word, size_t first = 0)
 {
     for (size_t i = 0; i < N; ++i)

@@ -1,4 +1,4 @@
-// Opening up to the file header, and releasing an instance.
+// Opening, up to and including the file header, and releasing an instance.
 
 #include "flvdmx/front/front.h"
 
@@ -19,7 +19,7 @@ constexpr uint32_t FLVD_FRAME_BUFFER_SIZE = 512000;
 // FLV file header.
 constexpr uint32_t FLVD_SIGNATURE = 0x464C56; // "FLV"
 constexpr uint32_t FLVD_SIGNATURE_BITS = 24;
-constexpr uint32_t FLVD_SIGNATURE_STEPS = 1048576; // a signature is looked for in the first MiB
+constexpr uint32_t FLVD_SIGNATURE_STEPS = 1048576; // bytes searched for the signature: 1 MiB
 constexpr uint32_t FLVD_HEADER_SIZE = 9;
 constexpr int32_t FLVD_DATA_OFFSET_MIN = 9;
 constexpr uint32_t FLVD_HEADER_VIDEO = 0x01;
@@ -45,7 +45,7 @@ void FLVD_Configure(flvd_ctx_t* ctx, const flvd_init_t* init, bool for_info)
 {
     ctx->video_codec_filter = FLVD_ANY_CODEC;
     ctx->audio_format_filter = FLVD_ANY_CODEC;
-    ctx->options = static_cast<uint32_t>(init->options); // the words are 32 bits wide in meaning
+    ctx->options = static_cast<uint32_t>(init->options); // only the low 32 bits of a word count
     ctx->opened_for_info = for_info ? 1 : 0;
     const auto cache_size = static_cast<uint32_t>(init->cache_size);
     ctx->cache_size = cache_size == 0 ? FLVD_CACHE_DEFAULT : std::max(cache_size, FLVD_CACHE_MIN);
@@ -59,7 +59,7 @@ fio_file_t* FLVD_OpenReader(const flvd_ctx_t* ctx, const char* file_name)
     return __FLV_DMX__fioOpen(file_name, FIO_MODE_READ | FIO_MODE_BINARY, ctx->cache_size, 0, 0);
 }
 
-// Opens the readers and allocates the frame buffer.
+// Opens the readers and allocates the frame buffer. Returns the site of a failure, or FLVD_SITE_NONE.
 flvd_site_t FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name)
 {
     ctx->main_reader = FLVD_OpenReader(ctx, file_name);
@@ -78,8 +78,8 @@ flvd_site_t FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name)
     return FLVD_SITE_NONE;
 }
 
-// Moves the bit reader to the first "FLV". After a MiB without one the bytes there are taken for a header all the same.
-// False when fewer bytes than a header has are left.
+// Moves the bit reader to the first "FLV". After 1 MiB without it, takes the bytes at that place for a header anyway.
+// False when fewer bytes are left than a header has.
 bool FLVD_FindSignature(fio_file_t* file)
 {
     __FLV_DMX__bitInit(file);

@@ -1,5 +1,5 @@
-// Stream probing: walks the first tags for the streams, their configuration and the metadata, derives duration and byte
-// rate, and fills the host's records.
+// Stream probing: walks the first tags to find the streams, their configuration and the metadata, derives duration and
+// byte rate, and fills the host's records.
 
 #include "flvdmx/front/front.h"
 
@@ -13,7 +13,7 @@
 
 namespace {
 
-constexpr uint32_t FLVD_FOUND_METADATA = 0x4; // beside the stream bits
+constexpr uint32_t FLVD_FOUND_METADATA = 0x4; // in addition to the stream bits
 constexpr uint32_t FLVD_FOUND_ALL = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO | FLVD_FOUND_METADATA;
 constexpr uint32_t FLVD_NO_TIMESTAMP = 0xFFFFFFFF;
 constexpr uint32_t FLVD_BYTE_RATE_SHIFT = 10; // bytes per 1024 ms
@@ -29,7 +29,7 @@ bool FLVD_IsProbed(const flvd_probing_t& probing)
     return probing.found == probing.wanted && probing.first_ts != FLVD_NO_TIMESTAMP;
 }
 
-// Probes a media tag unless its stream was found already. Returns the codec probe's result, 0 when there was none.
+// Probes a media tag unless its stream has been found. Returns the result of the codec's probe, or 0 without one.
 int32_t FLVD_ProbeTag(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t tag_type)
 {
     const uint32_t stream = tag_type == FLVD_TAG_TYPE_VIDEO ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
@@ -41,7 +41,7 @@ int32_t FLVD_ProbeTag(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t tag_typ
     return result;
 }
 
-// Reads a script tag whose header the reader stands on.
+// Parses the script tag at the reader's position.
 int32_t FLVD_ProbeScript(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t data_size)
 {
     FLVD_FioSkip(FLVD_TAG_HEADER_SIZE, ctx->cur_reader);
@@ -51,7 +51,7 @@ int32_t FLVD_ProbeScript(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t data
     return result;
 }
 
-// A tag of a complete file. Configurations do not count for the first timestamp, whatever time they carry.
+// Handles a tag of a complete file. Configurations do not count towards the first timestamp.
 void FLVD_ProbeCompleteTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag, uint32_t kind)
 {
     const bool config = (kind & FLVD_TAG_CONFIG) != 0;
@@ -81,7 +81,7 @@ void FLVD_ProbeCompleteTags(flvd_ctx_t* ctx, flvd_probing_t* probing)
     }
 }
 
-// A tag of a growing file; the reader is past it afterwards, a script tag's back-pointer included when it is there.
+// Handles a tag of a growing file and moves the reader past it. After a script tag, its back-pointer may not exist yet.
 flvd_site_t FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag)
 {
     if (tag.type == FLVD_TAG_TYPE_SCRIPT) {
@@ -133,7 +133,7 @@ flvd_site_t FLVD_ProbeTags(flvd_ctx_t* ctx)
     return FLVD_SITE_NONE;
 }
 
-// Last timestamp, end of the valid data and seek method.
+// Determines the last timestamp, the end of the valid data and the seek method.
 bool FLVD_MeasureExtent(flvd_ctx_t* ctx)
 {
     if (!FLVD_IsGrowing(ctx))
@@ -191,6 +191,6 @@ flvd_site_t FLVD_ProbeStreams(flvd_ctx_t* ctx, flvd_open_info_t* info)
         return FLVD_SITE_OPEN_REWIND;
     if (FLVD_HasAudioReader(ctx) && FLVD_SeekToFirstTag(ctx, ctx->audio_reader) != 0)
         return FLVD_SITE_OPEN_REWIND;
-    FLVD_FillRecords(ctx, info); // last: the records of an open that fails stay empty
+    FLVD_FillRecords(ctx, info); // last, so that a failed open leaves the records empty
     return FLVD_SITE_NONE;
 }
