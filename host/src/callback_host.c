@@ -1,4 +1,4 @@
-/* Host functions over two callbacks of the caller. */
+/* Host functions on two callbacks of the caller. */
 #include "flvdmx/callback_host.h"
 
 #include "callback_file.h"
@@ -17,7 +17,7 @@ typedef struct open_callbacks_t {
     void* user;
 } open_callbacks_t;
 
-/* All files that can be opened, under the lock. It is held for a few comparisons. */
+/* All files that can be opened; guarded by the lock, which is held only briefly. */
 static flvd_callback_file_t* first_file;
 static unsigned long names;
 static atomic_flag lock = ATOMIC_FLAG_INIT;
@@ -33,7 +33,7 @@ static void release_lock(void)
     atomic_flag_clear_explicit(&lock, memory_order_release);
 }
 
-/* A copy of the file of that name, so that the record may go; false when there is none. */
+/* Copies the file with that name, so that its record may go away. False when there is none. */
 static bool find_file(const char* name, flvd_callback_file_t* found)
 {
     if (name == NULL)
@@ -77,7 +77,7 @@ static int32_t close_file(void* handle)
     return 0;
 }
 
-/* Elements are single bytes. */
+/* The library reads elements of 1 byte. */
 static uint32_t read_file(void* buffer, uint32_t size, uint32_t count, void* handle)
 {
     open_callbacks_t* const file = handle;
@@ -86,7 +86,7 @@ static uint32_t read_file(void* buffer, uint32_t size, uint32_t count, void* han
     while (done < wanted) {
         const uint32_t left = wanted - done;
         const uint32_t got = file->read_at(file->user, file->counted.position, (char*)buffer + done, left);
-        if (got == 0 || got > left) { /* a function that claims more than it was asked for has failed */
+        if (got == 0 || got > left) { /* claiming more than requested counts as a failure */
             file->counted.end = true;
             break;
         }

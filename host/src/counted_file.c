@@ -1,4 +1,4 @@
-/* Seeks, position and end flag of files whose position the host keeps itself. */
+/* Seek, tell and end flag for hosts that keep the file position themselves. */
 #include "counted_file.h"
 
 #include "flvdmx/stdio_host.h"

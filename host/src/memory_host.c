@@ -1,4 +1,4 @@
-/* Host functions over the caller's memory: callback files that have the names of the caller. */
+/* Host functions on the caller's memory: callback files under names that the caller chooses. */
 #include "flvdmx/memory_host.h"
 
 #include "callback_file.h"
@@ -9,7 +9,7 @@ static flvd_memory_file_t* first_file;
 
 static int64_t get_size(void* user)
 {
-    return (int64_t)((const flvd_memory_file_t*)user)->size; /* memory is smaller than that */
+    return (int64_t)((const flvd_memory_file_t*)user)->size; /* no buffer is larger than INT64_MAX */
 }
 
 static uint32_t read_at(void* user, int64_t position, void* buffer, uint32_t size)
@@ -43,7 +43,7 @@ void flvd_memory_host_remove(const flvd_memory_file_t* file)
 
 void flvd_memory_host_add(flvd_memory_file_t* file)
 {
-    flvd_memory_host_remove(file); /* a file that is known moves to the front */
+    flvd_memory_host_remove(file); /* a file that was added before moves to the front */
     file->next = first_file;
     first_file = file;
 }

@@ -1,10 +1,10 @@
 /*
- * Host functions over POSIX descriptors with a window over each file.
+ * Host functions on POSIX descriptors, with a read window for each file.
  *
- * The position that the library sees is a number here; the descriptor moves by reading, and only where a read continues
- * the one before.
+ * The position that the library sees is a number kept here. The descriptor itself moves only when a read continues the
+ * previous one.
  */
-#define _FILE_OFFSET_BITS 64    /* pread and lseek have 64 bits on 32-bit systems too; open takes large files */
+#define _FILE_OFFSET_BITS 64    /* 64-bit pread and lseek on 32-bit systems, and an open that accepts large files */
 #define _POSIX_C_SOURCE 200809L /* pread, O_CLOEXEC */
 
 #include "flvdmx/posix_host.h"
@@ -26,17 +26,17 @@ static_assert(sizeof(off_t) == sizeof(int64_t), "places beyond 2 GiB must be rea
 enum {
     WINDOW = FLVD_POSIX_HOST_WINDOW,
     BACK_POINTER = 4,
-    BETWEEN_LARGE = WINDOW / 4 /* read after a large tag: what lies before the next one is short */
+    BETWEEN_LARGE = WINDOW / 4 /* read after a large tag: the tags up to the next large one are small */
 };
 
 typedef struct posix_file_t {
     counted_file_t counted;
     int descriptor;
-    bool large;            /* the last read did not go through the window */
+    bool large;            /* the last read bypassed the window */
     int64_t descriptor_at; /* where the descriptor stands */
-    int64_t file_end;      /* where it was when the library last asked for it */
-    int64_t start;         /* of the window in the file */
-    uint32_t count;        /* bytes in it */
+    int64_t file_end;      /* the size when the library last asked for it */
+    int64_t start;         /* file position of the window */
+    uint32_t count;        /* bytes in the window */
     char window[WINDOW];
 } posix_file_t;
 
@@ -47,7 +47,7 @@ static uint32_t least_of(uint32_t a, uint32_t b)
     return a < b ? a : b;
 }
 
-/* A directory opens for reading; only its reads fail, as if the file were empty. */
+/* open succeeds for a directory; only the reads fail, which would look like an empty file. */
 static bool is_directory(int descriptor)
 {
     struct stat status;
@@ -72,7 +72,7 @@ static int64_t size_of(void* handle)
     return size;
 }
 
-/* Null, for this reason. */
+/* Stores the reason and returns null. */
 static void* refuse(int reason)
 {
     open_error = reason;
@@ -107,8 +107,8 @@ static int32_t close_file(void* handle)
 }
 
 /*
- * Reads at least `least` bytes, at most `most`, from a place in the file on; fewer only at the end or after a failure.
- * Continues after signals and short reads. Where the descriptor stands elsewhere it stays there, which saves a seek.
+ * Reads between `least` and `most` bytes at file position `from`; fewer only at the end or after a failure. Continues
+ * after signals and short reads. If the descriptor is at another position, it stays there, which saves a seek.
  */
 static uint32_t read_at(posix_file_t* file, int64_t from, char* to, uint32_t least, uint32_t most)
 {
@@ -130,7 +130,7 @@ static uint32_t read_at(posix_file_t* file, int64_t from, char* to, uint32_t lea
     return done;
 }
 
-/* Copies what the window holds at the position, and moves past it. */
+/* Copies up to `wanted` bytes from the window at the position, and moves the position past them. */
 static uint32_t take_from_window(posix_file_t* file, char* to, uint32_t wanted)
 {
     const int64_t offset = file->counted.position - file->start;
@@ -143,7 +143,7 @@ static uint32_t take_from_window(posix_file_t* file, char* to, uint32_t wanted)
     return n;
 }
 
-/* True where the library steps backward: before the window, and from the end of the file. */
+/* True when the library seems to step backward: before the window, or near the end of the file. */
 static bool is_way_back(const posix_file_t* file)
 {
     const int64_t left = file->file_end - file->counted.position;
@@ -151,8 +151,9 @@ static bool is_way_back(const posix_file_t* file)
 }
 
 /*
- * Puts the window where the position is, at its start, or in its middle on a way back. At least `wanted` bytes, fewer
- * than half a window, are there after the position unless the file ends; where nothing is, the window stays.
+ * Moves the window so that it starts at the position or, when the library steps backward, has the position in its
+ * middle. The window then holds at least `wanted` bytes (fewer than half a window) from the position on, unless the
+ * file ends. If nothing can be read, the window does not change.
  */
 static void move_window(posix_file_t* file, uint32_t wanted)
 {
@@ -170,8 +171,8 @@ static void move_window(posix_file_t* file, uint32_t wanted)
 }
 
 /*
- * Elements are single bytes. What does not fit half a window goes straight to the library. So does the back-pointer
- * after a tag that is larger than the library's cache: the library comes back to the tag, and finds the window there.
+ * The library reads elements of 1 byte. A request of half a window or more bypasses the window. So does the read of a
+ * back-pointer after a tag larger than the library's cache: the library then returns to the tag, where the window is.
  */
 static uint32_t read_file(void* buffer, uint32_t size, uint32_t count, void* handle)
 {

@@ -1,8 +1,8 @@
 /*
- * Host functions over the C library's streams. The file stands alone: to write a host for another system, copy it and
- * put that system's functions in place of the C library's.
+ * Host functions on C streams. This file is self-contained: to write a host for another system, copy it and replace the
+ * C library's functions by those of that system.
  */
-#define _FILE_OFFSET_BITS 64    /* fseeko and ftello have 64 bits on 32-bit systems too */
+#define _FILE_OFFSET_BITS 64    /* 64-bit fseeko and ftello on 32-bit systems too */
 #define _POSIX_C_SOURCE 200809L /* fseeko, ftello, fileno */
 
 #include "flvdmx/stdio_host.h"
@@ -21,8 +21,8 @@ static_assert(sizeof(off_t) == sizeof(int64_t), "fseeko and ftello must reach be
 enum { UNKNOWN = -1 };
 
 /*
- * An open file. The position is counted, because the library asks for it twice per frame and the C library takes longer
- * to answer than the demuxer for the whole frame. After a seek or a write it is UNKNOWN until the next tell.
+ * An open file. The host counts the position itself, because the library queries it twice per frame, and ftello takes
+ * longer than the demultiplexer needs for the whole frame. After a seek or a write it is UNKNOWN until the next tell.
  */
 typedef struct stream_t {
     FILE* file;
@@ -46,14 +46,14 @@ static void* set(void* destination, int value, uint32_t count)
     return memset(destination, value, count);
 }
 
-/* fopen opens a directory for reading without complaint; every read then fails as if the file were empty. */
+/* fopen succeeds for a directory; only the reads fail, which would look like an empty file. */
 static int is_directory(FILE* file)
 {
     struct stat status;
     return fstat(fileno(file), &status) == 0 && S_ISDIR(status.st_mode);
 }
 
-/* Null, for this reason. */
+/* Stores the reason and returns null. */
 static void* refuse(int reason)
 {
     open_error = reason;
@@ -73,12 +73,13 @@ static void* open_stream(const char* path, const char* mode)
         return refuse(directory ? EISDIR : ENOMEM);
     }
     open_error = 0;
-    setvbuf(file, NULL, _IONBF, 0); /* the library has a cache of its own */
+    setvbuf(file, NULL, _IONBF, 0); /* the library has its own cache */
     *stream = (stream_t){file, UNKNOWN};
     return stream;
 }
 
-/* Elements are single bytes. A signal may cut a read short; only the end of the file or a real failure ends it. */
+/* The library reads elements of 1 byte. A read cut short by a signal continues; the end of the file or an error ends
+ * it. */
 static uint32_t read_stream(void* buffer, uint32_t size, uint32_t count, void* handle)
 {
     stream_t* const stream = handle;
@@ -95,7 +96,7 @@ static uint32_t read_stream(void* buffer, uint32_t size, uint32_t count, void* h
     return done;
 }
 
-/* Leaves the position unknown: a file that is appended to is written at its end. */
+/* Leaves the position unknown, because a file opened for appending is written at its end. */
 static uint32_t write_stream(const void* buffer, uint32_t size, uint32_t count, void* handle)
 {
     stream_t* const stream = handle;
@@ -107,7 +108,7 @@ static int32_t seek64(void* handle, int64_t offset, int32_t whence)
 {
     stream_t* const stream = handle;
     if (whence != SEEK_SET && whence != SEEK_CUR && whence != SEEK_END)
-        return -1; /* systems have further origins of their own */
+        return -1; /* some systems define further origins */
     stream->position = UNKNOWN;
     return fseeko(stream->file, offset, whence);
 }
@@ -120,7 +121,7 @@ static int64_t tell64(void* handle)
     return stream->position;
 }
 
-/* For callers without the 64-bit functions. A position that does not fit is a failure, never a smaller position. */
+/* 32-bit versions of the two. A position that does not fit is reported as a failure, never truncated. */
 static int32_t seek(void* handle, int32_t offset, int32_t whence)
 {
     return seek64(handle, offset, whence);

@@ -1,7 +1,7 @@
 /*
- * Host over two functions of the caller with a user pointer: read at a position, tell the size. What the library's file
- * functions lack, a context, is found by a name that the kit generates. The kit handles opening, positions, the end
- * flag and thread safety.
+ * Host on two functions of the caller, read at a position and get the size, with a user pointer. The library's
+ * file_open takes no context argument, so the kit generates a file name by which it finds the functions and the
+ * pointer. It also handles opening, positions, the end flag and thread safety.
  *
  *     static uint32_t read_at(void* user, int64_t position, void* buffer, uint32_t size);
  *     static int64_t get_size(void* user);
@@ -12,10 +12,10 @@
  *     ... open, play, close ...
  *     flvd_callback_host_remove(&file);
  *
- * Threads: adding and removing may run beside any other call. The callbacks of a file run on the thread that uses its
- * instance; those of files that are played on several threads run at the same time.
+ * Threads: files may be added and removed during any other call. The callbacks of a file run on the thread that uses
+ * its instance; when files are played on several threads, their callbacks run concurrently.
  *
- * Usable from C11 and C++17; link flvdmx-host, which needs the C library alone.
+ * For C11 and C++17. Link flvdmx-host, which needs only the C library.
  */
 #ifndef FLVDMX_CALLBACK_HOST_H
 #define FLVDMX_CALLBACK_HOST_H
@@ -26,58 +26,58 @@
 extern "C" {
 #endif
 
-/** Bytes that a generated name takes, its end included. */
+/** Size of a generated name in bytes, including the terminating NUL. */
 #define FLVD_CALLBACK_NAME_SIZE 32
 
 /**
- * Reads bytes of a file. It must not call the library.
+ * Reads bytes of a file. Must not call the library.
  *
- * @param user     what the file was given
- * @param position byte to begin at, 0 or more; may be at or past the end
- * @param buffer   where they go
- * @param size     how many are wanted, at least 1
- * @return how many were read. Fewer than wanted is not the end: the rest is requested next. 0: the end of the file, or
- * a failure, which looks the same.
+ * @param user     the file's user pointer
+ * @param position file position of the first byte, 0 or more; may be at or past the end
+ * @param buffer   receives the bytes
+ * @param size     bytes wanted, at least 1
+ * @return bytes read. When these are fewer than wanted, the kit calls again for the rest. 0 means the end of the file
+ * or a failure; the two look the same.
  */
 typedef uint32_t (*flvd_read_at_fn)(void* user, int64_t position, void* buffer, uint32_t size);
 
 /**
- * Tells how large a file is now. It must not call the library.
+ * Returns the current size of a file. Must not call the library.
  *
- * @param user what the file was given
- * @return bytes; negative when it cannot be told. A file that is still arriving (FLVD_OPT_PROGRESSIVE) may grow.
+ * @param user the file's user pointer
+ * @return bytes; negative on failure. A file that is still arriving (FLVD_OPT_PROGRESSIVE) may grow.
  */
 typedef int64_t (*flvd_get_size_fn)(void* user);
 
 /**
- * A file that can be opened. The caller owns the record, which stays where it is from adding to removing. What `user`
- * points to must last until every instance that was opened on it is closed, also after the file was removed.
+ * A file that can be opened. The caller owns the record, which must stay in place from adding to removing. What `user`
+ * points to must outlive every instance opened on the file, even when the file is removed earlier.
  */
 typedef struct flvd_callback_file_t {
-    flvd_read_at_fn read_at;            /**< reads; not null */
-    flvd_get_size_fn get_size;          /**< tells the size; not null */
-    void* user;                         /**< handed to both, otherwise not looked at */
-    char name[FLVD_CALLBACK_NAME_SIZE]; /**< the kit's own: the generated name */
-    struct flvd_callback_file_t* next;  /**< the kit's own: the list */
+    flvd_read_at_fn read_at;            /**< not null */
+    flvd_get_size_fn get_size;          /**< not null */
+    void* user;                         /**< passed to both functions */
+    char name[FLVD_CALLBACK_NAME_SIZE]; /**< private: the generated name */
+    struct flvd_callback_file_t* next;  /**< private: next in the list */
 } flvd_callback_file_t;
 
 /**
- * Makes a file known under a new name, which no other file of the process has had.
+ * Adds a file under a generated name, unique in the process.
  *
- * @param file record with its first three fields filled; one that is known already keeps its name
- * @return its name, for flvd_init_t::file_name; lies in the record. Null when the record or a function is missing; the
- * name null opens nothing.
+ * @param file record with its first three fields set; a file that was added already keeps its name
+ * @return the name for flvd_init_t::file_name, stored in the record; null when the record or one of its functions is
+ *         null. Opening a null name fails.
  */
 const char* flvd_callback_host_add(flvd_callback_file_t* file);
 
-/** Forgets a file: its name cannot be opened any more. Instances that are open go on. Unknown files are ignored. */
+/** Removes a file: its name can no longer be opened. Open instances keep working. Unknown files are ignored. */
 void flvd_callback_host_remove(const flvd_callback_file_t* file);
 
 /**
- * Clears the block and puts all host functions into it; file name, options and sizes are left to the caller.
+ * Clears the block and sets all host functions in it; the caller then sets file name, options and sizes.
  *
- * @param init block to fill; it may go away after the open, the functions are valid for the whole process
- * @note  For reading: other open modes (errno EACCES) and unknown names (ENOENT) are refused, writes take nothing.
+ * @param init block to fill; need not outlive the open
+ * @note  Read only: opening fails with errno EACCES for other modes and ENOENT for unknown names, and writes return 0.
  */
 void flvd_callback_host_fill(flvd_init_t* init);
 

@@ -1,8 +1,8 @@
 /*
- * Names and texts of the error codes, FLVD_ERR_* as they are recorded in flvd_ctx_t::error and g_flvd_lLastError,
- * and those that flvdmx.hpp adds.
+ * Names and texts of the error codes: the FLVD_ERR_* recorded in flvd_ctx_t::error and g_flvd_lLastError, and those
+ * that flvdmx.hpp adds.
  *
- * Usable from C11 and C++17; link flvdmx-host, which needs the C library alone.
+ * For C11 and C++17. Link flvdmx-host, which needs only the C library.
  */
 #ifndef FLVDMX_ERROR_TEXT_H
 #define FLVDMX_ERROR_TEXT_H
@@ -13,16 +13,16 @@
 extern "C" {
 #endif
 
-/** Error codes of flvdmx.hpp, beside those of flvdmx.h. */
+/** Error codes of flvdmx.hpp, in addition to those of flvdmx.h. */
 enum {
-    FLVD_ERR_HOST_IN_USE = -20001,    /**< a file that was opened through other host functions is still open */
+    FLVD_ERR_HOST_IN_USE = -20001,    /**< a file opened with other host functions is still open */
     FLVD_ERR_HOST_INCOMPLETE = -20002 /**< the host lacks a function that the library calls */
 };
 
-/** @return the name of an error code, such as "FLVD_ERR_SEEK"; "unknown" for any other number. Never released. */
+/** @return the name of an error code, such as "FLVD_ERR_SEEK"; "unknown" for any other number. A static string. */
 const char* flvd_error_name(int32_t code);
 
-/** @return what happened, for people, without a full stop; "unknown error" for any other number. Never released. */
+/** @return a message for users, without a full stop; "unknown error" for any other number. A static string. */
 const char* flvd_error_text(int32_t code);
 
 #ifdef __cplusplus

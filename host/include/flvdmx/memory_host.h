@@ -1,6 +1,6 @@
 /*
- * Host over the caller's memory: any number of buffers, each with a name that takes the place of a path. The library's
- * file functions carry no context, so the names are one list for the process:
+ * Host on the caller's memory: any number of buffers, each with a name that takes the place of a path. The library's
+ * file_open takes no context argument, so there is one list of names per process:
  *
  *     flvd_memory_file_t file = {"clip", bytes, byte_count, NULL};
  *     flvd_memory_host_add(&file);
@@ -9,9 +9,9 @@
  *     ... open, play, close ...
  *     flvd_memory_host_remove(&file);
  *
- * Threads: adding and removing count as opens; they must not run beside any other call.
+ * Threads: adding and removing a buffer count as opens; they must not run during any other call.
  *
- * Usable from C11 and C++17; link flvdmx-host, which needs the C library alone.
+ * For C11 and C++17. Link flvdmx-host, which needs only the C library.
  */
 #ifndef FLVDMX_MEMORY_HOST_H
 #define FLVDMX_MEMORY_HOST_H
@@ -23,29 +23,29 @@ extern "C" {
 #endif
 
 /**
- * A buffer that can be opened. The caller owns the record, the name and the bytes; all three stay where they are from
- * adding to removing. Between two calls of the library `size` may grow: open instances see it at once, which plays a
- * file that is still arriving (FLVD_OPT_PROGRESSIVE); `data` may change as well when the old bytes moved along.
+ * A buffer that can be opened. The caller owns the record, the name and the bytes, which must stay in place from adding
+ * to removing, with one exception for a file that is still arriving (FLVD_OPT_PROGRESSIVE): between two calls to the
+ * library `size` may grow, and `data` may point to a new buffer that begins with the old bytes. Open instances see the
+ * change at once.
  */
 typedef struct flvd_memory_file_t {
-    const char* name;                /**< what flvd_init_t::file_name must say */
+    const char* name;                /**< the value of flvd_init_t::file_name that opens it */
     const void* data;                /**< the bytes; may be null when size is 0 */
-    uint64_t size;                   /**< their number */
-    struct flvd_memory_file_t* next; /**< the list's own */
+    uint64_t size;                   /**< number of bytes */
+    struct flvd_memory_file_t* next; /**< private: next in the list */
 } flvd_memory_file_t;
 
-/** Makes a buffer known; of two with one name the one added last is opened. A record that is known already becomes the
- * last one. */
+/** Adds a buffer. Of several with the same name, the one added last is opened. A record may be added again. */
 void flvd_memory_host_add(flvd_memory_file_t* file);
 
-/** Forgets a buffer; every instance that was opened on it must be closed by then. Unknown ones are ignored. */
+/** Removes a buffer. Close all instances opened on it first. Unknown buffers are ignored. */
 void flvd_memory_host_remove(const flvd_memory_file_t* file);
 
 /**
- * Clears the block and puts all host functions into it; file name, options and sizes are left to the caller.
+ * Clears the block and sets all host functions in it; the caller then sets file name, options and sizes.
  *
- * @param init block to fill; it may go away after the open, the functions are valid for the whole process
- * @note  For reading: other open modes and unknown names are refused, writes take nothing.
+ * @param init block to fill; need not outlive the open
+ * @note  Read only: opening fails for other modes and for unknown names, and writes return 0.
  */
 void flvd_memory_host_fill(flvd_init_t* init);
 

@@ -1,7 +1,7 @@
 /*
- * The next frame, however many tags lie before it: what a program calls to play a file.
+ * The next frame, however many tags come before it: the function to play a file with.
  *
- * Usable from C11 and C++17; link flvdmx-host, which needs the C library alone.
+ * For C11 and C++17. Link flvdmx-host, which needs only the C library.
  */
 #ifndef FLVDMX_NEXT_FRAME_H
 #define FLVDMX_NEXT_FRAME_H
@@ -13,15 +13,15 @@ extern "C" {
 #endif
 
 /**
- * Asks for a frame with FLVD_OP_GET_FRAME. One such request gives up after 102 tags without a frame; this function
- * retries while the reader advances inside the data, so it crosses damaged stretches of any length.
+ * Gets the next frame with FLVD_OP_GET_FRAME. A single request gives up after 102 tags without a frame; this function
+ * retries while the reader advances inside the data, so it crosses damage of any length.
  *
- * @param instance open instance; null as for QVX_FLV_DMX
- * @param request  as for QVX_FLV_DMX: it names the stream with a separate audio reader and brings the caller's buffer
+ * @param instance open instance; null fails as in QVX_FLV_DMX
+ * @param request  as for QVX_FLV_DMX: the stream, with a separate audio reader; the caller's buffer, if it has one
  * @param frame    written on success; `data` is valid until the next request on the instance
- * @return as QVX_FLV_DMX. FLVD_RET_END of a complete file is final; of a growing file it means that there is no more so
- *         far: ask again after a while, and once more after the file has stopped growing.
- * @note   Ends for every file: each retry starts after the one before.
+ * @return as QVX_FLV_DMX. For a complete file FLVD_RET_END is final. For a growing file it means that there is no more
+ *         data yet: retry later, and once more after the file has stopped growing.
+ * @note   Terminates for every file, because each retry starts after the previous one.
  */
 int32_t flvd_next_frame(flvd_ctx_t* instance, const flvd_frame_request_t* request, flvd_frame_t* frame);
 
