@@ -356,7 +356,7 @@ FLVD_API extern int32_t g_flvd_lErrorLine;
  *         result also means that the next tag is still incomplete, or was when its beginning was read: retry later, and
  *         once more after the file has stopped growing. Streams that the open did not find are not found later: reopen
  *         until all expected streams are found. In a complete file, tags with later timestamps than its last tags are
- *         skipped; that may be most of a second recording that was appended to the first.
+ *         skipped: most of the tags before a point where the timestamps restart, as when another file was appended.
  */
 FLVD_API int32_t QVX_FLV_DMX(uint32_t operation, flvd_ctx_t** handle, const void* arg1, void* arg2);
 
