@@ -98,7 +98,7 @@ int32_t FLVD_GoToPositions(flvd_ctx_t* ctx, flvd_site_t site)
     return FLVD_Fail(ctx, site);
 }
 
-// Cuts off the entries past the end of the valid data, except the first of them, and returns how many remain in *count.
+// Trims the entries past the end of the valid data, except the first of them, and returns how many remain in *count.
 // An index in memory without positions keeps its entry count.
 int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end, uint32_t* count)
 {

@@ -36,8 +36,8 @@ bool FLVD_IsIndexUsable(const flvd_ctx_t* ctx);
 // no position lies outside, or only the last one.
 int32_t FLVD_FindLastInside(flvd_ctx_t* ctx, int64_t* last, bool* all_inside);
 
-// Cuts off the entries past the end of the valid data, except the first of them, and sets the last keyframe time from
-// the entries that remain.
+// Trims the entries past the end of the valid data, except the first of them, and sets the last keyframe time from the
+// entries that remain.
 int32_t FLVD_TrimIndex(flvd_ctx_t* ctx, int64_t end);
 
 // Choosing.
