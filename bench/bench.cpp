@@ -1,5 +1,5 @@
-// Times of every operation on every medium, player and host. The players of one medium stand side by side, so that a
-// round compares what ran within the same seconds. flvdmx-bench FOLDER [Google Benchmark's options]
+// Times every operation on every medium, player and host. All players of a medium run in succession, so that a round
+// compares what ran within the same seconds. Usage: flvdmx-bench FOLDER [Google Benchmark options]
 
 #include "flvdmx_player.h"
 #include "hosts.h"
@@ -33,7 +33,7 @@ double UserSeconds()
     return static_cast<double>(used.ru_utime.tv_sec) + 1e-6 * static_cast<double>(used.ru_utime.tv_usec);
 }
 
-/** Seconds that `work` takes; what it takes of the processor outside the kernel is added to `user`. */
+/** Runs `work` and returns its wall time in seconds; adds its user time to `user`. */
 template <class Work> double Timed(double& user, const Work& work)
 {
     using Clock = std::chrono::steady_clock;
@@ -51,7 +51,7 @@ void Play(benchmark::State& state, const std::string& medium, const MakePlayer& 
     Tally tally;
     double user = 0;
     if (player->open(PathOf(medium)))
-        tally = player->play(); // for the page cache, which one file does not leave to the next
+        tally = player->play(); // warms the page cache, which the previous file may have filled
     for (auto _ : state) {
         if (!player->open(PathOf(medium)))
             return state.SkipWithError("cannot open");
@@ -75,7 +75,7 @@ void Open(benchmark::State& state, const std::string& medium, const MakePlayer& 
         state.SkipWithError("cannot open");
 }
 
-/** A time behind the middle that is no keyframe's. */
+/** A time after the middle of the file that is not a keyframe's. */
 int32_t SeekTime(const std::string& medium)
 {
     FlvdmxPlayer player(MakeHost(g_hosts[0]));
@@ -111,7 +111,7 @@ void Register(const std::string& name, const std::string& medium, Operation run,
         ->Iterations(times);
 }
 
-/** The library on each host. */
+/** The library, on each host. */
 void RegisterHosts(const std::string& name, const std::string& medium, Operation run, int times, uint32_t options = 0)
 {
     for (const HostKind& kind : g_hosts)

@@ -1,5 +1,5 @@
-// What the library asks of its host: calls and bytes of every operation, and for the worst files the processor time as
-// well. flvdmx-cost FOLDER prints one JSON document.
+// Counts the host calls and bytes of every operation and, for the worst-case files, measures the processor time as
+// well. Usage: flvdmx-cost FOLDER. Prints one JSON document.
 
 #include "flvdmx_player.h"
 #include "hosts.h"
@@ -18,8 +18,8 @@ using nlohmann::json;
 
 namespace {
 
-constexpr uint32_t MOST_FRAMES = 2'000'000;     // nothing here has as many
-constexpr uintmax_t WORST_FILE_SIZE = 8u << 20; // only the files made to cost much are smaller
+constexpr uint32_t MOST_FRAMES = 2'000'000;     // more than any medium has
+constexpr uintmax_t WORST_FILE_SIZE = 8u << 20; // only the worst-case files are smaller
 
 double ProcessorSeconds()
 {
@@ -28,7 +28,7 @@ double ProcessorSeconds()
     return static_cast<double>(now.tv_sec) + 1e-9 * static_cast<double>(now.tv_nsec);
 }
 
-/** One operation's price; the largest of several. */
+/** Cost of one operation, or the largest cost of several. */
 struct Price {
     HostCost cost;
     uint64_t calls = 0, bytes = 0;
@@ -77,7 +77,7 @@ private:
     FlvdmxPlayer m_player;
 };
 
-/** Every request of a play by itself, also after one that ends inside the file. */
+/** The cost of each frame request while playing; continues after a request that ends inside the file. */
 Price MeasureRequests(Meter& meter)
 {
     Price request;
@@ -95,7 +95,7 @@ Price MeasureRequests(Meter& meter)
     return request;
 }
 
-/** A worst file with the fewest system calls, which take most of the time that it costs. */
+/** The cost of a worst-case file with the fewest system calls, which would otherwise dominate its time. */
 json MeasureOnPosix(const std::string& path)
 {
     Meter meter(g_hosts[1]);
@@ -104,7 +104,7 @@ json MeasureOnPosix(const std::string& path)
     return {{"open", open.text()}, {"request", MeasureRequests(meter).text()}};
 }
 
-/** All operations on one file: opening, each frame and all of them, seeks; the first seek on an instance of its own. */
+/** All operations on one file: opening, each frame, all frames, seeks; the first seek uses a fresh instance. */
 json Measure(const std::string& path, uint32_t options)
 {
     Meter meter(g_hosts[0], options);

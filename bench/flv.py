@@ -1,4 +1,4 @@
-"""Reads and writes FLV files for the bench: tags of ffmpeg's files, repeated; worst cases; files that are mostly holes."""
+"""Reads and writes FLV files for the bench: repeated tags of ffmpeg's files, worst cases, sparse files."""
 
 import struct
 
@@ -23,7 +23,7 @@ def tag(kind, time, data):
 
 
 def read_tags(path):
-    """All tags of a sound file: (kind, time, data)."""
+    """All tags of an undamaged file: (kind, time, data)."""
     with open(path, "rb") as file:
         whole = file.read()
     place, tags = HEADER_SIZE + BACK_POINTER, []
@@ -53,7 +53,7 @@ def numbers(values):
 
 
 def metadata(keyframes=()):
-    """onMetaData; keyframes: (time in ms, place in the file), nothing is written for none."""
+    """onMetaData with an index of `keyframes`: (time in ms, file position). Without keyframes there is no index."""
     body = string("width") + b"\0" + struct.pack(">d", 320)
     if keyframes:
         body += string("keyframes") + b"\x03" + string("filepositions") + numbers([place for _, place in keyframes])
@@ -62,7 +62,7 @@ def metadata(keyframes=()):
 
 
 class Writer:
-    """Writes tags and counts; a payload that is a number is a hole of so many bytes behind its first ones."""
+    """Writes tags and records the positions of keyframes; can leave most of a tag's data as a hole."""
 
     def __init__(self, path):
         self.file = open(path, "wb")
@@ -82,14 +82,14 @@ class Writer:
         self.file.write(tag(kind, time, data))
 
     def sparse_tag(self, kind, time, start, size):
-        """A tag of `size` data bytes of which only `start` is written."""
+        """Writes a tag of `size` data bytes; all but `start` is left as a hole."""
         self.file.write(tag_header(kind, time, size) + start)
         self.file.seek(size - len(start), 1)
         self.file.write(back_pointer(size))
 
 
 def repeated(base, count, length):
-    """The frames of `base`, `length` ms long, again and again: `count` tags, the configuration once."""
+    """Repeats the frames of `base`, which is `length` ms long: `count` tags, the configuration only once."""
     head = [entry for entry in base if is_config(entry[0], entry[2])]
     body = [entry for entry in base if entry[0] != SCRIPT and not is_config(entry[0], entry[2])]
     yield from head

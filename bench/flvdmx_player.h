@@ -10,7 +10,7 @@ namespace flvd_bench {
 
 class FlvdmxPlayer : public Player {
 public:
-    /** host: filled but for the file name; its options count. */
+    /** host: complete except for the file name; its options apply. */
     explicit FlvdmxPlayer(const flvd_init_t& host) : m_init(host) {}
     ~FlvdmxPlayer() override { close(); }
     FlvdmxPlayer(const FlvdmxPlayer&) = delete;
@@ -21,9 +21,9 @@ public:
     Tally play() override;
     uint32_t seek(int32_t time_ms) override;
 
-    /** One request. @return whether it brought a frame */
+    /** Makes one frame request. @return whether it delivered a frame */
     bool frame(flvd_frame_t& frame);
-    /** A seek alone. @return whether it reached a time */
+    /** Seeks without getting a frame. @return whether the seek succeeded */
     bool seek_only(int32_t time_ms, uint32_t mode);
     /** Valid while open. */
     const flvd_ctx_t& instance() const { return *m_instance; }
@@ -34,7 +34,7 @@ private:
     flvd_ctx_t* m_instance = nullptr;
 };
 
-/** Through flvdmx.hpp: with all that it tells of a frame. */
+/** The library through flvdmx.hpp, with everything that it reports per frame. */
 class HeaderPlayer : public Player {
 public:
     explicit HeaderPlayer(const flvd_init_t& host) : m_host(host) {}

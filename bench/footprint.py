@@ -1,8 +1,8 @@
 #!/usr/bin/env python3
-"""What the library takes of its target: footprint.py PREFIX LIBRARY OBJECTS [--json].
+"""Measures the library's footprint on its target: footprint.py PREFIX LIBRARY OBJECTS [--json].
 
-PREFIX stands before the binutils' names, OBJECTS is a folder with the compiler's call graphs (.ci) of the library's sources
-and the object of instance_size.cpp. Fails when a bound is passed. Calls of host functions count nothing.
+PREFIX is the prefix of the binutils, OBJECTS a folder with the compiler's call graphs (.ci) of the library's sources
+and the object of instance_size.cpp. Fails when a bound is exceeded. The stack of host functions does not count.
 """
 
 import glob
@@ -15,7 +15,7 @@ import sys
 BOUNDS = {"code and constants": 24 * 1024, "static data": 512, "instance": 1024, "deepest stack": 8 * 1024}
 CODE = (".text", ".rodata", ".ARM.exidx", ".ARM.extab", ".plt")
 DATA = (".data", ".bss", ".data.rel.ro")
-SCRIPT_NESTING = 64  # a function that calls itself does so for containers in script data, no deeper
+SCRIPT_NESTING = 64  # recursion happens only for containers in script data, up to this depth
 
 
 def sections(prefix, library):
@@ -30,7 +30,7 @@ def instance(prefix, objects):
 
 
 class CallGraph:
-    """Functions with their stack, and who calls whom."""
+    """Stack size of each function, and the functions that each one calls."""
 
     def __init__(self, objects):
         self.stack, self.calls, self.known = {}, {}, {}
@@ -51,7 +51,7 @@ class CallGraph:
             self.calls.setdefault(source, set()).add(target)
 
     def deepest(self, function, above=()):
-        """Bytes and path; a cycle is gone round as often as script data may nest."""
+        """Stack bytes and call path; a cycle is followed as often as script data may nest."""
         if function in above:
             cycle = above[above.index(function) :]
             return (SCRIPT_NESTING - 1) * sum(self.stack.get(name, 0) for name in cycle), (f"{len(cycle)} again",)

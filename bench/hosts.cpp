@@ -24,7 +24,7 @@ flvd_init_t MakeHost(const HostKind& kind, uint32_t options)
 
 namespace {
 
-constexpr uint8_t NO_BLOCK = 255; // memory that is not the host's: the caller's or the library's own
+constexpr uint8_t NO_BLOCK = 255; // memory that the host did not allocate: the caller's or the library's
 
 HostWatch* g_watch = nullptr;
 
@@ -267,7 +267,7 @@ private:
     Trace m_trace;
     void* m_handle = nullptr;
     std::vector<uint8_t*> m_blocks;
-    std::vector<uint8_t> m_else = std::vector<uint8_t>(1u << 24); // for what is not the host's memory
+    std::vector<uint8_t> m_else = std::vector<uint8_t>(1u << 24); // stands in for memory that the host did not allocate
 };
 
 } // namespace

@@ -1,4 +1,4 @@
-/* The hosts of the bench, and what passes between them and the library: counted, written down, done again. */
+/* The hosts of the bench; their calls can be counted, recorded and replayed. */
 #pragma once
 
 #include "player.h"
@@ -15,31 +15,31 @@ struct HostKind {
     void (*fill)(flvd_init_t*);
 };
 
-/** C streams, POSIX descriptors with a window. */
+/** C streams, and POSIX descriptors with a window. */
 extern const std::array<HostKind, 2> g_hosts;
 
 flvd_init_t MakeHost(const HostKind& kind, uint32_t options = 0);
 
 enum class HostFn : uint8_t { Alloc, Free, Copy, Set, Read, Seek, Tell, Eof, Count };
 
-/** What was asked of a host. */
+/** Calls to a host. */
 struct HostCost {
     std::array<uint64_t, static_cast<size_t>(HostFn::Count)> calls{};
-    uint64_t bytes = 0; /**< read */
-    uint64_t held = 0;  /**< of memory, at most */
+    uint64_t bytes = 0; /**< bytes read */
+    uint64_t held = 0;  /**< most memory held at once, in bytes */
 
     uint64_t of(HostFn fn) const { return calls[static_cast<size_t>(fn)]; }
-    /** Of the file: reads, seeks, position and end queries. */
+    /** File calls: reads, seeks, tells and end-of-file queries. */
     uint64_t file_calls() const { return of(HostFn::Read) + of(HostFn::Seek) + of(HostFn::Tell) + of(HostFn::Eof); }
 };
 
-/** One call, small: playing replays millions of them. Memory is named by its block and a place in it. */
+/** One recorded call; small, because replaying uses millions of them. Memory is given as a block and an offset. */
 struct HostCall {
     HostFn fn;
-    uint8_t whence;          /**< of a seek; of a set its value */
+    uint8_t whence;          /**< of a seek; the value of a set */
     uint8_t to, from;        /**< blocks */
-    uint32_t size;           /**< of alloc, copy, set and read */
-    uint32_t to_at, from_at; /**< places in the blocks; of a seek together its 64-bit offset, high part first */
+    uint32_t size;           /**< bytes of an alloc, copy, set or read */
+    uint32_t to_at, from_at; /**< offsets in the blocks; of a seek, its 64-bit offset, high part first */
 };
 
 struct Trace {
@@ -47,8 +47,8 @@ struct Trace {
 };
 
 /**
- * Stands between the library and a host. The library's tables carry no context, so one of these is in use at a time:
- * the newest.
+ * Sits between the library and a host. The library's functions take no context argument, so only the newest of these
+ * objects is in use.
  */
 class HostWatch {
 public:
@@ -57,11 +57,11 @@ public:
     HostWatch(const HostWatch&) = delete;
     HostWatch& operator=(const HostWatch&) = delete;
 
-    /** What the library is given. */
+    /** The initialisation block for the library. */
     const flvd_init_t& init() const { return m_outer; }
-    /** Since the last time; begins anew but for the memory held. */
+    /** Returns the counts since the last call and resets them, except for the memory held. */
     HostCost take_cost();
-    /** Calls from now on go there too, or nowhere. */
+    /** Records calls there from now on; null stops recording. */
     void record(std::vector<HostCall>* calls) { m_calls = calls; }
 
 private:
@@ -80,14 +80,14 @@ private:
     flvd_init_t m_host, m_outer;
     HostCost m_cost;
     std::vector<HostCall>* m_calls = nullptr;
-    std::vector<Block> m_blocks; /**< by number; given back ones keep theirs, with size 0 */
+    std::vector<Block> m_blocks; /**< by number; freed blocks keep their number, with size 0 */
     uint64_t m_held = 0;
 };
 
-/** Opens and plays `path` on a host, and writes down all that the host was asked. */
+/** Opens and plays `path` on a host and records all calls to the host. */
 Trace RecordPlaying(const flvd_init_t& host, const std::string& path);
 
-/** The same calls on the same host, without a demuxer. Delivers nothing; does not seek. */
+/** Replays recorded calls on the same host, without a demultiplexer. Delivers no frames and cannot seek. */
 PlayerPtr MakeReplayPlayer(const flvd_init_t& host);
 
 } // namespace flvd_bench

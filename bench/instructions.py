@@ -1,8 +1,8 @@
 #!/usr/bin/env python3
-"""Instructions of the library itself, host and C library left out, and of the C++ header: instructions.py PROGRAM
+"""Counts instructions of the library, without host and C library, and of the C++ header: instructions.py PROGRAM
 SAMPLE FOLDER.
 
-Fails when one of the bounds is passed. PROGRAM is flvdmx-own, SAMPLE the file whose open is counted.
+Fails when a bound is exceeded. PROGRAM is flvdmx-own, SAMPLE the file whose open is counted.
 """
 
 import os
@@ -11,7 +11,7 @@ import sys
 
 import flv
 
-BOUNDS = {"small frame": 260, "large frame": 450, "small frame, added by flvdmx.hpp": 160, "open": 8600}  # a change that costs more is to be seen
+BOUNDS = {"small frame": 260, "large frame": 450, "small frame, added by flvdmx.hpp": 160, "open": 8600}  # a more expensive change must be noticed
 SMALL_FRAMES, SMALL_SIZE = 4000, 90
 LARGE_FRAMES, LARGE_SIZE = 400, 9000  # larger than the cache
 
@@ -28,7 +28,7 @@ def make_file(path, frames, size):
 
 
 def own_instructions(profile):
-    """Sum of the self costs of the functions that lie in the library."""
+    """Sum of the self costs of the library's functions."""
     total, objects, inside, skip = 0, {}, False, False
     with open(profile) as lines:
         for line in lines:
@@ -55,7 +55,7 @@ def all_instructions(profile):
 
 
 def count(program, path, function, folder, instructions=own_instructions):
-    """Instructions inside `function`, and what the program printed: the frames."""
+    """Instructions inside `function`, and the number of frames, which the program prints."""
     profile = os.path.join(folder, "callgrind." + function)
     done = subprocess.run(["valgrind", "--tool=callgrind", f"--toggle-collect={function}",
                            f"--callgrind-out-file={profile}", program, path],
@@ -64,7 +64,7 @@ def count(program, path, function, folder, instructions=own_instructions):
 
 
 def measure(program, opens, folder):
-    """Instructions of a small frame, a large frame, and of the open of each of the files, by name."""
+    """Instructions per small frame, per large frame, and per open of each file, by name."""
     os.makedirs(folder, exist_ok=True)
     figures = {}
     for name, frames, size in (("small", SMALL_FRAMES, SMALL_SIZE), ("large", LARGE_FRAMES, LARGE_SIZE)):

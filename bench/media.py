@@ -1,5 +1,5 @@
 #!/usr/bin/env python3
-"""Makes the bench's media, once: media.py FOLDER [SCALE]. ffmpeg codes a few seconds, the rest repeats them."""
+"""Generates the bench's media, once: media.py FOLDER [SCALE]. ffmpeg encodes a few seconds, which are then repeated."""
 
 import os
 import subprocess
@@ -14,7 +14,7 @@ DAMAGED_TAGS, HOLE_EVERY, HOLE_TAGS = 200_000, 1000, 40
 TAIL_TAGS, TAIL_ZEROS = 100_000, 8 * MIB
 LONG_BYTES, LONG_TAG = 3_000_000_000, 1_000_000
 HOSTILE_BYTES = 4 * MIB
-SOUND_8 = 8  # a sound header byte that is the type of a sound tag: in a run of it every byte begins a plausible tag
+SOUND_8 = 8  # an audio codec byte that is also an audio tag's type: every byte in a run of it starts a plausible header
 
 
 def encode(path, size, rate, seconds, video, audio):
@@ -62,7 +62,7 @@ def write_hd(path, indexed_path, base, scale):
 
 
 def write_damaged(path, base, scale):
-    """Every so often some tags are zeros, whole tags, so that nothing of a lost frame is left to argue about."""
+    """Replaces whole tags by zeros at regular intervals, so that all players lose the same frames."""
     tags = flv.repeated(base, int(DAMAGED_TAGS * scale), SMALL_SECONDS * 1000)
     with flv.Writer(path) as out:
         out.tag(flv.SCRIPT, 0, flv.metadata())
@@ -84,7 +84,7 @@ def append(path, data):
 
 
 def write_long(path, scale):
-    """One picture a second and sound beside it; of the pictures only the first bytes are there."""
+    """One picture per second, with audio; only the first bytes of each picture are written."""
     with flv.Writer(path) as out:
         out.tag(flv.SCRIPT, 0, flv.metadata())
         for kind, data in ((flv.VIDEO, flv.AVC_CONFIG), (flv.AUDIO, flv.AAC_CONFIG)):
@@ -95,7 +95,7 @@ def write_long(path, scale):
 
 
 def sounds(first):
-    """Tags of sound whose header byte is 8."""
+    """Audio tags whose codec byte is 8."""
     return b"".join(flv.tag(flv.AUDIO, first + 40 * n, bytes([SOUND_8]) + bytes([77]) * 200) for n in range(20))
 
 

@@ -1,5 +1,5 @@
-// Opens and plays a file in memory, also through flvdmx.hpp, each in a function of its own, so that a profiler can
-// count what the library itself does in it. flvdmx-own FILE prints the number of frames.
+// Opens and plays a file in memory, through the C entry point and through flvdmx.hpp. Each runs in a separate function,
+// so that a profiler can count the library's own instructions. Usage: flvdmx-own FILE. Prints the number of frames.
 
 #include "flvdmx/flvdmx.hpp"
 #include "flvdmx/memory_host.h"

@@ -7,7 +7,7 @@
 
 namespace flvd_bench {
 
-/** Frames delivered; players that deliver the same must agree in both. */
+/** Frames delivered and their bytes; players that deliver the same frames agree in both. */
 struct Tally {
     uint64_t frames = 0;
     uint64_t bytes = 0;
@@ -26,31 +26,31 @@ public:
     Player(const Player&) = delete;
     Player& operator=(const Player&) = delete;
 
-    /** A player that is open already is closed first. @return whether it can play */
+    /** Opens a file; closes one that is open. @return whether it can be played */
     virtual bool open(const std::string& path) = 0;
     virtual void close() = 0;
-    /** Frames from here to the end. */
+    /** Plays from the current position to the end. */
     virtual Tally play() = 0;
-    /** Goes to the keyframe at or before `time_ms` and takes its frame. @return frame size, 0 when it failed */
+    /** Seeks to the keyframe at or before `time_ms` and gets its frame. @return frame size, 0 on failure */
     virtual uint32_t seek(int32_t time_ms) = 0;
 };
 
 using PlayerPtr = std::unique_ptr<Player>;
 
 /**
- * Plays through C streams and checks nothing: a tag header, one copy of the data, the back-pointer. What any player has
- * to do at least. It does not seek.
+ * Plays through C streams and checks nothing: reads a tag header, copies the data once, reads the back-pointer. This is
+ * the least that any player must do. It cannot seek.
  */
 PlayerPtr MakeTrustingPlayer();
 
-/** How far libavformat goes when it opens. */
+/** How much libavformat does when it opens a file. */
 enum class LibavformatOpen {
-    Bare,        /**< no streams yet */
-    StreamInfo,  /**< the least of its stream information */
-    StreamsKnown /**< until the first picture told it of its streams, for seeking */
+    Bare,        /**< finds no streams yet */
+    StreamInfo,  /**< finds the least stream information */
+    StreamsKnown /**< reads until the first picture has revealed the streams, for seeking */
 };
 
-/** Null without libavformat. It neither parses nor fills in. */
+/** Null without libavformat. Parsing and frame completion are switched off. */
 PlayerPtr MakeLibavformatPlayer(LibavformatOpen how);
 
 } // namespace flvd_bench

@@ -1,9 +1,9 @@
 #!/usr/bin/env python3
-"""Runs the bench and writes its table: summary.py BIN MEDIA TARGETS ROUNDS, BIN the folder of the programs.
+"""Runs the bench and writes its tables: summary.py BIN MEDIA TARGETS ROUNDS. BIN is the folder of the programs.
 
-Each round runs everything once, the players of one medium side by side. A ratio is taken within a round; what is shown is
-the median of the rounds, with the least and the largest. The tables go into docs/performance.md and README.md, between
-their marks. TARGETS is a file with the target's footprint as JSON; it may be missing.
+Each round runs everything once, all players of a medium in succession. Ratios are computed within a round; the tables
+show the median of the rounds, with the smallest and the largest value. They replace the text between the marks in
+docs/performance.md and README.md. TARGETS is a file with the target's footprint as JSON; it may be missing.
 """
 
 import datetime
@@ -31,7 +31,7 @@ def run(*command):
 
 
 class Times:
-    """Nanoseconds of each benchmark, a list by rounds, and what its last round counted."""
+    """Nanoseconds of each benchmark, one value per round, and the counters of its last round."""
 
     def __init__(self, program, media, rounds):
         self.times, self.counters = {}, {}
@@ -44,7 +44,7 @@ class Times:
                     self.times.setdefault(name, []).append(entry["real_time"])
 
     def ratio(self, one, other):
-        """Median, least and largest of `one` over `other`; None when either did not run."""
+        """Median, smallest and largest ratio of `one` to `other`; None when either did not run."""
         pairs = [a / b for a, b in zip(self.times.get(one, ()), self.times.get(other, ()))]
         return (statistics.median(pairs), min(pairs), max(pairs)) if pairs else None
 
@@ -57,7 +57,7 @@ def row(what, goal, measured, met):
 
 
 def measured(what, value):
-    """A row without a goal: what the host calls of the operation decide, not how the library makes them."""
+    """A row without a goal, because the operation's host calls decide it, not the way the library makes them."""
     return f"| {what} | | {value} | |"
 
 
@@ -114,7 +114,7 @@ def time_rows(times):
 
 
 def cost_rows(cost):
-    """Host calls, bytes and the worst files' processor time."""
+    """Host calls, bytes, and processor time of the worst-case files."""
     for medium in VALID:
         play, share = cost[medium]["play"], cost[medium]["play"]["bytes"] / cost[medium]["size"]
         yield row(f"`{medium}`: seeks while playing", "≤ 3", play["seeks"], play["seeks"] <= 3)
@@ -140,7 +140,7 @@ def figure_rows(figures, bounds, unit):
 
 
 def frame_table(times):
-    """What one frame takes, and how fast the bytes of the frames go by."""
+    """Time per frame, and bytes per second."""
     yield "| Medium | " + " | ".join([*HOSTS.values(), "trusting loop", "libavformat"]) + " |"
     yield "|---|" + "---:|" * (len(HOSTS) + 2)
     for medium in PLAYED:
@@ -177,7 +177,7 @@ def machine():
 
 
 def put(path, mark, text):
-    """Replaces what stands between the marks."""
+    """Replaces the text between the marks."""
     before, begin, rest = path.read_text().partition(f"<!-- {mark} -->\n")
     _, end, after = rest.partition(f"<!-- end of {mark} -->\n")
     if not begin or not end:
