@@ -1,4 +1,4 @@
-// Codec headers against a second reading of them: audio headers, AVC records, picture headers.
+// Checks codec headers against a second implementation: audio headers, AVC records, picture headers.
 
 #include "judge.h"
 
@@ -8,7 +8,7 @@ using namespace flvd_fuzz;
 
 namespace {
 
-// The first MPEG audio frame header, or 0.
+// Returns the first MPEG audio frame header, or 0.
 uint32_t find_mpeg(const Bytes& data)
 {
     for (size_t at = 0; at + 4 <= data.size(); ++at) {
@@ -28,17 +28,17 @@ void run_audio(Input& input)
     const uint32_t header = format == 2 || format == 14 ? find_mpeg(data) : 0;
     flvd_audio_info_t info{};
     const int32_t rc = FLVD_ParseAudioHeader(format, data.data(), static_cast<int32_t>(data.size()), &info);
-    require(rc == (format == 10 || header != 0 ? 0 : -1), "another result");
-    require(header == 0 || info.channels == ((header >> 6u & 3u) == 3 ? 1u : 2u), "another number of channels");
-    require(header == 0 || info.data_rate <= 448, "an impossible rate");
+    require(rc == (format == 10 || header != 0 ? 0 : -1), "wrong result");
+    require(header == 0 || info.channels == ((header >> 6u & 3u) == 3 ? 1u : 2u), "wrong number of channels");
+    require(header == 0 || info.data_rate <= 448, "impossible data rate");
     if (rc == 0)
         info.sample_rate = info.channels = 0;
     if (header != 0)
         info.sample_size = info.format_tag = info.data_rate = 0;
-    require(bytes_of(info) == Bytes(sizeof info), "an audio header that changed something else");
+    require(bytes_of(info) == Bytes(sizeof info), "parsing an audio header changed other fields");
 }
 
-// With start codes; nothing when the record ends before them.
+// The record's parameter sets with start codes; empty when the record ends too early.
 Bytes parameter_sets(const Bytes& record)
 {
     Bytes sets;
@@ -62,15 +62,15 @@ void judge_picture(int32_t codec, const Bytes& data)
     flvd_video_info_t info{};
     const int32_t rc = FLVD_ParseVideoHeader(codec, data.data(), static_cast<int32_t>(data.size()), &info);
     const bool known = codec == 2 || codec == 4 || codec == 5 || codec == 7;
-    require(rc == -1 || (rc == 0 && known && data.size() >= 8), "a picture header where there can be none");
+    require(rc == -1 || (rc == 0 && known && data.size() >= 8), "found a picture header where there can be none");
     if (rc == 0)
         info.width = info.height = 0;
     if (rc == 0 && codec == 7)
         std::memset(info.fourcc, 0, sizeof info.fourcc);
-    require(bytes_of(info) == Bytes(sizeof info), "a picture header that changed something else");
+    require(bytes_of(info) == Bytes(sizeof info), "parsing a picture header changed other fields");
 }
 
-// The control bytes are the codec of a picture header and the room for the parameter sets.
+// The control bytes are the codec of a picture header and the capacity for parameter sets, in units of 4 bytes.
 void run_avc(Input& input)
 {
     const Bytes& record = input.payload();
@@ -79,9 +79,10 @@ void run_avc(Input& input)
     const Bytes expected = parameter_sets(record);
     const int32_t written = FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()), out.data(),
                                                          static_cast<int32_t>(out.size()));
-    require(static_cast<size_t>(written) == (expected.size() <= out.size() ? expected.size() : 0), "another size");
+    require(static_cast<size_t>(written) == (expected.size() <= out.size() ? expected.size() : 0),
+            "wrong size of the parameter sets");
     out.resize(static_cast<size_t>(written));
-    require(written == 0 || out == expected, "other parameter sets");
+    require(written == 0 || out == expected, "wrong parameter sets");
     judge_picture(codec, record);
     judge_picture(7, out);
 }

@@ -9,7 +9,7 @@ void require(bool holds, const char* what)
 {
     if (holds)
         return;
-    std::fprintf(stderr, "judgement: %s\n", what);
+    std::fprintf(stderr, "check failed: %s\n", what);
     std::abort();
 }
 
@@ -31,10 +31,10 @@ Input::Input(const uint8_t* data, size_t size)
 
 Host::Host(Bytes file) : FakeHost(std::move(file))
 {
-    on_call = [this](HostFn) { require(m_calls_left-- != 0, "more host calls than an operation may cost"); };
+    on_call = [this](HostFn) { require(m_calls_left-- != 0, "the operation made too many host calls"); };
 }
 
-// Honest work is no effort.
+// Work costs patience only while the host lies.
 bool Host::refuses(uint64_t effort)
 {
     const bool refused = m_patience == 0;

@@ -1,6 +1,6 @@
 /*
- * What the fuzz targets share: the input, the list of targets, a host that lies, and the judgement itself: one that
- * does not hold ends the process.
+ * What the fuzz targets share: the input, the list of targets, a host that lies, and require(), which prints a message
+ * and aborts when a check fails.
  */
 #pragma once
 
@@ -16,8 +16,8 @@ using namespace flvd_test;
 void require(bool holds, const char* what);
 
 /**
- * What the fuzzer gave: a payload, control bytes, and in the last byte their number. The payload comes first so
- * that its offsets stay when commands are added.
+ * The fuzzer's input: a payload, control bytes, and a last byte with the number of control bytes. The payload comes
+ * first so that its offsets do not change when commands are added.
  */
 class Input {
 public:
@@ -37,7 +37,7 @@ private:
     size_t m_next = 0;
 };
 
-/** A course: the control bytes are its calls, each a code and an argument. */
+/** Runs a sequence of calls on a Course; each call is a code and an argument from the control bytes. */
 template <class Course, uint32_t MAX_CALLS> void run_calls(Input& input)
 {
     Course course(input);
@@ -47,37 +47,36 @@ template <class Course, uint32_t MAX_CALLS> void run_calls(Input& input)
     }
 }
 
-/** A fuzz target. Each is a static object; the programs find what it runs by its name. */
+/** A fuzz target. Each is a static object that registers its function by name. */
 struct Target {
     Target(const char* name, void (*run)(Input&)) { all[name] = run; }
     static inline std::map<std::string, void (*)(Input&)> all;
 };
 
 enum class Lie : uint8_t {
-    ReadClaimsMore,   /**< more bytes than were asked for */
-    ReadStands,       /**< the position does not follow */
-    TellGoesBack,     /**< every other position is too low */
-    TellStands,       /**< always the same position */
-    TellHuge,         /**< a position that no file has */
-    SeekForgetsWhere, /**< every offset counts from the start */
-    SeekStands,       /**< success without moving */
+    ReadClaimsMore,   /**< claims more bytes than were requested */
+    ReadStands,       /**< does not advance the position */
+    TellGoesBack,     /**< returns too low a position every other time */
+    TellStands,       /**< always returns the same position */
+    TellHuge,         /**< returns a position that no file has */
+    SeekForgetsWhere, /**< takes every offset from the start */
+    SeekStands,       /**< succeeds without moving */
     NeverAtEnd,
     AlwaysAtEnd,
     Count
 };
 
-/** The fake host with lies, and with a limit to its calls. One at a time. */
+/** The fake host with lies and a limit on its calls. Only one may exist at a time. */
 class Host : public FakeHost {
 public:
     explicit Host(Bytes file);
-    /** Tells these lies (bits 1 << Lie) from now on, until `patience` calls or KiB read are used up; then it refuses.
-     */
+    /** Tells these lies (bits 1 << Lie) until `patience` calls or KiB read are used up; after that its calls fail. */
     void lie(uint32_t lies, uint64_t patience) { std::tie(m_lies, m_patience) = std::tie(lies, patience); }
-    /** The next operation may cost so many calls. */
+    /** Sets how many host calls the next operation may make. */
     void begin(uint64_t calls) { m_calls_left = calls; }
     /** Where a reader really stands. */
     int64_t position(const fio_file_t* reader);
-    void require_clean() const { require(live_blocks() + open_handles() == 0, "memory or a file that was kept"); }
+    void require_clean() const { require(live_blocks() + open_handles() == 0, "memory or a file was not released"); }
 
 private:
     bool lies(Lie lie) const { return (m_lies >> static_cast<uint32_t>(lie) & 1u) != 0; }
@@ -91,21 +90,21 @@ private:
     uint64_t m_patience = UINT64_MAX, m_calls_left = UINT64_MAX;
 };
 
-/** A copy: reads it all, so that a sanitizer sees what is not there. */
+/** Copies the bytes; reading them all lets a sanitizer find invalid memory. */
 Bytes copy_of(const void* begin, size_t size);
 template <class Record> Bytes bytes_of(const Record& record)
 {
     return copy_of(&record, sizeof record);
 }
 
-/** A tag as it stands in a file, read anew from the bytes. */
+/** A tag parsed from the bytes of a file, independently of the library. */
 struct FileTag {
-    uint32_t type, size, timestamp, stream_id, first, second; /**< first, second: data bytes */
+    uint32_t type, size, timestamp, stream_id, first, second; /**< first, second: its first two data bytes */
     bool video() const { return type == FLVD_TAG_TYPE_VIDEO; }
     bool keyframe() const { return first / 16 == 1 || first / 16 == 4; }
 };
 uint32_t read_be(const uint8_t* bytes, size_t count);
-/** False when fewer than 13 bytes are there. */
+/** False when fewer than 13 bytes are left. */
 bool read_tag(const Bytes& file, int64_t position, FileTag* tag);
 
 } // namespace flvd_fuzz

@@ -1,6 +1,6 @@
-// Tag navigation against a second writing of its rules over a plain array: every call must give the same result, tag
-// and place. The host is honest, the description of the file is whatever the input says. The second writing has no
-// cache and no budgets: no input is long enough for 1 MiB without a tag or for 16,384 checks that fail.
+// Checks tag navigation against a second implementation over a plain array: every call must give the same result, tag
+// and position. The host is honest; the description of the file comes from the input. The second implementation has no
+// cache and no budgets, because no input is long enough for 1 MiB without a tag or for 16,384 failed checks.
 
 #include "judge.h"
 
@@ -9,9 +9,9 @@ using namespace flvd_fuzz;
 namespace {
 
 constexpr uint32_t ANY_CODEC = 0xFFFF;
-constexpr int64_t BEYOND = 64; // how far past the end of the file a reader is put
+constexpr int64_t BEYOND = 64; // how far past the end of the file a reader may be moved
 constexpr flvd_tag_info_t UNTOUCHED = {0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A};
-constexpr int32_t UNKNOWN = 1; // the host was asked to go before the file: nothing is said of what follows
+constexpr int32_t UNKNOWN = 1; // the host was asked to seek before the file: what follows is not defined
 
 struct Found {
     int32_t rc = FLVD_ERR_END_OF_DATA;
@@ -67,22 +67,23 @@ private:
     {
         if (expected.rc == UNKNOWN)
             return;
-        require(rc == expected.rc, "another result");
+        require(rc == expected.rc, "wrong result");
         const FileTag& tag = expected.tag;
         const flvd_tag_info_t described{tag.type, tag.size, tag.timestamp, tag.stream_id};
-        require(bytes_of(info) == bytes_of(rc == 0 ? described : UNTOUCHED), "another record");
-        require(rc != 0 || m_host.position(m_reader) == expected.position, "another place");
+        require(bytes_of(info) == bytes_of(rc == 0 ? described : UNTOUCHED), "wrong record");
+        require(rc != 0 || m_host.position(m_reader) == expected.position, "wrong position");
     }
     void judge_find(int64_t from, uint32_t limit)
     {
         const int32_t rc = FLVD_FindNextTag(&m_ctx, m_reader, limit);
         const int64_t there = scan(from);
         const bool exists = there < m_host.visible();
-        require(rc >= -1 && (rc >= 0 || !exists || there - from >= limit), "a search that missed a tag");
-        require(rc < 0 || (exists && from + rc == there && m_host.position(m_reader) == there), "another place found");
+        require(rc >= -1 && (rc >= 0 || !exists || there - from >= limit), "the search missed a tag");
+        require(rc < 0 || (exists && from + rc == there && m_host.position(m_reader) == there),
+                "the search ended at a wrong position");
     }
 
-    // The first place from there on where a plausible header stands, or the end.
+    // The position of the first plausible header at or after `position`, or the end.
     int64_t scan(int64_t position) const
     {
         FileTag tag;
@@ -90,7 +91,7 @@ private:
             ++position;
         return read_tag(m_file, position, &tag) ? position : std::max(position, m_host.visible());
     }
-    // After the tag when it is one, else where the next may be.
+    // The position after the tag if it counts as one, else of the next candidate.
     int64_t pass(int64_t position, const FileTag& tag, bool verify) const
     {
         return taken(position, tag, verify) ? position + 15 + tag.size : scan(position + 1);
@@ -129,7 +130,7 @@ private:
         return {FLVD_ERR_AT_FIRST_TAG, 0, {}};
     }
 
-    // 0 when it is not there.
+    // 0 when the file ends before it.
     uint32_t back_pointer(int64_t at) const { return at + 4 <= m_host.visible() ? read_be(m_file.data() + at, 4) : 0; }
     uint32_t ceiling() const { return m_ctx.last_ts != 0 ? m_ctx.last_ts : UINT32_MAX; }
     bool of_stream(const FileTag& tag) const
@@ -141,7 +142,7 @@ private:
                                               tag.type == FLVD_TAG_TYPE_SCRIPT);
     }
     bool plausible(const FileTag& tag) const { return of_stream(tag) && tag.size < m_ctx.data_end; }
-    // Plausible, and with verify the back-pointer agrees, or is that of a script tag in the first place.
+    // Plausible; with `verify` the back-pointer must agree too, unless the tag is a script tag and the first tag.
     bool taken(int64_t position, const FileTag& tag, bool verify) const
     {
         const bool exempt = tag.type == FLVD_TAG_TYPE_SCRIPT && position <= m_ctx.data_offset + 4;

@@ -1,5 +1,5 @@
-// The cached file and its bit reader against a plain array and a bit position: whatever the cache, the read size and
-// the order of calls, they must be the same.
+// Checks the cached file and its bit reader against a plain array and a bit position: they must agree for any cache,
+// read size and order of calls.
 
 #include "judge.h"
 
@@ -7,7 +7,7 @@ using namespace flvd_fuzz;
 
 namespace {
 
-constexpr uint32_t BIT_READER_CACHE = 8; // a smaller cache does not hold what the bit reader looks at
+constexpr uint32_t BIT_READER_CACHE = 8; // a smaller cache does not hold what the bit reader peeks at
 
 class Reader {
 public:
@@ -21,10 +21,10 @@ public:
 
     void call(uint8_t code, uint32_t n)
     {
-        m_host.begin(1200); // over-reading with a read size of one byte costs a call for each byte
+        m_host.begin(1200); // with overread and a read size of 1, each byte costs a call
         apply(code, n);
-        require(__FLV_DMX__fioTell64(m_file) == m_position, "another position");
-        require(uint64_t{m_file->head} + m_file->count <= m_room, "more cached than there is room for");
+        require(__FLV_DMX__fioTell64(m_file) == m_position, "wrong position");
+        require(uint64_t{m_file->head} + m_file->count <= m_room, "more bytes cached than fit");
     }
 
 private:
@@ -42,24 +42,24 @@ private:
         switch (code % 8) {
         case 0: {
             const uint32_t got = __FLV_DMX__fioShowBytesByPtr(&bytes, n, m_file);
-            return require(got == std::min<int64_t>(left(n), m_room) && holds(bytes, got), "peeked bytes");
+            return require(got == std::min<int64_t>(left(n), m_room) && holds(bytes, got), "wrong bytes from a peek");
         }
         case 1: {
             const uint32_t element = 1 + code / 64u;
             const int64_t expected = left(int64_t{n} * element);
             Bytes copy(size_t{n} * element);
             const uint32_t got = __FLV_DMX__fioRead(copy.data(), element, n, m_file);
-            require(got == expected / element && holds(copy.data(), expected), "read bytes");
+            require(got == expected / element && holds(copy.data(), expected), "wrong bytes from a read");
             return move_to(m_position + expected);
         }
         case 2:
-            require(__FLV_DMX__fioSkipBytes(n, m_file) == n, "a skip");
+            require(__FLV_DMX__fioSkipBytes(n, m_file) == n, "a skip failed");
             return move_to(m_position + n);
         case 3:
             return seek(code / 8 % 3, n);
         case 4:
             return require((__FLV_DMX__fioSetCacheReadSize(m_file, n % 80) == 1) == (n % 80 <= m_file->capacity),
-                           "the read size");
+                           "wrong result of setting the read size");
         case 5:
             __FLV_DMX__bitInit(m_file);
             m_bits_valid = m_room >= BIT_READER_CACHE;
@@ -76,7 +76,7 @@ private:
         const int64_t base = whence == FIO_SEEK_SET ? 0 : whence == FIO_SEEK_CUR ? m_position : m_host.visible();
         if (base + offset < 0)
             return;
-        require(__FLV_DMX__fioSeek64(m_file, offset, whence) == 0, "a seek");
+        require(__FLV_DMX__fioSeek64(m_file, offset, whence) == 0, "a seek failed");
         move_to(base + offset);
     }
     uint32_t bit_field(uint32_t n) const
@@ -96,9 +96,9 @@ private:
         else if (code >= 128)
             __FLV_DMX__bitSkipBits(m_file, length);
         else if (code >= 64)
-            return require(__FLV_DMX__bitShowUBits(m_file, length) == bit_field(length), "bits shown");
+            return require(__FLV_DMX__bitShowUBits(m_file, length) == bit_field(length), "wrong bits from a peek");
         else
-            require(__FLV_DMX__bitGetUBits(m_file, length) == bit_field(length), "bits taken");
+            require(__FLV_DMX__bitGetUBits(m_file, length) == bit_field(length), "wrong bits from a read");
         m_bit += length;
         m_position = (m_bit + 7) / 8;
     }

@@ -1,4 +1,4 @@
-// A libFuzzer program for the target that the build names; without that, a program that runs the files of folders
+// With FLVDMX_FUZZ_TARGET, the libFuzzer program of that target. Without it, a program that runs the files of folders
 // through the target named on the command line.
 
 #include "judge.h"
@@ -26,7 +26,7 @@ int main(int argc, char** argv)
     for (int i = 2; run != nullptr && i < argc; ++i) {
         for (const auto& entry : std::filesystem::directory_iterator(argv[i])) {
             std::printf("%s\n", entry.path().c_str());
-            std::fflush(stdout); // the last name printed is that of the file that ended the process
+            std::fflush(stdout); // if the process aborts, the last name printed is that of the file
             std::ifstream stream(entry.path(), std::ios::binary);
             const Bytes bytes{std::istreambuf_iterator<char>(stream), {}};
             Input input(bytes.data(), bytes.size());
@@ -34,6 +34,6 @@ int main(int argc, char** argv)
             ++count;
         }
     }
-    return count != 0 ? 0 : 1; // a wrong name or empty folders are no success
+    return count != 0 ? 0 : 1; // a wrong name or empty folders count as failure
 }
 #endif

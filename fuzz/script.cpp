@@ -1,14 +1,14 @@
-// Script data: the payload is one, in the middle of a file. It is read twice, by readers of different caches: where the
-// cache ends must not matter.
+// Script data: the input's payload is parsed as script data in the middle of a file. It is parsed twice, with different
+// cache sizes, because the size of the cache must not matter.
 
 #include "judge.h"
 
 namespace flvd_fuzz {
 namespace {
 
-constexpr size_t START = 24; // of the payload in the file
+constexpr size_t START = 24; // file position of the payload
 
-// What a payload sets in an instance as the probing has it when it meets the script tag.
+// What parsing a payload sets in an instance that is in the state in which probing meets the script tag.
 Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length)
 {
     const flvd_init_t init = host.init(options, 0, 0);
@@ -20,11 +20,11 @@ Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length
     __FLV_DMX__fioSeek64(ctx.cur_reader, START, FIO_SEEK_SET);
     host.begin(2000 + 30 * host.contents().size());
     const int32_t rc = FLVD_ReadMetadata(&ctx, length);
-    require(rc == 0 || rc == -1, "a result that reading of metadata has not");
+    require(rc == 0 || rc == -1, "a result that parsing of metadata does not have");
     require(host.position(ctx.cur_reader) == int64_t{START} + length, "the reader is not after the payload");
 
     const auto& [index, arrays] = std::tie(ctx.keyframe_index, ctx.keyframe_arrays);
-    const auto end = host.visible() + 5; // a key in the last bytes announces an array after them
+    const auto end = host.visible() + 5; // a key in the last bytes announces an array after the file
     require(index.times_offset <= end && index.positions_offset <= end, "an index outside the file");
     require(arrays.times_count <= length && arrays.positions_count <= length, "an array larger than the payload");
     const bool kept = (options & (FLVD_OPT_PROGRESSIVE | FLVD_OPT_INDEX_IN_MEMORY)) != 0;
@@ -44,7 +44,7 @@ void run(Input& input)
 {
     Bytes file = Concat({Bytes(START, 0x11), input.payload()});
     const uint32_t options = input.byte() & 0x0Fu;
-    const uint32_t more = input.byte(); // bytes of the file that are not the payload's
+    const uint32_t more = input.byte(); // bytes by which the script data is shorter or longer than the payload
     const uint32_t cache_size = 256u + 16u * input.byte();
     const auto size = static_cast<uint32_t>(input.payload().size());
     const uint32_t length = more < size ? size - more : size + more + 1;

@@ -1,8 +1,8 @@
 // Whole sessions: the control bytes are commands to the library and to its host, the payload is the file.
 //
-// Each result is judged: its code, the record, the bytes of a frame, where the readers stand, how many host calls it
-// took. While calls fail, the places are not judged; once the host has lied, only codes, memory and work are, until the
-// file is closed.
+// Each result is checked: its code, the record, the bytes of a frame, the positions of the readers, and the number of
+// host calls. While calls fail, positions are not checked. Once the host has lied, only codes, memory and the number of
+// calls are checked until the file is closed.
 
 #include "support/session.h"
 #include "judge.h"
@@ -13,9 +13,10 @@ using namespace flvd_fuzz;
 
 namespace {
 
-constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // frames requested after the commands
-constexpr uint64_t PATIENCE = 2000; // of most hosts that lie: they may lead through whole budgets, which takes long
-constexpr uint64_t BUDGETS = 30'000'000; // calls that a patient one may cost
+constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // MAX_PLAYED: frames requested after the commands
+constexpr uint64_t PATIENCE =
+    2000; // for most lying hosts: lies can make the library use up whole budgets, which is slow
+constexpr uint64_t BUDGETS = 30'000'000; // host calls allowed with a patient lying host
 constexpr uint8_t POISON = 0x5A;
 constexpr std::array<uint32_t, 8> CACHES = {0, 1024, 1, 1500, 65536, 4096, 16000, 0xFFFFFFFF};
 
@@ -74,17 +75,17 @@ public:
         begin();
         const int32_t rc =
             QVX_FLV_DMX((bits & 0x70u) == 0x70u ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN, &m_ctx, &init, &info);
-        require((rc == 0) == (m_ctx != nullptr), "an instance of a failed open, or none of a good one");
+        require((rc == 0) == (m_ctx != nullptr), "result and instance of an open disagree");
         if (m_ctx != nullptr)
             return judge_opened(info);
-        require(IsListed(Op::Open, rc, g_flvd_lLastError, g_flvd_lErrorLine), "a failure that no open has");
+        require(IsListed(Op::Open, rc, g_flvd_lLastError, g_flvd_lErrorLine), "a failure that opens do not have");
         m_host.require_clean();
     }
 
     void close()
     {
         begin();
-        require(m_ctx == nullptr || QVX_FLV_DMX(FLVD_OP_CLOSE, &m_ctx, nullptr, nullptr) == 0, "a close that fails");
+        require(m_ctx == nullptr || QVX_FLV_DMX(FLVD_OP_CLOSE, &m_ctx, nullptr, nullptr) == 0, "a close failed");
         m_ctx = nullptr;
         m_host.require_clean();
     }
@@ -101,14 +102,14 @@ public:
         begin();
         const int64_t before = place(reader);
         const int32_t rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &frame);
-        require(m_lied || m_faulty || place(reader) >= before, "a request that went back");
+        require(m_lied || m_faulty || place(reader) >= before, "a frame request moved back");
         if (rc == 0) {
-            require(!separate || frame.stream == stream, "a frame of another stream");
+            require(!separate || frame.stream == stream, "a frame of the wrong stream");
             return judge_frame(frame, m_host.position(reader) - 4);
         }
-        require(IsListed(Op::Frame, rc, m_ctx->error, m_ctx->error_line), "a failure that no frame has");
+        require(IsListed(Op::Frame, rc, m_ctx->error, m_ctx->error_line), "a failure that frame requests do not have");
         const bool refused = m_ctx->error <= FLVD_ERR_NO_VIDEO && m_ctx->error >= FLVD_ERR_INFO_ONLY;
-        require(bytes_of(frame) == Bytes(sizeof frame, refused ? POISON : 0), "the record of a failed request");
+        require(bytes_of(frame) == Bytes(sizeof frame, refused ? POISON : 0), "wrong record after a failed request");
     }
 
 private:
@@ -118,30 +119,31 @@ private:
     {
         const bool video = (m_ctx->streams & FLVD_STREAM_VIDEO) != 0, audio = (m_ctx->streams & FLVD_STREAM_AUDIO) != 0;
         const auto& arrays = m_ctx->keyframe_arrays;
-        require(video || audio, "no stream");
-        require(info.has_video == (video ? 1u : 0u) && info.has_audio == (audio ? 1u : 0u), "streams");
-        require(info.file_info == &m_ctx->file_info, "the record of the file");
-        require(info.video_info == (video ? &m_ctx->video_info : nullptr), "the record of video");
-        require(info.audio_info == (audio ? &m_ctx->audio_info : nullptr), "the record of audio");
+        require(video || audio, "an open without a stream succeeded");
+        require(info.has_video == (video ? 1u : 0u) && info.has_audio == (audio ? 1u : 0u), "wrong streams");
+        require(info.file_info == &m_ctx->file_info, "wrong record of the file");
+        require(info.video_info == (video ? &m_ctx->video_info : nullptr), "wrong record of the video");
+        require(info.audio_info == (audio ? &m_ctx->audio_info : nullptr), "wrong record of the audio");
         copy_of(m_ctx->video_info.config, m_ctx->video_info.config_size);
         copy_of(m_ctx->audio_info.config, m_ctx->audio_info.config_size);
         copy_of(arrays.times_ms, arrays.times_count * sizeof *arrays.times_ms);
         copy_of(arrays.positions, arrays.positions_count * sizeof *arrays.positions);
         require(m_lied || m_faulty || has(FLVD_OPT_PROGRESSIVE) || m_ctx->data_end <= m_host.visible(),
-                "the end of the data");
+                "the data ends past the file");
     }
 
-    // Where delivery goes on: a growing file's tag that waits to be tried again is gone back to first.
+    // Where delivery continues: in a growing file, the saved position of a tag that is to be retried takes precedence.
     int64_t place(const fio_file_t* reader)
     {
         const int64_t saved = reader == m_ctx->main_reader ? m_ctx->saved_main_pos : m_ctx->saved_audio_pos;
         return has(FLVD_OPT_PROGRESSIVE) && saved != 0 ? saved : m_host.position(reader);
     }
 
-    // While calls fail the way over the back-pointer may have failed too: then the tag may be anywhere.
+    // While calls fail, skipping the back-pointer may have failed too; the tag may then be anywhere.
     void judge_frame(const flvd_frame_t& frame, int64_t end) const
     {
-        require(m_buffer.empty() || (frame.data == m_buffer.data() && frame.size <= m_buffer.size()), "another buffer");
+        require(m_buffer.empty() || (frame.data == m_buffer.data() && frame.size <= m_buffer.size()),
+                "a frame outside the caller's buffer");
         copy_of(frame.data, frame.size);
         end = m_faulty ? m_host.visible() : end;
         while (m_faulty && end > 0 && !is_tag_of(frame, end))
@@ -176,30 +178,31 @@ private:
         const bool judged = !m_lied && !m_faulty;
         if (rc == 0 && judged && ((request.mode & FLVD_SEEK_RELATIVE) == 0 || time != 0))
             return judge_landing(reached);
-        require(rc == 0 || IsListed(Op::Seek, rc, m_ctx->error, m_ctx->error_line), "a failure that no seek has");
+        require(rc == 0 || IsListed(Op::Seek, rc, m_ctx->error, m_ctx->error_line), "a failure that seeks do not have");
         require(rc == 0 || reached == POISON, "a failed seek wrote a time");
         const bool stays = rc != 0 && judged && (request.mode & FLVD_SEEK_TO_END_ON_MISS) == 0;
-        require(!stays || (place(m_ctx->main_reader) == main && place(m_ctx->audio_reader) == audio), "a place lost");
+        require(!stays || (place(m_ctx->main_reader) == main && place(m_ctx->audio_reader) == audio),
+                "a failed seek lost the position");
     }
 
     void judge_landing(int32_t reached)
     {
         const int64_t position = m_host.position(m_ctx->main_reader);
-        require(position >= m_ctx->data_offset && position <= m_host.visible(), "a seek out of the data");
+        require(position >= m_ctx->data_offset && position <= m_host.visible(), "a seek left the data");
         FileTag tag;
         if ((m_ctx->streams & FLVD_STREAM_VIDEO) == 0 || position == m_ctx->data_offset)
             return;
-        require(read_tag(m_host.contents(), position, &tag), "a seek to no tag");
-        require(tag.timestamp == m_ctx->first_ts + static_cast<uint32_t>(reached), "a seek that reports another time");
-        if (m_ctx->seek_method == FLVD_SEEK_BY_SCAN) // an index may point at anything that carries about its time
-            require(tag.video() && tag.keyframe(), "a seek to no keyframe");
+        require(read_tag(m_host.contents(), position, &tag), "a seek landed where there is no tag");
+        require(tag.timestamp == m_ctx->first_ts + static_cast<uint32_t>(reached), "a seek reported the wrong time");
+        if (m_ctx->seek_method == FLVD_SEEK_BY_SCAN) // an index may point at any tag with about the same time
+            require(tag.video() && tag.keyframe(), "a seek by scanning did not land on a keyframe");
     }
 
     Host m_host;
     flvd_ctx_t* m_ctx = nullptr;
     Bytes m_buffer;
     uint32_t m_lies = 0;
-    bool m_was_opened = false, m_lied = false; // a lie counts until the file is closed
+    bool m_was_opened = false, m_lied = false; // m_lied holds until the file is closed
     bool m_faulty = false;                     // calls may fail or read short
 };
 
