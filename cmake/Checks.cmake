@@ -1,12 +1,12 @@
-# Checks of the sources, one test per file so that they run side by side, and of the samples under valgrind.
+# Checks of the sources, one test per file so that they run in parallel, and of the samples under valgrind.
 
 find_program(CLANG_TIDY clang-tidy REQUIRED)
 find_program(CPPCHECK cppcheck REQUIRED)
 find_program(VALGRIND valgrind REQUIRED)
 
-# Sources of the folders that this build compiles; headers are checked with the sources that include them. The tests
-# and the bench go without the path-sensitive analyzer: it takes minutes for the macros of one test file and finds fault
-# with Google Benchmark's, and the tests run with the sanitizers anyway.
+# Sources of the folders that this build compiles; headers are checked with the sources that include them. The tests and
+# the bench are not checked with the path-sensitive analyzer: it takes minutes for the macros of one test file and
+# complains about those of Google Benchmark, and the tests run with the sanitizers anyway.
 file(GLOB_RECURSE compiled CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR}
     flvdmx/*.cpp host/*.c tools/*.cpp examples/*.c examples/*.cpp tests/*.cpp bench/*.cpp fuzz/*.cpp)
 foreach(source IN LISTS compiled)
@@ -14,14 +14,14 @@ foreach(source IN LISTS compiled)
     if(source MATCHES "^(tests|bench)/")
         set(less --checks=-clang-analyzer-*)
     endif()
-    # clang does not know g++'s options for link-time optimisation
+    # clang does not know g++'s options for link-time optimisation.
     add_test(NAME tidy/${source} COMMAND ${CLANG_TIDY} --quiet -p ${PROJECT_BINARY_DIR} ${less} ${source}
             --extra-arg=-Wno-ignored-optimization-argument
         WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})
     set_tests_properties(tidy/${source} PROPERTIES LABELS tidy)
 endforeach()
 
-# Over the library alone: the two see what clang's analyzer may miss, and take seconds.
+# Two more analyzers, for the library only: they find what clang's may miss, and take seconds.
 file(GLOB library CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/flvdmx/*/*.cpp)
 add_test(NAME cppcheck COMMAND ${CPPCHECK} --quiet --error-exitcode=1 --enable=warning,performance,portability
     --std=c++17 --language=c++ -I . ${library} WORKING_DIRECTORY ${PROJECT_SOURCE_DIR})

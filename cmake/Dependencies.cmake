@@ -1,5 +1,5 @@
-# The packages from outside that the tool and the tests use. In a cross build nothing of the build machine can be
-# linked: GoogleTest is built from Debian's source package, the rest is used as headers alone.
+# The external packages that the tool and the tests use. A cross build cannot link libraries of the build machine, so it
+# builds GoogleTest from Debian's source package and uses the other packages as header-only libraries.
 
 if(NOT CMAKE_CROSSCOMPILING)
     if(FLVDMX_TOOLS)
@@ -13,7 +13,7 @@ if(NOT CMAKE_CROSSCOMPILING)
     return()
 endif()
 
-# A folder with these headers alone: /usr/include itself would put the build machine's C library before the target's.
+# Uses a folder with only these headers: /usr/include itself would bring the build machine's C library in as well.
 function(flvdmx_header_library target folder)
     find_path(include_${folder} ${folder} PATHS /usr/include REQUIRED NO_DEFAULT_PATH NO_CMAKE_FIND_ROOT_PATH)
     file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/headers/${folder})

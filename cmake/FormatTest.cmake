@@ -1,4 +1,4 @@
-# The test "format": every source as clang-format would write it. `./dev format` writes it so.
+# The test "format" checks that all sources are formatted by clang-format, as `./dev format` does it.
 
 find_program(CLANG_FORMAT clang-format REQUIRED)
 

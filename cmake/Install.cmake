@@ -1,7 +1,7 @@
-# What is installed, in three components: runtime, development and tools. Everything finds everything else by relative
-# paths, so that an installed tree may be moved.
+# Installs three components: runtime, development and tools. Installed files refer to each other by relative paths, so
+# that an installed tree can be moved.
 
-# On Debian the folder that bears the architecture's name, in cross builds and under every prefix.
+# On Debian, libraries go into the architecture's folder, also in cross builds and below every prefix.
 if(EXISTS /etc/debian_version AND CMAKE_LIBRARY_ARCHITECTURE)
     set(CMAKE_INSTALL_LIBDIR lib/${CMAKE_LIBRARY_ARCHITECTURE} CACHE PATH "Libraries, below the prefix")
 endif()
@@ -35,7 +35,7 @@ foreach(name IN ITEMS flvdmx flvdmx-host)
         DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig COMPONENT development)
 endforeach()
 
-# What those who write a host read and copy; the folders lie as in the source tree, for links and includes.
+# What authors of a host read and copy. The folders are arranged as in the source tree, so that links and includes work.
 set(doc_dir ${CMAKE_INSTALL_DATADIR}/doc/flvdmx)
 install(FILES ${PROJECT_SOURCE_DIR}/docs/host-guide.md ${PROJECT_SOURCE_DIR}/docs/damage.md
     DESTINATION ${doc_dir}/docs COMPONENT development)
@@ -43,7 +43,7 @@ install(DIRECTORY ${PROJECT_SOURCE_DIR}/examples ${PROJECT_SOURCE_DIR}/host DEST
     FILES_MATCHING PATTERN "*.c" PATTERN "*.cpp" PATTERN "*.h" PATTERN "host/include" EXCLUDE)
 
 file(MAKE_DIRECTORY ${PROJECT_BINARY_DIR}/man)
-# flvdmx_install_man(PAGE COMPONENT): compressed without the time, so that the same sources give the same bytes.
+# flvdmx_install_man(PAGE COMPONENT): compresses the page without a timestamp, so that builds are reproducible.
 function(flvdmx_install_man page component)
     set(source ${PROJECT_SOURCE_DIR}/docs/man/${page})
     set_property(DIRECTORY ${PROJECT_SOURCE_DIR} APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${source})
@@ -59,7 +59,7 @@ if(FLVDMX_TOOLS)
     file(RELATIVE_PATH lib_from_bin /${CMAKE_INSTALL_BINDIR} /${CMAKE_INSTALL_LIBDIR})
     set_target_properties(flvdmx-tool PROPERTIES INSTALL_RPATH "$ORIGIN/${lib_from_bin}")
     install(TARGETS flvdmx-tool RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT tools)
-    # The loader finds the library under the system's own prefix without help.
+    # Below the system's own prefix the loader finds the library without a run path.
     install(CODE "if(CMAKE_INSTALL_PREFIX STREQUAL \"/usr\")
         file(RPATH_REMOVE FILE \"\$ENV{DESTDIR}/usr/${CMAKE_INSTALL_BINDIR}/flvdmx\")
     endif()" COMPONENT tools)

@@ -1,5 +1,5 @@
-# Tests of the interface itself, run in every preset, cross builds included: each public header alone in the languages
-# that it is for, and what the library exports and imports.
+# Tests of the interface, run in every preset and in cross builds: every public header compiles on its own in the
+# languages that it supports, and the library exports and imports what it should.
 
 find_package(Python3 REQUIRED COMPONENTS Interpreter)
 
@@ -16,7 +16,7 @@ foreach(header IN LISTS headers ITEMS flvdmx/flvdmx.h flvdmx/layers.h)
             -x c++ /dev/null)
 endforeach()
 
-# A sanitizer brings symbols of its own; without optimisation the compiler is free to call more of its library.
+# Sanitizers add symbols, and without optimisation the compiler calls more library functions.
 if(CMAKE_BUILD_TYPE STREQUAL "Release" AND NOT FLVDMX_SANITIZE)
     add_test(NAME ${FLVDMX_TEST_PREFIX}symbols
         COMMAND ${Python3_EXECUTABLE} -B ${PROJECT_SOURCE_DIR}/tests/check_symbols.py

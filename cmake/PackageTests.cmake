@@ -1,5 +1,5 @@
-# Tests of what users get beside the library's code: the installed copy, the packages, the manual pages, the binary
-# interface and the reference. Once, in the build that is released.
+# Tests of what users get in addition to the code: the installed copy, the packages, the manual pages, the binary
+# interface and the reference. They run only in the build that is released.
 
 find_package(Python3 REQUIRED COMPONENTS Interpreter)
 find_program(ABIDW abidw REQUIRED)
@@ -26,7 +26,7 @@ flvdmx_python_test(options check_options.py $<TARGET_FILE:flvdmx-tool> ${manuals
     ${PROJECT_SOURCE_DIR}/packaging/flvdmx.bash)
 add_test(NAME manuals COMMAND ${MANDOC} -T lint -W warning ${manuals}/flvdmx.1 ${manuals}/QVX_FLV_DMX.3)
 
-# The binary interface against the one that was released. New functions are no break; `abi-dump` takes changes in.
+# Compares the binary interface with the released one. New functions are compatible; `abi-dump` records changes.
 target_compile_options(flvdmx PRIVATE -g) # changes no code; packages are stripped
 add_library(flvdmx-argument-types SHARED packaging/abi/argument_types.cpp)
 flvdmx_target(flvdmx-argument-types)

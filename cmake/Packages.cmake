@@ -1,4 +1,4 @@
-# Debian packages by CPack, one a component: libflvdmx1, libflvdmx-dev, flvdmx-tools.
+# Debian packages, built by CPack, one per component: libflvdmx1, libflvdmx-dev, flvdmx-tools.
 
 set(CPACK_GENERATOR DEB)
 set(CPACK_DEB_COMPONENT_INSTALL ON)
@@ -8,7 +8,7 @@ if(FLVDMX_TOOLS)
 endif()
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_STRIP_FILES ON)
-set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "") # it would stand above the summary of every package
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "") # would be printed above the summary of every package
 set(CPACK_PACKAGE_VENDOR "the flvdmx authors")
 set(CPACK_PACKAGE_CONTACT "the flvdmx authors")
 set(CPACK_DEBIAN_PACKAGE_RELEASE 1)
@@ -20,8 +20,8 @@ set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS ${CMAKE_LIBRARY_OUTPUT_DIRECTORY
 get_target_property(abi flvdmx SOVERSION)
 set(version ${PROJECT_VERSION}-${CPACK_DEBIAN_PACKAGE_RELEASE})
 
-# flvdmx_package(COMPONENT NAME SECTION MULTIARCH SUMMARY DESCRIPTION): its control fields and its licence. CPack has no
-# variable for the field Multi-Arch before 3.31: it is a second line of the section's.
+# flvdmx_package(COMPONENT NAME SECTION MULTIARCH SUMMARY DESCRIPTION): sets a package's control fields and installs its
+# licence. CPack has no variable for the Multi-Arch field before 3.31, so it is set as a second line of the section.
 macro(flvdmx_package component name section multiarch summary description)
     string(TOUPPER ${component} key)
     set(CPACK_DEBIAN_${key}_PACKAGE_NAME ${name})
@@ -34,13 +34,13 @@ macro(flvdmx_package component name section multiarch summary description)
 endmacro()
 
 flvdmx_package(runtime libflvdmx${abi} libs same "demultiplexer for the FLV container"
-    "Finds the audio and the video stream of an FLV file, their codec configuration\nand the metadata, and delivers \
-one frame a call. Plays files that are still\nbeing written and survives damage. It uses only the memory and \
-file functions\nthat the program gives it.")
+    "Finds the audio and video streams of an FLV file, their codec configuration\nand the metadata, and delivers \
+one frame per call. Plays files that are still\nbeing written and survives damage. Uses only the memory and \
+file functions\nthat the program supplies.")
 flvdmx_package(development libflvdmx-dev libdevel same "demultiplexer for the FLV container (development files)"
     "Headers for C and C++, the host kit with ready-made file functions, and the\nfiles for pkg-config and CMake.")
 if(FLVDMX_TOOLS)
-    flvdmx_package(tools flvdmx-tools video foreign "looks into FLV files, judges them and takes them apart"
+    flvdmx_package(tools flvdmx-tools video foreign "inspects, checks and demultiplexes FLV files"
         "The program flvdmx lists streams and frames, seeks, extracts elementary\nstreams, checks files for damage and \
 draws their bit rate.")
 endif()
@@ -49,7 +49,8 @@ set(CPACK_DEBIAN_RUNTIME_PACKAGE_CONTROL_EXTRA ${PROJECT_SOURCE_DIR}/packaging/t
 set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_DEPENDS "libflvdmx${abi} (= ${version})")
 set(CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS "libflvdmx${abi} (>= ${PROJECT_VERSION})")
 if(CMAKE_CROSSCOMPILING)
-    # The cross compiler's libraries belong to packages that the target does not have: named here as Debian 12 has them.
+    # The cross compiler's libraries belong to packages that do not exist on the target, so the dependencies cannot be
+    # derived from them. These are the target's packages in Debian 12.
     set(CPACK_DEBIAN_PACKAGE_ARCHITECTURE armhf)
     set(CPACK_DEBIAN_RUNTIME_PACKAGE_DEPENDS "libc6 (>= 2.36)")
     string(APPEND CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS ", libc6 (>= 2.36), libgcc-s1, libstdc++6 (>= 12)")

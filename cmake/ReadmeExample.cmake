@@ -1,4 +1,4 @@
-# Builds the C example of the README as it stands there and runs it on the file that the examples play as well.
+# Builds the C example exactly as it is in the README, and runs it on the file that the other examples play.
 
 set(readme ${PROJECT_SOURCE_DIR}/README.md)
 set_property(DIRECTORY APPEND PROPERTY CMAKE_CONFIGURE_DEPENDS ${readme})

@@ -1,4 +1,4 @@
-# 32-bit ARM Linux, hard float: Debian's g++-arm-linux-gnueabihf; what is built runs in qemu-user-static.
+# 32-bit ARM Linux, hard float: builds with Debian's g++-arm-linux-gnueabihf, runs with qemu-user-static.
 set(CMAKE_SYSTEM_NAME Linux)
 set(CMAKE_SYSTEM_PROCESSOR arm)
 set(CMAKE_C_COMPILER arm-linux-gnueabihf-gcc)

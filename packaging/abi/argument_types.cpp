@@ -1,5 +1,5 @@
-// The types of arguments and results that the signatures give as pointers to void or plain integers: gathered here for
-// the comparison of binary interfaces, and compiled for nothing else.
+// The types of arguments and results that signatures declare as void pointers or plain integers. Compiled only for the
+// comparison of binary interfaces, which would not see them otherwise.
 #include "flvdmx/flvdmx.h"
 
 struct Interface {
