@@ -14,8 +14,7 @@ using namespace flvd_fuzz;
 namespace {
 
 constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // MAX_PLAYED: frames requested after the commands
-constexpr uint64_t PATIENCE =
-    2000; // for most lying hosts: lies can make the library use up whole budgets, which is slow
+constexpr uint64_t PATIENCE = 2000;      // for most lying hosts: lies can use up whole budgets, which is slow
 constexpr uint64_t BUDGETS = 30'000'000; // host calls allowed with a patient lying host
 constexpr uint8_t POISON = 0x5A;
 constexpr std::array<uint32_t, 8> CACHES = {0, 1024, 1, 1500, 65536, 4096, 16000, 0xFFFFFFFF};

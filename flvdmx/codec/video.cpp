@@ -11,9 +11,8 @@
 
 namespace {
 
-constexpr uint32_t FLVD_VIDEO_PAYLOAD =
-    FLVD_CODEC_BYTE_OFFSET + 1;             // offset of the data of codecs without a packet type
-constexpr uint32_t FLVD_PICTURE_PEEK = 128; // bytes of the tag in which a picture header is searched
+constexpr uint32_t FLVD_VIDEO_PAYLOAD = FLVD_CODEC_BYTE_OFFSET + 1; // codecs without a packet type
+constexpr uint32_t FLVD_PICTURE_PEEK = 128; // bytes of the tag that are searched for a picture header
 
 constexpr int32_t FLVD_VIDEO_HEADER_MIN = 8; // no codec has a shorter header
 constexpr int32_t FLVD_AVC_OUT_CAPACITY = 128;

@@ -43,8 +43,7 @@ void FLVD_StartAt(const flvd_scan_t* scan, int64_t position)
 int32_t FLVD_FailWalk(const flvd_scan_t* scan, int32_t code)
 {
     FLVD_Record(scan->ctx, scan->audio ? FLVD_SITE_AUDIO_WALK : FLVD_SITE_VIDEO_WALK);
-    return code == FLVD_ERR_END_OF_DATA ? FLVD_ERR_NOT_FOUND
-                                        : code; // data that ends on the way back is a failure, not a miss
+    return code == FLVD_ERR_END_OF_DATA ? FLVD_ERR_NOT_FOUND : code; // running out of data here is not a miss
 }
 
 int32_t FLVD_Answer(const flvd_scan_t* scan)

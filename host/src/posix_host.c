@@ -1,8 +1,7 @@
 /*
  * Host functions on POSIX descriptors, with a read window for each file.
  *
- * The position that the library sees is a number kept here. The descriptor itself moves only when a read continues the
- * previous one.
+ * The position that the library sees is a number kept here. The descriptor itself moves only with consecutive reads.
  */
 #define _FILE_OFFSET_BITS 64    /* 64-bit pread and lseek on 32-bit systems, and an open that accepts large files */
 #define _POSIX_C_SOURCE 200809L /* pread, O_CLOEXEC */

@@ -78,8 +78,7 @@ static void* open_stream(const char* path, const char* mode)
     return stream;
 }
 
-/* The library reads elements of 1 byte. A read cut short by a signal continues; the end of the file or an error ends
- * it. */
+/* The library reads elements of 1 byte. A read that a signal interrupts continues until the end or a real error. */
 static uint32_t read_stream(void* buffer, uint32_t size, uint32_t count, void* handle)
 {
     stream_t* const stream = handle;

@@ -37,7 +37,7 @@ extern "C" {
  * @param buffer   receives the bytes
  * @param size     bytes wanted, at least 1
  * @return bytes read. When these are fewer than wanted, the kit calls again for the rest. 0 means the end of the file
- * or a failure; the two look the same.
+ *         or a failure; the two look the same.
  */
 typedef uint32_t (*flvd_read_at_fn)(void* user, int64_t position, void* buffer, uint32_t size);
 

@@ -24,8 +24,8 @@ extern "C" {
  *
  * @param init block to fill; need not outlive the open
  * @note  All open modes work. Opening a directory fails. Streams are unbuffered, since the library has its own cache. A
- *        read is short only at the end or after an error. The 64-bit functions reach beyond 2 GiB, where the 32-bit
- * tell fails.
+ *        read is short only at the end or after an error. Beyond 2 GiB the 32-bit tell fails; the 64-bit functions
+ * work.
  */
 void flvd_stdio_host_fill(flvd_init_t* init);
 
