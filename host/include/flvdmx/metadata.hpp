@@ -1,6 +1,6 @@
 /*
- * The metadata of a file as flvdmx::File::metadata() returns it: the properties of its script data, read as AMF0
- * ("Action Message Format, AMF 0"). Usable from C++17.
+ * The metadata of a file, as returned by flvdmx::File::metadata(): the properties of its script data, parsed as AMF0
+ * ("Action Message Format, AMF 0"). For C++17.
  */
 #ifndef FLVDMX_METADATA_HPP
 #define FLVDMX_METADATA_HPP
@@ -18,37 +18,37 @@
 
 namespace flvdmx {
 
-/** A date of the metadata. */
+/** A date in the metadata. */
 struct Date {
-    double milliseconds = 0;  /**< since the beginning of 1970, UTC, as in the file; NaN and infinity are possible */
-    int16_t zone_minutes = 0; /**< the time zone as in the file, mostly 0; not included in `milliseconds` */
+    double milliseconds = 0;  /**< since 1 January 1970 UTC, as in the file; may be NaN or infinite */
+    int16_t zone_minutes = 0; /**< time zone as in the file, usually 0; not included in `milliseconds` */
 };
 
 /** One property. */
 struct Property {
-    std::string name;                                    /**< nested names joined by dots: "cuePoints.0.name" */
-    std::variant<double, bool, std::string, Date> value; /**< text is UTF-8 when the file keeps the rules */
+    std::string name;                                    /**< nested names are joined by dots: "cuePoints.0.name" */
+    std::variant<double, bool, std::string, Date> value; /**< strings are UTF-8 if the file follows the format */
 };
 
 /**
- * Properties in file order: title, creator, encoder and the like. Those of "onMetaData" go by their bare names, those
- * of other script data by a name that begins with that of the data; elements of arrays are numbered from 0. The
- * keyframe index is left out: see File::keyframes().
+ * Properties in file order: title, creator, encoder and the like. Names of properties of "onMetaData" are used as they
+ * are; those of other script data are prefixed with the name of that data. Array elements are numbered from 0. The
+ * keyframe index is not included: see File::keyframes().
  *
- * Whatever the file holds, there are at most 1000 properties, 16 levels deep, with at most 1 MiB of names and texts;
- * what comes after that is left out.
+ * For any file, there are at most 1000 properties, 16 levels deep, with at most 1 MiB of names and strings. Everything
+ * beyond that is dropped.
  */
 class Metadata {
 public:
-    static constexpr size_t max_properties = 1000; /**< kept */
-    static constexpr size_t max_text = 1u << 20;   /**< bytes of names and texts kept */
-    static constexpr int max_depth = 16;           /**< levels of objects and arrays followed */
+    static constexpr size_t max_properties = 1000; /**< most properties kept */
+    static constexpr size_t max_text = 1u << 20;   /**< most bytes of names and strings kept */
+    static constexpr int max_depth = 16;           /**< most levels of nested objects and arrays */
 
     std::vector<Property>::const_iterator begin() const { return m_properties.begin(); } /**< the first property */
-    std::vector<Property>::const_iterator end() const { return m_properties.end(); }     /**< after the last */
-    size_t size() const { return m_properties.size(); }                                  /**< their number */
+    std::vector<Property>::const_iterator end() const { return m_properties.end(); }     /**< past the last property */
+    size_t size() const { return m_properties.size(); }                                  /**< number of properties */
 
-    /** @return the first property of that name, null without one; valid while the Metadata lives */
+    /** @return the first property with that name, or null; valid while the Metadata lives */
     const Property* find(std::string_view name) const&
     {
         for (const Property& property : m_properties)
@@ -57,9 +57,9 @@ public:
         return nullptr;
     }
 
-    const Property* find(std::string_view name) const&& = delete; /**< refused: the property would be gone at once */
+    const Property* find(std::string_view name) const&& = delete; /**< deleted: the result would dangle */
 
-    /** @return a copy of the text of the property of that name; empty when there is none or it is not a text */
+    /** @return a copy of the string property with that name; empty when there is none or it is not a string */
     std::string text(std::string_view name) const
     {
         const Property* const property = find(name);
@@ -76,12 +76,12 @@ public:
     }
 
 private:
-    // Reads AMF0 values. Whatever cannot be read ends the payload.
+    // Parses AMF0 values. Anything that cannot be parsed ends the payload.
     class Reader {
     public:
         Reader(Metadata& metadata, Bytes payload) : m_metadata(metadata), m_rest(payload) {}
 
-        // One value that is not inside another. A text there names the values after it.
+        // Reads one top-level value. A string there is the name of the values that follow.
         bool read_event()
         {
             if (m_rest[0] != string)
@@ -99,7 +99,7 @@ private:
                                  reference = 7, ecma_array = 8, object_end = 9, strict_array = 10, date = 11,
                                  long_string = 12, unsupported = 13, xml_document = 15, typed_object = 16;
 
-        // The next bytes; none when there are not so many, and the payload has ended.
+        // Takes the next bytes. When there are fewer, returns none and ends the payload.
         Bytes take(size_t size)
         {
             m_failed = m_failed || size > m_rest.size();
@@ -131,7 +131,7 @@ private:
             return {milliseconds, static_cast<int16_t>(take_integer(2))};
         }
 
-        // A text after its length, a number of 2 or 4 bytes.
+        // Takes a string preceded by its length, a number of 2 or 4 bytes.
         std::string_view take_text(size_t length_size)
         {
             const Bytes text = take(static_cast<uint32_t>(take_integer(length_size)));
@@ -144,7 +144,7 @@ private:
             return keep(std::string(text), text.size());
         }
 
-        // False when there is no room, which ends the payload as well.
+        // Adds a property. False at a limit, which ends the payload as well.
         template <typename Value> bool keep(Value value, size_t text_size = 0)
         {
             if (m_failed || m_skips)
@@ -174,7 +174,7 @@ private:
             return read;
         }
 
-        // Members up to an empty name with the end marker.
+        // Reads members up to an empty name followed by the end marker.
         bool read_object(int depth)
         {
             while (!m_failed) {
@@ -201,7 +201,7 @@ private:
             if (marker == strict_array)
                 return read_array(depth);
             if (marker == ecma_array)
-                take(4); // a count that need not be right
+                take(4); // the count, which is not reliable
             if (marker == typed_object)
                 take_text(2);
             return read_object(depth);
@@ -211,7 +211,7 @@ private:
         {
             if (depth == max_depth)
                 return false;
-            const bool skipped = std::exchange(m_skips, m_skips || m_name == "keyframes"); // numbers by the thousand
+            const bool skipped = std::exchange(m_skips, m_skips || m_name == "keyframes"); // skip thousands of numbers
             const bool read = read_members(marker, depth + 1);
             m_skips = skipped;
             return read;
@@ -253,7 +253,7 @@ private:
 
         Metadata& m_metadata;
         Bytes m_rest;
-        std::string m_name; // of the value being read, those of the containers around it included
+        std::string m_name; // of the value being read, prefixed with those of its containers
         bool m_skips = false;
         bool m_failed = false;
     };
