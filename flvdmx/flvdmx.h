@@ -189,7 +189,7 @@ typedef struct flvd_init_t {
     flvd_file_seek64_fn file_seek64; /**< word 25, may be null */
     flvd_file_tell64_fn file_tell64; /**< word 26, may be null */
     uintptr_t unused27[5];           /**< words 27 to 31, not read */
-    const char* file_name;           /**< word 32: path, passed to file_open as it is; must live until close */
+    const char* file_name;           /**< word 32: path, passed to file_open unchanged; must live until close */
     uintptr_t options;               /**< word 33: FLVD_OPT_* bits */
     uintptr_t cache_size;            /**< word 34: cache size of each reader; 0 means 4096, the least is 1024 */
     uintptr_t scan_read_size;        /**< word 35: bytes per read while scanning; 0 means 16, at most the cache size */

@@ -131,7 +131,7 @@ FLVD_API void __FLV_DMX__fioSetFunc(const fio_funcs_t* funcs);
 /**
  * Opens a cached file.
  *
- * @param path           passed to the host's file_open as it is
+ * @param path           passed to the host's file_open unchanged
  * @param mode           FIO_MODE_* bits; combinations without a mode string fail before the host is called
  * @param cache_size     cache size in bytes, at least 1
  * @param overread       non-zero: a refill reads the full request in addition to the cached bytes
