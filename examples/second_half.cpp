@@ -27,9 +27,11 @@ int main(int argc, char** argv)
         return complain(argv[1], file.error());
 
     const auto metadata = file->metadata();
-    const std::string title = (*metadata).text("title");
-    std::printf("title: %s\n", title.empty() ? "none" : title.c_str());
     const auto keyframes = file->keyframes();
+    if (!metadata || !keyframes)
+        return complain(argv[1], metadata ? keyframes.error() : metadata.error());
+    const std::string title = metadata->text("title");
+    std::printf("title: %s\n", title.empty() ? "none" : title.c_str());
     for (const flvdmx::Keyframe& keyframe : *keyframes)
         std::printf("keyframe: %lld ms, byte %lld\n", number(keyframe.time), static_cast<long long>(keyframe.position));
 

@@ -183,8 +183,17 @@ Bytes ConfigOf(char letter)
 {
     Bytes config = letter < 'a' ? SmallAvcRecord() : Bytes{0x12, 0x10};
     config.push_back(static_cast<uint8_t>(letter));
-    config.resize(letter == 'X' ? 65536 : letter == 'L' ? 5000 : config.size());
+    config.resize(letter == 'X' ? 65537 : letter == 'L' ? 5000 : config.size());
     return config;
+}
+
+// A dot for none.
+char LetterOf(const flvdmx::Bytes& config)
+{
+    for (const char letter : std::string("ABCLXabc"))
+        if (ConfigOf(letter) == Bytes(config.begin(), config.end()))
+            return letter;
+    return '.';
 }
 
 // A file of configurations, pictures (1), sounds (2) and holes of zeros (#), one every 10 ms.
@@ -214,10 +223,8 @@ std::string ReportedConfigs(flvdmx::File& file, const Flv& flv, const std::strin
     for (const Stream stream : apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any})
         for (auto frame = file.follow(wait, stream); frame; frame = file.follow(wait, stream))
             for (size_t i = 0; i < letters.size() && frame->config_changed(); ++i)
-                if (ConfigOf(letters[i]) == Bytes(frame->new_config.begin(), frame->new_config.end()))
-                    for (size_t tag = 0; tag < letters.size(); ++tag)
-                        if (flv.tags[tag].offset == frame->position)
-                            reported[tag] = letters[i];
+                if (flv.tags[i].offset == frame->position)
+                    reported[i] = LetterOf(frame->new_config);
     return reported;
 }
 
@@ -245,6 +252,7 @@ TEST(Interface, ReportsChangedConfigurations)
             memory.size = growing ? static_cast<uint64_t>(flv.tags[3].end()) : flv.bytes.size();
             auto file = flvdmx::File::open("memory", g_memory, {1024, 0, apart, growing});
             const auto grow = [&] {
+                EXPECT_FALSE(file->seek(1s)) << "which leaves everything as it was";
                 memory.size = std::min<uint64_t>(memory.size + 7 + flv.bytes.size() / 200, flv.bytes.size());
                 return memory.size < flv.bytes.size();
             };
@@ -255,6 +263,61 @@ TEST(Interface, ReportsChangedConfigurations)
             EXPECT_EQ(ReportedConfigs(*file, flv, test.file, apart, grow), test.again);
         }
     }
+}
+
+// Seeks in between, and requests for the streams in turn. What playing has passed is known.
+TEST(Interface, KnowsConfigurationsThatItHasPassed)
+{
+    // The last report up to a time.
+    const auto play = [](flvdmx::File& file, int64_t to, Stream stream) {
+        char reported = '.';
+        for (auto frame = file.next_frame(stream); frame; frame = file.next_frame(stream)) {
+            if (frame->config_changed())
+                reported = LetterOf(frame->new_config);
+            if (frame->time.count() >= to)
+                break;
+        }
+        return reported;
+    };
+    const std::string nine(9, '1');
+    const struct {
+        const char* name;
+        std::string file;
+        bool apart;
+        std::vector<std::tuple<int64_t, int64_t, Stream, char>> steps; // seek to, play to, report
+    } cases[] = {{.name = "back to one that was passed twice",
+                  .file = "A" + nine + "B" + nine + "A" + nine + nine,
+                  .apart = false,
+                  .steps = {{-1, 20, Stream::any, '.'},
+                            {190, 220, Stream::any, '.'},
+                            {90, 120, Stream::any, 'B'},
+                            {300, 310, Stream::any, 'A'}}},
+                 {.name = "what the other reader crosses is not passed",
+                  .file = "Aa12bB21A12121212121212",
+                  .apart = true,
+                  .steps = {{-1, 100, Stream::audio, 'b'}, {150, 160, Stream::video, '.'}}}};
+    for (const auto& test : cases) {
+        SCOPED_TRACE(test.name);
+        const Flv flv = ConfigFile(test.file);
+        const Memory memory("memory", flv.bytes);
+        auto file = flvdmx::File::open("memory", g_memory, {0, 0, test.apart});
+        for (const auto& [from, to, stream, report] : test.steps) {
+            EXPECT_TRUE(from < 0 || file->seek(std::chrono::milliseconds(from), SeekMode::backward));
+            EXPECT_EQ(play(*file, to, stream), report) << to;
+        }
+    }
+}
+
+// A stream that begins after the tags that an open looks at: it is not in the information, its frames are whole.
+TEST(Interface, DescribesFramesOfAStreamThatBeginsLate)
+{
+    const std::string letters = "a" + std::string(120, '2') + "A12";
+    const Flv flv = ConfigFile(letters);
+    const Memory memory("memory", flv.bytes);
+    auto file = flvdmx::File::open("memory", g_memory);
+    EXPECT_FALSE(file->info().video);
+    const std::string wanted = std::string(letters.size() - 2, '.') + "A.";
+    EXPECT_EQ(ReportedConfigs(*file, flv, letters, false, [] { return false; }), wanted);
 }
 
 // Of the changes that were forgotten a seek back reports none, rather than a wrong one.
@@ -327,6 +390,15 @@ TEST(Interface, ReportsListsThatCannotBeRead)
         host.fail_nothing();
         EXPECT_EQ(Line(*file->next_frame()), ExpectedLines(sample)[1]);
     }
+    Flv growing = ConfigFile("A1112");
+    for (const Tag& tag : growing.tags)
+        growing.bytes[static_cast<size_t>(tag.end()) - 1] ^= 1; // no size after a tag is right
+    Memory memory("growing", growing.bytes);
+    auto open = flvdmx::File::open("growing", g_memory, {0, 0, false, true});
+    EXPECT_EQ((*open->keyframes()).size(), 3u);
+    for (memory.size -= 40; memory.size != growing.bytes.size(); ++memory.size)
+        EXPECT_TRUE(open->metadata()) << memory.size; // wherever it ends
+    open->close();
     auto file = flvdmx::File::open(g_data + "avc_aac.flv");
     EXPECT_THROW((void)file->keyframes([](int64_t, int64_t) -> bool { throw 1; }), int);
     EXPECT_EQ(Line(*file->next_frame()), ExpectedLines(sample)[0]);
@@ -461,6 +533,12 @@ TEST(Interface, BoundsMetadata)
     flvdmx::Metadata numbers;
     numbers.add_script_data({many.data(), many.size()});
     EXPECT_EQ(numbers.size(), flvdmx::Metadata::max_properties);
+    Bytes nothing = Amf("[2000000");
+    nothing.insert(nothing.end(), 1999999, 5);
+    Append(nothing, Amf("1"));
+    flvdmx::Metadata values;
+    values.add_script_data({nothing.data(), nothing.size()});
+    EXPECT_EQ(values.size(), 0u);
 }
 
 // A second host while files of the first are open, and what lets no host do.
@@ -498,6 +576,8 @@ TEST(Interface, TellsWhyAFileDidNotOpen)
     }
     const auto cut = flvdmx::File::open(g_data + "avc_aac.flv" + '\0' + ".old");
     EXPECT_EQ(cut.error().system_error(), EINVAL);
+    const char* const no_callbacks = nullptr;
+    EXPECT_EQ(flvdmx::File::open(no_callbacks).error().system_error(), ENOENT);
     const auto text = flvdmx::File::open(g_data + "script_data.txt");
     EXPECT_EQ(text.error().code(), FLVD_ERR_FILE_HEADER);
     EXPECT_EQ(text.error().system_error(), 0) << "it was opened";
@@ -538,7 +618,9 @@ TEST(Interface, SurvivesMisuse)
     auto walked = flvdmx::File::open(g_data + "avc_aac.flv");
     const auto whole = walked->keyframes([&](int64_t, int64_t) { // which must not use the file that is walked over
         EXPECT_FALSE(walked->next_frame() || walked->seek(0ms) || walked->metadata() || walked->keyframes());
-        walked->close();
+        flvdmx::File other(std::move(*walked));
+        other.close();
+        *walked = flvdmx::File();
         return true;
     });
     EXPECT_TRUE(walked->is_open());
@@ -657,6 +739,19 @@ TEST(Interface, SeeksAsNamed)
         EXPECT_EQ(next.error().kind(), mode == SeekMode::to_end_on_miss ? Kind::end : Kind::none);
         EXPECT_TRUE(wanted < 0 || next->time.count() == wanted);
     }
+}
+
+TEST(Interface, SeeksToTheFirstTagForTimeZero)
+{
+    const Flv flv =
+        File({g_avc, g_aac, Raw(1000), Raw(1020), Tag{9, 1040, AvcNalu(false, Noise(60))}, Nalu(1200), Nalu(1300)});
+    const Memory memory("memory", flv.bytes);
+    for (const auto time : {0ms, -500ms})
+        for (const SeekMode mode : {SeekMode::automatic, SeekMode::forward, SeekMode::backward}) {
+            auto file = flvdmx::File::open("memory", g_memory);
+            EXPECT_EQ((*file->seek(time, mode)).count(), 0);
+            EXPECT_EQ((*file->next_frame()).position, flv.tags[2].offset);
+        }
 }
 
 // A file that arrives 100 bytes at a time, played beside another one: no frame is lost or doubled.

@@ -18,8 +18,9 @@
  * MISTAKES
  *
  * A File that is not open (closed, moved from, never opened) answers every call with FLVD_ERR_NO_INSTANCE, a result
- * without a value holds an empty one, and an open that would break files that are open already is refused. What must be
- * kept in mind is how long Frame::data is valid, and the rules for threads.
+ * without a value holds an empty one, and an open that would break files that are open already is refused. What remains
+ * to be kept in mind: how long Bytes are valid (those of a frame until the next call, those of a configuration as long
+ * as the Info that holds it), that a FrameRange must not outlive its File, and the rules for threads.
  *
  * THE PROCESS-WIDE TABLES
  *
@@ -297,6 +298,12 @@ constexpr SeekMode operator|(SeekMode a, SeekMode b)
     return static_cast<SeekMode>(static_cast<uint32_t>(a) | static_cast<uint32_t>(b));
 }
 
+/** True when `modes` holds `mode`. */
+constexpr bool has_mode(SeekMode modes, SeekMode mode)
+{
+    return (static_cast<uint32_t>(modes) & static_cast<uint32_t>(mode)) != 0;
+}
+
 /* ----------------------------------------------------------------------------------------- the file */
 
 class FrameRange;
@@ -332,8 +339,20 @@ public:
         return result<File>(std::move(file));
     }
 
+    /** The same; null, which flvd_callback_host_add returns without callbacks, names no file. */
+    static result<File> open(const char* path, const Host& host, const Options& options = {})
+    {
+        return open(path != nullptr ? std::string_view(path) : std::string_view(), host, options);
+    }
+
     /** Opens a file through the stdio host. */
     static result<File> open(std::string_view path, const Options& options = {})
+    {
+        return open(path, make_host(flvd_stdio_host_fill), options);
+    }
+
+    /** The same. */
+    static result<File> open(const char* path, const Options& options = {})
     {
         return open(path, make_host(flvd_stdio_host_fill), options);
     }
@@ -354,7 +373,7 @@ public:
     /** Closes the file; the data of its frames is gone. */
     void close()
     {
-        if (m_instance == nullptr || m_walking)
+        if (m_instance == nullptr)
             return;
         const std::lock_guard<std::recursive_mutex> lock(open_mutex);
         QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
@@ -398,7 +417,7 @@ public:
         Metadata metadata;
         const int32_t code = read_script_tags(m_return.reader, metadata);
         go_back();
-        if (code != FLVD_ERR_NONE)
+        if (is_failure(code))
             return error(Kind::failed, code, 0);
         return metadata;
     }
@@ -408,27 +427,15 @@ public:
      * there, as the index tells them; else the whole file is walked, tag by tag. Playing goes on where it was.
      *
      * @param progress bool(int64_t reached, int64_t size): called after each keyframe on that walk, with the bytes
-     *                 walked and those of the file, 0 for a growing one; when it returns false the list ends there.
-     * While it runs, all that it asks of this File fails, and closing does nothing.
+     *                 walked and the size of the file, 0 for a growing one; when it returns false the list ends there.
+     *                 While it runs this File is not open; it must not be destroyed.
      * @return the keyframes in file order, none without video; Kind::failed
      */
     template <typename Progress> result<std::vector<Keyframe>> keyframes(Progress&& progress)
     {
-        if (const error failed = leave(); failed.kind() != Kind::none)
-            return failed;
-        fio_file_t* const reader = m_return.reader;
-        std::vector<Keyframe> list;
-        int32_t code = FLVD_ERR_NONE;
-        if ((m_instance->streams & FLVD_STREAM_VIDEO) != 0) {
-            if (m_instance->seek_method == FLVD_SEEK_BY_INDEX)
-                list = read_index(reader);
-            if (list.empty())
-                code = walk_keyframes(reader, progress, list);
-        }
-        go_back();
-        if (code != FLVD_ERR_NONE)
-            return error(Kind::failed, code, 0);
-        return list;
+        File file(std::move(*this));
+        const GiveBack give_back(*this, file);
+        return file.list_keyframes(progress);
     }
 
     /** The same without a report of progress. */
@@ -494,15 +501,20 @@ public:
     {
         if (!can_read())
             return failure();
-        m_learned = {};
-        const flvd_seek_request_t request = {clamp<int32_t>(time.count()), static_cast<uint32_t>(mode)};
+        for (Learned& learned : m_learned)
+            learned.is_position = false;
+        // The library rewinds for the file timestamp 0 and times before it.
+        const bool rewinds = !has_mode(mode, SeekMode::relative) && time.count() <= 0;
+        const int64_t target = rewinds ? -int64_t{m_instance->first_ts} : time.count();
+        const flvd_seek_request_t request = {clamp<int32_t>(target), static_cast<uint32_t>(mode)};
         int32_t reached = 0;
         if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) != 0)
             return failure();
+        m_learned = {};
         return Milliseconds(reached);
     }
 
-    /** The last failure of this file, of Kind::none when there was none; later successes leave it in place. */
+    /** The last failure of a frame or a seek, of Kind::none when there was none; later successes leave it in place. */
     error last_error() const { return failure(); }
 
 private:
@@ -544,6 +556,13 @@ private:
         // What the packet type of AVC and AAC says: a configuration, a frame, or neither.
         bool is_config() const { return (is_avc() || is_aac()) && m_bytes[12] == 0; }
         bool has_frame() const { return !is_config() && !(is_avc() && m_bytes[12] == 2); }
+        uint32_t codec_header_size() const { return is_avc() ? 5 : is_aac() ? 2 : 1; }
+        // Of its frame; 0 for a tag without one.
+        uint32_t frame_size() const
+        {
+            const bool carries_frame = (is_video() || is_audio()) && has_frame() && data_size() > codec_header_size();
+            return carries_frame ? data_size() - codec_header_size() : 0;
+        }
         int32_t composition_offset() const
         {
             constexpr int32_t sign = 1 << 23;
@@ -576,32 +595,42 @@ private:
     public:
         bool empty() const { return m_changes.empty(); }
 
-        // Adds a configuration, whose tag begins at `position`. When there is no room all others are forgotten, so that
-        // no frame gets a wrong one.
+        // Adds a configuration, whose tag begins at `position`. When there is no room all others are forgotten.
         void add(int64_t position, std::vector<uint8_t> bytes, Bytes opened)
         {
             if (empty()) {
-                if (std::equal(bytes.begin(), bytes.end(), opened.begin(), opened.end()))
+                if (std::equal(bytes.begin(), bytes.end(), opened.begin(), opened.end())) {
+                    m_opened_last = std::max(m_opened_last, position);
                     return;
+                }
                 m_given = share({opened.begin(), opened.end()});
-                m_changes.push_back({-1, m_given});
+                m_changes.push_back({-1, m_opened_last, m_given});
             }
-            const Change* const before = change_at(position);
-            if (before != nullptr && *before->config == bytes)
+            const auto next = after(position);
+            Change* const before = next != m_changes.begin() ? &*(next - 1) : nullptr;
+            if (before != nullptr && *before->config == bytes) {
+                before->last = std::max(before->last, position);
                 return;
-            Change change = {position, share(std::move(bytes))};
-            if (m_changes.size() == configs_max)
+            }
+            Change change = {position, position, share(std::move(bytes))};
+            const bool splits = before != nullptr && before->last > position; // playing came here by a seek back
+            const Change rest = splits ? Change{before->last, before->last, before->config} : change;
+            if (splits)
+                before->last = before->position;
+            if (m_changes.size() + 2 > configs_max)
                 m_changes.clear();
+            if (splits)
+                m_changes.insert(after(rest.position), rest);
             m_changes.insert(after(position), std::move(change));
         }
 
         // The configuration of the frame whose tag begins at `position`, when the decoder has another; else empty.
         Bytes take_changed(int64_t position)
         {
-            const Change* const change = position >= 0 ? change_at(position) : nullptr;
-            if (change == nullptr || *change->config == *m_given)
+            const auto next = after(position);
+            if (position < 0 || next == m_changes.begin() || *(next - 1)->config == *m_given)
                 return {};
-            m_given = change->config;
+            m_given = (next - 1)->config;
             return *m_given;
         }
 
@@ -609,6 +638,7 @@ private:
         using Config = std::shared_ptr<const std::vector<uint8_t>>; // that of the decoder outlives what is forgotten
         struct Change {
             int64_t position;
+            int64_t last; // the last place where a copy of it was seen
             Config config;
         };
 
@@ -617,20 +647,15 @@ private:
             return std::make_shared<const std::vector<uint8_t>>(std::move(bytes));
         }
 
-        std::vector<Change>::const_iterator after(int64_t position) const
+        // The first change after a position.
+        std::vector<Change>::iterator after(int64_t position)
         {
             const auto is_before = [](int64_t at, const Change& change) { return at < change.position; };
             return std::upper_bound(m_changes.begin(), m_changes.end(), position, is_before);
         }
 
-        // The last change at or before a position; null when it was forgotten.
-        const Change* change_at(int64_t position) const
-        {
-            const auto next = after(position);
-            return next != m_changes.begin() ? &*(next - 1) : nullptr;
-        }
-
         std::vector<Change> m_changes; // in file order
+        int64_t m_opened_last = -1;    // of the configuration that the open found, while it is the only one
         Config m_given;
     };
 
@@ -640,16 +665,17 @@ private:
         bool is_position = false; // the reader stands there
     };
 
-    // Refuses other calls while keyframes() walks, whatever its report throws.
-    class Walk {
+    // Gives a file that was taken over back to its owner.
+    class GiveBack {
     public:
-        explicit Walk(bool& walking) : m_walking(walking) { m_walking = true; }
-        ~Walk() { m_walking = false; }
-        Walk(const Walk&) = delete;
-        Walk& operator=(const Walk&) = delete;
+        GiveBack(File& owner, File& file) : m_owner(owner), m_file(file) {}
+        ~GiveBack() { m_owner = std::move(m_file); }
+        GiveBack(const GiveBack&) = delete;
+        GiveBack& operator=(const GiveBack&) = delete;
 
     private:
-        bool& m_walking;
+        File& m_owner;
+        File& m_file;
     };
 
     // Where playing is when a reader is used for something else, or could not be put back.
@@ -767,7 +793,7 @@ private:
     // False when nothing is open or a reader is not where playing is.
     bool can_read()
     {
-        if (m_return.reader != nullptr && !m_walking)
+        if (m_return.reader != nullptr)
             go_back();
         return m_instance != nullptr && m_return.reader == nullptr;
     }
@@ -784,18 +810,49 @@ private:
         return {};
     }
 
-    // Moves to the first tag of a wanted kind from the reader's position on, by the library's own rules.
-    int32_t get_tag(fio_file_t* reader, flvd_tag_info_t& info, uint32_t wanted) const
-    {
-        return FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1);
-    }
-
-    // The same; no tag when there is none or its position is not known.
+    // The first tag of a wanted kind from the reader's position on, by the library's own rules; no tag when there is
+    // none or its position is not known.
     Tag find_tag(fio_file_t* reader, uint32_t wanted) const
     {
         flvd_tag_info_t info;
-        return get_tag(reader, info, wanted) == 0 ? Tag(reader, __FLV_DMX__fioTell64(reader)) : Tag();
+        const bool found = FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1) == 0;
+        return found ? Tag(reader, __FLV_DMX__fioTell64(reader)) : Tag();
     }
+
+    // Calls `see` for each tag of a wanted kind in a part of the file, until it returns false; stretches without a tag
+    // are crossed. 0; FLVD_ERR_SHORT_DATA when the data ended before `end`; FLVD_ERR_SEEK or FLVD_ERR_POSITION when the
+    // host failed.
+    template <typename See>
+    int32_t walk(fio_file_t* reader, int64_t from, int64_t end, uint32_t wanted, See&& see) const
+    {
+        for (bool again = false; from < end;) {
+            if (!move_to(reader, from))
+                return FLVD_ERR_SEEK;
+            flvd_tag_info_t info;
+            const int32_t result = FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1);
+            const int64_t position = __FLV_DMX__fioTell64(reader);
+            if (position < 0)
+                return FLVD_ERR_POSITION;
+            if (result ==
+                FLVD_ERR_NOT_FOUND) { // a stretch longer than one search, or the host failed: this is tried twice
+                if (again && position <= from)
+                    return FLVD_ERR_POSITION;
+                from = again ? position : from;
+                again = !again;
+                continue;
+            }
+            const Tag tag(reader, position);
+            if (result != 0 || tag.position < 0)
+                return FLVD_ERR_SHORT_DATA;
+            if (position >= end || !see(tag))
+                return FLVD_ERR_NONE;
+            from = tag.end();
+            again = false;
+        }
+        return FLVD_ERR_NONE;
+    }
+
+    static bool is_failure(int32_t code) { return code != FLVD_ERR_NONE && code != FLVD_ERR_SHORT_DATA; }
 
     /* Frames. */
 
@@ -805,13 +862,11 @@ private:
         if (!can_read())
             return false;
         fio_file_t* const reader = stream == Stream::audio ? m_instance->audio_reader : m_instance->main_reader;
-        Learned& learned = m_learned[reader == m_instance->main_reader ? 0 : 1];
-        const int64_t begin = learned.is_position ? learned.end : __FLV_DMX__fioTell64(reader);
-        if (learned.end < 0)
-            learned.end = begin;
+        Learned& learned = learned_of(reader);
+        const int64_t begin = learned.is_position ? learned.end : find_position(reader, learned);
         learned.is_position = false;
         Tag ahead(reader, begin);
-        if (m_instance->main_reader != m_instance->audio_reader && !go_to_stream(reader, stream, ahead))
+        if (has_two_readers() && !go_to_stream(reader, stream, ahead))
             return false;
         m_request.stream = static_cast<uint32_t>(stream);
         flvd_frame_t taken;
@@ -823,15 +878,28 @@ private:
         frame.data = {taken.data, taken.size};
         const uint32_t payload = taken.size + codec_header_size(frame.stream);
         if (!ahead.has_payload(frame.stream, payload, end) || ahead.position != learned.end)
-            ahead = look_again(frame.stream, payload, {reader, begin}, end, learned);
+            ahead = look_again(taken, reader, begin, end);
         else
             learned = {end, true};
         frame.composition_offset = Milliseconds(ahead.composition_offset());
         frame.keyframe = frame.stream == Stream::audio || ahead.is_keyframe();
         frame.position = ahead.position;
         ConfigHistory& configs = configs_of(frame.stream);
-        frame.new_config = configs.empty() ? Bytes() : configs.take_changed(ahead.position);
+        frame.new_config = configs.empty() || learned.end != end ? Bytes() : configs.take_changed(ahead.position);
         return true;
+    }
+
+    bool has_two_readers() const { return m_instance->main_reader != m_instance->audio_reader; }
+
+    Learned& learned_of(const fio_file_t* reader) { return m_learned[reader == m_instance->main_reader ? 0 : 1]; }
+
+    // Where a reader stands; -1 when the host fails to tell. After a seek nothing before that place is to be learned.
+    static int64_t find_position(fio_file_t* reader, Learned& learned)
+    {
+        const int64_t position = std::max<int64_t>(__FLV_DMX__fioTell64(reader), -1);
+        if (learned.end < 0)
+            learned.end = position;
+        return position;
     }
 
     // Most requests bring a frame: flvd_next_frame only goes on where one does not.
@@ -851,7 +919,7 @@ private:
         const Return begin = {reader, ahead.position};
         ahead = find_tag(reader, stream == Stream::video ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO);
         if (ahead.position >= 0) {
-            Learned& learned = m_learned[stream == Stream::audio ? 1 : 0];
+            Learned& learned = learned_of(reader);
             if (learned.end == begin.position)
                 learned.end = ahead.position; // none of this stream is between
             return true;
@@ -867,31 +935,37 @@ private:
     }
 
     // After a frame that is not the first tag ahead, or before which an earlier request has crossed tags: finds its tag
-    // and learns the configurations before it. `begin` is where the request began, `end` where the reader stands.
-    [[gnu::noinline]] Tag look_again(Stream stream, uint32_t payload, const Return& begin, int64_t end,
-                                     Learned& learned)
+    // and learns the configurations before it. `end` is where the reader stands after the frame.
+    [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, fio_file_t* reader, int64_t begin, int64_t end)
     {
         if (end < 0)
             return {};
         // A configuration takes memory. When that throws, the next request brings the frame again.
-        m_return = {begin.reader, begin.position < 0 ? end : begin.position};
-        const Tag tag = tag_before(begin.reader, end, stream, payload);
-        if (learned.end < 0 || (tag.position >= 0 && learn_configs(begin.reader, learned.end, tag.position)))
+        m_return = {reader, begin < 0 ? end : begin};
+        const Tag tag = tag_before(frame, reader, end);
+        Learned& learned = learned_of(reader);
+        if (learned.end < 0 || (tag.position >= 0 && learn_configs(reader, learned.end, tag)))
             learned.end = end; // else the host failed, and the next frame tries again
         m_return.position = end;
         go_back();
         return tag;
     }
 
-    // The tag with this payload that ends at `end`; none when the host failed.
-    static Tag tag_before(fio_file_t* reader, int64_t end, Stream stream, uint32_t payload)
+    // The tag that ends at `end` and carries the frame; none when the host failed.
+    static Tag tag_before(const flvd_frame_t& frame, fio_file_t* reader, int64_t end)
     {
-        const int64_t begin = end - back_pointer_size - payload - tag_header_size;
-        const Tag tag = move_to(reader, begin) ? Tag(reader, begin) : Tag();
-        return tag.has_payload(stream, payload, end) ? tag : Tag();
+        for (const uint32_t codec_header : {5U, 2U, 1U}) {
+            const uint32_t payload = frame.size + codec_header;
+            const int64_t begin = end - back_pointer_size - payload - tag_header_size;
+            const Tag tag = begin >= 0 && move_to(reader, begin) ? Tag(reader, begin) : Tag();
+            if (tag.codec_header_size() == codec_header &&
+                tag.has_payload(static_cast<Stream>(frame.stream), payload, end))
+                return tag;
+        }
+        return {};
     }
 
-    // Codec header bytes before each frame of a stream, and before its configurations.
+    // Codec header bytes before the frames of a stream that the open found.
     uint32_t codec_header_size(Stream stream) const
     {
         if (stream == Stream::video)
@@ -899,25 +973,24 @@ private:
         return audio_codec() == AudioCodec::aac ? 2 : 1;
     }
 
-    // Learns the configurations of both streams in a part of the file. False when the host failed.
-    bool learn_configs(fio_file_t* reader, int64_t from, int64_t end)
+    // Learns the configurations in a part of the file that ends at a tag: those of both streams or, with two readers,
+    // of the tag's stream, since each reader has its own place. False when the host failed.
+    bool learn_configs(fio_file_t* reader, int64_t from, const Tag& last)
     {
-        while (from < end) {
-            if (!move_to(reader, from))
-                return false;
-            const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO);
-            const int64_t next = tag.position >= 0 ? tag.end() : __FLV_DMX__fioTell64(reader); // past the search
-            if (next <= from || (tag.is_config() && tag.position < end && !learn_config(reader, tag)))
-                return false;
-            from = next;
-        }
-        return true;
+        const uint32_t one = last.is_video() ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO;
+        const uint32_t wanted = has_two_readers() ? one : FLVD_TAG_VIDEO | FLVD_TAG_AUDIO;
+        bool learned = true;
+        const int32_t code = walk(reader, from, last.position, wanted, [&](const Tag& tag) {
+            learned = !tag.is_config() || learn_config(reader, tag);
+            return learned;
+        });
+        return learned && code == FLVD_ERR_NONE;
     }
 
     bool learn_config(fio_file_t* reader, const Tag& tag)
     {
-        const uint32_t headers = codec_header_size(tag.stream());
-        if (tag.data_size() <= headers || tag.data_size() > config_max)
+        const uint32_t headers = tag.codec_header_size();
+        if (tag.data_size() <= headers || tag.data_size() - headers > config_max)
             return true;
         std::vector<uint8_t> config(tag.data_size() - headers);
         const auto size = static_cast<uint32_t>(config.size());
@@ -971,23 +1044,16 @@ private:
         return info;
     }
 
+    // The code of walk().
     int32_t read_script_tags(fio_file_t* reader, Metadata& metadata) const
     {
-        int64_t position = m_instance->data_offset;
-        for (uint32_t tags = 0; tags < metadata_tags; ++tags) {
-            if (!move_to(reader, position))
-                return FLVD_ERR_SEEK;
-            flvd_tag_info_t info;
-            if (get_tag(reader, info, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT) != 0)
-                return FLVD_ERR_NONE;
-            const Tag tag(reader, __FLV_DMX__fioTell64(reader));
-            if (tag.position < 0)
-                return FLVD_ERR_POSITION;
+        uint32_t tags = 0;
+        const uint32_t any = FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT;
+        return walk(reader, m_instance->data_offset, std::numeric_limits<int64_t>::max(), any, [&](const Tag& tag) {
             if (tag.stream() == Stream::any)
                 read_script_tag(reader, tag, metadata);
-            position = tag.end();
-        }
-        return FLVD_ERR_NONE;
+            return ++tags < metadata_tags;
+        });
     }
 
     static void read_script_tag(fio_file_t* reader, const Tag& tag, Metadata& metadata)
@@ -998,29 +1064,36 @@ private:
         metadata.add_script_data({payload.data(), size});
     }
 
-    // Adds the keyframes that a walk from the first tag on finds; returns the code of a failure.
-    template <typename Report> int32_t walk_keyframes(fio_file_t* reader, Report& report, std::vector<Keyframe>& list)
+    // keyframes() of a file that nobody else can reach.
+    template <typename Report> result<std::vector<Keyframe>> list_keyframes(Report& report)
     {
-        const Walk walk(m_walking);
-        if (!move_to(reader, m_instance->data_offset))
-            return FLVD_ERR_SEEK;
-        for (int64_t reached = -1;;) {
-            flvd_tag_info_t info;
-            const uint32_t wanted = FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME;
-            const bool found = FLVD_MoveToNextTag(m_instance, reader, &info, wanted, nullptr) == 0;
-            const int64_t position = __FLV_DMX__fioTell64(reader);
-            if (position < 0)
-                return FLVD_ERR_POSITION;
-            if (position <= reached || (!found && position >= m_instance->data_end))
-                return FLVD_ERR_NONE; // else the walk crosses damage
-            reached = position;
-            const Tag tag = found ? Tag(reader, position) : Tag();
-            if (tag.position < 0 || !tag.has_frame())
-                continue;
-            list.push_back({time_of(tag.timestamp()), position});
-            if (!report(position, m_instance->file_size))
-                return FLVD_ERR_NONE;
+        if (const error failed = leave(); failed.kind() != Kind::none)
+            return failed;
+        std::vector<Keyframe> list;
+        int32_t code = FLVD_ERR_NONE;
+        if ((m_instance->streams & FLVD_STREAM_VIDEO) != 0) {
+            if (m_instance->seek_method == FLVD_SEEK_BY_INDEX)
+                list = read_index(m_return.reader);
+            if (list.empty())
+                code = walk_keyframes(m_return.reader, report, list);
         }
+        go_back();
+        if (is_failure(code))
+            return error(Kind::failed, code, 0);
+        return list;
+    }
+
+    // Adds the keyframes that a walk from the first tag on finds. The code of walk().
+    template <typename Report>
+    int32_t walk_keyframes(fio_file_t* reader, Report& report, std::vector<Keyframe>& list) const
+    {
+        const int64_t end = is_growing() ? std::numeric_limits<int64_t>::max() : m_instance->data_end;
+        return walk(reader, m_instance->data_offset, end, FLVD_TAG_VIDEO | FLVD_TAG_KEYFRAME, [&](const Tag& tag) {
+            if (!tag.has_frame())
+                return true;
+            list.push_back({time_of(tag.timestamp()), tag.position});
+            return static_cast<bool>(report(tag.position, m_instance->file_size));
+        });
     }
 
     std::vector<Keyframe> read_index(fio_file_t* reader) const
@@ -1072,7 +1145,6 @@ private:
     flvd_ctx_t* m_instance = nullptr;
     flvd_frame_request_t m_request{};
     Return m_return;
-    bool m_walking = false;           // inside keyframes()
     std::array<Learned, 2> m_learned; // of the main reader and of a separate audio reader
     ConfigHistory m_video_configs;
     ConfigHistory m_audio_configs;

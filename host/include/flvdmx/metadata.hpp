@@ -35,18 +35,21 @@ struct Property {
  * are; those of other script data are prefixed with the name of that data. Array elements are numbered from 0. The
  * keyframe index is not included: see File::keyframes().
  *
- * For any file, there are at most 1000 properties, 16 levels deep, with at most 1 MiB of names and strings. Everything
- * beyond that is dropped.
+ * For any file, there are at most 1000 properties, 16 levels deep, with at most 1 MiB of names and strings, among at
+ * most a million values. Everything beyond that is dropped.
  */
 class Metadata {
 public:
     static constexpr size_t max_properties = 1000; /**< most properties kept */
     static constexpr size_t max_text = 1u << 20;   /**< most bytes of names and strings kept */
+    static constexpr size_t max_values = 1000000;  /**< most values read, those that are not kept included */
     static constexpr int max_depth = 16;           /**< most levels of nested objects and arrays */
 
-    std::vector<Property>::const_iterator begin() const { return m_properties.begin(); } /**< the first property */
-    std::vector<Property>::const_iterator end() const { return m_properties.end(); }     /**< past the last property */
-    size_t size() const { return m_properties.size(); }                                  /**< number of properties */
+    std::vector<Property>::const_iterator begin() const& { return m_properties.begin(); } /**< the first property */
+    std::vector<Property>::const_iterator end() const& { return m_properties.end(); }     /**< past the last property */
+    std::vector<Property>::const_iterator begin() const&& = delete; /**< deleted: the result would dangle */
+    std::vector<Property>::const_iterator end() const&& = delete;   /**< deleted: the result would dangle */
+    size_t size() const { return m_properties.size(); }             /**< number of properties */
 
     /** @return the first property with that name, or null; valid while the Metadata lives */
     const Property* find(std::string_view name) const&
@@ -220,7 +223,7 @@ private:
         bool read_value(int depth)
         {
             const Bytes marker = take(1);
-            if (m_failed)
+            if (m_failed || ++m_metadata.m_values > max_values)
                 return false;
             switch (marker[0]) {
             case number:
@@ -260,6 +263,7 @@ private:
 
     std::vector<Property> m_properties;
     size_t m_text = 0;
+    size_t m_values = 0;
 };
 
 } // namespace flvdmx
