@@ -464,6 +464,63 @@ public:
     }
 
     /**
+     * The next frame, as next_frame(), written to memory of the caller's choice, who can pass it on without a copy. For
+     * files opened with Options::buffer and without a separate audio reader. Frames whose size is not known in advance,
+     * such as those after damage or a configuration, are written to that buffer.
+     *
+     * @param allocate uint8_t*(uint32_t size): memory for a frame of `size` bytes, or null; called at most once
+     * @return as next_frame(); the data is at the address that `allocate` returned, or in Options::buffer
+     */
+    template <typename Allocate> result<Frame> next_frame_into(Allocate&& allocate)
+    {
+        if (!can_read())
+            return failure();
+        fio_file_t* const reader = m_instance->main_reader;
+        Learned& learned = learned_of(reader);
+        const int64_t begin = learned.is_position ? learned.end : find_position(reader, learned);
+        const Tag ahead(reader, begin);
+        const uint32_t size = ahead.end() <= m_instance->data_end ? ahead.frame_size() : 0;
+        uint8_t* const memory = size != 0 ? allocate(size) : nullptr;
+        if (memory == nullptr)
+            return next_frame();
+        const int64_t learned_end = learned.end;
+        const auto video_config = m_video_configs.given();
+        const auto audio_config = m_audio_configs.given();
+        const flvd_frame_request_t request = std::exchange(m_request, {memory, size, 0});
+        result<Frame> frame = next_frame();
+        m_request = request;
+        if (frame && frame->position == begin)
+            return frame;
+        // There was no valid tag ahead, and a frame that does not fit the memory may have been skipped.
+        m_return = {reader, begin};
+        learned = {learned_end, false};
+        m_video_configs.give(video_config);
+        m_audio_configs.give(audio_config);
+        return next_frame();
+    }
+
+    /**
+     * Tells whether there is damage between two frames. Playing goes on where it was.
+     *
+     * @param from byte in the file after a tag and its back-pointer
+     * @param to   a later byte, where a tag begins
+     * @return true when valid tags fill the space between
+     */
+    bool has_whole_tags(int64_t from, int64_t to)
+    {
+        if (leave().kind() != Kind::none)
+            return false;
+        int64_t reached = from;
+        walk(m_return.reader, from, to, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT, [&](const Tag& tag) {
+            const bool follows = tag.position == reached;
+            reached = follows ? tag.end() : reached;
+            return follows;
+        });
+        go_back();
+        return reached == to;
+    }
+
+    /**
      * The next frame of a growing file. While there is none yet, `wait` is called and the file is asked again; when
      * `wait` returns false, because writing has stopped, it is asked one last time.
      *
@@ -593,17 +650,21 @@ private:
     // first change: then the one that the open found holds everywhere.
     class ConfigHistory {
     public:
+        using Config = std::shared_ptr<const std::vector<uint8_t>>; // that of the decoder outlives what is forgotten
+
+        ConfigHistory() = default;
+        explicit ConfigHistory(Bytes opened) : m_given(share({opened.begin(), opened.end()})) {}
+
         bool empty() const { return m_changes.empty(); }
 
         // Adds a configuration, whose tag begins at `position`. When there is no room all others are forgotten.
-        void add(int64_t position, std::vector<uint8_t> bytes, Bytes opened)
+        void add(int64_t position, std::vector<uint8_t> bytes)
         {
             if (empty()) {
-                if (std::equal(bytes.begin(), bytes.end(), opened.begin(), opened.end())) {
+                if (*m_given == bytes) {
                     m_opened_last = std::max(m_opened_last, position);
                     return;
                 }
-                m_given = share({opened.begin(), opened.end()});
                 m_changes.push_back({-1, m_opened_last, m_given});
             }
             const auto next = after(position);
@@ -624,6 +685,10 @@ private:
             m_changes.insert(after(position), std::move(change));
         }
 
+        // What the decoder has.
+        const Config& given() const { return m_given; }
+        void give(const Config& config) { m_given = config; }
+
         // The configuration of the frame whose tag begins at `position`, when the decoder has another; else empty.
         Bytes take_changed(int64_t position)
         {
@@ -635,7 +700,6 @@ private:
         }
 
     private:
-        using Config = std::shared_ptr<const std::vector<uint8_t>>; // that of the decoder outlives what is forgotten
         struct Change {
             int64_t position;
             int64_t last; // the last place where a copy of it was seen
@@ -713,6 +777,8 @@ private:
             return open_failure(options.growing, errno);
         m_host = host;
         ++m_open_files;
+        m_video_configs = ConfigHistory({m_instance->video_info.config, m_instance->video_info.config_size});
+        m_audio_configs = ConfigHistory({m_instance->audio_info.config, m_instance->audio_info.config_size});
         if (options.restarting_timestamps)
             accept_all_times();
         return {};
@@ -997,17 +1063,11 @@ private:
         __FLV_DMX__fioSkipBytes(tag_header_size + headers, reader);
         if (__FLV_DMX__fioRead(config.data(), 1, size, reader) != size)
             return false;
-        configs_of(tag.stream()).add(tag.position, std::move(config), opened_config(tag.stream()));
+        configs_of(tag.stream()).add(tag.position, std::move(config));
         return true;
     }
 
     ConfigHistory& configs_of(Stream stream) { return stream == Stream::video ? m_video_configs : m_audio_configs; }
-
-    Bytes opened_config(Stream stream) const
-    {
-        return stream == Stream::video ? Bytes(m_instance->video_info.config, m_instance->video_info.config_size)
-                                       : Bytes(m_instance->audio_info.config, m_instance->audio_info.config_size);
-    }
 
     /* What the file says of itself. */
 

@@ -14,7 +14,8 @@ extern "C" {
 
 /**
  * Gets the next frame with FLVD_OP_GET_FRAME. A single request gives up after 102 tags without a frame; this function
- * retries while the reader advances inside the data, so it crosses damage of any length.
+ * retries while the reader advances inside the data, so it crosses damage of any length. After more than 1 MiB without
+ * a tag, the first tag or two can be lost.
  *
  * @param instance open instance; null fails as in QVX_FLV_DMX
  * @param request  as for QVX_FLV_DMX: the stream, with a separate audio reader; the caller's buffer, if it has one
