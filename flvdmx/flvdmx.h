@@ -224,7 +224,7 @@ typedef struct flvd_video_info_t {
 typedef struct flvd_audio_info_t {
     uint32_t reserved;    /**< 0 */
     uint32_t sample_rate; /**< Hz */
-    uint32_t sample_size; /**< bits a sample */
+    uint32_t sample_size; /**< bits per sample */
     uint32_t channels;    /**< channel count */
     uint32_t format_tag;  /**< FLVD_AUDIO_TAG_*, 0 for every other sound format */
     uint8_t* config;      /**< AAC: AudioSpecificConfig (ISO/IEC 14496-3), else null; owned by the instance */

@@ -36,6 +36,8 @@ static void release_lock(void)
 /* A copy of the file of that name, so that the record may go; false when there is none. */
 static bool find_file(const char* name, flvd_callback_file_t* found)
 {
+    if (name == NULL)
+        return false;
     take_lock();
     const flvd_callback_file_t* file = first_file;
     while (file != NULL && strcmp(file->name, name) != 0)
@@ -96,12 +98,17 @@ static uint32_t read_file(void* buffer, uint32_t size, uint32_t count, void* han
 
 const char* flvd_callback_host_add(flvd_callback_file_t* file)
 {
-    if (file->read_at == NULL || file->get_size == NULL)
+    if (file == NULL || file->read_at == NULL || file->get_size == NULL)
         return NULL;
     take_lock();
-    snprintf(file->name, sizeof file->name, "callbacks:%lu", ++names);
-    file->next = first_file;
-    first_file = file;
+    const flvd_callback_file_t* known = first_file;
+    while (known != NULL && known != file)
+        known = known->next;
+    if (known == NULL) {
+        snprintf(file->name, sizeof file->name, "callbacks:%lu", ++names);
+        file->next = first_file;
+        first_file = file;
+    }
     release_lock();
     return file->name;
 }

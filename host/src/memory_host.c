@@ -25,17 +25,11 @@ static uint32_t read_at(void* user, int64_t position, void* buffer, uint32_t siz
 
 static void* open_buffer(const char* path, const char* mode)
 {
-    flvd_memory_file_t* file = first_file;
+    flvd_memory_file_t* file = path != NULL ? first_file : NULL;
     while (file != NULL && strcmp(file->name, path) != 0)
         file = file->next;
     const flvd_callback_file_t callbacks = {.read_at = read_at, .get_size = get_size, .user = file};
     return flvd_callback_file_open(file != NULL ? &callbacks : NULL, mode);
-}
-
-void flvd_memory_host_add(flvd_memory_file_t* file)
-{
-    file->next = first_file;
-    first_file = file;
 }
 
 void flvd_memory_host_remove(const flvd_memory_file_t* file)
@@ -45,6 +39,13 @@ void flvd_memory_host_remove(const flvd_memory_file_t* file)
         link = &(*link)->next;
     if (*link != NULL)
         *link = file->next;
+}
+
+void flvd_memory_host_add(flvd_memory_file_t* file)
+{
+    flvd_memory_host_remove(file); /* a file that is known moves to the front */
+    file->next = first_file;
+    first_file = file;
 }
 
 void flvd_memory_host_fill(flvd_init_t* init)

@@ -33,11 +33,11 @@ extern "C" {
  * Reads bytes of a file. It must not call the library.
  *
  * @param user     what the file was given
- * @param position byte to begin at, 0 or more; may lie at or beyond the end
+ * @param position byte to begin at, 0 or more; may be at or past the end
  * @param buffer   where they go
  * @param size     how many are wanted, at least 1
- * @return how many were read. Fewer than wanted is no end: the rest is asked for. 0: the end of the file, or a failure,
- *         which looks the same.
+ * @return how many were read. Fewer than wanted is not the end: the rest is requested next. 0: the end of the file, or
+ * a failure, which looks the same.
  */
 typedef uint32_t (*flvd_read_at_fn)(void* user, int64_t position, void* buffer, uint32_t size);
 
@@ -64,8 +64,9 @@ typedef struct flvd_callback_file_t {
 /**
  * Makes a file known under a new name, which no other file of the process has had.
  *
- * @param file record with its first three fields filled; not one that is known already
- * @return its name, for flvd_init_t::file_name; lies in the record. Null when a function is missing.
+ * @param file record with its first three fields filled; one that is known already keeps its name
+ * @return its name, for flvd_init_t::file_name; lies in the record. Null when the record or a function is missing; the
+ * name null opens nothing.
  */
 const char* flvd_callback_host_add(flvd_callback_file_t* file);
 

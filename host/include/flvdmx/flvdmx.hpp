@@ -4,6 +4,8 @@
  *     auto file = flvdmx::File::open("clip.flv");
  *     if (!file)
  *         return std::fprintf(stderr, "%s\n", file.error().text());
+ *     if (file->info().video)
+ *         configure(flvdmx::Stream::video, file->info().video->config); // the same for audio
  *     for (const flvdmx::Frame& frame : file->frames()) {
  *         if (frame.config_changed())
  *             configure(frame.stream, frame.new_config);
@@ -26,7 +28,7 @@
  *
  * - Files that are open at the same time have one host. File::open(path) takes the stdio host; the other hosts of the
  *   kit, and hosts of your own, are passed as a Host. While a File is open, an open through other functions returns
- *   FLVD_ERR_HOST_IN_USE. What differs from file to file belongs into a callback file (flvdmx/callback_host.h).
+ *   FLVD_ERR_HOST_IN_USE. What differs from file to file belongs in a callback file (flvdmx/callback_host.h).
  * - Opening and closing hold open_mutex, so threads may open files, look at their Info and let them go as they like.
  *   All other calls take no lock, and an open must not run beside them, on whatever File: when threads play files while
  *   others open some, they hold open_mutex around their own calls as well.
@@ -465,7 +467,8 @@ public:
     inline FrameRange frames(Stream stream = Stream::any) &;
 
     /**
-     * Seeks to a keyframe, without video to an audio frame. After a miss or a failure playing goes on where it was.
+     * Seeks to a keyframe, without video to an audio frame. After a miss or a failure playing continues where it was,
+     * unless the mode puts the file at its end.
      *
      * Time 0, and whatever is before it, is the first tag, whatever its time. By an index, whose times muxers round or
      * count from elsewhere, "at or before" holds for the times of the index: the frame can be a few milliseconds later.

@@ -34,7 +34,8 @@ typedef struct flvd_memory_file_t {
     struct flvd_memory_file_t* next; /**< the list's own */
 } flvd_memory_file_t;
 
-/** Makes a buffer known; of two with one name the one added last is opened. The same record is not added twice. */
+/** Makes a buffer known; of two with one name the one added last is opened. A record that is known already becomes the
+ * last one. */
 void flvd_memory_host_add(flvd_memory_file_t* file);
 
 /** Forgets a buffer; every instance that was opened on it must be closed by then. Unknown ones are ignored. */

@@ -9,6 +9,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <utility>
+#include <vector>
 
 namespace flvdmx {
 
@@ -18,6 +19,8 @@ public:
     constexpr Bytes() = default;
     /** Borrows `size` bytes from `data` on. */
     constexpr Bytes(const uint8_t* data, size_t size) : m_data(data), m_size(size) {}
+    /** Borrows all bytes of a vector, such as VideoInfo::config. */
+    Bytes(const std::vector<uint8_t>& bytes) : m_data(bytes.data()), m_size(bytes.size()) {} // NOLINT: a view, as meant
     constexpr const uint8_t* data() const { return m_data; }         /**< the first; null when there is none */
     constexpr size_t size() const { return m_size; }                 /**< their number */
     constexpr bool empty() const { return m_size == 0; }             /**< true without bytes */
@@ -35,8 +38,8 @@ private:
 enum class Kind {
     none,    /**< no failure */
     end,     /**< the end of the data */
-    not_yet, /**< a growing file holds no more so far: ask, or open it, again later */
-    miss,    /**< a seek found nothing to land on; playing goes on where it was */
+    not_yet, /**< a growing file holds no more so far: retry, or open it again, later */
+    miss,    /**< a seek found nothing to land on; playing continues where it was, or at the end if asked for */
     failed   /**< anything else */
 };
 
