@@ -433,6 +433,18 @@ TEST(Interface, SurvivesMisuse)
     for (const Stream stream : {Stream::any, static_cast<Stream>(7)})
         EXPECT_STREQ(apart->next_frame(stream).error().name(), "FLVD_ERR_BAD_STREAM");
     EXPECT_EQ((*apart->next_frame(Stream::video)).position, 495) << "nothing was lost";
+
+    auto walked = flvdmx::File::open(g_data + "avc_aac.flv");
+    const auto whole = walked->keyframes([&](int64_t, int64_t) { // which must not use the file that is walked over
+        EXPECT_FALSE(walked->next_frame() || walked->seek(0ms) || walked->metadata() || walked->keyframes());
+        walked->close();
+        return true;
+    });
+    EXPECT_TRUE(walked->is_open());
+    int64_t last = 0;
+    for (const flvdmx::Keyframe& key : *walked->keyframes()) // a list that nothing else holds
+        last = key.position;
+    EXPECT_EQ(last, whole->back().position);
 }
 
 // All that a program does with a file. Of each frame that comes the tag must be the one that carries it.

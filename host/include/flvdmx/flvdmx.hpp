@@ -349,7 +349,7 @@ public:
     /** Closes the file; the data of its frames is gone. */
     void close()
     {
-        if (m_instance == nullptr)
+        if (m_instance == nullptr || m_walking)
             return;
         const std::lock_guard<std::recursive_mutex> lock(open_mutex);
         QVX_FLV_DMX(FLVD_OP_CLOSE, &m_instance, nullptr, nullptr);
@@ -402,7 +402,8 @@ public:
      * there, as the index tells them; else the whole file is walked, tag by tag. Playing goes on where it was.
      *
      * @param progress bool(int64_t reached, int64_t size): called after each keyframe on that walk, with the bytes
-     *                 walked and those of the file, 0 for a growing one; when it returns false the list ends there
+     *                 walked and those of the file, 0 for a growing one; when it returns false the list ends there.
+     * While it runs, all that it asks of this File fails, and closing does nothing.
      * @return the keyframes in file order, none without video; Kind::failed
      */
     template <typename Progress> result<std::vector<Keyframe>> keyframes(Progress&& progress)
@@ -414,8 +415,11 @@ public:
         if ((m_instance->streams & FLVD_STREAM_VIDEO) != 0) {
             if (m_instance->seek_method == FLVD_SEEK_BY_INDEX)
                 list = read_index(reader);
-            if (list.empty() && move_to(reader, m_instance->data_offset))
+            if (list.empty() && move_to(reader, m_instance->data_offset)) {
+                m_walking = true;
                 list = walk_keyframes(reader, progress);
+                m_walking = false;
+            }
         }
         go_back();
         return list;
@@ -680,6 +684,8 @@ private:
     // False when nothing is open or a reader is not where playing is.
     bool can_read()
     {
+        if (m_walking)
+            return false;
         if (m_return.reader != nullptr)
             go_back();
         return m_instance != nullptr && m_return.reader == nullptr;
@@ -732,7 +738,7 @@ private:
         if (!ahead.carries(taken, end))
             ahead = look_again(taken, reader, ahead.position, end);
         frame.composition_offset = Milliseconds(ahead.composition_offset());
-        frame.keyframe = ahead.is_keyframe();
+        frame.keyframe = frame.stream == Stream::audio || ahead.is_keyframe();
         frame.position = ahead.position;
         frame.new_config = m_changes.empty() ? Bytes() : changed_config(frame.stream, ahead.position);
         m_next[audio ? 1 : 0] = end;
@@ -975,6 +981,7 @@ private:
     flvd_ctx_t* m_instance = nullptr;
     flvd_frame_request_t m_request{};
     Return m_return;
+    bool m_walking = false;                 // inside keyframes()
     std::vector<Change> m_changes;          // in file order
     std::array<int64_t, 2> m_given{-1, -1}; // positions of the changes that video and audio had last; -1: none
     std::array<int64_t, 2> m_next{-1, -1};  // where the main and the audio reader stand, when that is known; else -1
@@ -1007,7 +1014,7 @@ public:
 
     FrameRange(File& file, Stream stream) : m_file(file), m_stream(stream) {} /**< see File::frames() */
     /** Takes the first frame. */
-    Iterator begin()
+    Iterator begin() &
     {
         advance();
         return Iterator(this);

@@ -13,7 +13,7 @@
 
 namespace flvdmx {
 
-/** Bytes that belong to somebody else. */
+/** Borrowed bytes. */
 class Bytes {
 public:
     constexpr Bytes() = default;
@@ -85,7 +85,7 @@ public:
     explicit operator bool() const { return m_has_value; } /**< true when there is a value */
     T& operator*() & { return m_value; }                   /**< the value */
     const T& operator*() const& { return m_value; }        /**< the value */
-    T&& operator*() && { return std::move(m_value); }      /**< the value, to be taken */
+    T operator*() && { return std::move(m_value); }        /**< the value, which a range-for keeps alive */
     T* operator->() & { return &m_value; }                 /**< of the value */
     const T* operator->() const& { return &m_value; }      /**< of the value */
     T* operator->() && = delete;                           /**< refused */
