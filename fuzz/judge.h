@@ -70,8 +70,7 @@ enum class Lie : uint8_t {
 class Host : public FakeHost {
 public:
     explicit Host(Bytes file);
-    /** Tells these lies (bits 1 << Lie) from now on, until `patience` calls or KiB read are used up; then it refuses.
-     */
+    /** Tells these lies (bits 1 << Lie) until `patience` calls or KiB read are used up; from then on it refuses. */
     void lie(uint32_t lies, uint64_t patience) { std::tie(m_lies, m_patience) = std::tie(lies, patience); }
     /** The next operation may cost so many calls. */
     void begin(uint64_t calls) { m_calls_left = calls; }

@@ -277,11 +277,10 @@ std::vector<Scenario> Scenarios()
     const Flv first_large = File({mp3(0), Screen(0, LARGE), mp3(9), Screen(9), Screen(40), Screen(80)});
     const auto plain = [&large](size_t size) { return large(Pcm(0), Pcm, size); };
     const int64_t video = avc.tags[2].end(), aac_frame = aac.tags[2].end();
-    using Opens = std::vector<OpenOptions>;
-    const Opens scanning = {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)};
-    const Opens indexing = {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}};
-    const Opens growing = {open(GROWING), open(GROWING | SEPARATE)};
-    const Opens information = {open(0, 0, true), open(SEPARATE, 0, true)};
+    const std::vector<OpenOptions> scanning = {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)},
+                                   indexing = {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}},
+                                   growing = {open(GROWING), open(GROWING | SEPARATE)},
+                                   information = {open(0, 0, true), open(SEPARATE, 0, true)};
     return {
         {.what = "scan", .flv = chain, .opens = scanning, .seeks = seeks},
         {.what = "audio", .flv = audio, .opens = {open(0)}, .seeks = seeks},

@@ -25,6 +25,10 @@ Flv Repeat(size_t n, const Tag& tag, const Tags& then, uint8_t flags = 5)
     return File(Tags(n, tag) + then, flags);
 }
 
+const auto Damaged = [](Tag tag) {
+    tag.back_pointer = 0xEEEEEEEE;
+    return tag;
+};
 const auto Cut = [](const Bytes& bytes, size_t size) { return Bytes(bytes.data(), bytes.data() + size); };
 const auto Indexed = [](uint32_t gop) { return MakeChain({true, true, true, true, 20, gop}); };
 const Flv g_chain = MakeChain();
@@ -138,9 +142,7 @@ TEST(Failures, OfDelivery)
     };
     const int frames = static_cast<int>(g_chain.frames().size());
     const Bytes within = Repeat(BUDGET - 1, g_avc, {Nalu(0)}, 1).bytes;
-    Tag bad = Nalu(0, 5000);
-    bad.back_pointer = 0;
-    const Bytes wrong = Repeat(BUDGET - 1, g_avc, {bad, Nalu(0), Nalu(40)}, 1).bytes;
+    const Bytes wrong = Repeat(BUDGET - 1, g_avc, {Damaged(Nalu(0, 5000)), Nalu(0), Nalu(40)}, 1).bytes;
     const Row rows[] = {
         // each also in a growing file
         {.what = "end", .file = g_chain.bytes, .site = FRAME_END, .before = frames},
@@ -441,7 +443,7 @@ TEST(Delivery, KeepsItsPlaceAfterManyTagsOfTheOtherStream)
 TEST(Delivery, LimitsFailedChecksOverAllTurnsOfARequest)
 {
     constexpr size_t CHECKS = 16384;
-    const Tag bad = {8, 0, AacRaw({1, 2, 3}), 0xEEEEEEEE};
+    const Tag bad = Damaged(Raw(0, 3));
     const struct {
         const char* what;
         size_t before, after; // tags of each run
@@ -470,11 +472,6 @@ TEST(Delivery, LimitsFailedChecksOverAllTurnsOfARequest)
 }
 
 // Frames that the cache does not hold, and what damaged data makes of them.
-
-const auto Damaged = [](Tag tag) {
-    tag.back_pointer = 0xEEEEEEEE;
-    return tag;
-};
 
 // A frame of 50,000 bytes: what is cached of it, the rest in one read, and a cache that begins with its back-pointer.
 // When that read ends early the back-pointer is looked at all the same: the tag is recorded as lost, the next one
@@ -547,10 +544,8 @@ TEST(LargeFrames, AreCheckedFirstWhenTheBufferHasToGrow)
 
 TEST(LargeFrames, WithAWrongBackPointerAreLostAlone)
 {
-    FakeHost host(
-        File({g_avc, Nalu(0, 5000), Damaged(Nalu(40, 6000)), Nalu(80, 7000), Nalu(120, 8000), Damaged(Nalu(100, 9000))},
-             1)
-            .bytes);
+    const Tag bad = Damaged(Nalu(40, 6000)), last = Damaged(Nalu(100, 9000));
+    FakeHost host(File({g_avc, Nalu(0, 5000), bad, Nalu(80, 7000), Nalu(120, 8000), last}, 1).bytes);
     Session session(host);
     const struct {
         int32_t rc;

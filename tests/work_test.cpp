@@ -300,7 +300,7 @@ TEST(Work, CostsLittleOnValidFiles)
     const Calls astray = Walk(38 + 2, 20);
     // Of large tags the estimate lies inside one; from the next, at 4,240 ms, it is 6 tags back.
     const Calls inside = Calls{BIG / (CACHE - 12) + 1, 0, 0, BIG} + Walk(0, 6);
-    // Two positions per tag; 95 bytes are read beside the frames.
+    // Bytes after the file header: script data and configuration, 95 in all, and the frames.
     const uint64_t tags = FRAMES + 2, tiny = 95 + FRAMES * (TINY + 20), big = 95 + FRAMES * (BIG + 20);
     constexpr int NONE = -1;
     const struct {

@@ -95,6 +95,8 @@ public:
     void limit_reads(uint32_t k) { m_faults.shortened[index(HostFn::Read)] = {EACH, k}; }
     /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
+    /** Set, it changes every position that is told. */
+    std::function<int64_t(int64_t position)> on_tell;
     /** Called with every block that is given back, while it still holds what it held. */
     std::function<void(const void* block, uint32_t size)> on_release;
 

@@ -97,7 +97,7 @@ Bytes Amf(const std::string& words)
             Append(out, Number(std::stod(word)));
         else
             for (size_t at = 0; at != std::string::npos; at = word.find('.', at + 1))
-                Put(out, std::stoul(word.substr(at + 1)), 1);
+                out.push_back(static_cast<uint8_t>(std::stoul(word.substr(at + 1))));
     }
     return out;
 }
@@ -213,7 +213,7 @@ Flv File(const Tags& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
     Flv flv{Concat({prefix, {'F', 'L', 'V', 1, flags}, BigEndian(data_offset, 4)}), tags};
     if (flv.bytes.size() < data_offset && data_offset < 0x10000)
         flv.bytes.resize(data_offset);
-    Put(flv.bytes, 0, 4);
+    Append(flv.bytes, Bytes(4));
     for (Tag& tag : flv.tags) {
         const size_t size = tag.data.size();
         tag.offset = static_cast<int64_t>(flv.bytes.size());

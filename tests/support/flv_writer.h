@@ -25,10 +25,6 @@ inline void Append(Bytes& out, const Bytes& more)
 {
     out.insert(out.end(), more.begin(), more.end());
 }
-inline void Put(Bytes& out, uint64_t value, int bytes)
-{
-    Append(out, BigEndian(value, bytes));
-}
 Bytes Concat(const std::vector<Bytes>& parts);
 /** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
