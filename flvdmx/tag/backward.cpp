@@ -74,7 +74,7 @@ int32_t FLVD_SearchBack(fio_file_t* file, const flvd_ctx_t* ctx, int64_t cursor,
         case FlvdStepBack::Unwanted: {
             __FLV_DMX__fioSeek64(file, -int64_t{FLVD_BACK_POINTER_SIZE}, FIO_SEEK_CUR);
             const int64_t before = FLVD_FioTell(file);
-            if (before < 0 || before >= cursor) // a host whose seeks fail would go round for ever
+            if (before < 0 || before >= cursor) // a host whose seeks fail would go round forever
                 return FLVD_ERR_NOT_FOUND;
             cursor = before;
             budget = FLVD_RESYNC_WINDOW;

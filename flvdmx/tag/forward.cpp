@@ -10,7 +10,7 @@ namespace {
 constexpr uint32_t FLVD_FIRST_LOOK = 4096;
 
 // The trusting search takes a position only once in so many tags passed: it has no budget for them, and a host whose
-// seek does not move could keep it busy for ever.
+// seek does not move could keep it busy forever.
 constexpr uint32_t FLVD_TAGS_PER_POSITION = 0x1000;
 
 // Results inside a search, beside those of the navigation functions.
