@@ -35,6 +35,13 @@ struct ReaderOptions {
     uint32_t mode = FIO_MODE_READ | FIO_MODE_BINARY;
 };
 
+/** A call of a function that fails: null, -1, 0 bytes, 0 elements. With `later` all calls after it fail, too. */
+struct HostFault {
+    HostFn fn = HostFn::Read;
+    uint64_t nth = 0; /**< 0: none */
+    bool later = false;
+};
+
 class FakeHost {
 public:
     FakeHost() { m_current = this; }
@@ -82,10 +89,12 @@ public:
 
     /* -- faults. Calls are numbered from 1, from the construction or the last reset_calls() on. */
 
-    /** The nth call of `fn` fails: null, -1, 0 bytes, 0 elements. */
-    void fail_nth(HostFn fn, uint64_t n) { m_faults.failing[index(fn)] = {n, n}; }
-    /** The nth call of `fn` and all later ones fail. */
-    void fail_from(HostFn fn, uint64_t n) { m_faults.failing[index(fn)] = {n, UINT64_MAX}; }
+    void fail(const HostFault& fault)
+    {
+        m_faults.failing[index(fault.fn)] = {fault.nth, fault.later ? UINT64_MAX : fault.nth};
+    }
+    void fail_nth(HostFn fn, uint64_t n) { fail({fn, n}); }
+    void fail_from(HostFn fn, uint64_t n) { fail({fn, n, true}); }
     /** The nth call of a function that can fail (alloc, open, read, write, seek, tell, flush) fails. */
     void fail_nth_call(uint64_t n) { m_faults.call = n; }
     void fail_nothing() { m_faults = {}; }
