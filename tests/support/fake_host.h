@@ -91,7 +91,7 @@ public:
 
     void fail(const HostFault& fault)
     {
-        m_faults.failing[index(fault.fn)] = {fault.nth, fault.later ? UINT64_MAX : fault.nth};
+        m_faults.failing[index(fault.fn)] = {fault.nth, fault.later && fault.nth != 0 ? UINT64_MAX : fault.nth};
     }
     void fail_nth(HostFn fn, uint64_t n) { fail({fn, n}); }
     void fail_from(HostFn fn, uint64_t n) { fail({fn, n, true}); }
