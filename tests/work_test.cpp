@@ -319,12 +319,7 @@ TEST(Work, CostsLittleOnValidFiles)
         {.what = "one: its rest and a cache", .size = BIG, .act = one, .most = {2, 0, 2, BIG + 20}, .before = 1},
         {.what = "scanning seek", .size = TINY, .act = sought, .most = astray, .script = long_text},
         {.what = "scanning seek in large frames", .size = BIG, .act = sought, .most = inside},
-        {.what = "index in memory",
-         .size = TINY,
-         .act = sought,
-         .most = {1, 1, 1, CACHE},
-         .script = {},
-         .options = INDEX},
+        {.what = "memory", .size = TINY, .act = sought, .most = {1, 1, 1, CACHE}, .script = {}, .options = INDEX},
         {.what = "index in the file", .size = TINY, .act = sought, .most = {3, 3, 1, 3 * CACHE}, .script = {}},
     };
     for (const auto& row : rows) {
