@@ -80,7 +80,7 @@ TEST(Samples, DeliverWhatTheProberFound)
 }
 
 // The file grows by one byte at a time: until it can be opened, with two readers until both streams can be seen, and
-// then between requests.
+// then between requests. Each frame comes with the request after its last byte.
 void PlayGrowing(const Expected& sample, uint32_t options)
 {
     FakeHost host(sample.bytes);
@@ -91,14 +91,18 @@ void PlayGrowing(const Expected& sample, uint32_t options)
         session.emplace(host, OpenOptions{options});
     while ((!session->opened() || session->info().has_video + session->info().has_audio < streams) && host.grow(1));
     std::map<uint32_t, Frames> delivered;
-    for (bool more = true; more;) {
-        more = host.grow(1);
-        for (const uint32_t stream : Streams(options))
-            if (FrameResult result = session->frame(stream); result.rc == 0) {
-                more = true;
+    do
+        for (const uint32_t stream : Streams(options)) {
+            const auto whole = [&](const Tag& tag) {
+                return (tag.stream() & stream) != 0 && tag.end() <= host.visible();
+            };
+            const auto due = static_cast<size_t>(std::count_if(sample.tags.begin(), sample.tags.end(), whole));
+            FrameResult result = session->frame(stream);
+            EXPECT_EQ(result.rc == 0, delivered[stream].size() < due) << sample.name;
+            if (result.rc == 0)
                 delivered[stream].push_back(std::move(result.frame));
-            }
-    }
+        }
+    while (host.grow(1));
     for (const uint32_t stream : Streams(options))
         EXPECT_EQ(delivered[stream], Whole(sample, stream)) << sample.name;
 }
