@@ -185,9 +185,8 @@ private:
         const bool before = fired();
         if (seek.stream != 0) {
             uint32_t result = 0;
-            const auto run = growing() ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
             judge(Op::FrameSeek,
-                  run(&ctx, static_cast<uint32_t>(seek.time), &result, seek.stream, seek.mode == BACK ? 1 : 0));
+                  m_session->frame_seek(static_cast<uint32_t>(seek.time), seek.stream, seek.mode, &result));
             return false;
         }
         int32_t reached = -1;

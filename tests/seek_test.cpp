@@ -349,9 +349,8 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
             host.fail({HostFn::Read, row.left == NO_READ ? 1u : 0u, true});
             uint32_t reached = 0;
             int32_t time = 0;
-            const auto run = (row.open & GROWING) != 0 ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
             const int32_t rc = row.stream == TIME ? session.seek(static_cast<int32_t>(row.to), mode, &time)
-                                                  : run(ctx, row.to, &reached, row.stream, mode == BACK ? 1 : 0);
+                                                  : session.frame_seek(row.to, row.stream, mode, &reached);
             EXPECT_EQ(rc, row.site ? At(*row.site).result() : row.rc);
             EXPECT_TRUE(session.recorded(row.site)) << session.error_line();
             EXPECT_EQ(row.stream == TIME ? static_cast<uint32_t>(time) : reached, row.reached);
