@@ -21,18 +21,76 @@ Bytes Part(size_t from, size_t to)
     return bytes;
 }
 
-constexpr ReaderOptions UPDATE = {CACHE, 0, 0, UPDATE_BINARY};
-
-// A host with an open file, and short names for the calls; the log starts after the opening.
+// A host with an open file, and the calls that tests/data/cached_file.txt names; the log starts after the opening.
 class Cached {
 public:
-    explicit Cached(const ReaderOptions& options = UPDATE, Bytes contents = Part(0, 200))
+    explicit Cached(const ReaderOptions& options, Bytes contents = Part(0, 200))
         : host(std::move(contents)), file(host.open_reader(options))
     {
         host.start_log();
     }
-    ~Cached() { close(); }
+    ~Cached() { __FLV_DMX__fioClose(file); }
 
+    // What a call returns, with the host calls that it costs.
+    std::string call(const std::string& text)
+    {
+        std::string name;
+        int64_t first = 0, second = 1; // numbers
+        uint32_t third = 1;
+        std::istringstream(text) >> name >> first >> second >> third;
+        const auto n = static_cast<uint32_t>(first), size = static_cast<uint32_t>(second);
+        const auto signed_n = static_cast<int32_t>(first), whence = static_cast<int32_t>(second);
+        const auto fail = [this](HostFn fn) { host.fail_from(fn, host.calls(fn) + 1); };
+        const std::map<std::string, std::function<void()>> changes = {
+            {"narrow", [&] { narrow(); }},
+            {"short-write", [&] { host.shorten_nth(HostFn::Write, host.calls(HostFn::Write) + 1, n); }},
+            {"start-bits", [&] { __FLV_DMX__bitInit(file); }},
+            {"skip-bits", [&] { __FLV_DMX__bitSkipBits(file, n); }},
+            {"skip-long", [&] { __FLV_DMX__bitSkipBitsLong(file, n); }},
+            {"set-left", [&] { file->bits_left = signed_n; }},
+            {"set-pending", [&] { file->bit_skip_pending = signed_n; }},
+            {"no-seek", [&] { fail(HostFn::Seek); }},
+            {"no-tell", [&] { fail(HostFn::Tell); }},
+            {"no-write", [&] { fail(HostFn::Write); }},
+            {"no-flush", [&] { fail(HostFn::Flush); }},
+        };
+        const std::map<std::string, std::function<std::string()>> calls = {
+            {"peek", [&] { return told(peek(n)); }},
+            {"read", [&] { return told(read(n, size)); }},
+            {"write", [&] { return told(write(first, second, third)); }},
+            {"copy", [&] { return told(__FLV_DMX__fioShowBytesByCopy(Bytes(n).data(), n, file)); }},
+            {"skip", [&] { return told(__FLV_DMX__fioSkipBytes(n, file)); }},
+            {"seek", [&] { return told(__FLV_DMX__fioSeek64(file, first, whence)); }},
+            {"seek32", [&] { return told(__FLV_DMX__fioSeek(file, signed_n, whence)); }},
+            {"tell", [&] { return told(__FLV_DMX__fioTell64(file)); }},
+            {"tell32", [&] { return told(__FLV_DMX__fioTell(file)); }},
+            {"eof", [&] { return told(__FLV_DMX__fioIsEof(file)); }},
+            {"flush", [&] { return told(__FLV_DMX__fioFlush(file)); }},
+            {"close", [&] { return told(__FLV_DMX__fioClose(std::exchange(file, nullptr))); }},
+            {"size", [&] { return told(__FLV_DMX__fioSetCacheReadSize(file, n)); }},
+            {"held", [&] { return told(file->count); }},
+            {"copies", [&] { return told(static_cast<int64_t>(host.calls(HostFn::Copy))); }},
+            {"contents", [&] { return told(host.contents()); }},
+            {"bits", [&] { return told(__FLV_DMX__bitShowUBits(file, n)); }},
+            {"bit", [&] { return told(__FLV_DMX__bitShowBit(file)); }},
+            {"signed", [&] { return told(__FLV_DMX__bitShowSBits(file, n)); }},
+            {"take-bits", [&] { return told(__FLV_DMX__bitGetUBits(file, n)); }},
+            {"take-bit", [&] { return told(__FLV_DMX__bitGetBit(file)); }},
+            {"take-signed", [&] { return told(__FLV_DMX__bitGetSBits(file, n)); }},
+            {"left", [&] { return told(file->bits_left); }},
+            {"held-bits", [&] { return std::to_string(file->bits); }},
+            {"pending", [&] { return told(file->bit_skip_pending); }},
+        };
+        if (changes.count(name) == 0)
+            return calls.at(name)();
+        changes.at(name)();
+        return "";
+    }
+
+    FakeHost host;
+    fio_file_t* file;
+
+private:
     // The bytes shown in place.
     Bytes peek(uint32_t n) const
     {
@@ -42,22 +100,24 @@ public:
         return Bytes(bytes, bytes + got);
     }
     // The whole elements read, as bytes.
-    Bytes read(uint32_t count, uint32_t size = 1) const
+    Bytes read(uint32_t count, uint32_t size) const
     {
         Bytes out(size_t{size} * count);
         out.resize(size_t{__FLV_DMX__fioRead(out.data(), size, count, file)} * size);
         return out;
     }
-    uint32_t write(const Bytes& bytes, uint32_t size = 1) const
+    uint32_t write(int64_t from, int64_t to, uint32_t size) const
     {
+        const Bytes bytes = Part(static_cast<size_t>(from), static_cast<size_t>(to));
         return __FLV_DMX__fioWrite(bytes.data(), size, static_cast<uint32_t>(bytes.size()) / size, file);
     }
-    uint32_t skip(uint32_t n) const { return __FLV_DMX__fioSkipBytes(n, file); }
-    int32_t seek(int64_t to, int32_t whence = FIO_SEEK_SET) const { return __FLV_DMX__fioSeek64(file, to, whence); }
-    int64_t tell() const { return __FLV_DMX__fioTell64(file); }
-    int32_t flush() const { return __FLV_DMX__fioFlush(file); }
-    int32_t close() { return __FLV_DMX__fioClose(std::exchange(file, nullptr)); }
-
+    // From here on the host has no 64-bit functions.
+    void narrow()
+    {
+        host.use_32_bit_only();
+        const fio_funcs_t funcs = host.funcs();
+        __FLV_DMX__fioSetFunc(&funcs);
+    }
     // Where the bytes came from, or the number returned, and the host calls since the last time.
     std::string told(const Bytes& got)
     {
@@ -70,16 +130,6 @@ public:
         const std::string calls = host.take_log();
         return std::to_string(result) + (calls.empty() ? "" : ": " + calls);
     }
-    // From here on the host has no 64-bit functions.
-    void narrow()
-    {
-        host.use_32_bit_only();
-        const fio_funcs_t funcs = host.funcs();
-        __FLV_DMX__fioSetFunc(&funcs);
-    }
-
-    FakeHost host;
-    fio_file_t* file;
 };
 
 TEST(FioOpen, TurnsModeBitsIntoModeStrings)
@@ -109,48 +159,6 @@ TEST(FioOpen, TakesTheExtraWithOverreadOnly)
     EXPECT_EQ(host.open_reader({0xFFFFFFF0, 1, 0x20}), nullptr); // the sum does not fit 32 bits
 }
 
-// What a call that tests/data/cached_file.txt names returns, with the host calls that it costs.
-std::string Call(Cached& f, const std::string& text)
-{
-    std::string name;
-    int64_t first = 0, second = 1; // numbers
-    uint32_t third = 1;
-    std::istringstream(text) >> name >> first >> second >> third;
-    const auto n = static_cast<uint32_t>(first), size = static_cast<uint32_t>(second);
-    const auto whence = static_cast<int32_t>(second);
-    const auto part = [&] { return Part(static_cast<size_t>(first), static_cast<size_t>(second)); };
-    const auto fail = [&f](HostFn fn) { f.host.fail_from(fn, f.host.calls(fn) + 1); };
-    const std::map<std::string, std::function<void()>> changes = {
-        {"narrow", [&] { f.narrow(); }},
-        {"short-write", [&] { f.host.shorten_nth(HostFn::Write, f.host.calls(HostFn::Write) + 1, n); }},
-        {"no-seek", [&] { fail(HostFn::Seek); }},
-        {"no-tell", [&] { fail(HostFn::Tell); }},
-        {"no-write", [&] { fail(HostFn::Write); }},
-        {"no-flush", [&] { fail(HostFn::Flush); }},
-    };
-    const std::map<std::string, std::function<std::string()>> calls = {
-        {"peek", [&] { return f.told(f.peek(n)); }},
-        {"read", [&] { return f.told(f.read(n, size)); }},
-        {"write", [&] { return f.told(f.write(part(), third)); }},
-        {"skip", [&] { return f.told(f.skip(n)); }},
-        {"seek", [&] { return f.told(f.seek(first, whence)); }},
-        {"seek32", [&] { return f.told(__FLV_DMX__fioSeek(f.file, static_cast<int32_t>(first), whence)); }},
-        {"tell", [&] { return f.told(f.tell()); }},
-        {"tell32", [&] { return f.told(__FLV_DMX__fioTell(f.file)); }},
-        {"eof", [&] { return f.told(__FLV_DMX__fioIsEof(f.file)); }},
-        {"flush", [&] { return f.told(f.flush()); }},
-        {"close", [&] { return f.told(f.close()); }},
-        {"size", [&] { return f.told(__FLV_DMX__fioSetCacheReadSize(f.file, n)); }},
-        {"held", [&] { return f.told(f.file->count); }},
-        {"copies", [&] { return f.told(static_cast<int64_t>(f.host.calls(HostFn::Copy))); }},
-        {"contents", [&] { return f.told(f.host.contents()); }},
-    };
-    if (changes.count(name) == 0)
-        return calls.at(name)();
-    changes.at(name)();
-    return "";
-}
-
 TEST(CachedFile, DoesWhatTheTableSays)
 {
     std::optional<Cached> f;
@@ -163,25 +171,24 @@ TEST(CachedFile, DoesWhatTheTableSays)
         else if (opening == "new")
             f.emplace(ReaderOptions{cache, 0, 0, UPDATE_BINARY | FIO_MODE_TRUNCATE});
         else
-            EXPECT_EQ(Call(*f, row[0]), row.size() > 1 ? row[1] : "") << row[0];
+            EXPECT_EQ(f->call(row[0]), row.size() > 1 ? row[1] : "") << row[0];
     }
 }
 
-TEST(FioRead, CountsWholeElementsAndRejectsCountsThatAreTooLarge)
+TEST(CachedFile, RejectsCountsThatAreTooLarge)
 {
-    Cached f(UPDATE, Part(0, 10));
+    Cached f({CACHE, 0, 0, UPDATE_BINARY}, Part(0, 10));
     __FLV_DMX__fiodbgReset();
     EXPECT_EQ(__FLV_DMX__fiodbgReadBytes(), 0u); // this build counts nothing
-    f.seek(2);
+    EXPECT_EQ(f.call("seek 2 0"), "0: seek64(2,0)=0");
     uint8_t byte = 77;
-    f.host.take_log();
     const std::pair<uint32_t, uint32_t> refused[] = {{0, 5}, {0x10000, 0x10000}, {3, 0x55555556}}; // 2 with 32 bits
     for (const auto& [size, count] : refused) {
         EXPECT_EQ(__FLV_DMX__fioRead(&byte, size, count, f.file), 0u);
         EXPECT_EQ(__FLV_DMX__fioWrite(&byte, size, count, f.file), 0u);
     }
     EXPECT_EQ(byte, 77);
-    EXPECT_EQ(f.told(f.peek(1)), "2..3: read(64)=8");
+    EXPECT_EQ(f.call("peek 1"), "2..3: read(64)=8");
     EXPECT_EQ(__FLV_DMX__fioShowBytesByCopy(&byte, 1, f.file), 1u);
     EXPECT_EQ(byte, 2);
 
@@ -191,60 +198,12 @@ TEST(FioRead, CountsWholeElementsAndRejectsCountsThatAreTooLarge)
     boaster.file_tell = [](void*) { return INT32_MIN; };
     __FLV_DMX__fioSetFunc(&boaster);
     EXPECT_LT(__FLV_DMX__fioTell(f.file), 0); // the read-ahead does not make it a position
-    f.seek(0);
-    EXPECT_EQ(f.peek(10), Bytes());
-    EXPECT_EQ(f.read(150), Bytes());
-    EXPECT_EQ(f.read(5), Bytes());
+    f.call("seek 0 0");
+    for (const char* const call : {"peek 10", "read 150", "read 5"})
+        EXPECT_EQ(f.call(call), "0..0");
     EXPECT_EQ(f.file->count, 0u);
-    f.write(Part(0, 10));
+    f.call("write 0 10");
     EXPECT_EQ(__FLV_DMX__fioWrite(&byte, 1, 0xFFFFFFF8, f.file), 0xFFFFFFF8); // no room for all, though the sum wraps
-}
-
-TEST(BitReader, IsEmptiedByByteLevelAccess)
-{
-    const Cached f;
-    const std::function<void()> accesses[] = {[&] { f.skip(1); },     [&] { f.read(2); },   [&] { f.seek(20); },
-                                              [&] { f.seek(20, 7); }, [&] { f.write({}); }, [&] { f.flush(); }};
-    for (const auto& access : accesses) {
-        f.seek(0);
-        __FLV_DMX__bitInit(f.file);
-        __FLV_DMX__bitSkipBits(f.file, 20);
-        f.peek(20);
-        EXPECT_EQ(f.file->bits_left, 44);
-        access();
-        EXPECT_EQ(std::pair(f.file->bits_left, f.file->bits), std::pair(0, uint64_t{0}));
-    }
-    f.write({});
-    f.file->bits_left = 9;
-    f.write({}); // while writing, too; and there bits are not consumed
-    EXPECT_EQ(f.file->bits_left, 0);
-    __FLV_DMX__bitSkipBits(f.file, 9);
-    EXPECT_EQ(f.file->bit_skip_pending, 0);
-    f.seek(30);
-    EXPECT_EQ(__FLV_DMX__bitGetUBits(f.file, 32), 0u); // the bytes are consumed, it stays empty
-    EXPECT_EQ(std::pair(f.tell(), f.file->bits_left), std::pair(int64_t{34}, 0));
-    __FLV_DMX__bitSkipBitsLong(f.file, 44); // starts it again
-    EXPECT_EQ(std::pair(f.tell(), f.file->bits_left), std::pair(int64_t{40}, 60));
-    f.file->bit_skip_pending = 1; // announces the reader's own skip
-    f.skip(1);
-    EXPECT_EQ(std::pair(f.file->bit_skip_pending, f.file->bits_left), std::pair(0, 60));
-}
-
-TEST(BitReader, TakesFieldsOfUpTo32Bits)
-{
-    const Cached f(UPDATE, Part(0x80, 200));
-    __FLV_DMX__bitInit(f.file);
-    EXPECT_EQ(__FLV_DMX__bitShowSBits(f.file, 4), 8u); // no sign
-    EXPECT_EQ(__FLV_DMX__bitGetSBits(f.file, 4), 8u);
-    EXPECT_EQ(__FLV_DMX__bitShowBit(f.file), 0u);
-    EXPECT_EQ(__FLV_DMX__bitGetBit(f.file), 0u);
-    __FLV_DMX__bitSkipBits(f.file, 3);
-    for (const uint32_t n : {32u, 33u, 40u})
-        EXPECT_EQ(__FLV_DMX__bitShowUBits(f.file, n), 0x81828384u);
-    for (uint32_t n = 1; n <= 32; ++n) {
-        __FLV_DMX__bitSkipBits(f.file, n);
-        EXPECT_GT(f.file->bits_left, 32);
-    }
 }
 
 } // namespace
