@@ -81,7 +81,7 @@ public:
             {"held-bits", [&] { return std::to_string(file->bits); }},
             {"pending", [&] { return told(file->bit_skip_pending); }},
         };
-        if (changes.count(name) == 0)
+        if (!changes.contains(name))
             return calls.at(name)();
         changes.at(name)();
         return "";

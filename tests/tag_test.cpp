@@ -267,7 +267,7 @@ TEST(Resynchronisation, CoversOneMiBInAll)
     }
 }
 
-// Position queries that tell another place, and seeks that fail, which are the last then.
+// A position query that tells another place, or a seek that fails and is not tried again.
 TEST(Position, ThatDoesNotAdvanceEndsASearch)
 {
     // Video of 65 bytes and 15 more, audio of 115 bytes in all, video; the first tag starts at FIRST_TAG. Or audio that
