@@ -82,7 +82,6 @@ TEST(Failures, OfOpening)
     const Bytes far = File({Pcm(0)}, 5, Noise(MIB + 1)).bytes, script = File({g_meta}).bytes;
     const Bytes unseen = Repeat(BUDGET, g_meta, {Pcm(0)}).bytes;
     const Row rows[] = {
-        {.what = "no such file", .open = {0, false, 0, 0, "b.flv"}, .site = OPEN_MAIN_READER},
         {.what = "no signature", .file = Noise(5000), .site = OPEN_FILE_HEADER},
         {.what = "signature too far", .file = far, .site = OPEN_FILE_HEADER},
         {.what = "8 bytes", .file = Cut(g_chain.bytes, 8), .open = {GROWING}, .site = OPEN_FILE_HEADER},
@@ -253,11 +252,8 @@ TEST(Probing, FindsStreamsAndTimes)
         {.what = "after script data", .file = scripts, .streams = AUDIO, .first_ts = 3, .duration = 6},
         {.what = "last below first", .file = File({g_meta, Pcm(5000), Pcm(100)}, 4), .streams = AUDIO, .method = 0},
         {.what = "second configuration", .file = second, .streams = VIDEO, .first_ts = 40, .duration = 50},
-        {.what = "growing", .file = video, .streams = VIDEO, .method = 0, .options = GROWING},
-        {.what = "growing, script data", .file = script_first, .streams = VIDEO, .method = 0, .options = GROWING},
-        {.what = "larger header", .file = after({}), .duration = 9},
+        {.what = "growing", .file = script_first, .streams = VIDEO, .method = 0, .options = GROWING},
         {.what = "signature after its own beginning", .file = after({'F', 'L'}), .duration = 9},
-        {.what = "signature after a few bytes", .file = after(Noise(5)), .duration = 9},
         {.what = "signature after a cache", .file = after(Noise(5000)), .duration = 9},
         {.what = "signature after the first MiB", .file = far, .duration = 9},
         {.what = "index", .file = g_indexed, .duration = 782, .method = FLVD_SEEK_BY_INDEX},
@@ -317,39 +313,6 @@ TEST(Delivery, GivesThePayloadsAfterTheCodecBytes)
                 EXPECT_EQ(play(session, stream, &rc), flv.frames(stream));
                 EXPECT_EQ(rc, (session.ctx()->streams & stream) != 0 ? -2 : -1);
             }
-        }
-    }
-}
-
-TEST(Delivery, KeepsTheSizeOfTheLastFrameAndTheTimeOfEachStream)
-{
-    const struct {
-        Tag tag;
-        uint32_t size, video, audio; // afterwards; the times count from 1000
-        int32_t rc = 0;
-    } rows[] = {
-        {.tag = Nalu(1000, 60), .size = 60, .video = 0, .audio = 0},
-        {.tag = Raw(1010, 50), .size = 50, .video = 0, .audio = 10},
-        {.tag = Nalu(1040, LARGE), .size = LARGE, .video = 40, .audio = 10},
-        {.tag = Raw(1050, LARGE + 9), .size = LARGE + 9, .video = 40, .audio = 50},
-        {.tag = Raw(1070, 20), .size = 20, .video = 40, .audio = 70},
-        {.tag = Nalu(1080, 70), .size = 70, .video = 80, .audio = 70},
-        {.tag = g_meta, .size = 70, .video = 80, .audio = 70, .rc = -2},
-    };
-    Tags tags = {g_meta, g_avc, g_aac};
-    for (const auto& row : rows)
-        tags.push_back(row.tag);
-    for (const OpenOptions& mode : {OpenOptions{}, Cache(SMALL), Buffer(5000), Cache(SMALL, GROWING)}) {
-        FakeHost host(File(tags).bytes);
-        Session session(host, mode);
-        const flvd_ctx_t& ctx = *session.ctx();
-        EXPECT_EQ(std::tuple(ctx.last_frame_size, ctx.last_video_ts, ctx.last_audio_ts), std::tuple(0u, 0u, 0u));
-        const uint32_t first = mode.options == GROWING ? 1000 : 0; // a growing file's times are those of its tags
-        for (const auto& row : rows) {
-            EXPECT_EQ(session.frame().rc, row.rc);
-            EXPECT_EQ(ctx.last_frame_size, row.size);
-            EXPECT_EQ(ctx.last_video_ts, first + row.video);
-            EXPECT_EQ(ctx.last_audio_ts, first != 0 && row.audio == 0 ? 0 : first + row.audio);
         }
     }
 }

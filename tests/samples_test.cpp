@@ -8,6 +8,7 @@
 #include "support/sweep.h"
 
 #include <algorithm>
+#include <array>
 #include <map>
 #include <optional>
 
@@ -49,10 +50,20 @@ bool Play(FakeHost& host, const OpenOptions& open, const Expected& sample, bool 
         EXPECT_TRUE(opened || !exact || waits || sample.tags.front().end() > size);
         EXPECT_TRUE(opened || session.failed_as_listed(Op::Open, session.open_rc())) << session.error_line();
         for (const uint32_t stream : opened ? Streams(open.options) : std::vector<uint32_t>{}) {
+            const auto told = [ctx = session.ctx()] {
+                return std::array{ctx->last_frame_size, ctx->last_video_ts, ctx->last_audio_ts};
+            };
             Frames frames;
+            auto last = told();
             FrameResult result = session.frame(stream);
-            for (; result.rc == 0 && frames.size() <= static_cast<size_t>(size) / 15; result = session.frame(stream))
+            for (; result.rc == 0 && frames.size() <= static_cast<size_t>(size) / 15; result = session.frame(stream)) {
+                last.at(0) = static_cast<uint32_t>(result.frame.data.size());
+                last.at(result.frame.stream) = result.frame.timestamp;
+                EXPECT_EQ(told(), last);
                 frames.push_back(std::move(result.frame));
+            }
+            // A growing file may have a frame whole that is not delivered yet.
+            EXPECT_TRUE((open.options & GROWING) != 0 || told() == last);
             EXPECT_TRUE(!exact || frames == Whole(sample, open.for_info ? 0 : stream, size))
                 << testing::PrintToString(frames);
             EXPECT_TRUE(session.failed_as_listed(Op::Frame, result.rc)) << session.error_line();

@@ -326,7 +326,6 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         {.what = "gone", .flv = cut, .stream = VIDEO, .to = 700, .mode = BACK, .reached = 800, .left = 36},
         {.what = "two gone", .flv = cut, .stream = VIDEO, .to = 500, .mode = BACK, .reached = 800, .left = 27},
         {.what = "forward", .flv = cut, .stream = VIDEO, .to = 500, .rc = -101, .left = 27},
-        {.what = "one cut, two gone", .flv = cut, .stream = VIDEO, .to = 300, .mode = BACK, .reached = 800, .left = 19},
         {.what = "not needed", .flv = cut, .stream = VIDEO, .to = 300, .mode = BACK, .reached = 200, .left = 27},
         {.what = "all gone", .flv = cut, .stream = VIDEO, .to = 300, .mode = BACK, .reached = 800, .left = 0},
         {.what = "to the start", .flv = cut, .stream = VIDEO, .mode = BACK, .left = 0},
