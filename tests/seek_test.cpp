@@ -17,8 +17,8 @@ using enum Site;
 
 constexpr uint32_t AUTO = 0, ONE = 0, TWO = SEPARATE, TIME = 0, INFO = 1u << 31, EACH = 1u << 30;
 constexpr int32_t UNTOUCHED = -77777;
-// What a seek chooses besides tags: no place, the place where it is, and a rewind, which goes to the end of the file
-// header.
+// What a seek chooses besides tags: no place, the place where it is, a rewind, and the first tag. The latter two lead
+// to the end of the file header.
 constexpr int64_t NOWHERE = 0, HERE = 1, REWIND = 2, FIRST_TAG = 9;
 constexpr size_t ALL = 100000;
 constexpr int64_t NO_READ = -1;
@@ -309,14 +309,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         {.what = "place in the file header", .flv = in_header, .stream = VIDEO, .to = 200, .at = 5},
         {.what = "memory", .flv = in_header, .open = INDEX, .stream = VIDEO, .to = 200, .at = 5},
         {.what = "no video", .flv = no_video, .stream = VIDEO, .to = 1700, .mode = EACH, .reached = 1538, .at = 9},
-        {.what = "no audio",
-         .flv = mute,
-         .open = TWO,
-         .stream = AUDIO,
-         .to = 1700,
-         .mode = EACH,
-         .reached = 1538,
-         .at = 9},
+        {.what = "mute", .flv = mute, .open = TWO, .stream = AUDIO, .to = 1700, .mode = EACH, .reached = 1538, .at = 9},
         {.what = "audio ends the file", .flv = index, .stream = AUDIO, .to = 1979, .mode = EACH, .reached = 1978},
         {.what = "after audio", .flv = ended, .stream = AUDIO, .to = 2100, .mode = EACH, .reached = 2360, .at = end},
         {.what = "1 ms later", .flv = ended, .stream = AUDIO, .to = 1979, .mode = BACK, .reached = 2360, .at = end},
