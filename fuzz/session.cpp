@@ -7,8 +7,6 @@
 #include "support/session.h"
 #include "judge.h"
 
-#include <cstring>
-
 using namespace flvd_fuzz;
 
 namespace {
@@ -16,7 +14,7 @@ namespace {
 constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // MAX_PLAYED: frames requested after the commands
 constexpr uint64_t PATIENCE = 2000;      // for most lying hosts: lies can use up whole budgets, which is slow
 constexpr uint64_t BUDGETS = 30'000'000; // host calls allowed with a patient lying host
-constexpr uint8_t POISON = 0x5A;
+constexpr int32_t UNTOUCHED = 0x5A;
 constexpr std::array<uint32_t, 8> CACHES = {0, 1024, 1, 1500, 65536, 4096, 16000, 0xFFFFFFFF};
 
 class Run {
@@ -67,24 +65,23 @@ public:
         const uint8_t bits = input.byte(), sizes = input.byte();
         if ((bits & 0x80u) != 0)
             m_host.use_32_bit_only();
-        m_buffer = Bytes((bits & FLVD_OPT_USER_BUFFER) != 0 ? input.word() : 0);
-        const flvd_init_t init = m_host.init(bits & 0x0Fu, CACHES[sizes % CACHES.size()], sizes / 8);
-        flvd_open_info_t info{};
+        const uint32_t room = (bits & USER) != 0 ? input.word() : 0;
         m_lied = m_lies != 0;
         begin();
-        const int32_t rc =
-            QVX_FLV_DMX((bits & 0x70u) == 0x70u ? FLVD_OP_OPEN_INFO : FLVD_OP_OPEN, &m_ctx, &init, &info);
-        require((rc == 0) == (m_ctx != nullptr), "result and instance of an open disagree");
+        m_session.emplace(m_host, OpenOptions{bits & 0x0Fu, (bits & 0x70u) == 0x70u, CACHES[sizes % CACHES.size()],
+                                              sizes / 8u, FakeHost::DEFAULT_FILE, room});
+        m_ctx = m_session->ctx();
+        require(m_session->opened() == (m_ctx != nullptr), "result and instance of an open disagree");
         if (m_ctx != nullptr)
-            return judge_opened(info);
-        require(IsListed(Op::Open, rc, g_flvd_lLastError, g_flvd_lErrorLine), "a failure that opens do not have");
+            return judge_opened(m_session->info());
+        require(m_session->failed_as_listed(Op::Open, m_session->open_rc()), "a failure that opens do not have");
         m_host.require_clean();
     }
 
     void close()
     {
         begin();
-        require(m_ctx == nullptr || QVX_FLV_DMX(FLVD_OP_CLOSE, &m_ctx, nullptr, nullptr) == 0, "a close failed");
+        require(m_ctx == nullptr || m_session->close() == 0, "a close failed");
         m_ctx = nullptr;
         m_host.require_clean();
     }
@@ -95,20 +92,19 @@ public:
             return;
         const bool separate = has(SEPARATE) && m_ctx->opened_for_info == 0;
         const fio_file_t* const reader = separate && stream == AUDIO ? m_ctx->audio_reader : m_ctx->main_reader;
-        const flvd_frame_request_t request{m_buffer.data(), static_cast<uint32_t>(m_buffer.size()), stream};
-        flvd_frame_t frame;
-        std::memset(&frame, POISON, sizeof frame);
         begin();
         const int64_t before = place(reader);
-        const int32_t rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &frame);
+        const int32_t rc = m_session->frame(stream).rc;
+        const flvd_frame_t& frame = m_session->record();
         require(m_lied || m_faulty || place(reader) >= before, "a frame request moved back");
         if (rc == 0) {
             require(!separate || frame.stream == stream, "a frame of the wrong stream");
             return judge_frame(frame, m_host.position(reader) - 4);
         }
-        require(IsListed(Op::Frame, rc, m_ctx->error, m_ctx->error_line), "a failure that frame requests do not have");
+        require(m_session->failed_as_listed(Op::Frame, rc), "a failure that frame requests do not have");
         const bool refused = m_ctx->error <= FLVD_ERR_NO_VIDEO && m_ctx->error >= FLVD_ERR_INFO_ONLY;
-        require(bytes_of(frame) == Bytes(sizeof frame, refused ? POISON : 0), "wrong record after a failed request");
+        require(bytes_of(frame) == Bytes(sizeof frame, refused ? Session::POISON : 0),
+                "wrong record after a failed request");
     }
 
 private:
@@ -141,7 +137,8 @@ private:
     // While calls fail, skipping the back-pointer may have failed too; the tag may then be anywhere.
     void judge_frame(const flvd_frame_t& frame, int64_t end) const
     {
-        require(m_buffer.empty() || (frame.data == m_buffer.data() && frame.size <= m_buffer.size()),
+        const Bytes& buffer = m_session->user_buffer();
+        require(buffer.empty() || (frame.data == buffer.data() && frame.size <= buffer.size()),
                 "a frame outside the caller's buffer");
         copy_of(frame.data, frame.size);
         end = m_faulty ? m_host.visible() : end;
@@ -169,17 +166,17 @@ private:
     {
         if (m_ctx == nullptr)
             return;
-        const flvd_seek_request_t request{time, (bits & 0x10u) | (bits & 3u) << 8 | (bits & 0x0Cu) << 14};
-        int32_t reached = POISON;
+        const uint32_t mode = (bits & 0x10u) | (bits & 3u) << 8 | (bits & 0x0Cu) << 14;
+        int32_t reached = UNTOUCHED;
         begin();
         const int64_t main = place(m_ctx->main_reader), audio = place(m_ctx->audio_reader);
-        const int32_t rc = QVX_FLV_DMX(FLVD_OP_SEEK, &m_ctx, &request, &reached);
+        const int32_t rc = m_session->seek(time, mode, &reached);
         const bool judged = !m_lied && !m_faulty;
-        if (rc == 0 && judged && ((request.mode & FLVD_SEEK_RELATIVE) == 0 || time != 0))
+        if (rc == 0 && judged && ((mode & FLVD_SEEK_RELATIVE) == 0 || time != 0))
             return judge_landing(reached);
-        require(rc == 0 || IsListed(Op::Seek, rc, m_ctx->error, m_ctx->error_line), "a failure that seeks do not have");
-        require(rc == 0 || reached == POISON, "a failed seek wrote a time");
-        const bool stays = rc != 0 && judged && (request.mode & FLVD_SEEK_TO_END_ON_MISS) == 0;
+        require(rc == 0 || m_session->failed_as_listed(Op::Seek, rc), "a failure that seeks do not have");
+        require(rc == 0 || reached == UNTOUCHED, "a failed seek wrote a time");
+        const bool stays = rc != 0 && judged && (mode & FLVD_SEEK_TO_END_ON_MISS) == 0;
         require(!stays || (place(m_ctx->main_reader) == main && place(m_ctx->audio_reader) == audio),
                 "a failed seek lost the position");
     }
@@ -198,8 +195,8 @@ private:
     }
 
     Host m_host;
-    flvd_ctx_t* m_ctx = nullptr;
-    Bytes m_buffer;
+    std::optional<Session> m_session;
+    flvd_ctx_t* m_ctx = nullptr; // null when none is open
     uint32_t m_lies = 0;
     bool m_was_opened = false, m_lied = false; // m_lied holds until the file is closed
     bool m_faulty = false;                     // calls may fail or read short

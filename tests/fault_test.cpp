@@ -37,14 +37,6 @@ const std::map<HostFn, std::set<Site>> g_ledTo = {
                        INDEX_BACK_POSITION, INDEX_LAST_TAG, LAST_TAG, WALK_STEP, FRAME_POSITION, BACK_FROM_SKIP,
                        SEEK_VIDEO_POSITION, SEEK_AUDIO_POSITION, SEEK_ONE_READER_POSITION, SEEK_FOLLOW_POSITION,
                        AUDIO_FOLLOW_POSITION, AUDIO_FIRST_STEP, AUDIO_WALK, VIDEO_FIRST_STEP, VIDEO_WALK)}};
-// To the other places the file or the caller leads alone.
-const std::set<Site> g_withoutFault =
-    Set(NO_INSTANCE, RESERVED_OPERATION, MP3_HEADER, AAC_DATA, MP3_8KHZ_DATA, MP3_8KHZ_HEADER, H263_DATA, H263_HEADER,
-        VP6_DATA, VP6_HEADER, VP6A_DATA, VP6A_HEADER, AVC_DATA, AVC_CONFIG, AVC_PARAMETERS, AVC_NO_SEQUENCE_HEADER,
-        FRAME_INFO_ONLY, FRAME_NO_VIDEO, FRAME_NO_AUDIO, FRAME_BAD_STREAM, FRAME_END, SEEK_INFO_ONLY, SEEK_NOT_SEEKABLE,
-        SEEK_MISS, FILE_INDEX_POSITION_TYPE, FILE_INDEX_TAG_CUT, FILE_INDEX_TOLERANCE, MEMORY_INDEX_TAG_CUT,
-        MEMORY_INDEX_TOLERANCE, SEEK_METHOD);
-
 struct Seek {
     int32_t time;
     uint32_t mode = 0, stream = 0; // of a stream: a frame seek, BACK or FORTH
@@ -193,9 +185,8 @@ private:
         const bool before = fired();
         if (seek.stream != 0) {
             uint32_t result = 0;
-            const auto run = growing() ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
             judge(Op::FrameSeek,
-                  run(&ctx, static_cast<uint32_t>(seek.time), &result, seek.stream, seek.mode == BACK ? 1 : 0));
+                  m_session->frame_seek(static_cast<uint32_t>(seek.time), seek.stream, seek.mode, &result));
             return false;
         }
         int32_t reached = -1;
@@ -277,11 +268,10 @@ std::vector<Scenario> Scenarios()
     const Flv first_large = File({mp3(0), Screen(0, LARGE), mp3(9), Screen(9), Screen(40), Screen(80)});
     const auto plain = [&large](size_t size) { return large(Pcm(0), Pcm, size); };
     const int64_t video = avc.tags[2].end(), aac_frame = aac.tags[2].end();
-    using Opens = std::vector<OpenOptions>;
-    const Opens scanning = {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)};
-    const Opens indexing = {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}};
-    const Opens growing = {open(GROWING), open(GROWING | SEPARATE)};
-    const Opens information = {open(0, 0, true), open(SEPARATE, 0, true)};
+    const std::vector<OpenOptions> scanning = {open(0), open(SEPARATE, SMALL), open(0, 0, false, 320)},
+                                   indexing = {open(0), open(SEPARATE), open(INDEX), {INDEX | SEPARATE}},
+                                   growing = {open(GROWING), open(GROWING | SEPARATE)},
+                                   information = {open(0, 0, true), open(SEPARATE, 0, true)};
     return {
         {.what = "scan", .flv = chain, .opens = scanning, .seeks = seeks},
         {.what = "audio", .flv = audio, .opens = {open(0)}, .seeks = seeks},
@@ -349,15 +339,6 @@ TEST(Faults, AreSurvivedAtEveryCall)
             EXPECT_TRUE(seen[place.line].contains(fn)) << place.line;
             EXPECT_TRUE(place.growing_line == 0 || seen[place.growing_line].contains(fn)) << place.growing_line;
         }
-}
-
-TEST(Faults, LeadToEveryPlaceOrTheFileAloneDoes)
-{
-    for (const Place& place : Places()) {
-        const auto leads = [&place](const auto& led) { return led.second.contains(place.site); };
-        const bool fault = std::any_of(g_ledTo.begin(), g_ledTo.end(), leads);
-        EXPECT_NE(fault, g_withoutFault.contains(place.site)) << place.line;
-    }
 }
 
 } // namespace

@@ -17,10 +17,11 @@ using enum Site;
 
 constexpr uint32_t AUTO = 0, ONE = 0, TWO = SEPARATE, TIME = 0, INFO = 1u << 31, EACH = 1u << 30;
 constexpr int32_t UNTOUCHED = -77777;
-// What a seek chooses besides tags: no place, the place where it is, and a rewind, which goes to the end of the file
-// header.
-constexpr int64_t NOWHERE = 0, HERE = 1, FIRST_TAG = 9;
+// What a seek chooses besides tags: no place, the place where it is, a rewind, and the first tag. The latter two lead
+// to the end of the file header.
+constexpr int64_t NOWHERE = 0, HERE = 1, REWIND = 2, FIRST_TAG = 9;
 constexpr size_t ALL = 100000;
+constexpr int64_t NO_READ = -1;
 
 // Where the elements of a script array begin; past the end of the file without such a key.
 size_t Elements(const Bytes& bytes, const std::string& key)
@@ -41,13 +42,13 @@ struct Media {
     Frames frames;
     uint32_t stream; // the one that decides
     uint32_t first_ts, last_ts = 0;
-    bool by_index;
+    bool by_index, audio;
     Tags tags, keys; // of the frames
 
     // index_lag: ms by which the index's times are too early
     explicit Media(const Flv& flv, uint32_t index_lag = 0)
         : bytes(flv.bytes), frames(flv.frames()), stream((bytes[4] & 1) != 0 ? VIDEO : AUDIO), first_ts(flv.first_ts()),
-          by_index(Elements(bytes, "keyframes") < bytes.size())
+          by_index(Elements(bytes, "keyframes") < bytes.size()), audio(!flv.frames(AUDIO).empty())
     {
         std::copy_if(flv.tags.begin(), flv.tags.end(), std::back_inserter(tags), std::mem_fn(&Tag::is_frame));
         for (Tag tag : tags) {
@@ -64,8 +65,8 @@ struct Media {
 struct Player {
     const Media& m;
     Session session;
-    std::array<size_t, 3> next{}; // frame that comes next; [0] with one reader, else by stream
-    uint32_t current = 0;
+    std::array<size_t, 3> next{};    // frame that comes next; [0] with one reader, else by stream
+    std::array<uint32_t, 3> times{}; // of the last frame of each stream, or where a seek led it
 
     Player(FakeHost& host, const Media& media, const OpenOptions& options) : m(media), session(host, options) {}
 
@@ -73,6 +74,7 @@ struct Player {
     // The reader that seeks: the two are one without the option.
     fio_file_t* reader() const { return m.stream == VIDEO ? session.ctx()->main_reader : session.ctx()->audio_reader; }
 
+    uint32_t& current() { return times.at(m.stream); }
     // The first frame at or after a place.
     size_t at(int64_t pos) const
     {
@@ -93,19 +95,19 @@ struct Player {
                 if (got.rc != 0)
                     break;
                 ASSERT_EQ(got.frame, m.frames[n++]) << "frame " << n - 1;
-                current = got.frame.stream == m.stream ? got.frame.timestamp : current;
+                times.at(got.frame.stream) = got.frame.timestamp;
             }
     }
 
     // The place that the rules choose.
-    int64_t choose(int32_t time, uint32_t mode) const
+    int64_t choose(int32_t time, uint32_t mode)
     {
         const bool relative = (mode & REL) != 0;
-        const int64_t now = int64_t{m.first_ts} + current, target = (relative ? now : m.first_ts) + time;
+        const int64_t now = int64_t{m.first_ts} + current(), target = (relative ? now : m.first_ts) + time;
         const uint32_t forced = mode & FLVD_SEEK_DIRECTION_MASK;
         const bool backward = forced == BACK || (forced != FORTH && target < now);
         if ((relative && time == 0) || target <= 0)
-            return relative && time == 0 ? HERE : FIRST_TAG;
+            return relative && time == 0 ? HERE : REWIND;
         const auto reaches = [target](const Tag& key) { return key.timestamp >= target; };
         auto chosen = std::find_if(m.keys.begin(), m.keys.end(), reaches);
         const bool exact = chosen != m.keys.end() && chosen->timestamp == target;
@@ -116,12 +118,14 @@ struct Player {
         return (backward && !exact ? chosen - 1 : chosen)->offset;
     }
 
-    // The readers stand where a seek puts them that reached this place.
-    void place(int64_t pos)
+    // The readers stand where a seek puts them that reached this place. Audio of a growing file does not move by
+    // itself.
+    void place(int64_t pos, bool rewound = false)
     {
         next.fill(at(pos));
         const uint32_t time = next[0] < m.tags.size() ? m.tags[next[0]].timestamp : m.last_ts;
-        current = time - m.first_ts;
+        const bool moves = m.audio && (rewound || !has(GROWING) || has(TWO));
+        times = {0, m.stream == VIDEO ? time - m.first_ts : 0, moves ? time - m.first_ts : times[AUDIO]};
         if (!has(TWO) || has(GROWING) || m.stream == AUDIO || time == m.first_ts)
             return;
         uint32_t last = 0;
@@ -131,6 +135,8 @@ struct Player {
             next[2] = m.tags[i].type == 8 && last <= time ? i : next[2];
         }
         next[2] = last < time ? m.tags.size() : next[2];
+        if (m.audio)
+            times[AUDIO] = (last < time ? m.last_ts : m.tags[next[2]].timestamp) - m.first_ts;
     }
 
     // Does as chosen and returns the place.
@@ -142,17 +148,23 @@ struct Player {
         if (chosen == NOWHERE && (mode & RETRY) != 0)
             chosen = choose(time, BACK);
         int32_t reached = UNTOUCHED;
+        const uint32_t size = session.ctx()->last_frame_size;
         const int32_t rc = session.seek(time, mode, &reached);
-        SCOPED_TRACE(testing::PrintToString(std::tuple(time, mode, current, rc)));
+        SCOPED_TRACE(testing::PrintToString(std::tuple(time, mode, current(), rc)));
         EXPECT_TRUE(rc == 0 || session.failed_as_listed(Op::Seek, rc)) << session.error_line();
         EXPECT_EQ(rc, chosen == NOWHERE ? -2 : 0);
         EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(reader()), session.ctx()->cache_size);
+        const bool rewinds = chosen == REWIND;
+        chosen = rewinds ? FIRST_TAG : chosen;
         if (const int64_t pos = __FLV_DMX__fioTell64(reader()); rc == 0 && chosen != HERE) {
-            place(pos);
+            place(pos, rewinds);
             // audio may as well be found at its configuration
             EXPECT_TRUE(m.stream == AUDIO ? at(chosen) == at(pos) : chosen == pos) << pos;
         }
-        EXPECT_EQ(reached, rc == 0 ? static_cast<int32_t>(current) : UNTOUCHED);
+        EXPECT_EQ(reached, rc == 0 ? static_cast<int32_t>(current()) : UNTOUCHED);
+        EXPECT_EQ(session.ctx()->last_video_ts, times[VIDEO]);
+        EXPECT_EQ(session.ctx()->last_audio_ts, times[AUDIO]);
+        EXPECT_EQ(session.ctx()->last_frame_size, size);
         return chosen;
     }
 };
@@ -172,7 +184,7 @@ void SeekAround(const Media& media, const OpenOptions& options)
             auto time = static_cast<uint32_t>(random() % (media.last_ts - media.first_ts + 1300) - 1200);
             if (random() % 4 == 0) // exactly at a choice
                 time = media.keys.at(random() % media.keys.size()).timestamp - media.first_ts;
-            time = i % 50 == 49 ? 0 : (mode & REL) != 0 ? time - player.current : time;
+            time = i % 50 == 49 ? 0 : (mode & REL) != 0 ? time - player.current() : time;
             const int64_t place = player.seek(static_cast<int32_t>(time), mode);
             const bool fresh = place > FIRST_TAG && played.insert({player.next[0], player.next[2]}).second;
             player.deliver(fresh ? ALL : random() % 3);
@@ -245,120 +257,98 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
             late.push_back(tag(time, 60));
         return File(late);
     };
-    const Flv no_video = without({Screen(90000)}, Pcm), no_audio = without({g_avc, Pcm(90000)}, Nalu);
+    const Flv no_video = without({Screen(90000)}, Pcm), mute = without({g_avc, Pcm(90000)}, Nalu);
     const Flv ended = Configured(); // audio up to 1978 ms, video up to 2360
     const int64_t end = ended.size();
+    // The times are the last bytes of the file, and it loses some of them after opening. Elements without a byte count
+    // as 0.0; with two of them in a row the index ends with its last entry, at 0 s, which is near enough to its tag at
+    // 800 ms.
+    Tags pictures = {g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(800)};
+    std::string positions = "filepositions: [5";
+    for (size_t i = 0; const Tag& tag : File(pictures, 1).tags)
+        positions += i++ != 0 ? " " + std::to_string(tag.offset) : "";
+    pictures.push_back({18, 0, OnMetaData("keyframes: { " + positions + " times: [5 0 0.2 0.4 0.6 0.8 }")});
+    const Flv cut = File(pictures, 1);
     Flv text = index; // the positions have a string at 800 ms, the times one in the place of 1600 ms
     for (const auto& [key, element] : {std::pair("filepositions", 4 * 9), {"times", 8 * 9}})
         std::copy(g_string.begin(), g_string.end(), &text.bytes[Elements(text.bytes, key)] + element);
     struct Row {
         const char* what;
         const Flv& flv;
-        uint32_t options = ONE, stream = TIME; // TIME: a time seek, else the frame seek of a stream
-        uint32_t time = 0, mode = AUTO;        // EACH: both directions, one after the other
-        std::optional<Site> site = {};         // where it fails
-        int32_t rc = 0;                        // without a site
+        uint32_t open = ONE, stream = TIME; // TIME: a time seek, else the frame seek of a stream
+        uint32_t to = 0, mode = AUTO;       // EACH: both directions, one after the other
+        std::optional<Site> site = {};      // where it fails
+        int32_t rc = 0;                     // without a site
         uint32_t reached = 0;
-        int64_t at = HERE; // where the reader stands afterwards; HERE: not looked at
+        int64_t at = HERE;        // where the reader stands afterwards; HERE: not looked at
+        int64_t left = INT32_MAX; // bytes of the times and of what follows; NO_READ: of the whole file
     };
     const Row rows[] = {
-        {.what = "for information", .flv = scan, .options = INFO, .time = 100, .site = SEEK_INFO_ONLY},
-        {.what = "growing: information", .flv = index, .options = GROWING | INFO, .time = 100, .site = SEEK_INFO_ONLY},
-        {.what = "growing: no index", .flv = scan, .options = GROWING, .time = 100, .site = SEEK_NOT_SEEKABLE},
-        {.what = "growing: no video", .flv = audio, .options = GROWING, .time = 100, .site = SEEK_NOT_SEEKABLE},
-        {.what = "growing: audio", .flv = index, .options = GROWING, .stream = AUDIO, .time = 900, .rc = -1},
-        {.what = "growing: fewer times", .flv = two_times, .options = GROWING, .time = 1900, .mode = BACK},
-        {.what = "growing: fewer places", .flv = two_places, .options = GROWING, .time = 1900, .mode = BACK},
-        {.what = "index of one entry", .flv = one_entry, .time = 100, .site = SEEK_NOT_SEEKABLE},
-        {.what = "frame seek by it", .flv = one_entry, .stream = VIDEO, .time = 900, .mode = BACK, .site = SEEK_METHOD},
-        {.what = "after the last time", .flv = scan, .time = 9000, .site = SEEK_MISS},
-        {.what = "growing: after the last entry", .flv = index, .options = GROWING, .time = 9000, .site = SEEK_MISS},
-        {.what = "after the last keyframe", .flv = scan, .time = 1950, .mode = FORTH, .site = SEEK_MISS},
-        {.what = "frame seek there", .flv = scan, .stream = VIDEO, .time = 1950, .rc = -101, .reached = 1978},
-        {.what = "frame seek there by index", .flv = index, .stream = VIDEO, .time = 1801, .rc = -101},
-        {.what = "place after the file", .flv = odd, .stream = VIDEO, .time = 1800, .site = FILE_INDEX_TAG_CUT},
-        {.what = "memory", .flv = odd, .options = INDEX, .stream = VIDEO, .time = 1800, .site = MEMORY_INDEX_TAG_CUT},
-        {.what = "1001 ms off the tag", .flv = odd, .stream = VIDEO, .time = 1601, .site = FILE_INDEX_TOLERANCE},
-        {.what = "memory", .flv = odd, .options = INDEX, .stream = VIDEO, .time = 1601, .site = MEMORY_INDEX_TOLERANCE},
-        {.what = "1000 ms off the tag", .flv = odd, .stream = VIDEO, .time = 1400, .mode = BACK, .reached = 400},
-        {.what = "before an entry with another time", .flv = odd, .time = 700, .mode = BACK, .reached = 200},
-        {.what = "string as a place", .flv = text, .stream = VIDEO, .time = 800, .site = FILE_INDEX_POSITION_TYPE},
-        {.what = "string ends the times", .flv = text, .stream = VIDEO, .time = 1900, .mode = BACK, .reached = 1400},
-        {.what = "place in the file header", .flv = in_header, .stream = VIDEO, .time = 200, .at = 5},
-        {.what = "memory", .flv = in_header, .options = INDEX, .stream = VIDEO, .time = 200, .at = 5},
-        {.what = "no video", .flv = no_video, .stream = VIDEO, .time = 1700, .mode = EACH, .reached = 1538, .at = 9},
-        {.what = "no audio",
-         .flv = no_audio,
-         .options = TWO,
-         .stream = AUDIO,
-         .time = 1700,
-         .mode = EACH,
-         .reached = 1538,
-         .at = 9},
-        {.what = "audio ends the file", .flv = index, .stream = AUDIO, .time = 1979, .mode = EACH, .reached = 1978},
-        {.what = "after audio", .flv = ended, .stream = AUDIO, .time = 2100, .mode = EACH, .reached = 2360, .at = end},
-        {.what = "1 ms later", .flv = ended, .stream = AUDIO, .time = 1979, .mode = BACK, .reached = 2360, .at = end},
-        {.what = "to the last audio tag", .flv = ended, .stream = AUDIO, .time = 1978, .mode = BACK, .reached = 1978},
-        {.what = "1 ms before it", .flv = ended, .stream = AUDIO, .time = 1977, .mode = BACK, .reached = 1955},
+        {.what = "for information", .flv = scan, .open = INFO, .to = 100, .site = SEEK_INFO_ONLY},
+        {.what = "growing: information", .flv = index, .open = GROWING | INFO, .to = 100, .site = SEEK_INFO_ONLY},
+        {.what = "growing: no index", .flv = scan, .open = GROWING, .to = 100, .site = SEEK_NOT_SEEKABLE},
+        {.what = "growing: no video", .flv = audio, .open = GROWING, .to = 100, .site = SEEK_NOT_SEEKABLE},
+        {.what = "growing: audio", .flv = index, .open = GROWING, .stream = AUDIO, .to = 900, .rc = -1},
+        {.what = "growing: fewer times", .flv = two_times, .open = GROWING, .to = 1900, .mode = BACK},
+        {.what = "growing: fewer places", .flv = two_places, .open = GROWING, .to = 1900, .mode = BACK},
+        {.what = "index of one entry", .flv = one_entry, .to = 100, .site = SEEK_NOT_SEEKABLE},
+        {.what = "frame seek by it", .flv = one_entry, .stream = VIDEO, .to = 900, .mode = BACK, .site = SEEK_METHOD},
+        {.what = "after the last time", .flv = scan, .to = 9000, .site = SEEK_MISS},
+        {.what = "growing: after the last entry", .flv = index, .open = GROWING, .to = 9000, .site = SEEK_MISS},
+        {.what = "after the last keyframe", .flv = scan, .to = 1950, .mode = FORTH, .site = SEEK_MISS},
+        {.what = "frame seek there", .flv = scan, .stream = VIDEO, .to = 1950, .rc = -101, .reached = 1978},
+        {.what = "frame seek there by index", .flv = index, .stream = VIDEO, .to = 1801, .rc = -101},
+        {.what = "place after the file", .flv = odd, .stream = VIDEO, .to = 1800, .site = FILE_INDEX_TAG_CUT},
+        {.what = "memory", .flv = odd, .open = INDEX, .stream = VIDEO, .to = 1800, .site = MEMORY_INDEX_TAG_CUT},
+        {.what = "1001 ms off the tag", .flv = odd, .stream = VIDEO, .to = 1601, .site = FILE_INDEX_TOLERANCE},
+        {.what = "memory", .flv = odd, .open = INDEX, .stream = VIDEO, .to = 1601, .site = MEMORY_INDEX_TOLERANCE},
+        {.what = "1000 ms off the tag", .flv = odd, .stream = VIDEO, .to = 1400, .mode = BACK, .reached = 400},
+        {.what = "before an entry with another time", .flv = odd, .to = 700, .mode = BACK, .reached = 200},
+        {.what = "string as a place", .flv = text, .stream = VIDEO, .to = 800, .site = FILE_INDEX_POSITION_TYPE},
+        {.what = "string ends the times", .flv = text, .stream = VIDEO, .to = 1900, .mode = BACK, .reached = 1400},
+        {.what = "place in the file header", .flv = in_header, .stream = VIDEO, .to = 200, .at = 5},
+        {.what = "memory", .flv = in_header, .open = INDEX, .stream = VIDEO, .to = 200, .at = 5},
+        {.what = "no video", .flv = no_video, .stream = VIDEO, .to = 1700, .mode = EACH, .reached = 1538, .at = 9},
+        {.what = "mute", .flv = mute, .open = TWO, .stream = AUDIO, .to = 1700, .mode = EACH, .reached = 1538, .at = 9},
+        {.what = "audio ends the file", .flv = index, .stream = AUDIO, .to = 1979, .mode = EACH, .reached = 1978},
+        {.what = "after audio", .flv = ended, .stream = AUDIO, .to = 2100, .mode = EACH, .reached = 2360, .at = end},
+        {.what = "1 ms later", .flv = ended, .stream = AUDIO, .to = 1979, .mode = BACK, .reached = 2360, .at = end},
+        {.what = "to the last audio tag", .flv = ended, .stream = AUDIO, .to = 1978, .mode = BACK, .reached = 1978},
+        {.what = "1 ms before it", .flv = ended, .stream = AUDIO, .to = 1977, .mode = BACK, .reached = 1955},
+        {.what = "last time cut", .flv = cut, .stream = VIDEO, .to = 700, .mode = BACK, .reached = 800, .left = 44},
+        {.what = "gone", .flv = cut, .stream = VIDEO, .to = 700, .mode = BACK, .reached = 800, .left = 36},
+        {.what = "two gone", .flv = cut, .stream = VIDEO, .to = 500, .mode = BACK, .reached = 800, .left = 27},
+        {.what = "forward", .flv = cut, .stream = VIDEO, .to = 500, .rc = -101, .left = 27},
+        {.what = "not needed", .flv = cut, .stream = VIDEO, .to = 300, .mode = BACK, .reached = 200, .left = 27},
+        {.what = "all gone", .flv = cut, .stream = VIDEO, .to = 300, .mode = BACK, .reached = 800, .left = 0},
+        {.what = "to the start", .flv = cut, .stream = VIDEO, .mode = BACK, .left = 0},
+        {.what = "no read",
+         .flv = cut,
+         .stream = VIDEO,
+         .to = 300,
+         .mode = BACK,
+         .site = FILE_INDEX_TAG_CUT,
+         .left = NO_READ},
+        {.what = "forward", .flv = cut, .stream = VIDEO, .to = 300, .rc = -101, .left = NO_READ},
     };
     for (const Row& row : rows)
         for (const uint32_t mode : row.mode == EACH ? std::vector{BACK, AUTO} : std::vector{row.mode}) {
             SCOPED_TRACE(std::to_string(&row - rows) + ": " + row.what);
             FakeHost host(row.flv.bytes);
-            Session session(host, {row.options, (row.options & INFO) != 0});
+            Session session(host, {row.open, (row.open & INFO) != 0});
             flvd_ctx_t* const ctx = session.ctx();
+            host.set_visible(static_cast<int64_t>(Elements(row.flv.bytes, "times")) + row.left);
+            host.fail({HostFn::Read, row.left == NO_READ ? 1u : 0u, true});
             uint32_t reached = 0;
             int32_t time = 0;
-            const auto run = (row.options & GROWING) != 0 ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
-            const int32_t rc = row.stream == TIME ? session.seek(static_cast<int32_t>(row.time), mode, &time)
-                                                  : run(ctx, row.time, &reached, row.stream, mode == BACK ? 1 : 0);
+            const int32_t rc = row.stream == TIME ? session.seek(static_cast<int32_t>(row.to), mode, &time)
+                                                  : session.frame_seek(row.to, row.stream, mode, &reached);
             EXPECT_EQ(rc, row.site ? At(*row.site).result() : row.rc);
             EXPECT_TRUE(session.recorded(row.site)) << session.error_line();
             EXPECT_EQ(row.stream == TIME ? static_cast<uint32_t>(time) : reached, row.reached);
             fio_file_t* const reader = row.stream == AUDIO ? ctx->audio_reader : ctx->main_reader;
             EXPECT_TRUE(row.at == HERE || __FLV_DMX__fioTell64(reader) == row.at);
         }
-}
-
-// A keyframe every 200 ms, audio every 23; the times count from 1000, those of the growing file from 0.
-TEST(Seek, SetsTheTimeOfEachStream)
-{
-    constexpr uint32_t KEPT = UINT32_MAX;
-    const Flv scan = Chain(1000, false), index = Chain(1000, true), no_video = Chain(1000, false, false);
-    const Flv growing = Chain(0, true);
-    const struct {
-        const Flv& flv;
-        uint32_t options;
-        int32_t time;
-        uint32_t mode, video, audio;
-        int32_t rc = 0;
-    } rows[] = {
-        {.flv = scan, .options = ONE, .time = 500, .mode = BACK, .video = 400, .audio = 400},
-        {.flv = scan, .options = TWO, .time = 500, .mode = BACK, .video = 400, .audio = 391},
-        {.flv = index, .options = INDEX, .time = 500, .mode = FORTH, .video = 600, .audio = 600},
-        {.flv = no_video, .options = ONE, .time = 500, .mode = BACK, .video = KEPT, .audio = 483},
-        {.flv = no_video, .options = TWO, .time = 500, .mode = FORTH, .video = KEPT, .audio = 506},
-        {.flv = growing, .options = GROWING, .time = 500, .mode = BACK, .video = 400, .audio = KEPT},
-        {.flv = growing, .options = GROWING | TWO, .time = 500, .mode = BACK, .video = 400, .audio = 400},
-        {.flv = scan, .options = TWO, .time = -5000, .mode = AUTO, .video = 0, .audio = 0},
-        {.flv = growing, .options = GROWING, .time = -1, .mode = AUTO, .video = 0, .audio = 0},
-        {.flv = scan, .options = ONE, .time = 0, .mode = REL, .video = KEPT, .audio = KEPT},
-        {.flv = scan, .options = TWO, .time = 9000, .mode = FORTH, .video = KEPT, .audio = KEPT, .rc = -2},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(&row - rows);
-        FakeHost host(row.flv.bytes);
-        Session session(host, {row.options});
-        const flvd_ctx_t& ctx = *session.ctx();
-        for (const uint32_t stream : Streams(row.options))
-            for (int i = 0; i < 8; ++i)
-                session.frame(stream);
-        const auto [size, video, audio] = std::tuple(ctx.last_frame_size, ctx.last_video_ts, ctx.last_audio_ts);
-        EXPECT_EQ(session.seek(row.time, row.mode), row.rc);
-        EXPECT_EQ(ctx.last_video_ts, row.video == KEPT ? video : row.video);
-        EXPECT_EQ(ctx.last_audio_ts, row.audio == KEPT ? audio : row.audio);
-        EXPECT_EQ(ctx.last_frame_size, size);
-    }
 }
 
 TEST(Seek, InAFileThatStillGrows)
@@ -373,9 +363,7 @@ TEST(Seek, InAFileThatStillGrows)
         EXPECT_EQ(player.session.seek(1300, BACK), -1);
         player.deliver(2);
         host.grow(1);
-        const uint32_t audio = player.session.ctx()->last_audio_ts;
         player.seek(1300, BACK); // to a tag of which no more is there
-        EXPECT_EQ(player.session.ctx()->last_audio_ts, options != GROWING ? 1200 : audio);
         host.fail_from(HostFn::Seek, host.calls(HostFn::Seek) + 1);
         EXPECT_EQ(player.session.frame(VIDEO).rc, -1); // and which cannot be gone back to now, so it has to wait
         host.fail_nothing();
@@ -414,34 +402,20 @@ TEST(Seek, GoesBackToAPlaceThatItCouldNotGoBackToBefore)
     }
 }
 
-// A host whose position stays the same, once it is told to.
-class StuckHost : public FakeHost {
-public:
-    using FakeHost::FakeHost;
-    std::optional<int64_t> stuck_at;
-
-protected:
-    int64_t tell(void* pointer, bool wide) override
-    {
-        const int64_t position = FakeHost::tell(pointer, wide);
-        return stuck_at.value_or(position);
-    }
-};
-
-// Every step of a walk begins at the same place then, and may find the same tag again. One of these never ended.
+// Every step of a walk begins at the same place, and may find the same tag again. One of these never ended.
 TEST(Seek, EndsOnAHostWhosePositionStaysTheSame)
 {
     constexpr uint64_t many = 100000; // 200 tags are walked over with a few thousand calls
-    std::vector<Tag> tags;
+    Tags tags;
     for (uint32_t i = 0; i < 200; ++i)
         tags.push_back({9, 40 * i, Concat({{0x13}, Bytes(49, 0x55)})}); // 65 bytes in all
     const auto before = tags.begin() + 50;
     const Bytes file = Concat({File({tags.begin(), before}, 1).bytes, {0x55}, File({before, tags.end()}, 1).body()});
     for (const int32_t time : {40, 560, 1080})
         for (int64_t stuck_at = 13; stuck_at < static_cast<int64_t>(file.size()); stuck_at += 997) {
-            StuckHost host(file);
+            FakeHost host(file);
             Session session(host);
-            host.stuck_at = stuck_at;
+            host.on_tell = [stuck_at](int64_t) { return stuck_at; };
             uint64_t calls = 0;
             host.on_call = [&](HostFn) {
                 if (++calls == many)
@@ -450,55 +424,6 @@ TEST(Seek, EndsOnAHostWhosePositionStaysTheSame)
             session.seek(time, BACK);
             EXPECT_LT(calls, many) << time << " ms, position " << stuck_at;
         }
-}
-
-// The file loses its end after opening, and with it elements of the times, which are its last bytes; or no byte can be
-// read any more. Elements without a byte count as 0.0; with two of them in a row the index ends with its last entry, at
-// 0 s, which is near enough to its tag at 800 ms.
-TEST(Seek, ReadsZerosWhereTheIndexInTheFileIsCut)
-{
-    Tags tags = {g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(800)};
-    std::string positions = "filepositions: [5";
-    for (size_t i = 0; const Tag& tag : File(tags, 1).tags)
-        positions += i++ != 0 ? " " + std::to_string(tag.offset) : "";
-    tags.push_back({18, 0, OnMetaData("keyframes: { " + positions + " times: [5 0 0.2 0.4 0.6 0.8 }")});
-    const Bytes bytes = File(tags, 1).bytes;
-    const auto times = static_cast<int64_t>(Elements(bytes, "times"));
-    constexpr int64_t NO_READ = -1;
-    const struct {
-        const char* what;
-        int64_t visible;
-        uint32_t target, reached;
-        bool backward = true;
-        int32_t rc = 0;
-        std::optional<Site> site = {};
-    } rows[] = {
-        {.what = "whole", .visible = times + 45, .target = 300, .reached = 200},
-        {.what = "the last is cut", .visible = times + 44, .target = 700, .reached = 800},
-        {.what = "the last is gone", .visible = times + 36, .target = 700, .reached = 800},
-        {.what = "two are gone", .visible = times + 27, .target = 500, .reached = 800},
-        {.what = "forward", .visible = times + 27, .target = 500, .reached = 0, .backward = false, .rc = -101},
-        {.what = "one is cut, two are gone", .visible = times + 19, .target = 300, .reached = 800},
-        {.what = "two are gone, not needed", .visible = times + 27, .target = 300, .reached = 200},
-        {.what = "all are gone", .visible = times, .target = 300, .reached = 800},
-        {.what = "all are gone, to the start", .visible = times, .target = 0, .reached = 0},
-        {.what = "no read", .visible = NO_READ, .target = 300, .reached = 0, .rc = -1, .site = FILE_INDEX_TAG_CUT},
-        {.what = "no read, forward", .visible = NO_READ, .target = 300, .reached = 0, .backward = false, .rc = -101},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.what);
-        FakeHost host(bytes);
-        Session session(host);
-        ASSERT_EQ(session.ctx()->keyframe_index.entry_count, 5u);
-        if (row.visible == NO_READ)
-            host.fail_from(HostFn::Read, host.calls(HostFn::Read) + 1);
-        else
-            host.set_visible(row.visible);
-        uint32_t reached = 0;
-        EXPECT_EQ(FLVD_RunFrameSeek(session.ctx(), row.target, &reached, VIDEO, row.backward ? 1 : 0), row.rc);
-        EXPECT_EQ(reached, row.reached);
-        EXPECT_TRUE(session.recorded(row.site)) << session.error_line();
-    }
 }
 
 TEST(Seek, BeyondFourGiB)

@@ -300,7 +300,7 @@ TEST(Work, CostsLittleOnValidFiles)
     const Calls astray = Walk(38 + 2, 20);
     // Of large tags the estimate lies inside one; from the next, at 4,240 ms, it is 6 tags back.
     const Calls inside = Calls{BIG / (CACHE - 12) + 1, 0, 0, BIG} + Walk(0, 6);
-    // Two positions per tag; 95 bytes are read beside the frames.
+    // Bytes after the file header: script data and configuration, 95 in all, and the frames.
     const uint64_t tags = FRAMES + 2, tiny = 95 + FRAMES * (TINY + 20), big = 95 + FRAMES * (BIG + 20);
     constexpr int NONE = -1;
     const struct {
@@ -319,12 +319,7 @@ TEST(Work, CostsLittleOnValidFiles)
         {.what = "one: its rest and a cache", .size = BIG, .act = one, .most = {2, 0, 2, BIG + 20}, .before = 1},
         {.what = "scanning seek", .size = TINY, .act = sought, .most = astray, .script = long_text},
         {.what = "scanning seek in large frames", .size = BIG, .act = sought, .most = inside},
-        {.what = "index in memory",
-         .size = TINY,
-         .act = sought,
-         .most = {1, 1, 1, CACHE},
-         .script = {},
-         .options = INDEX},
+        {.what = "memory", .size = TINY, .act = sought, .most = {1, 1, 1, CACHE}, .script = {}, .options = INDEX},
         {.what = "index in the file", .size = TINY, .act = sought, .most = {3, 3, 1, 3 * CACHE}, .script = {}},
     };
     for (const auto& row : rows) {

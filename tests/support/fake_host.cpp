@@ -289,7 +289,8 @@ int64_t FakeHost::tell(void* pointer, bool wide)
 {
     const bool allowed = begin(HostFn::Tell);
     const int64_t position = handle(pointer).pos;
-    return logged(wide ? "tell64" : "tell", "", allowed && (wide || position <= INT32_MAX) ? position : -1);
+    const int64_t told = allowed && (wide || position <= INT32_MAX) ? position : -1;
+    return logged(wide ? "tell64" : "tell", "", on_tell ? on_tell(told) : told);
 }
 
 } // namespace flvd_test

@@ -35,6 +35,13 @@ struct ReaderOptions {
     uint32_t mode = FIO_MODE_READ | FIO_MODE_BINARY;
 };
 
+/** A call of a function that fails: null, -1, 0 bytes, 0 elements. With `later` all calls after it fail, too. */
+struct HostFault {
+    HostFn fn = HostFn::Read;
+    uint64_t nth = 0; /**< 0: none */
+    bool later = false;
+};
+
 class FakeHost {
 public:
     FakeHost() { m_current = this; }
@@ -82,10 +89,12 @@ public:
 
     /* -- faults. Calls are numbered from 1, from the construction or the last reset_calls() on. */
 
-    /** The nth call of `fn` fails: null, -1, 0 bytes, 0 elements. */
-    void fail_nth(HostFn fn, uint64_t n) { m_faults.failing[index(fn)] = {n, n}; }
-    /** The nth call of `fn` and all later ones fail. */
-    void fail_from(HostFn fn, uint64_t n) { m_faults.failing[index(fn)] = {n, UINT64_MAX}; }
+    void fail(const HostFault& fault)
+    {
+        m_faults.failing[index(fault.fn)] = {fault.nth, fault.later && fault.nth != 0 ? UINT64_MAX : fault.nth};
+    }
+    void fail_nth(HostFn fn, uint64_t n) { fail({fn, n}); }
+    void fail_from(HostFn fn, uint64_t n) { fail({fn, n, true}); }
     /** The nth call of a function that can fail (alloc, open, read, write, seek, tell, flush) fails. */
     void fail_nth_call(uint64_t n) { m_faults.call = n; }
     void fail_nothing() { m_faults = {}; }
@@ -95,6 +104,8 @@ public:
     void limit_reads(uint32_t k) { m_faults.shortened[index(HostFn::Read)] = {EACH, k}; }
     /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
+    /** Set, it changes every position that is told. */
+    std::function<int64_t(int64_t position)> on_tell;
     /** Called with every block that is given back, while it still holds what it held. */
     std::function<void(const void* block, uint32_t size)> on_release;
 

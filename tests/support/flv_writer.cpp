@@ -1,8 +1,8 @@
 #include "flv_writer.h"
 
 #include <algorithm>
+#include <bit>
 #include <bitset>
-#include <cstring>
 #include <iomanip>
 #include <map>
 #include <sstream>
@@ -63,13 +63,6 @@ Bytes Bits(const std::string& words)
     return out;
 }
 
-static Bytes Number(double value)
-{
-    uint64_t bits = 0;
-    std::memcpy(&bits, &value, sizeof(bits));
-    return Concat({{0}, BigEndian(bits, 8)});
-}
-
 Bytes Amf(const std::string& words)
 {
     const std::map<std::string, Bytes> marks = {
@@ -83,7 +76,7 @@ Bytes Amf(const std::string& words)
             word.replace(at, digits + 1, count - 1, word[at - 1]);
         }
         const Bytes text(word.begin() + 1, word.end()), key(word.begin(), word.end() - 1);
-        if (marks.count(word) != 0)
+        if (marks.contains(word))
             Append(out, marks.at(word));
         else if (word.back() == ':')
             Append(out, Concat({BigEndian(key.size(), 2), key}));
@@ -94,10 +87,10 @@ Bytes Amf(const std::string& words)
         else if (word[0] == '[')
             Append(out, Concat({{10}, BigEndian(std::stoul(word.substr(1)), 4)}));
         else if (word[0] != '%')
-            Append(out, Number(std::stod(word)));
+            Append(out, Concat({{0}, BigEndian(std::bit_cast<uint64_t>(std::stod(word)), 8)}));
         else
             for (size_t at = 0; at != std::string::npos; at = word.find('.', at + 1))
-                Put(out, std::stoul(word.substr(at + 1)), 1);
+                out.push_back(static_cast<uint8_t>(std::stoul(word.substr(at + 1))));
     }
     return out;
 }
@@ -213,7 +206,7 @@ Flv File(const Tags& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
     Flv flv{Concat({prefix, {'F', 'L', 'V', 1, flags}, BigEndian(data_offset, 4)}), tags};
     if (flv.bytes.size() < data_offset && data_offset < 0x10000)
         flv.bytes.resize(data_offset);
-    Put(flv.bytes, 0, 4);
+    Append(flv.bytes, Bytes(4));
     for (Tag& tag : flv.tags) {
         const size_t size = tag.data.size();
         tag.offset = static_cast<int64_t>(flv.bytes.size());

@@ -25,10 +25,6 @@ inline void Append(Bytes& out, const Bytes& more)
 {
     out.insert(out.end(), more.begin(), more.end());
 }
-inline void Put(Bytes& out, uint64_t value, int bytes)
-{
-    Append(out, BigEndian(value, bytes));
-}
 Bytes Concat(const std::vector<Bytes>& parts);
 /** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
@@ -46,36 +42,20 @@ Bytes Bits(const std::string& words);
  */
 Bytes Amf(const std::string& words);
 /** The string "onMetaData" and an ECMA array of these keys and values. */
-inline Bytes OnMetaData(const std::string& properties)
-{
-    return Amf("'onMetaData < " + properties + " >");
-}
+inline const auto OnMetaData = [](const std::string& properties) { return Amf("'onMetaData < " + properties + " >"); };
 
 /* Tag data (what follows the 11-byte tag header), codec header bytes included. */
 
-inline Bytes AudioData(uint8_t header, const Bytes& payload)
-{
-    return Concat({{header}, payload});
-}
-inline Bytes VideoData(uint32_t frame_type, uint8_t codec, const Bytes& payload)
-{
+inline const auto AudioData = [](uint8_t header, const Bytes& payload) { return Concat({{header}, payload}); };
+inline const auto VideoData = [](uint32_t frame_type, uint8_t codec, const Bytes& payload) {
     return AudioData(static_cast<uint8_t>(frame_type << 4 | codec), payload);
-}
+};
 Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms = 0, uint8_t packet_type = 1);
-inline Bytes AvcConfig(const Bytes& record)
-{
-    return AvcNalu(true, record, 0, 0);
-}
+inline const auto AvcConfig = [](const Bytes& record) { return AvcNalu(true, record, 0, 0); };
 inline const Bytes g_avc_end = AvcNalu(true, {}, 0, 2);
 /* header: SoundFormat 10 with rate, size and type bits; 0xAF in every usual file. */
-inline Bytes AacConfig(const Bytes& config, uint8_t header = 0xAF)
-{
-    return Concat({{header, 0}, config});
-}
-inline Bytes AacRaw(const Bytes& payload, uint8_t header = 0xAF)
-{
-    return Concat({{header, 1}, payload});
-}
+inline const auto AacConfig = [](const Bytes& config, uint8_t header = 0xAF) { return Concat({{header, 0}, config}); };
+inline const auto AacRaw = [](const Bytes& payload, uint8_t header = 0xAF) { return Concat({{header, 1}, payload}); };
 
 /* Codec payloads, after the codec header bytes. */
 
@@ -98,12 +78,10 @@ struct Frame {
     uint32_t stream = 0;    /**< 1 video, 2 audio */
     uint32_t timestamp = 0; /**< ms, from the first timestamp */
     Bytes data;
+
+    bool operator==(const Frame&) const = default;
 };
 using Frames = std::vector<Frame>;
-inline bool operator==(const Frame& a, const Frame& b)
-{
-    return std::tie(a.stream, a.timestamp, a.data) == std::tie(b.stream, b.timestamp, b.data);
-}
 void PrintTo(const Frame& frame, std::ostream* out);
 
 /** One tag as it is to be written. */

@@ -1,10 +1,9 @@
 #include "session.h"
 
 #include <algorithm>
+#include <cstring>
 
 namespace flvd_test {
-
-static constexpr uint32_t POISON = 0x5A5A5A5A;
 
 const std::vector<Place>& Places()
 {
@@ -59,11 +58,10 @@ FrameResult Session::frame(uint32_t stream)
 {
     uint8_t* const buffer = m_user_buffer.empty() ? nullptr : m_user_buffer.data();
     const flvd_frame_request_t request{buffer, static_cast<uint32_t>(m_user_buffer.size()), stream};
-    flvd_frame_t out{nullptr, POISON, POISON, POISON, {POISON, POISON}};
-    FrameResult result = {QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &out), {}};
-    const bool delivered = result.rc == 0 && out.data != nullptr;
-    result.frame = {out.stream, out.timestamp_ms, delivered ? Bytes(out.data, out.data + out.size) : Bytes{}};
-    return result;
+    std::memset(&m_record, POISON, sizeof m_record);
+    const int32_t rc = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_ctx, &request, &m_record);
+    const auto& [data, size, stream_of, timestamp, reserved] = m_record;
+    return {rc, {stream_of, timestamp, rc == 0 ? Bytes(data, data + size) : Bytes{}}};
 }
 
 int32_t Session::seek(int32_t time, uint32_t mode, int32_t* reached)
@@ -71,6 +69,12 @@ int32_t Session::seek(int32_t time, uint32_t mode, int32_t* reached)
     const flvd_seek_request_t request{time, mode};
     int32_t ignored = 0;
     return QVX_FLV_DMX(FLVD_OP_SEEK, &m_ctx, &request, reached != nullptr ? reached : &ignored);
+}
+
+int32_t Session::frame_seek(uint32_t time, uint32_t stream, uint32_t mode, uint32_t* reached)
+{
+    const auto run = (m_options & GROWING) != 0 ? FLVD_RunFrameSeekProgressive : FLVD_RunFrameSeek;
+    return run(m_ctx, time, reached, stream, mode == BACK ? 1 : 0);
 }
 
 int32_t Session::close()

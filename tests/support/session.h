@@ -74,6 +74,8 @@ struct FrameResult {
 
 class Session {
 public:
+    static constexpr uint8_t POISON = 0x5A;
+
     /** Opens; see opened() and open_rc(). The host must live as long as the session. */
     explicit Session(FakeHost& host, const OpenOptions& options = {});
     ~Session();
@@ -88,7 +90,12 @@ public:
 
     /** stream: looked at with FLVD_OPT_SEPARATE_AUDIO_READER only. */
     FrameResult frame(uint32_t stream = 0);
+    /** What the last request left in its record, which was full of POISON, and the buffer that it offered. */
+    const flvd_frame_t& record() const { return m_record; }
+    const Bytes& user_buffer() const { return m_user_buffer; }
     int32_t seek(int32_t time, uint32_t mode, int32_t* reached = nullptr);
+    /** A frame seek of one stream; mode: BACK or not. */
+    int32_t frame_seek(uint32_t time, uint32_t stream, uint32_t mode, uint32_t* reached);
     int32_t last_error() { return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr); }
     /** Line of the last failure: the instance's, or the global one after a failed open. */
     int32_t error_line() const { return m_ctx != nullptr ? m_ctx->error_line : g_flvd_lErrorLine; }
@@ -105,6 +112,7 @@ public:
 private:
     flvd_ctx_t* m_ctx = nullptr;
     flvd_open_info_t m_info{};
+    flvd_frame_t m_record{};
     Bytes m_user_buffer;
     const uint32_t m_options;
     int32_t m_open_rc = 0;
