@@ -12,30 +12,31 @@
  *         play(frame.stream, frame.presentation_time(), frame.data);
  *     }
  *
- * What can fail returns a result<T>. Nothing needs exceptions or run-time type information; only texts, lists and codec
- * configurations take memory from operator new, which may throw. All else comes from the host.
+ * Functions that can fail return a result<T>. Neither exceptions nor run-time type information are needed. Strings,
+ * lists and codec configurations are allocated with operator new, which may throw; all other memory comes from the
+ * host.
  *
  * MISTAKES
  *
- * A File that is not open (closed, moved from, never opened) answers every call with FLVD_ERR_NO_INSTANCE, a result
- * without a value holds an empty one, and an open that would break files that are open already is refused. What remains
- * to be kept in mind: how long Bytes are valid (those of a frame until the next call, those of a configuration as long
- * as the Info that holds it), that a FrameRange must not outlive its File, and the rules for threads.
+ * A File that is not open (closed, moved from, never opened) fails every call with FLVD_ERR_NO_INSTANCE, a result
+ * without a value holds an empty one, and an open that would break other open files is refused. You are left with three
+ * rules: Bytes are borrowed (those of a frame are valid until the next call, those of a configuration as long as the
+ * Info that holds it), a FrameRange must not outlive its File, and the rules for threads below.
  *
  * THE PROCESS-WIDE TABLES
  *
- * The library calls the memory and file functions of its host. They carry no context, so there is one set of them for
- * the process: every open overwrites it, and all files that are open already go on with the newest functions. Hence:
+ * The library calls the memory and file functions of its host. They carry no context, so there is one set per process:
+ * every open replaces it, and files that are already open continue with the new functions. Therefore:
  *
- * - Files that are open at the same time have one host. File::open(path) takes the stdio host; the other hosts of the
- *   kit, and hosts of your own, are passed as a Host. While a File is open, an open through other functions returns
- *   FLVD_ERR_HOST_IN_USE. What differs from file to file belongs in a callback file (flvdmx/callback_host.h).
- * - Opening and closing hold open_mutex, so threads may open files, look at their Info and let them go as they like.
- *   All other calls take no lock, and an open must not run beside them, on whatever File: when threads play files while
- *   others open some, they hold open_mutex around their own calls as well.
- * - One File is used by one thread at a time. Calls on different Files may run at the same time.
- * - open_mutex and what else the header keeps for the process are inline variables. Shared objects that hide their
- *   symbols have them once each: let only one of them open files.
+ * - All files that are open at the same time share one host. File::open(path) uses the stdio host; pass the other hosts
+ *   of the kit, or your own, as a Host. While a File is open, an open with other functions returns
+ *   FLVD_ERR_HOST_IN_USE. If files need different functions, use callback files (flvdmx/callback_host.h).
+ * - Opening and closing hold open_mutex, so threads may open files, read their Info and close them freely. Other calls
+ *   take no lock, and no open may run at the same time as any of them, on any File: if some threads play files while
+ *   others open files, hold open_mutex around the playing calls, too.
+ * - Use a File from one thread at a time. Calls on different Files may run at the same time.
+ * - open_mutex and the other process-wide state of this header are inline variables. Shared objects that hide their
+ *   symbols each have a copy, so open files from only one of them.
  */
 #ifndef FLVDMX_FLVDMX_HPP
 #define FLVDMX_FLVDMX_HPP
@@ -73,17 +74,17 @@
 namespace flvdmx {
 
 /**
- * Held while a file is opened, for the process-wide tables and the globals in which a failed open leaves its error, and
- * while one is closed, which uses the tables. Whoever holds it may open and close.
+ * Held during every open, which writes the process-wide tables and reads the globals that hold the error of a failed
+ * open, and during every close, which uses the tables. The thread that holds it may open and close files.
  */
 inline std::recursive_mutex open_mutex;
 
-/** Every time and duration. */
+/** All times and durations. */
 using Milliseconds = std::chrono::milliseconds;
 
 /** The host's functions. */
 class Host {
-    // What the library calls.
+    // The functions that the library calls.
     static auto called(const flvd_init_t& f)
     {
         return std::tie(f.mem_alloc, f.mem_free, f.mem_copy, f.mem_set, f.file_open, f.file_read, f.file_close,
@@ -91,11 +92,11 @@ class Host {
     }
 
 public:
-    /** From a block of which all but the functions is ignored. */
+    /** Takes the functions from an initialisation block and ignores its other fields. */
     explicit Host(const flvd_init_t& functions) : m_functions(functions) {}
     const flvd_init_t& functions() const { return m_functions; } /**< the block */
 
-    /** True when all functions that the library calls are there. */
+    /** True when no function that the library needs is null. */
     bool is_complete() const
     {
         const flvd_init_t& f = m_functions;
@@ -104,15 +105,15 @@ public:
                f.file_seek != nullptr && f.file_tell != nullptr;
     }
 
-    /** True for a host with the same functions. */
+    /** True if both have the same functions. */
     bool operator==(const Host& other) const { return called(m_functions) == called(other.m_functions); }
-    bool operator!=(const Host& other) const { return !(*this == other); } /**< true for a host with others */
+    bool operator!=(const Host& other) const { return !(*this == other); } /**< true if they differ */
 
 private:
     flvd_init_t m_functions;
 };
 
-/** A Host from a function of the host kit, such as flvd_posix_host_fill; an incomplete one from null. */
+/** Makes a Host with a function of the host kit, such as flvd_posix_host_fill. Null makes an incomplete Host. */
 inline Host make_host(void (*fill)(flvd_init_t*))
 {
     flvd_init_t functions{};
@@ -125,31 +126,31 @@ inline Host make_host(void (*fill)(flvd_init_t*))
 
 /** A stream. */
 enum class Stream : uint32_t {
-    any = 0,                   /**< in requests, without a separate audio reader: whatever comes next */
+    any = 0,                   /**< the next frame of either stream; only without a separate audio reader */
     video = FLVD_STREAM_VIDEO, /**< video */
     audio = FLVD_STREAM_AUDIO  /**< audio */
 };
 
 /**
- * One frame, without the headers of FLV. AVC: NAL units, each after its length, a big-endian number of as many bytes as
- * the configuration says (mostly 4), and no parameter sets: those are in the configuration. AAC: a raw access unit,
- * without ADTS. VP6: the bytes of FLV that tell how the picture is cropped come first.
+ * One frame, without FLV headers. AVC: NAL units, each preceded by its length, a big-endian number whose size is given
+ * in the configuration (usually 4 bytes); parameter sets are only in the configuration. AAC: a raw access unit without
+ * ADTS header. VP6: starts with FLV's own bytes, which tell how to crop the picture.
  */
 struct Frame {
     Stream stream = Stream::any; /**< video or audio */
-    Milliseconds time{}; /**< when to decode it, from the first timestamp of the file; negative: a tag before that */
-    Bytes data;          /**< valid until the next call on the file other than info() */
-    Milliseconds composition_offset{}; /**< from decoding to showing it, may be negative; 0 unless the codec is AVC */
-    bool keyframe = false; /**< it can be decoded without the frames before it; true for every audio frame */
-    int64_t position = -1; /**< byte in the file where its tag begins; -1 when the host failed to tell */
-    Bytes new_config;      /**< the stream's configuration from this frame on, when another held for the frame before;
-                                else empty. Valid as long as `data`. */
+    Milliseconds time{};         /**< when to decode it, counted from the file's first timestamp; may be negative */
+    Bytes data;                  /**< valid until the next call on the file other than info() */
+    Milliseconds composition_offset{}; /**< presentation time minus `time`, may be negative; 0 unless AVC */
+    bool keyframe = false;             /**< can be decoded without earlier frames; true for all audio frames */
+    int64_t position = -1;             /**< file position of its tag header; -1 if the host's tell failed */
+    Bytes new_config; /**< the stream's configuration, if it has changed since the frame before; otherwise
+                           empty. Valid as long as `data`. */
 
-    Milliseconds presentation_time() const { return time + composition_offset; } /**< when to show it */
-    bool config_changed() const { return !new_config.empty(); } /**< true: give `new_config` to the decoder first */
+    Milliseconds presentation_time() const { return time + composition_offset; } /**< when to present it */
+    bool config_changed() const { return !new_config.empty(); } /**< true: pass `new_config` to the decoder first */
 };
 
-/** CodecID of video tags (FLV file format, version 10.1, annex E.4.3.1). Files may hold other numbers. */
+/** CodecID of video tags (FLV file format, version 10.1, annex E.4.3.1). Files may contain other values. */
 enum class VideoCodec : uint32_t {
     unknown = 0,        /**< none */
     jpeg = 1,           /**< JPEG */
@@ -161,9 +162,9 @@ enum class VideoCodec : uint32_t {
     avc = 7             /**< AVC, H.264 */
 };
 
-/** SoundFormat of audio tags (the same, annex E.4.2.1). Files may hold other numbers. */
+/** SoundFormat of audio tags (annex E.4.2.1). Files may contain other values. */
 enum class AudioCodec : uint32_t {
-    pcm = 0,               /**< linear PCM in the byte order of the machine that wrote it */
+    pcm = 0,               /**< linear PCM, byte order of the machine that wrote it */
     adpcm = 1,             /**< ADPCM */
     mp3 = 2,               /**< MP3 */
     pcm_little_endian = 3, /**< linear PCM, little-endian */
@@ -172,14 +173,14 @@ enum class AudioCodec : uint32_t {
     nellymoser = 6,        /**< Nellymoser */
     a_law = 7,             /**< G.711 A-law */
     mu_law = 8,            /**< G.711 mu-law */
-    unknown = 9,           /**< reserved in the format */
+    unknown = 9,           /**< reserved */
     aac = 10,              /**< AAC */
     speex = 11,            /**< Speex */
     mp3_8khz = 14,         /**< MP3, 8 kHz */
-    device_specific = 15   /**< whatever a device wrote */
+    device_specific = 15   /**< device-specific sound */
 };
 
-/** @return the codec's name for people; "unknown" for a number that the format does not define */
+/** @return the codec's name in plain words; "unknown" for a value that the format does not define */
 constexpr const char* name(VideoCodec codec)
 {
     constexpr std::array names = {"unknown", "JPEG",           "Sorenson H.263", "screen video",
@@ -188,7 +189,7 @@ constexpr const char* name(VideoCodec codec)
     return number < names.size() ? names[number] : names[0];
 }
 
-/** @return as for video */
+/** @return the same for audio */
 constexpr const char* name(AudioCodec codec)
 {
     constexpr std::array names = {"PCM",
@@ -211,9 +212,9 @@ constexpr const char* name(AudioCodec codec)
     return number < names.size() ? names[number] : "unknown";
 }
 
-/** The video stream; 0 in all that the file does not tell. */
+/** The video stream. Fields that are not known are 0. */
 struct VideoInfo {
-    VideoCodec codec = VideoCodec::unknown; /**< what its frames are */
+    VideoCodec codec = VideoCodec::unknown; /**< of its frames */
     uint32_t width = 0;                     /**< pixels */
     uint32_t height = 0;                    /**< pixels */
     double frame_rate = 0.0;                /**< frames per second, from the metadata */
@@ -223,82 +224,82 @@ struct VideoInfo {
 };
 
 /**
- * The audio stream; 0 in all that the file does not tell. Sample rate, sample size and channels of AAC and MP3 are the
- * codec's own. Those of all other codecs are the tag header's, which knows 5.5, 11, 22 and 44.1 kHz alone and can be
- * wrong: Speex has 16 kHz and one channel, A-law, mu-law and Nellymoser mostly 8 or 16 kHz, whatever stands there.
+ * The audio stream. Fields that are not known are 0. For AAC and MP3, sample rate, sample size and channels come from
+ * the codec's own data. For other codecs they come from the tag header, which can only express 5.5, 11, 22 and 44.1 kHz
+ * and may be wrong: Speex always has 16 kHz and one channel; A-law, mu-law and Nellymoser usually have 8 or 16 kHz.
  */
 struct AudioInfo {
-    AudioCodec codec = AudioCodec::unknown; /**< what its frames are */
+    AudioCodec codec = AudioCodec::unknown; /**< of its frames */
     uint32_t sample_rate = 0;               /**< Hz */
     uint32_t sample_size = 0;               /**< bits */
-    uint32_t channels = 0;                  /**< their number */
-    uint32_t format_tag = 0;                /**< FLVD_AUDIO_TAG_*, 0 for every other format */
+    uint32_t channels = 0;                  /**< number of channels */
+    uint32_t format_tag = 0;                /**< FLVD_AUDIO_TAG_*; 0 for other formats */
     uint32_t data_rate = 0;                 /**< kbit/s */
     std::vector<uint8_t> config;            /**< AAC: the first AudioSpecificConfig (ISO/IEC 14496-3) */
 };
 
-/** How seeks find their way. */
+/** How a file is seeked. */
 enum class SeekMethod : uint32_t {
     none = FLVD_SEEK_NONE,         /**< not at all */
     by_index = FLVD_SEEK_BY_INDEX, /**< by the metadata's keyframe index */
-    by_scan = FLVD_SEEK_BY_SCAN    /**< by stepping from tag to tag */
+    by_scan = FLVD_SEEK_BY_SCAN    /**< by scanning from tag to tag */
 };
 
-/** What was known of a file when it had been opened. A copy: it stays as it is. */
+/** What was found out about a file when it was opened. A copy: it does not change. */
 struct Info {
     std::string path;          /**< as given to open() */
-    Milliseconds start_time{}; /**< first timestamp of the file, from which all times count; 0 for a
+    Milliseconds start_time{}; /**< first timestamp of the file, from which all times are counted; 0 for a
                                     growing file */
-    Milliseconds duration{};   /**< last timestamp less the first; 0 when unknown, as of a growing file */
+    Milliseconds duration{};   /**< last timestamp minus the first; 0 if unknown, as for a growing file */
     int64_t size = 0;          /**< bytes, 0 for a growing file */
-    SeekMethod seek_method = SeekMethod::none; /**< how seeks find their way */
+    SeekMethod seek_method = SeekMethod::none; /**< how it is seeked */
     std::optional<VideoInfo> video;            /**< the video stream, if there is one */
     std::optional<AudioInfo> audio;            /**< the audio stream, if there is one */
 };
 
-/** A keyframe of the list. */
+/** An entry of File::keyframes(). */
 struct Keyframe {
-    Milliseconds time{};  /**< from the first timestamp of the file */
-    int64_t position = 0; /**< byte in the file where its tag begins */
+    Milliseconds time{};  /**< counted from the file's first timestamp */
+    int64_t position = 0; /**< file position of its tag header */
 };
 
 /* -------------------------------------------------------------------------------- how it is opened */
 
 /** How a file is opened. */
 struct Options {
-    uint32_t cache_size = 0;            /**< bytes of each reader's cache; 0: the library's choice */
-    uint32_t scan_read_size = 0;        /**< bytes per read while scanning; 0: the library's choice */
-    bool separate_audio_reader = false; /**< audio and video are asked for apart, each at its own pace */
-    bool growing = false;               /**< the file may still be written: see File::follow() */
-    bool index_in_memory = false;       /**< keep the keyframe index in memory: faster seeks */
-    bool for_info_only = false; /**< frames and seeks are refused; opens faster: the duration may be the metadata's
-                                     claim, and how to seek is not found out */
-    uint8_t* buffer = nullptr;  /**< the caller's frame buffer, which must outlive the file; null: the library's
-                                     own, which grows as needed. Frames that do not fit are passed over. */
-    uint32_t buffer_size = 0;   /**< its bytes */
-    bool restarting_timestamps = false; /**< deliver all frames, also those later than the file's last timestamp, as a
-                                             recording has whose timestamps start again; times may jump back, and
-                                             seeking is refused */
+    uint32_t cache_size = 0;            /**< size of each reader's cache in bytes; 0: default */
+    uint32_t scan_read_size = 0;        /**< bytes per read while scanning; 0: default */
+    bool separate_audio_reader = false; /**< request audio and video independently, each at its own pace */
+    bool growing = false;               /**< the file may still be growing: see File::follow() */
+    bool index_in_memory = false;       /**< keep the keyframe index in memory, for faster seeks */
+    bool for_info_only = false; /**< open faster, but refuse frames and seeks; the duration may be the one that the
+                                     metadata claims, and the seek method is not determined */
+    uint8_t* buffer = nullptr;  /**< the caller's frame buffer, which must outlive the file; frames that do not fit
+                                     are skipped. Null: the library's own, which grows as needed. */
+    uint32_t buffer_size = 0;   /**< size of `buffer` in bytes */
+    bool restarting_timestamps = false; /**< deliver all frames, even those later than the file's last timestamp, as in
+                                             recordings whose timestamps restart; times may jump back, and seeks
+                                             are refused */
 };
 
-/** How to seek; modes are combined with |. */
+/** How to seek. Combine modes with |. */
 enum class SeekMode : uint32_t {
     automatic = 0,                 /**< backward when the time is earlier than the current position, else forward */
-    absolute = 0,                  /**< the time counts from the file's first timestamp */
+    absolute = 0,                  /**< the time is counted from the file's first timestamp */
     backward = FLVD_SEEK_BACKWARD, /**< to the keyframe at or before the time */
     forward = FLVD_SEEK_FORWARD,   /**< to the keyframe at or after the time */
-    relative = FLVD_SEEK_RELATIVE, /**< the time counts from the current position */
-    to_end_on_miss = FLVD_SEEK_TO_END_ON_MISS, /**< after a miss go to the end */
-    retry_backward = FLVD_SEEK_RETRY_BACKWARD  /**< after a miss try backward, the time being absolute */
+    relative = FLVD_SEEK_RELATIVE, /**< the time is relative to the current position */
+    to_end_on_miss = FLVD_SEEK_TO_END_ON_MISS, /**< go to the end after a miss */
+    retry_backward = FLVD_SEEK_RETRY_BACKWARD  /**< after a miss, retry backward, with an absolute time */
 };
 
-/** Both modes. */
+/** Combines two modes. */
 constexpr SeekMode operator|(SeekMode a, SeekMode b)
 {
     return static_cast<SeekMode>(static_cast<uint32_t>(a) | static_cast<uint32_t>(b));
 }
 
-/** True when `modes` holds `mode`. */
+/** True if `modes` contains `mode`. */
 constexpr bool has_mode(SeekMode modes, SeekMode mode)
 {
     return (static_cast<uint32_t>(modes) & static_cast<uint32_t>(mode)) != 0;
@@ -308,20 +309,20 @@ constexpr bool has_mode(SeekMode modes, SeekMode mode)
 
 class FrameRange;
 
-/** An open file. Moved, not copied; closes itself. */
+/** An open file. Can be moved, not copied. Closed by the destructor. */
 class File {
 public:
     /** A File that is not open. */
     File() = default;
 
     /**
-     * Opens a file through the functions of `host`; they stay the process's, see above. The path is copied.
-     * @return the file; Kind::not_yet when a growing file does not yet hold a file header and the beginning of a
-     *         stream, which is also the answer for a growing file that is no FLV file: set a limit; Kind::failed, with
-     *         the system's reason when the host could not open the file, EINVAL for a path with a null character in it;
-     *         FLVD_ERR_HOST_IN_USE, FLVD_ERR_HOST_INCOMPLETE
-     * @note What the open did not find is not found later: look at info() for the streams that are awaited, and open
-     *       a growing file again while one is missing.
+     * Opens a file with the functions of `host`, which become the functions of the process, see above. Copies the path.
+     * @return the file. Kind::not_yet if a growing file does not contain a file header and the start of a stream yet; a
+     *         growing file that is not FLV looks the same, so set a time limit. Otherwise Kind::failed: with errno if
+     *         the host could not open the file (EINVAL for a path that contains a null character), or with
+     *         FLVD_ERR_HOST_IN_USE or FLVD_ERR_HOST_INCOMPLETE.
+     * @note A stream that was not found is never found later. If info() lacks a stream that you expect of a growing
+     *       file, open the file again later.
      */
     static result<File> open(std::string_view path, const Host& host, const Options& options = {})
     {
@@ -339,13 +340,13 @@ public:
         return result<File>(std::move(file));
     }
 
-    /** The same; null, which flvd_callback_host_add returns without callbacks, names no file. */
+    /** The same. Null, which flvd_callback_host_add returns if a callback is missing, fails like a missing file. */
     static result<File> open(const char* path, const Host& host, const Options& options = {})
     {
         return open(path != nullptr ? std::string_view(path) : std::string_view(), host, options);
     }
 
-    /** Opens a file through the stdio host. */
+    /** Opens a file with the stdio host. */
     static result<File> open(std::string_view path, const Options& options = {})
     {
         return open(path, make_host(flvd_stdio_host_fill), options);
@@ -357,9 +358,9 @@ public:
         return open(path, make_host(flvd_stdio_host_fill), options);
     }
 
-    /** Takes the open file over. */
+    /** Takes over the open file. */
     File(File&& other) noexcept { swap(other); }
-    /** Closes this file and takes the other over. */
+    /** Closes this file and takes over the other one. */
     File& operator=(File&& other) noexcept
     {
         File taken(std::move(other));
@@ -370,7 +371,7 @@ public:
     File& operator=(const File&) = delete;
     ~File() { close(); } /**< closes the file */
 
-    /** Closes the file; the data of its frames is gone. */
+    /** Closes the file. The data of its frames becomes invalid. */
     void close()
     {
         if (m_instance == nullptr)
@@ -382,12 +383,12 @@ public:
         --m_open_files;
     }
 
-    bool is_open() const { return m_instance != nullptr; } /**< false when closed or moved from */
+    bool is_open() const { return m_instance != nullptr; } /**< false if closed or moved from */
 
-    /** The C interface's instance, for what is not wrapped here; null when nothing is open. */
+    /** The instance of the C interface, for functions that have no wrapper here; null if not open. */
     flvd_ctx_t* instance() const { return m_instance; }
 
-    /** What is in the file; empty when nothing is open. */
+    /** Describes the file; empty if not open. */
     Info info() const
     {
         Info info;
@@ -406,9 +407,9 @@ public:
     }
 
     /**
-     * The script data at the beginning of the file: the script tags among the first 102 tags, of each the first MiB.
-     * Playing goes on where it was.
-     * @return the properties, none when the file has none; Kind::failed
+     * Reads the script data at the beginning of the file: the first MiB of each script tag among the first 102 tags.
+     * Does not change the playing position.
+     * @return the properties, possibly none; Kind::failed
      */
     result<Metadata> metadata()
     {
@@ -423,12 +424,13 @@ public:
     }
 
     /**
-     * All keyframes of the video, those of a growing file so far. A file that seeks by its keyframe index has them
-     * there, as the index tells them; else the whole file is walked, tag by tag. Playing goes on where it was.
+     * Lists the video keyframes, of a growing file those written so far. If the file is seeked by its keyframe index,
+     * the list comes from the index; otherwise the whole file is scanned, tag by tag. Does not change the playing
+     * position.
      *
-     * @param progress bool(int64_t reached, int64_t size): called after each keyframe on that walk, with the bytes
-     *                 walked and the size of the file, 0 for a growing one; when it returns false the list ends there.
-     *                 While it runs this File is not open; it must not be destroyed.
+     * @param progress bool(int64_t reached, int64_t size): called after each keyframe of a scan with its position and
+     *                 the size of the file (0 for a growing file); return false to end the list there. During the call
+     *                 this File is not open, and it must not be destroyed.
      * @return the keyframes in file order, none without video; Kind::failed
      */
     template <typename Progress> result<std::vector<Keyframe>> keyframes(Progress&& progress)
@@ -438,22 +440,22 @@ public:
         return file.list_keyframes(progress);
     }
 
-    /** The same without a report of progress. */
+    /** The same without progress reports. */
     result<std::vector<Keyframe>> keyframes()
     {
         return keyframes([](int64_t, int64_t) { return true; });
     }
 
     /**
-     * The next frame, as flvd_next_frame() finds it: damaged stretches of any length are crossed.
+     * Returns the next frame, as flvd_next_frame() does: it crosses damage of any length.
      *
-     * A codec configuration that differs from the one in force is reported with the first frame after it. A seek back
-     * to frames that were played before reports theirs again. What a seek jumps over is not looked at: until playing
-     * has passed it, a change in there is not known. Configurations above 64 KiB are not reported; when a stream has
-     * more than 256 changes, earlier ones are forgotten, and a seek back to them reports none.
+     * When the codec configuration of a stream changes, the first frame after the change reports the new one. A seek
+     * back before the change reports the old one again. A seek forward skips tags without looking at them, so a change
+     * among them is not known until playing has passed it. Configurations above 64 KiB are not reported. If a stream
+     * changes more than 256 times, earlier changes are forgotten, and a seek back to them reports nothing.
      *
-     * @param stream with a separate audio reader video or audio; without one it is not looked at
-     * @return the frame; Kind::end, for a growing file Kind::not_yet; Kind::failed
+     * @param stream video or audio, with a separate audio reader; ignored without one
+     * @return the frame; Kind::end, or Kind::not_yet for a growing file; Kind::failed
      */
     result<Frame> next_frame(Stream stream = Stream::any)
     {
@@ -464,12 +466,12 @@ public:
     }
 
     /**
-     * The next frame, as next_frame(), written to memory of the caller's choice, who can pass it on without a copy. For
-     * files opened with Options::buffer and without a separate audio reader. Frames whose size is not known in advance,
-     * such as those after damage or a configuration, are written to that buffer.
+     * Returns the next frame in memory that the caller provides, to be passed on without a copy. For files opened with
+     * Options::buffer and without a separate audio reader. A frame whose size is not known in advance, such as the one
+     * after damage or after a configuration, is written to that buffer instead.
      *
      * @param allocate uint8_t*(uint32_t size): memory for a frame of `size` bytes, or null; called at most once
-     * @return as next_frame(); the data is at the address that `allocate` returned, or in Options::buffer
+     * @return as next_frame(); the data is either where `allocate` said or in Options::buffer
      */
     template <typename Allocate> result<Frame> next_frame_into(Allocate&& allocate)
     {
@@ -500,11 +502,11 @@ public:
     }
 
     /**
-     * Tells whether there is damage between two frames. Playing goes on where it was.
+     * Tells whether there is damage between two frames. Does not change the playing position.
      *
-     * @param from byte in the file after a tag and its back-pointer
-     * @param to   a later byte, where a tag begins
-     * @return true when valid tags fill the space between
+     * @param from file position after a tag and its back-pointer
+     * @param to   later file position of a tag header
+     * @return true if nothing but valid tags lies between them
      */
     bool has_whole_tags(int64_t from, int64_t to)
     {
@@ -521,11 +523,11 @@ public:
     }
 
     /**
-     * The next frame of a growing file. While there is none yet, `wait` is called and the file is asked again; when
-     * `wait` returns false, because writing has stopped, it is asked one last time.
+     * Returns the next frame of a growing file. While there is none yet, calls `wait` and retries. After `wait` returns
+     * false, because writing has stopped, retries once more.
      *
-     * @param wait   bool(): sleeps for a while, true when the file may have grown since
-     * @param stream as of next_frame()
+     * @param wait   bool(): sleeps for a while; returns true if the file may grow further
+     * @param stream as for next_frame()
      * @return as next_frame()
      */
     template <typename Wait> result<Frame> follow(Wait&& wait, Stream stream = Stream::any)
@@ -538,21 +540,22 @@ public:
         }
     }
 
-    /** For range-for: frames up to the first request that fails; last_error() tells why it ended. */
+    /** The remaining frames, for range-for. Ends at the first request that fails; last_error() tells why. */
     inline FrameRange frames(Stream stream = Stream::any) &;
 
     /**
-     * Seeks to a keyframe, without video to an audio frame. After a miss or a failure playing continues where it was,
-     * unless the mode puts the file at its end.
+     * Seeks to a keyframe, or to an audio frame if there is no video. After a miss or a failure playing continues where
+     * it was, unless the mode says to go to the end.
      *
-     * Time 0, and whatever is before it, is the first tag, whatever its time. By an index, whose times muxers round or
-     * count from elsewhere, "at or before" holds for the times of the index: the frame can be a few milliseconds later.
-     * In a growing file seeking needs timestamps that begin at 0, video, and Options::index_in_memory.
+     * Time 0 and all earlier times lead to the first tag, whatever its time. With a keyframe index, "at or before"
+     * refers to the times in the index, which muxers round or count from another start: the frame reached can be a few
+     * milliseconds later. A growing file can be seeked only if it has video, if its timestamps start at 0, and with
+     * Options::index_in_memory.
      *
-     * @param time from the first timestamp; with SeekMode::relative from the current position. What does not fit 32
-     *             bits counts as the greatest or least time that does.
+     * @param time from the file's first timestamp, or with SeekMode::relative from the current position; clamped to 32
+     * bits
      * @param mode how to get there
-     * @return the time reached, from the first timestamp; Kind::miss; Kind::failed
+     * @return the time reached, from the file's first timestamp; Kind::miss; Kind::failed
      */
     result<Milliseconds> seek(Milliseconds time, SeekMode mode = SeekMode::automatic)
     {
@@ -560,7 +563,7 @@ public:
             return failure();
         for (Learned& learned : m_learned)
             learned.is_position = false;
-        // The library rewinds for the file timestamp 0 and times before it.
+        // The library goes to the first tag for file timestamps up to 0.
         const bool rewinds = !has_mode(mode, SeekMode::relative) && time.count() <= 0;
         const int64_t target = rewinds ? -int64_t{m_instance->first_ts} : time.count();
         const flvd_seek_request_t request = {clamp<int32_t>(target), static_cast<uint32_t>(mode)};
@@ -571,30 +574,30 @@ public:
         return Milliseconds(reached);
     }
 
-    /** The last failure of a frame or a seek, of Kind::none when there was none; later successes leave it in place. */
+    /** The last failure of a frame request or a seek; Kind::none if there was none. Successes do not reset it. */
     error last_error() const { return failure(); }
 
 private:
     friend FrameRange; // takes frames without a copy
 
-    // Of a tag (FLV file format, version 10.1, annex E.4).
+    // Tags (FLV file format, version 10.1, annex E.4).
     static constexpr uint32_t tag_header_size = 11;
     static constexpr uint32_t back_pointer_size = 4;
-    static constexpr uint32_t metadata_tags = 102;        // as many as an open looks at
-    static constexpr uint32_t script_data_max = 1u << 20; // bytes read of one script tag
-    static constexpr uint32_t config_max = 1u << 16;      // bytes of a configuration; longer ones are not reported
-    static constexpr size_t configs_max = 256;            // remembered of a stream
+    static constexpr uint32_t metadata_tags = 102;        // an open looks at the same number
+    static constexpr uint32_t script_data_max = 1u << 20; // bytes read from one script tag
+    static constexpr uint32_t config_max = 1u << 16;      // bytes; longer configurations are not reported
+    static constexpr size_t configs_max = 256;            // remembered per stream
 
-    // A tag header and the five bytes after it, of which a codec header has 1, 2 or 5.
+    // A tag header and the next five bytes, enough for every codec header.
     class Tag {
     public:
         int64_t position = -1; // in the file; -1: no tag
 
         Tag() = default;
-        // The tag at the reader's position, which is given. None when fewer bytes than a tag has are left.
+        // Peeks at the tag at the reader's position `at`. No tag if fewer bytes are left than the smallest tag has.
         Tag(fio_file_t* reader, int64_t at)
         {
-            const uint8_t* bytes = reader->cache + reader->head; // seen without a call when it is cached
+            const uint8_t* bytes = reader->cache + reader->head; // when it is cached, no call is needed
             const bool cached = reader->count >= sizeof m_bytes;
             if (!cached && __FLV_DMX__fioShowBytesByPtr(&bytes, sizeof m_bytes, reader) < sizeof m_bytes)
                 return;
@@ -610,11 +613,11 @@ private:
         int64_t end() const { return position + tag_header_size + data_size() + back_pointer_size; }
         bool is_keyframe() const { return is_audio() || m_bytes[11] >> 4 == 1 || m_bytes[11] >> 4 == 4; }
 
-        // What the packet type of AVC and AAC says: a configuration, a frame, or neither.
+        // By the packet type of AVC and AAC: a configuration, a frame, or neither.
         bool is_config() const { return (is_avc() || is_aac()) && m_bytes[12] == 0; }
         bool has_frame() const { return !is_config() && !(is_avc() && m_bytes[12] == 2); }
         uint32_t codec_header_size() const { return is_avc() ? 5 : is_aac() ? 2 : 1; }
-        // Of its frame; 0 for a tag without one.
+        // Size of the frame; 0 if there is none.
         uint32_t frame_size() const
         {
             const bool carries_frame = (is_video() || is_audio()) && has_frame() && data_size() > codec_header_size();
@@ -626,8 +629,7 @@ private:
             return is_avc() ? (static_cast<int32_t>(word(12) & 0xFFFFFF) ^ sign) - sign : 0;
         }
 
-        // True when a payload of this stream and size, after which the reader stands at `payload_end`, is that of this
-        // tag.
+        // True if this is the tag of a payload of this size, after which the reader stands at `payload_end`.
         bool has_payload(Stream of, uint32_t payload, int64_t payload_end) const
         {
             const uint32_t type = of == Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
@@ -646,18 +648,18 @@ private:
         uint8_t m_bytes[tag_header_size + 5]{};
     };
 
-    // The configurations of a stream where they are known to change, and the one that the decoder has. Empty until the
-    // first change: then the one that the open found holds everywhere.
+    // Where the configuration of a stream is known to change, and which one the decoder has. Empty until the first
+    // change: up to then the one found by the open holds everywhere.
     class ConfigHistory {
     public:
-        using Config = std::shared_ptr<const std::vector<uint8_t>>; // that of the decoder outlives what is forgotten
+        using Config = std::shared_ptr<const std::vector<uint8_t>>; // shared: the decoder's may be forgotten here
 
         ConfigHistory() = default;
         explicit ConfigHistory(Bytes opened) : m_given(share({opened.begin(), opened.end()})) {}
 
         bool empty() const { return m_changes.empty(); }
 
-        // Adds a configuration, whose tag begins at `position`. When there is no room all others are forgotten.
+        // Adds a configuration whose tag starts at `position`. If there is no room, forgets all others.
         void add(int64_t position, std::vector<uint8_t> bytes)
         {
             if (empty()) {
@@ -674,7 +676,7 @@ private:
                 return;
             }
             Change change = {position, position, share(std::move(bytes))};
-            const bool splits = before != nullptr && before->last > position; // playing came here by a seek back
+            const bool splits = before != nullptr && before->last > position; // playing has been past here before
             const Change rest = splits ? Change{before->last, before->last, before->config} : change;
             if (splits)
                 before->last = before->position;
@@ -685,11 +687,11 @@ private:
             m_changes.insert(after(position), std::move(change));
         }
 
-        // What the decoder has.
+        // The decoder's configuration.
         const Config& given() const { return m_given; }
         void give(const Config& config) { m_given = config; }
 
-        // The configuration of the frame whose tag begins at `position`, when the decoder has another; else empty.
+        // Returns the configuration of the frame whose tag starts at `position` if the decoder has another one.
         Bytes take_changed(int64_t position)
         {
             const auto next = after(position);
@@ -702,7 +704,7 @@ private:
     private:
         struct Change {
             int64_t position;
-            int64_t last; // the last place where a copy of it was seen
+            int64_t last; // where its last repetition was seen
             Config config;
         };
 
@@ -719,17 +721,17 @@ private:
         }
 
         std::vector<Change> m_changes; // in file order
-        int64_t m_opened_last = -1;    // of the configuration that the open found, while it is the only one
+        int64_t m_opened_last = -1;    // `last` of the open's configuration, while there is no other
         Config m_given;
     };
 
-    // How far a reader's tags have been looked at for configurations since the last seek; -1: not at all.
+    // How far a reader's tags have been searched for configurations since the last seek; -1: not at all.
     struct Learned {
         int64_t end = -1;
-        bool is_position = false; // the reader stands there
+        bool is_position = false; // the reader stands at `end`
     };
 
-    // Gives a file that was taken over back to its owner.
+    // Moves a file back to where it was moved from.
     class GiveBack {
     public:
         GiveBack(File& owner, File& file) : m_owner(owner), m_file(file) {}
@@ -742,7 +744,7 @@ private:
         File& m_file;
     };
 
-    // Where playing is when a reader is used for something else, or could not be put back.
+    // The playing position of a reader that is used for something else, or that could not be moved back.
     struct Return {
         fio_file_t* reader = nullptr;
         int64_t position = 0;
@@ -806,7 +808,7 @@ private:
         return init;
     }
 
-    // Without a last timestamp a tag may have any; a seek would take it for the end of the file.
+    // Without a last timestamp all timestamps are valid. Seeks would take 0 for the end of the file.
     void accept_all_times()
     {
         m_instance->last_ts = 0;
@@ -856,7 +858,7 @@ private:
             m_return = {};
     }
 
-    // False when nothing is open or a reader is not where playing is.
+    // False if nothing is open or a reader cannot be moved to its playing position.
     bool can_read()
     {
         if (m_return.reader != nullptr)
@@ -864,7 +866,7 @@ private:
         return m_instance != nullptr && m_return.reader == nullptr;
     }
 
-    // The main reader is going to be used for something else than playing.
+    // Saves the playing position of the main reader, which is going to be used for something else.
     error leave()
     {
         if (!can_read())
@@ -876,8 +878,8 @@ private:
         return {};
     }
 
-    // The first tag of a wanted kind from the reader's position on, by the library's own rules; no tag when there is
-    // none or its position is not known.
+    // The first wanted tag at or after the reader's position, by the library's own rules. No tag if there is none or if
+    // its position is not known.
     Tag find_tag(fio_file_t* reader, uint32_t wanted) const
     {
         flvd_tag_info_t info;
@@ -885,9 +887,8 @@ private:
         return found ? Tag(reader, __FLV_DMX__fioTell64(reader)) : Tag();
     }
 
-    // Calls `see` for each tag of a wanted kind in a part of the file, until it returns false; stretches without a tag
-    // are crossed. 0; FLVD_ERR_SHORT_DATA when the data ended before `end`; FLVD_ERR_SEEK or FLVD_ERR_POSITION when the
-    // host failed.
+    // Calls `see` for each wanted tag between two file positions, until it returns false. Crosses damage. Returns 0,
+    // FLVD_ERR_SHORT_DATA if the data ends before `end`, and FLVD_ERR_SEEK or FLVD_ERR_POSITION if the host fails.
     template <typename See>
     int32_t walk(fio_file_t* reader, int64_t from, int64_t end, uint32_t wanted, See&& see) const
     {
@@ -899,8 +900,8 @@ private:
             const int64_t position = __FLV_DMX__fioTell64(reader);
             if (position < 0)
                 return FLVD_ERR_POSITION;
-            if (result ==
-                FLVD_ERR_NOT_FOUND) { // a stretch longer than one search, or the host failed: this is tried twice
+            // The search gave up after 1 MiB, or a host call failed. A retry tells them apart.
+            if (result == FLVD_ERR_NOT_FOUND) {
                 if (again && position <= from)
                     return FLVD_ERR_POSITION;
                 from = again ? position : from;
@@ -922,7 +923,7 @@ private:
 
     /* Frames. */
 
-    // The next frame, all its fields. False when there is none.
+    // Gets the next frame. False if there is none.
     bool take(Stream stream, Frame& frame)
     {
         if (!can_read())
@@ -959,7 +960,7 @@ private:
 
     Learned& learned_of(const fio_file_t* reader) { return m_learned[reader == m_instance->main_reader ? 0 : 1]; }
 
-    // Where a reader stands; -1 when the host fails to tell. After a seek nothing before that place is to be learned.
+    // Where a reader stands; -1 if the host's tell fails. After a seek, the search for configurations starts there.
     static int64_t find_position(fio_file_t* reader, Learned& learned)
     {
         const int64_t position = std::max<int64_t>(__FLV_DMX__fioTell64(reader), -1);
@@ -968,15 +969,15 @@ private:
         return position;
     }
 
-    // Most requests bring a frame: flvd_next_frame only goes on where one does not.
+    // Most requests deliver a frame. flvd_next_frame takes over only when one does not.
     int32_t request(flvd_frame_t& frame)
     {
         const int32_t result = QVX_FLV_DMX(FLVD_OP_GET_FRAME, &m_instance, &m_request, &frame);
         return result == FLVD_RET_END ? flvd_next_frame(m_instance, &m_request, &frame) : result;
     }
 
-    // With two readers the tags of the other stream come first: the library would cross them as well, and goes on from
-    // the tag after them. False when the reader is no longer where playing is.
+    // With two readers, moves past tags of the other stream, which the library would skip as well. False if the reader
+    // could not be moved back when there was no tag.
     [[gnu::noinline]] bool go_to_stream(fio_file_t* reader, Stream stream, Tag& ahead)
     {
         const bool found = (m_instance->streams & static_cast<uint32_t>(stream)) != 0;
@@ -987,37 +988,37 @@ private:
         if (ahead.position >= 0) {
             Learned& learned = learned_of(reader);
             if (learned.end == begin.position)
-                learned.end = ahead.position; // none of this stream is between
+                learned.end = ahead.position; // no tag of this stream was skipped
             return true;
         }
         m_return = begin;
         return can_read();
     }
 
-    // Of a file timestamp. One before the first is negative.
+    // Converts a file timestamp. Those before the file's first one become negative.
     Milliseconds time_of(uint32_t timestamp) const
     {
         return Milliseconds(int64_t{timestamp} - int64_t{m_instance->first_ts});
     }
 
-    // After a frame that is not the first tag ahead, or before which an earlier request has crossed tags: finds its tag
-    // and learns the configurations before it. `end` is where the reader stands after the frame.
+    // For a frame that did not come from the tag ahead, or if an earlier request skipped tags: finds the frame's tag
+    // and the configurations before it. `begin` and `end` are the reader's positions before and after the request.
     [[gnu::noinline]] Tag look_again(const flvd_frame_t& frame, fio_file_t* reader, int64_t begin, int64_t end)
     {
         if (end < 0)
             return {};
-        // A configuration takes memory. When that throws, the next request brings the frame again.
+        // Allocating a configuration may throw. Then the next request delivers the frame again.
         m_return = {reader, begin < 0 ? end : begin};
         const Tag tag = tag_before(frame, reader, end);
         Learned& learned = learned_of(reader);
         if (learned.end < 0 || (tag.position >= 0 && learn_configs(reader, learned.end, tag)))
-            learned.end = end; // else the host failed, and the next frame tries again
+            learned.end = end; // else the host failed, and the next frame retries
         m_return.position = end;
         go_back();
         return tag;
     }
 
-    // The tag that ends at `end` and carries the frame; none when the host failed.
+    // The tag that carries the frame and ends at `end`; none if the host failed.
     static Tag tag_before(const flvd_frame_t& frame, fio_file_t* reader, int64_t end)
     {
         for (const uint32_t codec_header : {5U, 2U, 1U}) {
@@ -1031,7 +1032,7 @@ private:
         return {};
     }
 
-    // Codec header bytes before the frames of a stream that the open found.
+    // Size of the codec header before the frames of a stream that was found by the open.
     uint32_t codec_header_size(Stream stream) const
     {
         if (stream == Stream::video)
@@ -1039,8 +1040,8 @@ private:
         return audio_codec() == AudioCodec::aac ? 2 : 1;
     }
 
-    // Learns the configurations in a part of the file that ends at a tag: those of both streams or, with two readers,
-    // of the tag's stream, since each reader has its own place. False when the host failed.
+    // Adds the configurations before a tag to the history: those of both streams, or with two readers those of the
+    // tag's stream, since the other reader may be elsewhere. False if the host failed.
     bool learn_configs(fio_file_t* reader, int64_t from, const Tag& last)
     {
         const uint32_t one = last.is_video() ? FLVD_TAG_VIDEO : FLVD_TAG_AUDIO;
@@ -1069,9 +1070,9 @@ private:
 
     ConfigHistory& configs_of(Stream stream) { return stream == Stream::video ? m_video_configs : m_audio_configs; }
 
-    /* What the file says of itself. */
+    /* Information about the file. */
 
-    // CodecID and SoundFormat are the low and the high half of the first payload byte.
+    // CodecID is the low half of the codec byte, SoundFormat the high half.
     VideoCodec video_codec() const { return static_cast<VideoCodec>(m_instance->video_codec_filter & 15); }
     AudioCodec audio_codec() const { return static_cast<AudioCodec>(m_instance->audio_format_filter >> 4 & 15); }
 
@@ -1104,7 +1105,7 @@ private:
         return info;
     }
 
-    // The code of walk().
+    // Returns the code of walk().
     int32_t read_script_tags(fio_file_t* reader, Metadata& metadata) const
     {
         uint32_t tags = 0;
@@ -1124,7 +1125,7 @@ private:
         metadata.add_script_data({payload.data(), size});
     }
 
-    // keyframes() of a file that nobody else can reach.
+    // keyframes() on a file that `report` cannot reach.
     template <typename Report> result<std::vector<Keyframe>> list_keyframes(Report& report)
     {
         if (const error failed = leave(); failed.kind() != Kind::none)
@@ -1143,7 +1144,7 @@ private:
         return list;
     }
 
-    // Adds the keyframes that a walk from the first tag on finds. The code of walk().
+    // Adds all keyframes found by scanning the file. Returns the code of walk().
     template <typename Report>
     int32_t walk_keyframes(fio_file_t* reader, Report& report, std::vector<Keyframe>& list) const
     {
@@ -1172,7 +1173,7 @@ private:
         return list;
     }
 
-    // Up to `count` elements of a strict array of AMF0; another kind of value ends it.
+    // Reads up to `count` elements of an AMF0 strict array. Stops at a value that is not a number.
     static std::vector<double> read_numbers(fio_file_t* reader, int64_t from, uint32_t count)
     {
         constexpr size_t element_size = 1 + sizeof(double); // marker 0, big-endian number
@@ -1189,7 +1190,7 @@ private:
         return numbers;
     }
 
-    // What does not fit becomes the greatest or least number that does; NaN becomes the least.
+    // Clamps to the range of To. NaN becomes the least value.
     template <typename To, typename From> static To clamp(From value)
     {
         using Limits = std::numeric_limits<To>;
@@ -1198,14 +1199,14 @@ private:
         return value > static_cast<From>(Limits::min()) ? static_cast<To>(value) : Limits::min();
     }
 
-    inline static Host m_host = make_host(nullptr); // of the files that are open, both under open_mutex
+    inline static Host m_host = make_host(nullptr); // of all open files; both guarded by open_mutex
     inline static size_t m_open_files = 0;
 
-    std::unique_ptr<char[]> m_path; // the library keeps the address
+    std::unique_ptr<char[]> m_path; // the library keeps a pointer to it
     flvd_ctx_t* m_instance = nullptr;
     flvd_frame_request_t m_request{};
     Return m_return;
-    std::array<Learned, 2> m_learned; // of the main reader and of a separate audio reader
+    std::array<Learned, 2> m_learned; // main reader, separate audio reader
     ConfigHistory m_video_configs;
     ConfigHistory m_audio_configs;
 };
