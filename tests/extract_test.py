@@ -29,18 +29,27 @@ class Extract(Case):
         self.tool("extract", path, "-o", path.parent / "out", **outcome)
         return path.parent / "out"
 
+    @staticmethod
+    def content(path):
+        """What HASHES tells: for WAV of the samples alone."""
+        data = path.read_bytes()
+        return hashlib.sha256(data[44:] if data.startswith(b"RIFF") else data).hexdigest()
+
     def test_every_sample(self):
         for name in SAMPLES:
             codecs = {kind: stream["codec"] for kind, stream in Expected(name).streams.items()}
-            extensions = {kind: codec if codec in ("h264", "aac", "mp3") else kind for kind, codec in codecs.items()}
+            known = {"h264": "h264", "aac": "aac", "mp3": "mp3", "pcm_s16le": "wav"}
+            extensions = {kind: known.get(codec, kind) for kind, codec in codecs.items()}
             folder = self.write("base", b"").parent
             for out, base in (("a", "a.{}" if len(codecs) > 1 else "a"), (".", name + ".{}")):
                 with self.subTest(name=name, out=out):
                     raw = ".* is written raw.*\n" * sum(extensions[kind] == kind for kind in codecs)
                     told = WARNINGS.get(name, raw)
-                    self.assertEqual(self.tool("extract", sample(name), "-o", folder / out, stderr=told), "")
+                    said = self.tool("extract", sample(name), "-o", folder / out, stderr=told)
                     for kind, extension in extensions.items():
-                        self.assertEqual(sha(folder / base.format(extension)), HASHES[name, kind])
+                        path = folder / base.format(extension)
+                        self.assertEqual(self.content(path), HASHES[name, kind])
+                        self.assertIn(f"{path}: {len(Expected(name).of[kind])} frames, {path.stat().st_size} b", said)
 
     def test_annexb(self):
         """Rewritten with each size of lengths, with configurations between, and with damaged lengths."""
@@ -74,7 +83,7 @@ class Extract(Case):
                     wanted += b"".join(START + unit for unit in units)
                 stderr = ".*configuration is damaged; the one before.*\n" if 5 in changes else ""
                 if damage:
-                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames.* at byte {place}, .*\n"
+                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames?, .* at byte {place}, .*\n"
                 self.assertEqual(self.extract(b"".join(made), stderr=stderr).read_bytes(), wanted)
 
     def test_refused(self):
