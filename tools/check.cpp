@@ -250,7 +250,8 @@ std::vector<std::string> FilesIn(const std::string& folder)
     if (files.empty())
         throw FileError(folder, "no FLV file is in this folder");
     if (others > 0)
-        Complain(folder, fmt::format("note: skips {} that {} not FLV", Plural(others, "file"), others == 1 ? "is" : "are"));
+        Complain(folder,
+                 fmt::format("note: skips {} that {} not FLV", Plural(others, "file"), others == 1 ? "is" : "are"));
     std::sort(files.begin(), files.end());
     return files;
 }
