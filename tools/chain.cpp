@@ -12,7 +12,7 @@
 namespace tool {
 
 Chain::Chain(const Input& input, TagReader& reader, Limits limits, Findings& findings, Progress progress)
-    : m_input(input), m_reader(reader), m_limits(limits), m_findings(findings), m_progress(std::move(progress)),
+    : m_reader(reader), m_limits(limits), m_findings(findings), m_progress(std::move(progress)),
       m_first(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
 {
 }
@@ -53,7 +53,7 @@ int64_t Chain::Step(int64_t position)
 
 void Chain::JudgePlayed(const Tag& tag)
 {
-    const std::string why = WhyNotPlayed(m_input, tag, m_reader);
+    const std::string why = m_reader.WhyNotPlayed(tag);
     if (why.empty())
         return;
     m_findings.Lose(tag.End() - tag.position);

@@ -25,7 +25,7 @@ class Chain {
 public:
     using Progress = std::function<void(int64_t position)>;
 
-    /** @param input, reader, findings borrowed
+    /** @param reader, findings borrowed
      *  @param progress called often */
     Chain(const Input& input, TagReader& reader, Limits limits, Findings& findings, Progress progress);
 
@@ -63,7 +63,6 @@ private:
     void JudgeGaps(const Tag& tag);
     Lane& LaneOf(const Tag& tag) { return tag.IsVideo() ? m_video : m_audio; }
 
-    const Input& m_input;
     TagReader& m_reader;
     const Limits m_limits;
     Findings& m_findings;

@@ -80,8 +80,8 @@ public:
             Complain(m_file, fmt::format("warning: {} in {}, the first at byte {}, left out", m_fault,
                                          Plural(m_faults, "frame"), m_firstFault));
         if (m_format->IsRaw())
-            Complain(m_file, fmt::format("note: the {} is written raw, one frame after the other: no player takes that",
-                                         StreamName(m_stream)));
+            Complain(m_file,
+                     fmt::format("note: the {} is written raw, one frame after the other", StreamName(m_stream)));
         if (!m_out->IsStandard())
             Print(fmt::format("{}: {}, {} bytes\n", Printable(m_out->Path()), Plural(m_frames, "frame"),
                               m_out->Written()));
@@ -115,7 +115,7 @@ std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input
         if (const auto bit = static_cast<uint32_t>(stream); (options.streams & bit) != 0) {
             if (input.Has(stream))
                 writers.emplace_back(input, stream);
-            else if (const std::string why = WhyNoStream(input, stream); !why.empty())
+            else if (const std::string why = TagReader(input).WhyNoStream(stream); !why.empty())
                 Complain(input.name, fmt::format("note: the {} is left out: {}", StreamName(stream), why));
         }
     if (writers.empty())

@@ -17,6 +17,8 @@ namespace tool {
 
 namespace {
 
+constexpr uint32_t SIXTEEN_BITS = 0x02; // SoundSize in the codec byte of audio tags
+
 using Buffer = std::vector<uint8_t>;
 
 void Append(Buffer& out, flvdmx::Bytes bytes)
@@ -155,9 +157,8 @@ private:
 // PCM as RIFF/WAVE. What FLV calls the byte order of the machine that wrote it was little-endian nearly everywhere.
 class Wav : public StreamFormat {
 public:
-    explicit Wav(const flvdmx::AudioInfo& audio)
-        : StreamFormat("wav"), m_channels(std::max(audio.channels, 1U)), m_rate(audio.sample_rate),
-          m_bits(audio.sample_size)
+    Wav(const flvdmx::AudioInfo& audio, uint32_t bits)
+        : StreamFormat("wav"), m_channels(std::max(audio.channels, 1U)), m_rate(audio.sample_rate), m_bits(bits)
     {
     }
 
@@ -231,7 +232,8 @@ std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream
         return std::make_unique<StreamFormat>("mp3");
     case flvdmx::AudioCodec::pcm:
     case flvdmx::AudioCodec::pcm_little_endian:
-        return std::make_unique<Wav>(*input.info.audio);
+        return std::make_unique<Wav>(*input.info.audio,
+                                     (input.Instance().audio_format_filter & SIXTEEN_BITS) != 0 ? 16 : 8);
     default:
         return std::make_unique<Raw>("audio");
     }

@@ -188,7 +188,7 @@ void PrintComplete(const FramesOptions& options)
     const uint32_t streams = WantedStreams(options) & input.Streams();
     if (streams == 0) {
         const auto wanted = static_cast<flvdmx::Stream>(WantedStreams(options));
-        const std::string why = WhyNoStream(input, wanted);
+        const std::string why = TagReader(input).WhyNoStream(wanted);
         throw FileError(options.file, fmt::format("the file has no {} stream{}", StreamName(wanted),
                                                   why.empty() ? "" : " that is played: " + why));
     }

@@ -32,10 +32,11 @@ struct Subject {
 };
 
 // Kilobits per second over the whole file: bits per millisecond.
-uint64_t DataRate(const Input& input)
+uint64_t DataRate(const Subject& subject)
 {
-    const auto duration = static_cast<uint64_t>(input.info.duration.count());
-    return duration == 0 ? 0 : static_cast<uint64_t>(input.Instance().data_end) * 8 / duration;
+    const auto duration = subject.scan ? subject.scan->played : subject.input.info.duration;
+    const auto bits = static_cast<uint64_t>(subject.input.Instance().data_end) * 8;
+    return duration.count() <= 0 ? 0 : bits / static_cast<uint64_t>(duration.count());
 }
 
 // The count is raised before the arrays are met, so without both arrays it says nothing.
@@ -57,7 +58,13 @@ const char* SeekMethodText(flvdmx::SeekMethod method)
     return TEXTS[std::min<size_t>(static_cast<size_t>(method), TEXTS.size() - 1)];
 }
 
-template <typename Codec> std::string CodecName(Codec codec)
+std::string CodecName(flvdmx::VideoCodec codec)
+{
+    const std::string name = flvdmx::name(codec);
+    return name == "unknown" ? VideoCodecName(codec) : name;
+}
+
+std::string CodecName(flvdmx::AudioCodec codec)
 {
     const std::string name = flvdmx::name(codec);
     return name == "unknown" ? fmt::format("unknown ({})", static_cast<uint32_t>(codec)) : name;
@@ -66,7 +73,7 @@ template <typename Codec> std::string CodecName(Codec codec)
 // What the tag headers say; AAC and MP3 have a rate of their own, the others theirs from here.
 uint32_t HeaderSampleRate(const Input& input)
 {
-    constexpr std::array<uint32_t, 4> RATES = {5512, 11025, 22050, 44100};
+    constexpr std::array<uint32_t, 4> RATES = {5500, 11025, 22050, 44100};
     return RATES[input.Instance().audio_format_filter >> 2 & 3];
 }
 
@@ -195,7 +202,7 @@ std::string InfoText(const Subject& subject)
         listing.Line("played duration", fmt::format("{}, timestamps start again {}", FormatTime(subject.scan->played),
                                                     Plural(subject.scan->restarts, "time")));
     listing.Line("first timestamp", FormatTime(input.info.start_time));
-    listing.Number("data rate", static_cast<double>(DataRate(input)), "kbit/s");
+    listing.Number("data rate", static_cast<double>(DataRate(subject)), "kbit/s");
     listing.Line("seek method", SeekMethodText(input.info.seek_method));
     const uint32_t entries = IndexEntries(input);
     listing.Line("keyframe index", entries == 0 ? "none" : fmt::format("{} entries", entries));
@@ -206,7 +213,8 @@ std::string InfoText(const Subject& subject)
     if (input.info.audio)
         ListAudio(listing, subject, *input.info.audio);
     if (subject.metadata.size() > 0)
-        listing.Line("metadata", fmt::format("{} properties", subject.metadata.size()));
+        listing.Line("metadata", fmt::format("{} {}", subject.metadata.size(),
+                                             subject.metadata.size() == 1 ? "property" : "properties"));
     for (const flvdmx::Property& property : subject.metadata)
         listing.Line("  " + Printable(property.name), ValueText(property));
     return Printable(input.name) + "\n" + listing.Text();
@@ -264,7 +272,7 @@ Json InfoObject(const Subject& subject)
                    {"size", input.info.size},
                    {"duration_ms", input.info.duration.count()},
                    {"first_timestamp_ms", input.info.start_time.count()},
-                   {"data_rate_kbit", DataRate(input)},
+                   {"data_rate_kbit", DataRate(subject)},
                    {"seek_method", SeekMethodName(input.info.seek_method)},
                    {"index_entries", IndexEntries(input)},
                    {"shorter_than_metadata", input.Instance().file_shorter_than_meta != 0},
@@ -294,7 +302,8 @@ void Warn(const Subject& subject)
     const Input& input = subject.input;
     input.WarnIfCutShort();
     if (subject.scan && subject.scan->restarts > 0)
-        Complain(input.name, fmt::format("warning: the timestamps start again: they end at {}, but {} are played",
+        Complain(input.name, fmt::format("warning: the timestamps start again: the last one is at {}, {} are "
+                                         "played in all",
                                          FormatTime(input.info.duration), FormatTime(subject.scan->played)));
     for (const auto& [stream, why] : {std::pair("video", subject.noVideo), std::pair("audio", subject.noAudio)})
         if (!why.empty())
@@ -309,10 +318,9 @@ Json Inspect(const std::string& name, const InfoOptions& options, bool first)
         subject.metadata = *metadata;
     if (options.scan || SeemsToRestart(input))
         subject.scan = ScanFile(name);
-    if (!input.info.video)
-        subject.noVideo = WhyNoStream(input, flvdmx::Stream::video);
-    if (!input.info.audio)
-        subject.noAudio = WhyNoStream(input, flvdmx::Stream::audio);
+    TagReader reader(input);
+    subject.noVideo = reader.WhyNoStream(flvdmx::Stream::video);
+    subject.noAudio = reader.WhyNoStream(flvdmx::Stream::audio);
     Warn(subject);
     if (!options.json)
         Print((first ? "" : "\n") + InfoText(subject));

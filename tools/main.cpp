@@ -200,7 +200,7 @@ void AddExtract(CLI::App& app, ExtractOptions& options)
         "OUT is the file to write when there is one stream, or --stream chooses one. Of two streams it is the\n"
         "beginning of the names: OUT.h264 and OUT.aac, for instance. A folder that exists takes files\n"
         "named as FILE. Extensions: h264 (Annex B), aac (ADTS), mp3, wav (PCM); video and audio for all else,\n"
-        "which is written raw: no player takes that.\n\n"
+        "which is written raw.\n\n"
         "  flvdmx extract clip.flv -o clip\n"
         "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
         "  flvdmx extract --stream video clip.flv -o - | player -");

@@ -37,49 +37,6 @@ Tag Parse(int64_t position, const uint8_t* bytes, uint32_t available)
     return tag;
 }
 
-// Video with the extended header has a FourCC after its first byte.
-std::string ExtendedCodec(const Tag& tag, TagReader& reader)
-{
-    const uint8_t* const bytes = reader.Bytes(tag.position + TAG_HEADER_SIZE + 1, 4);
-    const std::string_view fourcc(reinterpret_cast<const char*>(bytes), bytes != nullptr ? 4 : 0);
-    const char* const name = fourcc == "hvc1"   ? "HEVC, "
-                             : fourcc == "av01" ? "AV1, "
-                             : fourcc == "vp09" ? "VP9, "
-                             : fourcc == "avc1" ? "AVC, "
-                                                : "";
-    return fmt::format("enhanced FLV ({}FourCC '{}')", name, Printable(fourcc));
-}
-
-// CodecID 12 and 13 belong to no standard, but encoders have written them for years.
-std::string VideoName(const Tag& tag, TagReader& reader)
-{
-    constexpr uint8_t EXTENDED_HEADER = 0x80;
-    if ((tag.codec & EXTENDED_HEADER) != 0)
-        return ExtendedCodec(tag, reader);
-    const uint32_t id = tag.codec & CODEC_ID_MASK;
-    const std::string_view name = id == 12 ? "HEVC" : id == 13 ? "AV1" : flvdmx::name(tag.VideoCodec());
-    return fmt::format("{} (CodecID {})", name, id);
-}
-
-std::string AudioName(const Tag& tag)
-{
-    return fmt::format("{} (SoundFormat {})", flvdmx::name(tag.AudioCodec()), tag.codec >> 4);
-}
-
-// An AVC configuration that the library does not take.
-std::string ConfigFault(const Tag& tag, TagReader& reader)
-{
-    constexpr uint32_t MOST_SET_BYTES = 128;
-    constexpr uint32_t SETS_OFFSET = 6; // of the first set's length in the record
-    const uint8_t* const record = reader.Bytes(tag.position + TAG_HEADER_SIZE + tag.CodecHeaderSize(), SETS_OFFSET + 2);
-    if (record == nullptr || tag.size < tag.CodecHeaderSize() + SETS_OFFSET + 2)
-        return "its AVC configuration is cut short";
-    const uint32_t size = BigEndian(record + SETS_OFFSET, 2);
-    if (size > MOST_SET_BYTES || tag.size > MOST_SET_BYTES + tag.CodecHeaderSize())
-        return fmt::format("its AVC parameter sets are larger than the {} bytes that are supported", MOST_SET_BYTES);
-    return "its AVC configuration is damaged";
-}
-
 } // namespace
 
 uint32_t BigEndian(const uint8_t* bytes, uint32_t size)
@@ -99,7 +56,7 @@ bool Tag::IsFrame() const
 }
 
 TagReader::TagReader(const Input& input)
-    : m_instance(input.file.instance()),
+    : m_input(input), m_instance(input.file.instance()),
       m_reader(__FLV_DMX__fioOpen(PathOf(input.name).c_str(), FIO_MODE_READ | FIO_MODE_BINARY, READER_CACHE, 0, 0))
 {
     if (m_reader == nullptr)
@@ -148,47 +105,89 @@ std::optional<Tag> TagReader::Find(int64_t from, int64_t end, const std::functio
     }
 }
 
-std::string WhyNotPlayed(const Input& input, const Tag& tag, TagReader& reader)
+// CodecID 12 and 13 belong to no standard, but encoders have written them for years.
+std::string VideoCodecName(flvdmx::VideoCodec codec)
 {
-    const flvd_ctx_t& instance = input.Instance();
-    const char* const stream = StreamName(tag.Stream());
-    const auto name = [&] { return tag.IsVideo() ? VideoName(tag, reader) : AudioName(tag); };
+    const auto id = static_cast<uint32_t>(codec);
+    return fmt::format("{} (CodecID {})", id == 12 ? "HEVC" : id == 13 ? "AV1" : flvdmx::name(codec), id);
+}
+
+std::string TagReader::ExtendedCodec(const Tag& tag)
+{
+    const uint8_t* const bytes = Bytes(tag.position + TAG_HEADER_SIZE + 1, 4);
+    const std::string_view fourcc(reinterpret_cast<const char*>(bytes), bytes != nullptr ? 4 : 0);
+    const char* const name = fourcc == "hvc1"   ? "HEVC, "
+                             : fourcc == "av01" ? "AV1, "
+                             : fourcc == "vp09" ? "VP9, "
+                             : fourcc == "avc1" ? "AVC, "
+                                                : "";
+    return fmt::format("enhanced FLV ({}FourCC '{}')", name, Printable(fourcc));
+}
+
+std::string TagReader::NameCodec(const Tag& tag)
+{
+    if (tag.IsExtended())
+        return ExtendedCodec(tag);
+    return tag.IsVideo() ? VideoCodecName(tag.VideoCodec())
+                         : fmt::format("{} (SoundFormat {})", flvdmx::name(tag.AudioCodec()), tag.codec >> 4);
+}
+
+std::string TagReader::WhyNotPlayed(const Tag& tag)
+{
     if (tag.IsScript())
         return "";
-    if (!input.Has(tag.Stream()))
-        return fmt::format("are {} that is not played: {}", stream, name());
+    const char* const stream = StreamName(tag.Stream());
+    const std::string& none = WhyNoStream(tag.Stream());
+    if (!none.empty() || !m_input.Has(tag.Stream()))
+        return fmt::format("are {} that is not played{}{}", stream, none.empty() ? "" : ": ", none);
     const bool sameCodec = tag.IsVideo()
-                               ? tag.VideoCodec() == input.info.video->codec && tag.codec >> 4 <= MOST_FRAME_TYPE
-                               : tag.AudioCodec() == input.info.audio->codec;
+                               ? tag.VideoCodec() == m_input.info.video->codec && tag.codec >> 4 <= MOST_FRAME_TYPE
+                               : tag.AudioCodec() == m_input.info.audio->codec;
     if (!sameCodec)
-        return fmt::format("are of another codec than the {} stream: {}", stream, name());
-    if (tag.IsAudio() && tag.codec != instance.audio_format_filter)
+        return fmt::format("are of another codec than the {} stream: {}", stream, NameCodec(tag));
+    if (tag.IsAudio() && tag.codec != m_instance->audio_format_filter)
         return fmt::format("have another header byte than the audio stream: 0x{:02x} instead of 0x{:02x}", tag.codec,
-                           instance.audio_format_filter & 0xFF);
-    if (instance.last_ts != 0 && tag.timestamp > instance.last_ts)
+                           m_instance->audio_format_filter & 0xFF);
+    if (m_instance->last_ts != 0 && tag.timestamp > m_instance->last_ts)
         return "are later than the last ones of the file";
     return tag.size < tag.CodecHeaderSize() ? "are too short for a frame" : "";
 }
 
-std::string WhyNoStream(const Input& input, flvdmx::Stream stream)
+const std::string& TagReader::WhyNoStream(flvdmx::Stream stream)
+{
+    const bool video = stream == flvdmx::Stream::video;
+    std::optional<std::string>& reason = video ? m_noVideo : m_noAudio;
+    const bool played = m_input.Has(stream) && !(video && (m_instance->video_codec_filter & EXTENDED_HEADER) != 0);
+    if (!reason)
+        reason = played ? "" : FindReason(stream);
+    return *reason;
+}
+
+// An AVC configuration that the library does not take.
+std::string TagReader::ConfigFault(const Tag& tag)
+{
+    constexpr uint32_t MOST_SET_BYTES = 128;
+    constexpr uint32_t SETS_OFFSET = 6; // of the first set's length in the record
+    const uint8_t* const record = Bytes(tag.position + TAG_HEADER_SIZE + tag.CodecHeaderSize(), SETS_OFFSET + 2);
+    if (record == nullptr || tag.size < tag.CodecHeaderSize() + SETS_OFFSET + 2)
+        return "its AVC configuration is cut short";
+    const uint32_t size = BigEndian(record + SETS_OFFSET, 2);
+    if (size > MOST_SET_BYTES || tag.size > MOST_SET_BYTES + tag.CodecHeaderSize())
+        return fmt::format("its AVC parameter sets are larger than the {} bytes that are supported", MOST_SET_BYTES);
+    return "its AVC configuration is damaged";
+}
+
+std::string TagReader::FindReason(flvdmx::Stream stream)
 {
     constexpr int TAGS = 1000; // at the beginning of the file
-    TagReader reader(input);
-    int64_t position = int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE;
-    for (int i = 0; i < TAGS; ++i) {
-        const std::optional<Tag> tag = reader.At(position);
-        if (!tag)
-            return "";
-        if (!tag->IsScript() && tag->Stream() == stream) {
-            const bool known = tag->IsAvc() && tag->codec >> 4 <= MOST_FRAME_TYPE;
-            if (known && tag->IsConfig())
-                return ConfigFault(*tag, reader);
-            return known ? "its AVC stream begins without a configuration"
-                         : fmt::format("it is {}", tag->IsVideo() ? VideoName(*tag, reader) : AudioName(*tag));
-        }
-        position = tag->End();
-    }
-    return "";
+    std::optional<Tag> tag = At(int64_t{m_instance->data_offset} + BACK_POINTER_SIZE);
+    for (int i = 0; i < TAGS && tag && (tag->IsScript() || tag->Stream() != stream); ++i)
+        tag = At(tag->End());
+    if (!tag || tag->IsScript() || tag->Stream() != stream)
+        return "";
+    if (!tag->IsAvc() || tag->IsExtended())
+        return fmt::format("it is {}", NameCodec(*tag));
+    return tag->IsConfig() ? ConfigFault(*tag) : "its AVC stream begins without a configuration";
 }
 
 Losses::Losses(const Input& input)
@@ -235,17 +234,16 @@ void Losses::Lose(int64_t from, int64_t to)
     m_bytes += to - from;
     if (m_why.empty())
         if (const std::optional<Tag> tag = m_reader.At(from); tag && tag->streamId == 0 && tag->End() <= to)
-            m_why = WhyNotPlayed(m_input, *tag, m_reader);
+            m_why = m_reader.WhyNotPlayed(*tag);
 }
 
 void Losses::Warn() const
 {
     if (m_bytes == 0)
         return;
-    const std::string why = m_why.empty() ? "" : fmt::format("; tags from there on {}", m_why);
-    Complain(m_input.name, fmt::format("warning: {} bytes, the first at byte {}, hold no valid tag of the streams and "
-                                       "are left out{}",
-                                       m_bytes, m_first, why));
+    const std::string why = m_why.empty() ? "hold no valid tag of the streams and are left out"
+                                          : fmt::format("are left out: tags from there on {}", m_why);
+    Complain(m_input.name, fmt::format("warning: {} bytes, the first at byte {}, {}", m_bytes, m_first, why));
 }
 
 flvdmx::Milliseconds Takes::Continue(const flvdmx::Frame& frame)

@@ -17,7 +17,8 @@ namespace tool {
 constexpr uint32_t TAG_HEADER_SIZE = 11;
 constexpr uint32_t BACK_POINTER_SIZE = 4;
 constexpr uint32_t CODEC_ID_MASK = 0x0F;
-constexpr uint32_t MOST_FRAME_TYPE = 5; /**< FrameType of video */
+constexpr uint8_t EXTENDED_HEADER = 0x80; /**< in the codec byte of enhanced FLV, before a FourCC */
+constexpr uint32_t MOST_FRAME_TYPE = 5;   /**< FrameType of video */
 
 /** @return the number in the `size` bytes at `bytes`, most significant first */
 uint32_t BigEndian(const uint8_t* bytes, uint32_t size);
@@ -39,6 +40,7 @@ struct Tag {
     bool IsScript() const { return type == FLVD_TAG_TYPE_SCRIPT; }
     flvdmx::VideoCodec VideoCodec() const { return static_cast<flvdmx::VideoCodec>(codec & CODEC_ID_MASK); }
     flvdmx::AudioCodec AudioCodec() const { return static_cast<flvdmx::AudioCodec>(codec >> 4); }
+    bool IsExtended() const { return IsVideo() && (codec & EXTENDED_HEADER) != 0; } /**< enhanced FLV */
     bool IsAvc() const { return IsVideo() && VideoCodec() == flvdmx::VideoCodec::avc; }
     bool IsAac() const { return IsAudio() && AudioCodec() == flvdmx::AudioCodec::aac; }
     flvdmx::Stream Stream() const { return IsVideo() ? flvdmx::Stream::video : flvdmx::Stream::audio; }
@@ -70,20 +72,33 @@ public:
      */
     std::optional<Tag> Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress = {});
 
+    /** @return why a tag with nothing wrong about it is not played, such as "are too short for a frame"; empty when it
+     *          is */
+    std::string WhyNotPlayed(const Tag& tag);
+
+    /** @return why no frame of that stream is delivered, from its first tag; empty when frames are, or when there is no
+     *          such tag */
+    const std::string& WhyNoStream(flvdmx::Stream stream);
+
 private:
+    std::string NameCodec(const Tag& tag);
+    std::string ExtendedCodec(const Tag& tag);
+    std::string ConfigFault(const Tag& tag);
+    std::string FindReason(flvdmx::Stream stream);
+
     struct Closer {
         void operator()(fio_file_t* reader) const { __FLV_DMX__fioClose(reader); }
     };
+    const Input& m_input;
     flvd_ctx_t* const m_instance;
     const std::unique_ptr<fio_file_t, Closer> m_reader;
     int64_t m_fileSize = 0;
+    std::optional<std::string> m_noVideo; // the reasons, once they were sought
+    std::optional<std::string> m_noAudio;
 };
 
-/** @return why a tag with nothing wrong about it is not played, such as "HEVC is not played"; empty when it is */
-std::string WhyNotPlayed(const Input& input, const Tag& tag, TagReader& reader);
-
-/** @return why the file has no such stream, from its first tag of that kind; empty when there is none */
-std::string WhyNoStream(const Input& input, flvdmx::Stream stream);
+/** @return name and CodecID of a video codec */
+std::string VideoCodecName(flvdmx::VideoCodec codec);
 
 /** Watches for bytes that are left out between the frames of a file. */
 class Losses {
