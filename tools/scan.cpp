@@ -48,6 +48,7 @@ FileScan ScanFile(const std::string& name)
 bool SeemsToRestart(const Input& input)
 {
     constexpr int64_t PLACES = 16;
+    constexpr int64_t NEAR = 1 << 20; // bytes: a place inside a larger tag tells nothing
     constexpr uint32_t JITTER_MS = 2000;
     flvdmx::Options options;
     options.restarting_timestamps = true;
@@ -55,7 +56,8 @@ bool SeemsToRestart(const Input& input)
     TagReader reader(any);
     uint32_t latest = 0;
     for (int64_t i = 1; i < PLACES; ++i) {
-        const std::optional<Tag> tag = reader.Find(input.info.size / PLACES * i, input.info.size);
+        const int64_t place = input.info.size / PLACES * i;
+        const std::optional<Tag> tag = reader.Find(place, place + NEAR);
         if (!tag || tag->IsScript())
             continue;
         if (tag->timestamp + JITTER_MS < latest || tag->timestamp > input.Instance().last_ts + JITTER_MS)

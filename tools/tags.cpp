@@ -13,7 +13,7 @@ namespace tool {
 
 namespace {
 
-constexpr uint32_t READER_CACHE = 65536;
+constexpr uint32_t READER_CACHE = 4096; // more would bypass the window that the host reads ahead
 constexpr uint32_t BYTES_WITH_CODEC = TAG_HEADER_SIZE + 2;
 
 bool IsTagType(uint32_t type)
