@@ -370,7 +370,7 @@ private:
         }
         if (!upper.empty())
             m_svg.Add("<path class=\"lead\" d=\"{}{}{}Z\"/>", bands, upper, lower);
-        DrawLegend(top - 12, {{"lead", "from the least to the most"}});
+        DrawLegend(top - 12, {{"lead", "minimum to maximum"}});
     }
 
     const Input& m_input;

@@ -88,24 +88,23 @@ public:
     {
         Lane& lane = point.video ? m_video : m_audio;
         StreamTimeline& stream = point.video ? m_timeline.video : m_timeline.audio;
-        if (point.loss || point.restart)
-            m_video.breaks = m_audio.breaks = m_leadBreaks = true;
-        Judge(point, lane, stream);
+        AddMarks(point, lane, stream);
         const size_t columns = m_timeline.lead.size();
         const size_t column = CellOf(point.time, m_timeline.duration / static_cast<double>(columns), columns);
         stream.bits[CellOf(point.time, m_timeline.interval, stream.bits.size())] += point.size * 8.0;
         Enter(stream.positions[column], lane.breaks, point.position);
         if (point.keyframe)
             m_timeline.keyframes.push_back(point.time);
-        lane.last = point.time;
-        if (m_video.last && m_audio.last)
-            TakeLead(m_timeline.lead[column], *m_audio.last - *m_video.last);
+        lane.last = lane.sinceBreak = point.time;
+        if (m_video.sinceBreak && m_audio.sinceBreak)
+            TakeLead(m_timeline.lead[column], *m_audio.sinceBreak - *m_video.sinceBreak);
     }
 
 private:
     struct Lane {
         std::optional<double> last{};
-        bool breaks = false;
+        std::optional<double> sinceBreak{}; // the last time, when it is not from before a break
+        bool breaks = false;                // the curve does not go on
     };
 
     static void Enter(Range& range, bool& breaks, double value)
@@ -115,17 +114,22 @@ private:
         range.Take(value);
     }
 
-    void Judge(const Point& point, Lane& lane, const StreamTimeline& stream)
+    void AddMarks(const Point& point, Lane& lane, const StreamTimeline& stream)
     {
         const double latest = std::max(m_video.last.value_or(0), m_audio.last.value_or(0));
+        const bool gap = lane.last && point.time - *lane.last > LongestStep(m_timeline, stream);
         if (point.restart)
             m_timeline.marks.push_back({Mark::Kind::restart, point.time, point.time});
         if (point.loss)
             m_timeline.marks.push_back({Mark::Kind::damage, std::min(latest, point.time), point.time});
-        else if (lane.last && point.time - *lane.last > LongestStep(m_timeline, stream)) {
+        else if (gap)
             m_timeline.marks.push_back({Mark::Kind::gap, *lane.last, point.time});
-            lane.breaks = m_leadBreaks = true;
-        }
+        if (!point.restart && !point.loss && !gap)
+            return;
+        lane.breaks = m_leadBreaks = true;
+        if (!gap)
+            m_video.breaks = m_audio.breaks = true;
+        m_video.sinceBreak = m_audio.sinceBreak = std::nullopt;
     }
 
     void TakeLead(Range& range, double lead)
