@@ -129,6 +129,33 @@ class Check(Case):
         self.assertEqual((found["lost_bytes"], found["counts"]["passed_over"]), (sum(late), len(late)))
         self.assertEqual(len(found["findings"]), 2)
 
+    def test_limits_and_notes(self):
+        config, video = TAGS[1], [tag for tag in TAGS if tag[0] == 9 and tag[12] == 1]
+        key = start(next(i for i, tag in enumerate(TAGS) if tag == [v for v in video if v[11] >> 4 == 1][1]))
+        apart = HEADER + b"".join(sorted(TAGS, key=lambda tag: -tag[0]))
+        for data, arguments, kinds, place in (
+                (put(), ["--max-gap", "1.2"], [], None), (put(), ["--max-gap", "0.9"], ["keyframe_distance"], key),
+                (apart, ["--max-gap", "1.2"], ["interleaving"], None), (apart, [], [], None)):
+            found = self.check(data, *arguments)["findings"]
+            self.assertEqual([f["kind"] for f in found], kinds)
+            if place:
+                self.assertEqual(found[0]["offset"], place)
+        other = config[:-5] + bytes([config[-5] ^ 1]) + config[-4:]
+        found = self.check(HEADER + b"".join(TAGS[:90]) + shift(other, time_of(TAGS[90])) + b"".join(TAGS[90:]))
+        self.assertEqual([(f["kind"], f["offset"]) for f in found["notes"]], [("configuration", start(90))])
+
+    def test_folders(self):
+        root = self.write("b.flv", AVC_BYTES).parent
+        (root / "sub").mkdir()
+        for name, data in (("sub/a", AVC_BYTES), ("sub/text", b"no FLV"), ("c.flv", b"")):
+            (root / name).write_bytes(data)
+        result = run("check", "--json", root)
+        self.assertEqual([d["file"] for d in json.loads(result.stdout)["files"]],
+                         [f"{root}/b.flv", f"{root}/c.flv", f"{root}/sub/a"])
+        self.assertRegex(result.stderr, rf"{root}: note: skips 1 file that is not FLV\n.*c.flv: .*is empty\n\Z")
+        (root / "sub/a").unlink()
+        self.tool("check", root / "sub", code=1, stderr=".*no FLV file is in this folder\n")
+
     def test_jobs_say_the_same_as_one(self):
         files = [*map(sample, SAMPLES), "missing.flv", DATA / "make_samples.sh", self.write("ruined.flv", RUINED)] * 3
         for arguments in ([], ["--json"]):

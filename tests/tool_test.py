@@ -1,6 +1,7 @@
 """Runs the command-line tool as a user does. Needs FLVDMX_TOOL (the program) and FLVDMX_TEST_DATA (the samples)."""
 import concurrent.futures
 import contextlib
+import csv
 import json
 import operator
 import os
@@ -15,7 +16,7 @@ import threading
 import time
 import unittest
 
-from flv import split_tags
+from flv import retag, split_tags
 
 TOOL = os.environ["FLVDMX_TOOL"]
 DATA = pathlib.Path(os.environ["FLVDMX_TEST_DATA"])
@@ -37,7 +38,8 @@ def sample_bytes(name):
 
 def run(*arguments, **options):
     streams = {"stdout": subprocess.PIPE, "stderr": subprocess.PIPE, **options}
-    return subprocess.run([TOOL, *map(str, arguments)], text=True, timeout=60, **streams)
+    arguments = (a if isinstance(a, bytes) else str(a) for a in arguments)
+    return subprocess.run([TOOL, *arguments], text=True, timeout=60, **streams)
 
 
 class Expected:
@@ -71,6 +73,7 @@ def milliseconds(text):
     return round((int(hours) * 3600 + int(minutes) * 60 + float(seconds)) * 1000)
 
 
+TAGS_B = split_tags(sample_bytes("avc_bframes_aac"))[1]
 AVC, AVC_BYTES = Expected("avc_aac"), sample_bytes("avc_aac")
 HEADER, TAGS = split_tags(AVC_BYTES)
 APART = HEADER + b"".join(sorted(TAGS, key=lambda tag: -tag[0]))  # script, video, audio
@@ -136,11 +139,27 @@ class Frames(Case):
                 (whole, "--count 7", frames[:7]), (whole, "--count 0", []),
                 (whole, "--stream audio --count 3", of["audio"][:3]),
                 (whole, "--to 0.5", [f for f in frames if f[1] <= 500]), (whole, "--from 0:01.5", frames[start:]),
+                (whole, "--keyframes", [frames[k[2]] for k in AVC.keyframes]),
+                (whole, "--stream audio --from 1.5 --to 1.6", [f for f in of["audio"] if 1500 <= f[1] <= 1600]),
                 (whole, "--from 1.5 --to 0:00:01.75", [f for f in frames[start:] if f[1] <= 1750]),
                 (apart, "", late), (apart, "--to 0.5", [f for f in late if f[1] <= 500]),
                 (apart, "--separate-audio", sorted(late, key=TIME)), (configs, "", frames)):
             with self.subTest(file=file, arguments=arguments):
                 self.assertEqual(json_frames(self.tool("frames", "--json", file, *arguments.split())), wanted)
+
+
+    def test_fields(self):
+        """Presentation times of a stream with B-frames, in both formats for programs."""
+        objects = [json.loads(line) for line in self.tool("frames", "--json", sample("avc_bframes_aac")).splitlines()]
+        rows = list(csv.DictReader(self.tool("frames", "--csv", sample("avc_bframes_aac")).splitlines()))
+        self.assertEqual([{**row, "keyframe": bool(int(row["keyframe"]))} for row in rows],
+                         [{key: value if key == "keyframe" else str(value) for key, value in o.items()} for o in objects])
+        tags = {13 + sum(map(len, TAGS_B[:i])): tag for i, tag in enumerate(TAGS_B)}
+        for o in objects:
+            tag = tags[o["position"]]
+            offset = int.from_bytes(tag[13:16], "big", signed=True) if tag[0] == 9 else 0
+            self.assertEqual((o["presentation_ms"] - o["time_ms"], o["keyframe"]), (offset, tag[11] >> 4 != 2))
+        self.assertTrue(any(o["presentation_ms"] > o["time_ms"] for o in objects))
 
 
 class Info(Case):
@@ -173,6 +192,63 @@ class Info(Case):
             self.assertRegex(text, line)
 
 
+    def test_details(self):
+        """What the file tells of itself, and what a scan adds."""
+        [plain, scanned] = [json.loads(self.tool("info", "--json", *scan, sample("avc_aac_index")))["files"][0]
+                            for scan in ([], ["--scan"])]
+        self.assertEqual((plain["metadata"]["hasKeyframes"], plain["metadata"]["lasttimestamp"]), (True, 2.96))
+        self.assertEqual((plain["video"]["profile"], plain["video"]["level"]), ("High", "1.1"))
+        self.assertEqual((plain["audio"]["object_type"], plain["first_timestamp_ms"]), (2, 0))
+        indexed = Expected("avc_aac_index")
+        counts = [scanned["video"]["frames"], scanned["video"]["keyframes"], scanned["audio"]["frames"]]
+        self.assertEqual(counts, [len(indexed.of["video"]), len(indexed.keyframes), len(indexed.of["audio"])])
+        times = [k[0] for k in indexed.keyframes]
+        self.assertEqual(scanned["video"]["last_keyframe_ms"], times[-1])
+        longest = max(b - a for a, b in zip(times, times[1:]))
+        self.assertEqual(scanned["video"]["keyframe_distance_ms"]["longest"], longest)
+        unknown = json.loads(self.tool("info", "--json", sample("avc_aac")))["files"][0]
+        self.assertIsNone(unknown["video"]["last_keyframe_ms"])
+
+    def test_why_a_stream_is_not_played(self):
+        def put(change):
+            return self.write("in.flv", HEADER + b"".join(map(change, TAGS)))
+
+        def large(tag):
+            if tag[0] != 9 or tag[12] != 0:
+                return tag
+            length = int.from_bytes(tag[22:24], "big")
+            sps = tag[24:24 + length] + bytes(150)
+            return retag(tag, tag[11:22] + len(sps).to_bytes(2, "big") + sps + tag[24 + length:-4])
+
+        def enhanced(tag):
+            return retag(tag, bytes([tag[11] & 0x70 | 0x81]) + b"hvc1" + tag[16:-4]) if tag[0] == 9 else tag
+
+        def late(tag):
+            return retag(tag, bytes([tag[11] ^ 1]) + tag[12:-4]) if tag[0] == 8 and tag[5] > 3 else tag
+
+        for change, words, scan in ((enhanced, "enhanced FLV \\(HEVC, FourCC 'hvc1'", ""),
+                                    (large, "parameter sets are larger than the 128 bytes", ""),
+                                    (late, "another header byte than the audio stream", None)):
+            with self.subTest(words):
+                path = put(change)
+                if scan is not None:
+                    self.tool("info", path, stderr=f".*the video is not played: .*{words}.*\n")
+                [result] = json.loads(self.tool("check", "--json", path, code=1))["files"]
+                [finding] = result["findings"]  # one for all of them
+                self.assertRegex(finding["text"], words)
+                self.assertEqual(finding["count"], sum(change(tag) != tag for tag in TAGS)
+                                 if change is not large else sum(tag[0] == 9 for tag in TAGS))
+
+    def test_timestamps_that_start_again(self):
+        last = max(f[1] for f in AVC.frames)
+        early = [tag for tag in TAGS[1:] if int.from_bytes(tag[4:7], "big") < 1000]
+        found = json.loads(self.tool("info", "--json", self.write("two.flv", AVC_BYTES + b"".join(early)),
+                                     stderr=".*timestamps start again: the last one is at 0:00:00.9.*\n"))["files"][0]
+        self.assertLess(found["duration_ms"], 1000)
+        self.assertAlmostEqual(found["played_duration_ms"], last + 1000, delta=60)
+        self.assertEqual(found["timestamp_restarts"], 1)
+
+
 class Seek(Case):
     def seek(self, *arguments, **outcome):
         return json.loads(self.tool("seek", "--json", "--count", 1000, *arguments, **outcome))
@@ -184,10 +260,10 @@ class Seek(Case):
                 # Backward from before the first keyframe: the start of the tags.
                 backward = [(0, 9, 0), *(k for k in expected.keyframes if k[0] <= target)][-1]
                 forward = next((k for k in expected.keyframes if k[0] >= target), None)
-                for mode, place in (("backward", backward), ("forward", forward), ("auto", forward)):
+                for mode, place in (("", backward), ("--mode=forward", forward), ("--mode=auto", forward)):
                     with self.subTest(name=name, target=target, mode=mode):
                         outcome = {} if place else {"code": 1, "stderr": ".+\n"}
-                        found = self.seek("--mode", mode, sample(name), target / 1000, **outcome)
+                        found = self.seek(*mode.split(), sample(name), target / 1000, **outcome)
                         landed = place and {"time_ms": place[0], "position": place[1], "keyframe": True}
                         self.assertEqual(found["landed"], landed)
                         frames = expected.frames[place[2]:] if place else []
@@ -284,21 +360,47 @@ class Failures(Case):
                 told = r"flvdmx: .+\nTry 'flvdmx .*--help'\.\n"
                 self.assertEqual(self.tool(*arguments, code=2, stderr=told), "")
 
+    def test_choices_and_dashes_are_told(self):
+        folder = self.write("-x.flv", AVC_BYTES).parent
+        for arguments, words in ((["frames", "--stream", "all", "x"], "'all' is not one of: audio, video"),
+                                 (["seek", "--mode", "up", "x", "1"], "not one of: auto, backward, forward"),
+                                 (["help", "me"], "not one of: check, extract"),
+                                 (["info", "-x.flv"], "begins with a dash goes after '--': flvdmx COMMAND -- -x.flv")):
+            self.assertIn(words, run(*arguments, cwd=folder).stderr)
+        self.tool("info", "--", "-x.flv", cwd=folder)
+
     def test_help_and_version(self):
-        self.assertRegex(self.tool("--version"), r"\Aflvdmx \d+\.\d+\.\d+\n\Z")
+        for option in ("--version", "-V"):
+            self.assertRegex(self.tool(option), r"\Aflvdmx \d+\.\d+\.\d+\n\Z")
         for arguments in ([], ["info"], ["frames"], ["seek"], ["extract"], ["check"], ["plot"]):
             self.assertIn("Usage: flvdmx", self.tool(*arguments, "--help"))
+            self.assertEqual(self.tool("help", *arguments), self.tool(*arguments, "--help"))
+
+    def test_names_are_escaped(self):
+        self.tool("info", b"a\x1b[1m\xff\xc3\xa9\n", code=1, stderr=r"flvdmx: a\\x1b\[1m\\xffé\\x0a: .*\n")
 
 
 class Output(Case):
     def test_closed_pipe_ends_quietly_and_a_full_disk_is_told(self):
         full = "flvdmx: cannot write: No space left on device\n"
-        for text in ("frames", "frames --json", "info", "frames --follow --timeout 30"):
+        for text in ("frames FILE", "frames --json FILE", "info FILE", "frames --follow --timeout 30 FILE", "--help",
+                     "--version", "extract FILE --stream video -o -", "plot FILE -o -"):
             reading, writing = os.pipe()
             os.close(reading)
+            arguments = text.replace("FILE", sample("avc_aac")).split()
             with self.subTest(text), os.fdopen(writing), open("/dev/full", "wb") as disk:
-                self.tool(*text.split(), sample("avc_aac"), stdout=writing)
-                self.tool(*text.split(), sample("avc_aac"), stdout=disk, code=1, stderr=full)
+                self.tool(*arguments, stdout=writing)
+                self.tool(*arguments, stdout=disk, code=1, stderr=full)
+                closed = subprocess.run(["sh", "-c", '"$@" >&-', "sh", TOOL, *arguments], stderr=subprocess.PIPE)
+                self.assertEqual((closed.returncode, closed.stderr), (1, b"flvdmx: cannot write: Bad file descriptor\n"))
+
+    def test_standard_input(self):
+        frames = self.tool("frames", sample("avc_aac"))
+        with open(sample("avc_aac"), "rb") as file:
+            self.assertEqual(self.tool("frames", "-", stdin=file), frames)
+        with subprocess.Popen(["cat", sample("avc_aac")], stdout=subprocess.PIPE) as pipe:
+            self.assertEqual(self.tool("frames", "-", stdin=pipe.stdout), frames)
+        self.tool("frames", "--follow", "-", code=1, stderr=".*cannot be followed.*\n")
 
     def test_progress_only_on_a_terminal(self):
         terminal, end = pty.openpty()
@@ -353,6 +455,14 @@ class Follow(Case):
                     tags, frames = sorted(tags, key=KIND), sorted(frames, key=KIND)
                 self.assertEqual((code, frames), (1 if count == 0 else 0, tags))
                 self.assertRegex(stderr, rf"\A{words}\Z")
+
+    def test_file_that_comes_later(self):
+        path = self.write("any", b"").parent / "later.flv"
+        writer = threading.Timer(0.5, path.write_bytes, [AVC_BYTES])
+        writer.start()
+        self.assertEqual(json_frames(self.tool("frames", "--json", "--follow", "--timeout", "3", path)), AVC.tags)
+        writer.join()
+        self.tool("frames", "--follow", "--timeout", "0.1", "never.flv", code=1, stderr=".*No such file.*\n")
 
     def test_start_is_searched_without_an_index(self):
         arguments = ("frames", "--json", "--from", "2", sample("avc_aac"))

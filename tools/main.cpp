@@ -348,7 +348,8 @@ int Run(int argc, char** argv)
         {"check", [&] { return RunCheck(check); }},
         {"plot", [&] { return RunPlot(plot); }},
         {"help", [&] {
-             Print(topic.empty() ? app.help() : app.get_subcommand(topic)->help("flvdmx"));
+             Print(topic.empty() ? app.get_formatter()->make_help(&app, "flvdmx", CLI::AppFormatMode::Normal)
+                                 : app.get_subcommand(topic)->help("flvdmx"));
              return DONE;
          }}};
     return commands.at(app.get_subcommands().front()->get_name())();
