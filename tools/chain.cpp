@@ -31,7 +31,7 @@ void Chain::Walk()
     }
 }
 
-// One step costs one read for most tags: the back-pointer and the next header lie together.
+// One step costs one read for most tags: the back-pointer and the next header are side by side.
 int64_t Chain::Step(int64_t position)
 {
     const std::optional<Tag> tag = m_reader.At(position);

@@ -136,7 +136,7 @@ int RunExtract(const ExtractOptions& options)
     ProgressBar progress(options.file, input.Instance().data_end);
     for (StreamWriter& writer : writers)
         writer.Open(options, writers.size() > 1);
-    input.AcceptAllTimes();
+    AcceptAllTimes(input);
     Losses losses(input);
     while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
         progress.ShowDone(frame->position);

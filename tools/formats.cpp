@@ -106,7 +106,7 @@ public:
     std::string Configure(flvdmx::Bytes config) override
     {
         const AacConfig aac = ParseAacConfig(config);
-        if (const std::string refusal = Refusal(aac); !refusal.empty())
+        if (std::string refusal = Refusal(aac); !refusal.empty())
             return refusal;
         m_fixed = 0xFFF10000U | (aac.coreObjectType - 1) << 14 | aac.frequencyIndex << 10 | aac.channels << 6;
         return {};

@@ -43,7 +43,7 @@ public:
      *  @param losses borrowed, takes the frames of a single reader; may be null */
     FrameSource(Input& input, uint32_t streams, Losses* losses = nullptr);
 
-    /** @return the next frame; nothing at the end of the data, which a growing file may leave behind later. Throws
+    /** @return the next frame; nothing at the end of the data, which a growing file may pass later. Throws
      *          FileError */
     Frame Next();
 

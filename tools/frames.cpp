@@ -194,7 +194,7 @@ void PrintComplete(const FramesOptions& options)
     }
     if (options.fromMs)
         SeekToStart(input, *options.fromMs);
-    input.AcceptAllTimes();
+    AcceptAllTimes(input);
     Losses losses(input);
     FrameSource source(input, streams, &losses);
     FramePrinter printer(options, streams);

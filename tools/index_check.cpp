@@ -1,4 +1,4 @@
-// The keyframe index against the file. It is read where it lies: a long one takes no memory.
+// The keyframe index against the file. It is read where it is: a long one takes no memory.
 #include "tools/chain.h"
 
 #include <algorithm>

@@ -8,6 +8,7 @@
 #include <utility>
 #include <variant>
 
+#include <fmt/chrono.h>
 #include <fmt/core.h>
 
 #include "tools/codec_config.h"
@@ -157,29 +158,22 @@ void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo
     listing.Config(audio.config);
 }
 
-Json DateValue(const flvdmx::Date& date)
-{
-    const double seconds = std::floor(date.milliseconds / 1000);
-    const auto time = std::isfinite(seconds) && std::abs(seconds) < 1e11 ? static_cast<time_t>(seconds) : 0;
-    std::tm parts{};
-    std::array<char, 32> text{};
-    if (gmtime_r(&time, &parts) != nullptr)
-        std::strftime(text.data(), text.size(), "%Y-%m-%dT%H:%M:%SZ", &parts);
-    return text.data();
-}
+// Dates as ISO 8601 has them; one that no calendar has is null.
+struct ToJson {
+    Json operator()(const flvdmx::Date& date) const
+    {
+        constexpr double MOST_SECONDS = 1e11; // the year 5138
+        const double seconds = date.milliseconds / 1000;
+        if (!(std::abs(seconds) < MOST_SECONDS))
+            return {};
+        return fmt::format("{:%FT%TZ}", fmt::gmtime(static_cast<time_t>(seconds)));
+    }
+    template <typename Value> Json operator()(const Value& value) const { return value; }
+};
 
 Json ValueOf(const flvdmx::Property& property)
 {
-    if (const auto* const date = std::get_if<flvdmx::Date>(&property.value))
-        return DateValue(*date);
-    return std::visit(
-        [](const auto& value) {
-            if constexpr (std::is_same_v<std::decay_t<decltype(value)>, flvdmx::Date>)
-                return Json();
-            else
-                return Json(value);
-        },
-        property.value);
+    return std::visit(ToJson{}, property.value);
 }
 
 std::string ValueText(const flvdmx::Property& property)

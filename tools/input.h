@@ -39,12 +39,15 @@ struct Input {
     /** Bytes after the last whole tag of a complete file. */
     int64_t Rest() const;
 
-    /** From now on frames may have any time, as with Options::restarting_timestamps; no seek may follow. */
-    void AcceptAllTimes() { file.instance()->last_ts = 0; }
-
     /** Tells on standard error what of a complete file cannot be played because its end is missing. */
     void WarnIfCutShort() const;
 };
+
+/** From now on frames may have any time, as with Options::restarting_timestamps; no seek may follow. */
+inline void AcceptAllTimes(Input& input)
+{
+    input.file.instance()->last_ts = 0;
+}
 
 /** @return what to tell of a file that could not be opened */
 std::string OpenFailureText(const std::string& path, const flvdmx::error& error);

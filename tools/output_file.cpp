@@ -96,7 +96,7 @@ OutputFile::~OutputFile()
 
 void OutputFile::Write(const void* data, size_t size)
 {
-    if (std::fwrite(data, 1, size, m_file) != size)
+    if (size > 0 && std::fwrite(data, 1, size, m_file) != size)
         Fail();
     m_written += size;
 }

@@ -393,7 +393,7 @@ int RunPlot(const PlotOptions& options)
     Input input(options.file);
     input.WarnIfCutShort();
     OutputFile file(options.out, options.file, options.force);
-    input.AcceptAllTimes();
+    AcceptAllTimes(input);
     const Timeline timeline = ReadTimeline(input, COLUMNS);
     file.Write(Plot(input, timeline).Draw());
     file.Finish();

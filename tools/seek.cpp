@@ -154,7 +154,7 @@ FileError Miss(const SeekOptions& options, Input& input, int64_t target, int64_t
     const std::string reason = beyond ? fmt::format("that is beyond the end at {}", FormatTime(input.info.duration))
                                       : fmt::format("no keyframe is at or {} it{}", forward ? "after" : "before",
                                                     Advice(input, target, forward));
-    const FileError miss(input.name, fmt::format("seek to {} missed: {}", FormatTime(target), reason), error);
+    FileError miss(input.name, fmt::format("seek to {} missed: {}", FormatTime(target), reason), error);
     if (options.json) {
         Json document = RequestObject(options);
         document["landed"] = nullptr;

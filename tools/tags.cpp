@@ -1,4 +1,4 @@
-// The tags of a file as they lie there.
+// The tags of a file as they are there.
 #include "tools/tags.h"
 
 #include <algorithm>
@@ -211,7 +211,7 @@ bool Losses::Take(const flvdmx::Frame& frame)
     return m_bytes > before;
 }
 
-// What lies between two frames: mostly nothing, else configurations, script data, tags that are not played, or damage.
+// What is between two frames: mostly nothing, else configurations, script data, tags that are not played, or damage.
 void Losses::Inspect(int64_t from, int64_t to)
 {
     while (from < to) {

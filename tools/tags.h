@@ -1,4 +1,4 @@
-// The tags of a file as they lie there, for what playing does not tell: damage, and tags that are not played.
+// The tags of a file as they are there, for what playing does not tell: damage, and tags that are not played.
 #ifndef FLVDMX_TOOLS_TAGS_H
 #define FLVDMX_TOOLS_TAGS_H
 
@@ -65,7 +65,7 @@ public:
     std::optional<Tag> At(int64_t position);
 
     /**
-     * Finds the first valid tag of the file's streams at or after `from`, however much damage lies before it. One
+     * Finds the first valid tag of the file's streams at or after `from`, however much damage is before it. One
      * search of the library covers a bounded stretch; the next follows while the reader advances before `end`.
      *
      * @param progress called with the place that each search without a tag has reached
