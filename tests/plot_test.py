@@ -106,3 +106,5 @@ class Plot(Case):
     def test_any_name(self):
         root = self.plot("a<b>&\"c\udcff.flv", sample_bytes("aac_only"))
         self.assertEqual(self.of(root, "title")[0], r'a<b>&"c\xff.flv')
+        root = self.plot("n" * 200 + ".flv", sample_bytes("aac_only"))
+        self.assertRegex(self.of(root, "title")[0], r"\An{30,40}\.\.\.n{30,40}\.flv\Z")

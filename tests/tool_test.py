@@ -239,6 +239,9 @@ class Info(Case):
                 self.assertEqual(finding["count"], sum(change(tag) != tag for tag in TAGS)
                                  if change is not large else sum(tag[0] == 9 for tag in TAGS))
 
+        other = put(lambda tag: retag(tag, bytes([tag[11] & 0xF0 | 12]) + tag[12:-4]) if tag[0] == 9 else tag)
+        self.assertRegex(self.tool("info", other), r"video +HEVC \(CodecID 12\)")
+
     def test_timestamps_that_start_again(self):
         last = max(f[1] for f in AVC.frames)
         early = [tag for tag in TAGS[1:] if int.from_bytes(tag[4:7], "big") < 1000]

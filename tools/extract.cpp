@@ -69,7 +69,7 @@ public:
     {
         const uint64_t written = m_out->Written() - m_format->Header(0).size();
         if (written == 0) {
-            Complain(m_file, fmt::format("the {} stream has no frames: {} is not written", StreamName(m_stream),
+            Complain(m_file, fmt::format("note: the {} stream has no frames: {} is not written", StreamName(m_stream),
                                          Printable(m_out->Path())));
             return false;
         }
@@ -147,9 +147,9 @@ int RunExtract(const ExtractOptions& options)
     }
     progress.Wipe();
     losses.Finish();
-    bool written = true;
+    bool written = false;
     for (StreamWriter& writer : writers)
-        written = writer.Finish() && written;
+        written = writer.Finish() || written;
     losses.Warn();
     return written ? DONE : FAILED;
 }

@@ -103,12 +103,6 @@ std::string VideoCodecName(flvdmx::VideoCodec codec);
 /** Watches for bytes that are left out between the frames of a file. */
 class Losses {
 public:
-    /** A stretch of bytes of which none is played. */
-    struct Range {
-        int64_t begin;
-        int64_t end;
-    };
-
     explicit Losses(const Input& input); /**< borrowed */
 
     /** Takes every frame of the file, in file order. @return true when bytes were left out before it */
