@@ -1,7 +1,9 @@
 # The external packages that the tool and the tests use. A cross build cannot link libraries of the build machine, so it
 # builds GoogleTest from Debian's source package and uses the other packages as header-only libraries.
 
+find_package(Threads REQUIRED)
 if(NOT CMAKE_CROSSCOMPILING)
+    find_package(Boost REQUIRED) # headers alone
     if(FLVDMX_TOOLS)
         find_package(CLI11 REQUIRED)
         find_package(fmt REQUIRED)
@@ -22,6 +24,7 @@ function(flvdmx_header_library target folder)
     target_include_directories(${target} INTERFACE ${PROJECT_BINARY_DIR}/headers/${folder})
 endfunction()
 
+flvdmx_header_library(Boost::headers boost)
 if(FLVDMX_TOOLS)
     flvdmx_header_library(CLI11::CLI11 CLI)
     flvdmx_header_library(nlohmann_json::nlohmann_json nlohmann)

@@ -26,7 +26,7 @@ def from_help():
 
 
 def from_manual():
-    first, *sections = re.split(r"^\.Ss (\w+).*\n", read(manual).split(".Sh EXIT STATUS")[0], flags=re.M)
+    first, *sections = re.split(r"^\.Ss (\w+).*\n", read(manual).split(".Sh THE DRAWING")[0], flags=re.M)
     texts = {TOP: first, **dict(zip(sections[::2], sections[1::2]))}
     items = {name: " ".join(re.findall(r"^\.It (Fl .*)", text, re.M)) for name, text in texts.items()}
     return {name: {"--help", *("--" + option for option in re.findall(r"Fl Fl ([\w-]+)", text))}  # help: told once

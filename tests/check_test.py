@@ -51,7 +51,8 @@ class Check(Case):
         [document] = json.loads(result.stdout)["files"]
         self.assertEqual((result.returncode, result.stderr), (0 if document["sound"] else 1, ""))
         self.assertEqual(document["sound"], document["findings"] == [])
-        self.assertEqual(sum(document["counts"].values()), len(document["findings"]) + document["unlisted"])
+        self.assertEqual(sum(document["counts"].values()),
+                         sum(f["count"] for f in document["findings"]) + document["unlisted"])
         return document
 
     def test_sound_samples(self):
@@ -76,7 +77,7 @@ class Check(Case):
                 ("wrong script", put(unlink(0)), [], [("back_pointer", start(1) - 4)], 0),
                 ("wrong last", put(unlink(175)), [], [("back_pointer", len(whole) - 4)], size[175]),
                 ("two wrong", put(unlink(50), unlink(51)), [],
-                 [("back_pointer", start(51) - 4), ("back_pointer", start(52) - 4)], size[50] + size[51]),
+                 [("back_pointer", start(51) - 4, start(52) - 4)], size[50] + size[51]),
                 ("first", replace(whole, 9, BAD_BACK_POINTER), [], [("back_pointer", 9)], 0),
                 ("cut", whole[:start(90) + 50], [], [("cut_short", start(90), 50)], 50),
                 ("cut in header", whole[:start(90) + 5], [], [("cut_short", start(90), 5)], 5),
@@ -84,7 +85,7 @@ class Check(Case):
                 ("cut between", whole[:start(90)], [], [], 0),
                 ("another codec", replace(whole, start(video[9]) + 11, b"\x22"), [],
                  [("passed_over", start(video[9]))], size[video[9]]),
-                ("forward", put(late), [], sorted(jump(i, late[i]) for i in firsts), 0),
+                ("forward", put(late), [], [(*jump(min(firsts), late[min(firsts)]), start(max(firsts)))], 0),
                 ("allowed", put(late), ["--jump", "60.1"], [], 0),
                 ("back", put({video[30]: back}), [], [jump(video[30], back)], 0),
                 ("many", put({20: JUNK + TAGS[20]}, unlink(50), unlink(60, b"")) + JUNK, [],
@@ -92,7 +93,7 @@ class Check(Case):
                   ("gap", len(whole) + 96, 100)], 200 + size[50] + size[60] - 4)):
             with self.subTest(name):
                 found = self.check(data, *arguments)
-                keys = ("kind", "offset", "bytes", "stream", "to_ms")
+                keys = ("kind", "offset", "bytes", "stream", "to_ms", "last_offset")
                 self.assertEqual([tuple(f[key] for key in keys if key in f) for f in found["findings"]], findings)
                 self.assertEqual(found["lost_bytes"], lost)
 
@@ -125,7 +126,35 @@ class Check(Case):
         found = self.check(AVC_BYTES + b"".join(TAGS[1:60]))
         self.assertEqual({"jump", "passed_over"}, set(found["counts"]))
         late = [len(tag) for tag in TAGS if time_of(tag) > max(map(time_of, TAGS[1:60]))]
-        self.assertEqual(found["lost_bytes"], sum(late))
+        self.assertEqual((found["lost_bytes"], found["counts"]["passed_over"]), (sum(late), len(late)))
+        self.assertEqual(len(found["findings"]), 2)
+
+    def test_limits_and_notes(self):
+        config, video = TAGS[1], [tag for tag in TAGS if tag[0] == 9 and tag[12] == 1]
+        key = start(next(i for i, tag in enumerate(TAGS) if tag == [v for v in video if v[11] >> 4 == 1][1]))
+        apart = HEADER + b"".join(sorted(TAGS, key=lambda tag: -tag[0]))
+        for data, arguments, kinds, place in (
+                (put(), ["--max-gap", "1.2"], [], None), (put(), ["--max-gap", "0.9"], ["keyframe_distance"], key),
+                (apart, ["--max-gap", "1.2"], ["interleaving"], None), (apart, [], [], None)):
+            found = self.check(data, *arguments)["findings"]
+            self.assertEqual([f["kind"] for f in found], kinds)
+            if place:
+                self.assertEqual(found[0]["offset"], place)
+        other = config[:-5] + bytes([config[-5] ^ 1]) + config[-4:]
+        found = self.check(HEADER + b"".join(TAGS[:90]) + shift(other, time_of(TAGS[90])) + b"".join(TAGS[90:]))
+        self.assertEqual([(f["kind"], f["offset"]) for f in found["notes"]], [("configuration", start(90))])
+
+    def test_folders(self):
+        root = self.write("b.flv", AVC_BYTES).parent
+        (root / "sub").mkdir()
+        for name, data in (("sub/a", AVC_BYTES), ("sub/text", b"no FLV"), ("c.flv", b"")):
+            (root / name).write_bytes(data)
+        result = run("check", "--json", root)
+        self.assertEqual([d["file"] for d in json.loads(result.stdout)["files"]],
+                         [f"{root}/b.flv", f"{root}/c.flv", f"{root}/sub/a"])
+        self.assertRegex(result.stderr, rf"{root}: note: skips 1 file that is not FLV\n.*c.flv: .*is empty\n\Z")
+        (root / "sub/a").unlink()
+        self.tool("check", root / "sub", code=1, stderr=".*no FLV file is in this folder\n")
 
     def test_jobs_say_the_same_as_one(self):
         files = [*map(sample, SAMPLES), "missing.flv", DATA / "make_samples.sh", self.write("ruined.flv", RUINED)] * 3
@@ -141,7 +170,7 @@ class Check(Case):
         ruined = documents[-1]  # not listed whole
         self.assertEqual((ruined["counts"], len(ruined["findings"]), ruined["unlisted"]), ({"gap": 1500}, 1000, 500))
         text = self.tool("check", sample("aac_only"), "--jobs", 9)
-        self.assertEqual(text, f"{sample('aac_only')}: sound; 66 tags, 9549 bytes, 0 of them lost\n")
+        self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, 0 of them lost\n")
 
     def test_jobs_end_when_nobody_reads(self):
         files = [self.write("ruined.flv", RUINED)] * 20

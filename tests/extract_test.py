@@ -1,9 +1,14 @@
 """`flvdmx extract`: what comes out has once been decoded to the same pictures and sound by an independent decoder."""
+import fcntl
 import hashlib
 import os
 import pty
+import signal
+import struct
 import subprocess
+import termios
 import time
+import wave
 
 from flv import retag, split_tags
 from tool_test import DATA, SAMPLES, TOOL, WARNINGS, Case, Expected, sample, sample_bytes
@@ -29,18 +34,27 @@ class Extract(Case):
         self.tool("extract", path, "-o", path.parent / "out", **outcome)
         return path.parent / "out"
 
+    @staticmethod
+    def content(path):
+        """What HASHES tells: for WAV of the samples alone."""
+        data = path.read_bytes()
+        return hashlib.sha256(data[44:] if data.startswith(b"RIFF") else data).hexdigest()
+
     def test_every_sample(self):
         for name in SAMPLES:
             codecs = {kind: stream["codec"] for kind, stream in Expected(name).streams.items()}
-            extensions = {kind: codec if codec in ("h264", "aac", "mp3") else kind for kind, codec in codecs.items()}
+            known = {"h264": "h264", "aac": "aac", "mp3": "mp3", "pcm_s16le": "wav"}
+            extensions = {kind: known.get(codec, kind) for kind, codec in codecs.items()}
             folder = self.write("base", b"").parent
             for out, base in (("a", "a.{}" if len(codecs) > 1 else "a"), (".", name + ".{}")):
                 with self.subTest(name=name, out=out):
                     raw = ".* is written raw.*\n" * sum(extensions[kind] == kind for kind in codecs)
                     told = WARNINGS.get(name, raw)
-                    self.assertEqual(self.tool("extract", sample(name), "-o", folder / out, stderr=told), "")
+                    said = self.tool("extract", sample(name), "-o", folder / out, stderr=told)
                     for kind, extension in extensions.items():
-                        self.assertEqual(sha(folder / base.format(extension)), HASHES[name, kind])
+                        path = folder / base.format(extension)
+                        self.assertEqual(self.content(path), HASHES[name, kind])
+                        self.assertIn(f"{path}: {len(Expected(name).of[kind])} frames, {path.stat().st_size} b", said)
 
     def test_annexb(self):
         """Rewritten with each size of lengths, with configurations between, and with damaged lengths."""
@@ -74,7 +88,7 @@ class Extract(Case):
                     wanted += b"".join(START + unit for unit in units)
                 stderr = ".*configuration is damaged; the one before.*\n" if 5 in changes else ""
                 if damage:
-                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames.* at byte {place}, .*\n"
+                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames?, .* at byte {place}, .*\n"
                 self.assertEqual(self.extract(b"".join(made), stderr=stderr).read_bytes(), wanted)
 
     def test_refused(self):
@@ -95,14 +109,48 @@ class Extract(Case):
         self.assertEqual(copy.read_bytes(), sample_bytes("aac_only"))
         self.tool("extract", "--stream", "video", copy, "-o", copy.parent / "x", code=1, stderr=".+\n")
 
-    def test_bar_appears_after_a_second(self):
+    def test_files_that_exist_and_streams_without_frames(self):
+        header, tags = split_tags(sample_bytes("avc_aac"))
+        path = self.write("in.flv", header + b"".join(tag for tag in tags if tag[0] != 9 or tag[12] == 0))
+        (path.parent / "out.aac").write_bytes(b"mine")
+        self.tool("extract", path, "-o", path.parent / "out", code=1, stderr=".*out.aac exists: --force overw.*\n")
+        self.assertEqual((path.parent / "out.aac").read_bytes(), b"mine")
+        said = self.tool("extract", "--force", path, "-o", path.parent / "out",
+                         stderr=".*note: the video stream has no frames: .*out.h264 is not written\n")
+        self.assertIn("out.aac: 109 frames", said)
+        self.tool("extract", "--stream", "video", path, "-o", path.parent / "out", code=1, stderr=".*no frames.*\n")
+        self.assertFalse((path.parent / "out.h264").exists())
+
+    def test_standard_output_and_wav(self):
+        data = subprocess.run([TOOL, "extract", sample("pcm_only"), "-o", "-"], stdout=subprocess.PIPE).stdout
+        out = self.write("any", b"").parent / "out.wav"
+        self.tool("extract", sample("pcm_only"), "-o", out)
+        with wave.open(str(out)) as sound:
+            self.assertEqual(sound.getparams()[:3], (1, 2, 11025))
+            self.assertEqual(sound.readframes(1 << 20), data[44:])
+        self.tool("extract", sample("avc_aac"), "-o", "-", code=1, stderr=".*takes one stream.*\n")
+
+    def test_nothing_is_left_after_an_interruption(self):
         folder = self.write("any", b"").parent
+        os.mkfifo(folder / "out.aac")  # the tool waits for a reader, the file for the video being there
+        with subprocess.Popen([TOOL, "extract", sample("avc_aac"), "-o", folder / "out"]) as process:
+            while not (folder / "out.h264").exists():
+                time.sleep(0.01)
+            process.send_signal(signal.SIGINT)
+        self.assertEqual(process.returncode, -signal.SIGINT)
+        self.assertEqual([path.name for path in folder.glob("out.*")], ["out.aac"])
+
+    def test_bar_appears_after_a_second_and_fits(self):
+        name = "x" * 60 + "é.flv"
+        folder = self.write(name, sample_bytes("aac_only")).parent
         os.mkfifo(folder / "out")  # nobody takes what is written until a bar could have come
         terminal, end = pty.openpty()
-        with subprocess.Popen([TOOL, "extract", sample("aac_only"), "-o", folder / "out"], stderr=end) as process:
+        fcntl.ioctl(end, termios.TIOCSWINSZ, struct.pack("HHHH", 24, 60, 0, 0))
+        with subprocess.Popen([TOOL, "extract", folder / name, "-o", folder / "out"], stderr=end) as process:
             os.close(end)
             time.sleep(3)
             self.assertEqual(sha(folder / "out"), HASHES["aac_only", "audio"])
             shown = self.shown(terminal)
         self.assertEqual(process.returncode, 0)
-        self.assertRegex(shown, rb"\A\r\x1b\[K\S+aac_only.flv \[#* *\] +\d+%.*\r\x1b\[K\Z")
+        self.assertRegex(shown.decode(), r"\A\r\x1b\[K\S+\.\.\.x+é\.flv \[#* *\] +\d+%.*\r\x1b\[K\Z")
+        self.assertTrue(all(len(line) < 60 for line in shown.decode().split("\r\x1b[K")))

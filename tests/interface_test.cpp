@@ -8,11 +8,12 @@
 #include "support/report.h"
 #include "support/session.h"
 #include "support/sweep.h"
-#include "tools/crc32.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <sstream>
+
+#include <boost/crc.hpp>
 
 using namespace flvd_test;
 using namespace std::chrono_literals;
@@ -34,9 +35,11 @@ struct Memory : flvd_memory_file_t {
 // All that is told of a frame, in a line. Times in ms: decoding, presentation.
 std::string Line(Stream stream, int64_t time, int64_t presentation, bool keyframe, int64_t position, const Bytes& data)
 {
+    boost::crc_32_type crc;
+    crc.process_bytes(data.data(), data.size());
     std::ostringstream line;
     line << (stream == Stream::video ? "video " : "audio ") << time << ' ' << presentation << (keyframe ? " key" : "")
-         << " @" << position << ' ' << data.size() << " bytes " << tool::Crc32(data.data(), data.size());
+         << " @" << position << ' ' << data.size() << " bytes " << crc.checksum();
     return line.str();
 }
 

@@ -5,31 +5,19 @@
 #include <cstdint>
 #include <functional>
 #include <optional>
-#include <string_view>
+#include <string>
+#include <vector>
 
-#include "tools/demuxer.h"
 #include "tools/findings.h"
+#include "tools/input.h"
 #include "tools/tags.h"
 
 namespace tool {
 
-/** Reads single tags and numbers anywhere in the file. */
-class TagProbe {
-public:
-    /** @param demuxer borrowed; its main reader is used */
-    explicit TagProbe(const Demuxer& demuxer);
-
-    int64_t FileSize() const { return m_fileSize; }
-
-    /** @return up to `size` bytes at `position`, valid until the next call; null when not all of them are there */
-    const uint8_t* Bytes(int64_t position, uint32_t size) const;
-
-    /** @return what stands at `position` when it has the type of a tag and is not cut in its header */
-    std::optional<Tag> At(int64_t position) const;
-
-private:
-    fio_file_t* m_reader;
-    int64_t m_fileSize;
+/** What is still no fault. */
+struct Limits {
+    int64_t jumpMs;                    /**< largest step from one frame of a stream to the next */
+    std::optional<int64_t> maxGapMs{}; /**< largest distance of keyframes, and of audio and video in the file */
 };
 
 /** Walks from the first tag to the end of the file. */
@@ -37,40 +25,61 @@ class Chain {
 public:
     using Progress = std::function<void(int64_t position)>;
 
-    /** @param demuxer, probe, findings borrowed
-     *  @param jumpMs largest step from one frame of a stream to the next that is no jump
+    /** @param reader, findings borrowed
      *  @param progress called often */
-    Chain(const Demuxer& demuxer, const TagProbe& probe, uint32_t jumpMs, Findings& findings, Progress progress);
+    Chain(const Input& input, TagReader& reader, Limits limits, Findings& findings, Progress progress);
 
     void Walk();
     uint64_t Tags() const
     {
         return m_tags;
-    } /**< tags with a sound header, lost ones of damaged stretches not counted */
+    } /**< tags with a valid header, lost ones of damaged stretches not counted */
 
 private:
+    // What was last seen of a stream; times in ms as they are in the file.
+    struct Lane {
+        std::optional<int64_t> last;
+        std::optional<int64_t> interleaved; // the last time, none after a jump
+        std::vector<uint8_t> config;
+    };
+
+    struct Jump {
+        int64_t from;
+        int64_t to;
+        std::string cause;
+    };
+
     int64_t Step(int64_t position);
-    std::string_view WhyPassedOver(const Tag& tag) const;
     void JudgePlayed(const Tag& tag);
-    bool IsChained(const Tag& tag) const;
-    bool CouldFollow(int64_t position) const;
+    bool IsChained(const Tag& tag);
+    bool CouldFollow(int64_t position);
     void TakeUnlinked(const Tag& tag, int64_t next);
     int64_t Resume(int64_t position, const std::optional<Tag>& tag);
     void AddRest(int64_t position, const std::optional<Tag>& tag);
     void Take(const Tag& tag);
+    void JudgeConfig(const Tag& tag);
+    void JudgeTime(const Tag& tag);
+    void AddJump(const Tag& tag, int64_t from);
+    void JudgeGaps(const Tag& tag);
+    Lane& LaneOf(const Tag& tag) { return tag.IsVideo() ? m_video : m_audio; }
 
-    flvd_ctx_t* m_instance;
-    fio_file_t* m_reader;
-    const uint32_t m_streams;
-    const TagProbe& m_probe;
-    const uint32_t m_jumpMs;
+    TagReader& m_reader;
+    const Limits m_limits;
     Findings& m_findings;
     const Progress m_progress;
     const int64_t m_first; // position of the first tag
     uint64_t m_tags = 0;
-    std::string_view m_passedOver; // why the audio or video tag before was
-    std::optional<uint32_t> m_lastTimes[FLVD_STREAM_AUDIO + 1];
+    int64_t m_unlinkedEnd = -1;        // of the last tag without a valid back-pointer
+    std::string m_unlinkedCause;       // of the tags without one that follow each other
+    std::optional<Jump> m_jump{};      // the last one
+    std::optional<int64_t> m_keyframe; // time of the last one
+    Lane m_video;
+    Lane m_audio;
 };
+
+/** Adds what is wrong with the keyframe index of the metadata: entries that do not lead to a keyframe of about their
+ *  time. */
+void CheckIndex(const Input& input, TagReader& reader, Findings& findings);
 
 } // namespace tool
 

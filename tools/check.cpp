@@ -1,79 +1,95 @@
 // `flvdmx check`: judges files.
 #include <algorithm>
+#include <atomic>
+#include <filesystem>
 #include <functional>
+#include <future>
 #include <iterator>
 #include <memory>
 #include <optional>
+#include <stdexcept>
 #include <string>
+#include <system_error>
+#include <thread>
 #include <utility>
+#include <vector>
 
 #include <fmt/core.h>
 
 #include "tools/chain.h"
 #include "tools/commands.h"
-#include "tools/demuxer.h"
 #include "tools/findings.h"
-#include "tools/index_check.h"
+#include "tools/input.h"
 #include "tools/progress.h"
 #include "tools/report.h"
-#include "tools/time_text.h"
-#include "tools/workers.h"
+#include "tools/text.h"
 
 namespace tool {
 
 namespace {
 
+namespace fs = std::filesystem;
+
+constexpr double MS_PER_SECOND = 1000;
+
+// A file on its way from opening to its result.
+struct Subject {
+    std::string name;
+    std::optional<Input> input{};
+    Findings findings{};
+    std::optional<FileError> error{}; // why it is not open
+};
+
 // A file that cannot be played may still open as one that is growing, of which less is asked: then there is more to
 // say.
-std::unique_ptr<Demuxer> Open(const std::string& file, Findings& findings)
+Subject Open(const std::string& name)
 {
+    Subject subject{name};
     try {
-        return std::make_unique<Demuxer>(file, 0);
-    } catch (const DemuxError& error) {
+        subject.input.emplace(name);
+    } catch (const FileError& error) {
         try {
-            auto demuxer = std::make_unique<Demuxer>(file, FLVD_OPT_PROGRESSIVE);
-            findings.Add("not_playable", 0, error.Message());
-            return demuxer;
-        } catch (const DemuxError&) {
-            throw error;
+            flvdmx::Options options;
+            options.growing = true;
+            subject.input.emplace(name, options);
+            subject.findings.Add("not_playable", "", 0, error.what());
+        } catch (const FileError&) {
+            subject.error = error;
         }
     }
+    return subject;
 }
 
-Json CheckOpen(const Demuxer& demuxer, Findings& findings, const CheckOptions& options)
+Json Judge(Subject& subject, const CheckOptions& options, const Chain::Progress& progress)
 {
-    constexpr double MILLISECONDS_A_SECOND = 1000;
-    const flvd_ctx_t& instance = *demuxer.Instance();
-    const TagProbe probe(demuxer);
-    std::optional<ProgressBar> bar;
-    if (options.jobs == 1) // several bars would be one over the other
-        bar.emplace(demuxer.Path(), probe.FileSize());
-    Chain chain(demuxer, probe, static_cast<uint32_t>(options.jumpSeconds * MILLISECONDS_A_SECOND), findings,
-                [&bar](int64_t position) {
-                    if (bar)
-                        bar->ShowDone(position);
-                });
+    const Input input = std::move(*std::exchange(subject.input, std::nullopt)); // closed at the end
+    Findings& findings = subject.findings;
+    TagReader reader(input);
+    Limits limits{static_cast<int64_t>(options.jumpSeconds * MS_PER_SECOND)};
+    if (options.maxGapSeconds)
+        limits.maxGapMs = static_cast<int64_t>(*options.maxGapSeconds * MS_PER_SECOND);
+    Chain chain(input, reader, limits, findings, progress);
     chain.Walk();
-    CheckIndex(instance.keyframe_index, probe, findings);
-    if (instance.file_shorter_than_meta != 0)
-        findings.Add("cut_short", probe.FileSize(), "the metadata announces more bytes than the file has");
-    Json object = {{"file", demuxer.Path()},
-                   {"size", probe.FileSize()},
+    CheckIndex(input, reader, findings);
+    if (input.Instance().file_shorter_than_meta != 0)
+        findings.Add("cut_short", "", reader.FileSize(), "the metadata announces more bytes than the file has");
+    Json object = {{"file", input.name},
+                   {"size", reader.FileSize()},
                    {"tags", chain.Tags()},
-                   {"duration_ms", instance.duration_ms}};
+                   {"duration_ms", input.info.duration.count()}};
     findings.WriteTo(object);
     return object;
 }
 
-Json CheckFile(const std::string& file, const CheckOptions& options)
+Json Check(Subject& subject, const CheckOptions& options, const Chain::Progress& progress)
 {
     try {
-        Findings findings;
-        const std::unique_ptr<Demuxer> demuxer = Open(file, findings);
-        return CheckOpen(*demuxer, findings, options);
-    } catch (const DemuxError& error) {
-        return {{"file", file}, {"sound", false}, {"error", ErrorObject(error)}};
+        if (!subject.error)
+            return Judge(subject, options, progress);
+    } catch (const FileError& error) {
+        subject.error = error;
     }
+    return {{"file", subject.name}, {"sound", false}, {"error", subject.error->Object()}};
 }
 
 std::string CountsText(const Json& counts)
@@ -84,72 +100,187 @@ std::string CountsText(const Json& counts)
     return text;
 }
 
+std::string LineText(const Json& finding)
+{
+    const uint64_t count = finding.value("count", uint64_t{1});
+    const std::string more =
+        count > 1 ? fmt::format("; {} in all, the last at byte {}", count, finding["last_offset"].get<int64_t>()) : "";
+    return fmt::format("  byte {:<12} {:<17} {}{}\n", finding["offset"].get<int64_t>(),
+                       finding["kind"].get<std::string>(), finding["text"].get<std::string>(), more);
+}
+
 std::string Text(const std::string& file, const Json& result)
 {
     const Json& findings = result["findings"];
-    std::string text = fmt::format(
-        "{}: {}; {} tags, {} bytes, {} of them lost\n", file, findings.empty() ? "sound" : CountsText(result["counts"]),
-        result["tags"].get<uint64_t>(), result["size"].get<int64_t>(), result["lost_bytes"].get<int64_t>());
-    const auto out = std::back_inserter(text);
+    std::string text = fmt::format("{}: {}; {}, {} bytes, {} of them lost\n", Printable(file),
+                                   findings.empty() ? "ok" : CountsText(result["counts"]),
+                                   Plural(result["tags"].get<uint64_t>(), "tag"), result["size"].get<int64_t>(),
+                                   result["lost_bytes"].get<int64_t>());
     for (const Json& finding : findings)
-        fmt::format_to(out, "  byte {:<12} {:<16} {}\n", finding["offset"].get<int64_t>(),
-                       finding["kind"].get<std::string>(), finding["text"].get<std::string>());
+        text += LineText(finding);
     if (const auto unlisted = result["unlisted"].get<uint64_t>(); unlisted > 0)
-        fmt::format_to(out, "  and {} more\n", unlisted);
+        text += fmt::format("  and {} more\n", unlisted);
+    for (const Json& note : result["notes"])
+        text += LineText(note);
     return text;
 }
 
-void PrintResult(const std::string& file, const Json& result, const CheckOptions& options)
+// Checks files on several threads; results come in order. All files are opened first, since no open may run beside
+// other calls. What is thrown, such as for a pipe that nobody reads any more, ends the threads soon.
+class Crew {
+public:
+    Crew(std::vector<Subject> subjects, const CheckOptions& options) : m_subjects(std::move(subjects))
+    {
+        const auto progress = [this](int64_t) {
+            if (m_stopped)
+                throw std::runtime_error("stopped");
+        };
+        for (Subject& subject : m_subjects)
+            m_tasks.emplace_back([&subject, &options, progress] { return Check(subject, options, progress); });
+        for (size_t i = 0; i < std::min<size_t>(options.jobs, m_tasks.size()); ++i)
+            m_threads.emplace_back([this] {
+                for (size_t task = 0; (task = m_next++) < m_tasks.size();)
+                    m_tasks[task]();
+            });
+    }
+    ~Crew()
+    {
+        m_stopped = true;
+        m_next = m_tasks.size();
+        for (std::thread& thread : m_threads)
+            thread.join();
+    }
+    Crew(const Crew&) = delete;
+    Crew& operator=(const Crew&) = delete;
+
+    size_t Size() const { return m_subjects.size(); }
+    const Subject& SubjectAt(size_t i) const { return m_subjects[i]; }
+    Json Result(size_t i) { return m_tasks[i].get_future().get(); }
+
+private:
+    std::vector<Subject> m_subjects;
+    std::vector<std::packaged_task<Json()>> m_tasks;
+    std::vector<std::thread> m_threads;
+    std::atomic<size_t> m_next{0};
+    std::atomic<bool> m_stopped{false};
+};
+
+// Prints the results as they come, and gathers them for the document.
+class Results {
+public:
+    explicit Results(const CheckOptions& options) : m_options(options) {}
+
+    void Take(const Subject& subject, Json result)
+    {
+        if (subject.error)
+            Complain(*subject.error);
+        else if (!m_options.json)
+            Print(Text(subject.name, result));
+        m_allOk = m_allOk && result["sound"].get<bool>();
+        if (m_options.json)
+            m_documents.push_back(std::move(result));
+    }
+
+    void Fail() { m_allOk = false; }
+
+    int Finish()
+    {
+        if (m_options.json)
+            PrintJson({{"files", std::move(m_documents)}}, 2);
+        return m_allOk ? DONE : FAILED;
+    }
+
+private:
+    const CheckOptions& m_options;
+    Json m_documents = Json::array();
+    bool m_allOk = true;
+};
+
+void CheckOneByOne(const std::vector<std::string>& files, const CheckOptions& options, Results& results)
 {
-    if (result.contains("error")) {
-        const Json& error = result["error"];
-        const DemuxError thrown(error["message"], error["code"], error["line"]);
-        Complain(file, thrown.Message());
-    } else if (!options.json) {
-        Print(Text(file, result));
+    for (const std::string& file : files) {
+        Subject subject = Open(file);
+        Json result;
+        {
+            ProgressBar bar(file, subject.input ? subject.input->info.size : 0);
+            result = Check(subject, options, [&bar](int64_t position) { bar.ShowDone(position); });
+        }
+        results.Take(subject, std::move(result));
     }
 }
 
-// A process that was ended, or ran out of memory, sends nothing.
-Json Received(const std::string& file, const std::optional<std::string>& line)
+void CheckSideBySide(const std::vector<std::string>& files, const CheckOptions& options, Results& results)
 {
-    if (line)
-        return Json::parse(*line);
-    return {{"file", file}, {"sound", false}, {"error", ErrorObject(DemuxError("the process that checked it ended"))}};
+    constexpr size_t OPEN_FILES = 64;
+    ProgressBar progress("files", static_cast<int64_t>(files.size()));
+    const size_t most = std::max<size_t>(options.jobs, OPEN_FILES);
+    for (size_t begin = 0; begin < files.size(); begin += most) {
+        const size_t end = std::min(begin + most, files.size());
+        std::vector<Subject> subjects;
+        for (size_t i = begin; i < end; ++i)
+            subjects.push_back(Open(files[i]));
+        Crew crew(std::move(subjects), options);
+        for (size_t i = 0; i < crew.Size(); ++i) {
+            Json result = crew.Result(i);
+            progress.Wipe();
+            results.Take(crew.SubjectAt(i), std::move(result));
+            progress.ShowDone(static_cast<int64_t>(begin + i) + 1);
+        }
+    }
+}
+
+// The files of a folder and the folders in it that are FLV by their first bytes, or by their name.
+std::vector<std::string> FilesIn(const std::string& folder)
+{
+    std::vector<std::string> files;
+    uint64_t others = 0;
+    std::error_code failure;
+    for (fs::recursive_directory_iterator entry(folder, fs::directory_options::skip_permission_denied, failure), end;
+         !failure && entry != end; entry.increment(failure)) {
+        std::error_code unknown;
+        if (!entry->is_regular_file(unknown))
+            continue;
+        if (entry->path().extension() == ".flv" || HasSignature(entry->path()))
+            files.push_back(entry->path());
+        else
+            ++others;
+    }
+    if (failure)
+        throw FileError(folder, fmt::format("cannot be read: {}", failure.message()));
+    if (files.empty())
+        throw FileError(folder, "no FLV file is in this folder");
+    if (others > 0)
+        Complain(folder,
+                 fmt::format("note: skips {} that {} not FLV", Plural(others, "file"), others == 1 ? "is" : "are"));
+    std::sort(files.begin(), files.end());
+    return files;
 }
 
 } // namespace
 
 int RunCheck(const CheckOptions& options)
 {
-    const size_t count = options.files.size();
-    Json results = Json::array();
-    int exitCode = DONE;
-    const auto take = [&](size_t i, Json result) {
-        PrintResult(options.files[i], result, options);
-        if (!result["sound"])
-            exitCode = FAILED;
-        if (options.json)
-            results.push_back(std::move(result));
-    };
-    if (options.jobs == 1) {
-        for (size_t i = 0; i < count; ++i)
-            take(i, CheckFile(options.files[i], options));
-    } else {
-        ProgressBar progress("files", static_cast<int64_t>(count));
-        const auto work = [&](size_t i) {
-            return CheckFile(options.files[i], options).dump(-1, ' ', false, Json::error_handler_t::replace);
-        };
-        RunWorkers(count, std::min<size_t>(options.jobs, count), work,
-                   [&](size_t i, const std::optional<std::string>& line) {
-                       progress.Wipe();
-                       take(i, Received(options.files[i], line));
-                       progress.ShowDone(static_cast<int64_t>(i) + 1);
-                   });
+    Results results(options);
+    std::vector<std::string> files;
+    for (const std::string& name : options.files) {
+        std::error_code failure;
+        if (!fs::is_directory(name, failure)) {
+            files.push_back(name);
+            continue;
+        }
+        try {
+            const std::vector<std::string> found = FilesIn(name);
+            files.insert(files.end(), found.begin(), found.end());
+        } catch (const FileError& error) {
+            Complain(error);
+            results.Fail();
+        }
     }
-    if (options.json)
-        PrintJson({{"files", std::move(results)}}, 2);
-    return exitCode;
+    if (options.jobs == 1)
+        CheckOneByOne(files, options, results);
+    else
+        CheckSideBySide(files, options, results);
+    return results.Finish();
 }
 
 } // namespace tool

@@ -1,4 +1,5 @@
-// The subcommands of the tool. Each returns the exit code, DONE or FAILED, and has told the user of its failures.
+// The subcommands of the tool. Each returns the exit code, DONE or FAILED; what ends the work on its only file is
+// thrown as FileError.
 #ifndef FLVDMX_TOOLS_COMMANDS_H
 #define FLVDMX_TOOLS_COMMANDS_H
 
@@ -14,16 +15,22 @@ namespace tool {
 
 enum ExitCode { DONE = 0, FAILED = 1, WRONG_USE = 2 };
 
+constexpr uint32_t BOTH_STREAMS = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO;
+
+enum class Format { text, json, csv };
+
 struct InfoOptions {
     std::vector<std::string> files;
     bool json = false;
+    bool scan = false; /**< count the frames */
 };
 
 struct FramesOptions {
     std::string file;
-    bool json = false;
-    uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO; /**< FLVD_STREAM_* bits wanted */
-    uint64_t count = std::numeric_limits<uint64_t>::max();    /**< frames after which to stop */
+    Format format = Format::text;
+    uint32_t streams = BOTH_STREAMS;                       /**< FLVD_STREAM_* bits wanted */
+    bool keyframes = false;                                /**< of video keyframes alone, no audio */
+    uint64_t count = std::numeric_limits<uint64_t>::max(); /**< frames after which to stop */
     bool separateAudio = false;
     std::optional<int32_t> fromMs{};
     std::optional<int32_t> toMs{};
@@ -34,29 +41,33 @@ struct FramesOptions {
 struct SeekOptions {
     std::string file;
     int32_t timeMs = 0;
-    uint32_t mode = 0;  /**< FLVD_SEEK_* bits */
-    uint64_t play = 0;  /**< frames to read before the seek */
-    uint64_t count = 5; /**< frames to show behind the landing place */
+    uint32_t direction = FLVD_SEEK_BACKWARD; /**< FLVD_SEEK_BACKWARD, _FORWARD, or 0: automatic */
+    uint32_t mode = 0;                       /**< other FLVD_SEEK_* bits */
+    uint64_t play = 0;                       /**< frames to read before the seek */
+    uint64_t count = 5;                      /**< frames to show from the landing place on */
     bool separateAudio = false;
     bool json = false;
 };
 
 struct ExtractOptions {
     std::string file;
-    std::string out;                                          /**< file or base name, or a folder that exists */
-    uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO; /**< FLVD_STREAM_* bits wanted */
+    std::string out;                 /**< file or base name, or a folder that exists */
+    uint32_t streams = BOTH_STREAMS; /**< FLVD_STREAM_* bits wanted */
+    bool force = false;              /**< overwrite */
 };
 
 struct CheckOptions {
-    std::vector<std::string> files;
+    std::vector<std::string> files; /**< and folders */
     bool json = false;
-    uint32_t jobs = 1;       /**< files that are checked at the same time */
-    double jumpSeconds = 10; /**< largest step from one frame of a stream to the next that is no jump */
+    uint32_t jobs = 1;                   /**< files that are checked at the same time */
+    double jumpSeconds = 10;             /**< largest step from one frame of a stream to the next that is no jump */
+    std::optional<double> maxGapSeconds; /**< largest distance of keyframes, and of audio and video in the file */
 };
 
 struct PlotOptions {
     std::string file;
     std::string out;
+    bool force = false; /**< overwrite */
 };
 
 int RunInfo(const InfoOptions& options);

@@ -1,7 +1,7 @@
 // `flvdmx extract`: elementary streams as players take them.
 #include <cstdint>
 #include <filesystem>
-#include <functional>
+#include <limits>
 #include <memory>
 #include <optional>
 #include <string>
@@ -10,183 +10,148 @@
 
 #include <fmt/core.h>
 
-#include "tools/adts.h"
-#include "tools/annexb.h"
-#include "tools/codec_names.h"
 #include "tools/commands.h"
-#include "tools/demuxer.h"
+#include "tools/formats.h"
+#include "tools/frame_source.h"
+#include "tools/input.h"
 #include "tools/output_file.h"
 #include "tools/progress.h"
 #include "tools/report.h"
 #include "tools/tags.h"
+#include "tools/text.h"
 
 namespace tool {
 
 namespace {
 
-constexpr uint32_t SOUND_FORMAT_MP3 = 2;
-constexpr uint32_t SOUND_FORMAT_MP3_8K = 14;
-
-using Bytes = std::vector<uint8_t>;
-
-// How the frames of a codec become a stream.
-struct Format {
-    std::string extension;
-    std::function<std::string(const Bytes& config)> configure;                  // why that is not possible, or nothing
-    std::function<bool(const Bytes& frame, bool keyframe, Bytes& out)> convert; // false: part of it is left out
-    const char* fault;                                                          // what is wrong with such a frame
-};
-
-Format AvcFormat()
-{
-    const auto annexB = std::make_shared<AnnexB>();
-    const auto configure = [annexB](const Bytes& config) -> std::string {
-        return annexB->Configure(config) ? "" : "the AVC configuration is damaged";
-    };
-    const auto convert = [annexB](const Bytes& frame, bool keyframe, Bytes& out) {
-        return annexB->Convert(frame, keyframe, out);
-    };
-    return {"h264", configure, convert, "NAL units that do not fit their frame"};
-}
-
-Format AacFormat()
-{
-    const auto adts = std::make_shared<Adts>();
-    const auto configure = [adts](const Bytes& config) { return adts->Configure(config); };
-    const auto convert = [adts](const Bytes& frame, bool /*keyframe*/, Bytes& out) {
-        return adts->Convert(frame, out);
-    };
-    return {"aac", configure, convert, "more data than ADTS takes"};
-}
-
-Format RawFormat(const char* extension)
-{
-    const auto configure = [](const Bytes& /*config*/) { return std::string(); };
-    const auto convert = [](const Bytes& frame, bool /*keyframe*/, Bytes& out) {
-        out = frame;
-        return true;
-    };
-    return {extension, configure, convert, ""};
-}
-
-Format FormatOf(const flvd_ctx_t& instance, uint32_t stream)
-{
-    if (stream == FLVD_STREAM_VIDEO)
-        return VideoCodecId(instance) == CODEC_ID_AVC ? AvcFormat() : RawFormat("video");
-    const uint32_t sound = AudioSoundFormat(instance);
-    if (sound == SOUND_FORMAT_AAC)
-        return AacFormat();
-    return RawFormat(sound == SOUND_FORMAT_MP3 || sound == SOUND_FORMAT_MP3_8K ? "mp3" : "audio");
-}
-
-Bytes ConfigOf(const Demuxer& demuxer, uint32_t stream)
-{
-    const bool video = stream == FLVD_STREAM_VIDEO;
-    const uint8_t* const config = video ? demuxer.Video()->config : demuxer.Audio()->config;
-    const uint32_t size = video ? demuxer.Video()->config_size : demuxer.Audio()->config_size;
-    return config == nullptr ? Bytes() : Bytes(config, config + size);
-}
-
 // One stream on its way into its file.
 class StreamWriter {
 public:
-    StreamWriter(const ExtractOptions& options, const Demuxer& demuxer, uint32_t stream)
-        : m_file(options.file), m_stream(stream), m_format(FormatOf(*demuxer.Instance(), stream))
+    StreamWriter(const Input& input, flvdmx::Stream stream)
+        : m_file(input.name), m_stream(stream), m_format(FormatOf(input, stream))
     {
-        if (const std::string refusal = m_format.configure(ConfigOf(demuxer, stream)); !refusal.empty())
-            throw DemuxError(refusal);
+        const bool video = stream == flvdmx::Stream::video;
+        const std::string refusal = m_format->Configure(video ? input.info.video->config : input.info.audio->config);
+        if (!refusal.empty())
+            throw FileError(m_file, refusal);
     }
 
-    uint32_t Stream() const { return m_stream; }
+    flvdmx::Stream Stream() const { return m_stream; }
 
     // A folder takes files named as the input; otherwise two streams need two names.
-    void Open(const std::string& out, bool both)
+    void Open(const ExtractOptions& options, bool both)
     {
-        const std::string folderName = std::filesystem::path(m_file).stem().string() + "." + m_format.extension;
+        const std::string base = m_file == STANDARD_STREAM ? "stdin" : std::filesystem::path(m_file).stem().string();
         std::error_code failure;
-        if (std::filesystem::is_directory(out, failure))
-            m_out = std::make_unique<OutputFile>(std::filesystem::path(out) / folderName, m_file);
+        if (options.out != STANDARD_STREAM && std::filesystem::is_directory(options.out, failure))
+            Open(std::filesystem::path(options.out) / (base + "." + m_format->Extension()), options.force);
         else
-            m_out = std::make_unique<OutputFile>(both ? out + "." + m_format.extension : out, m_file);
-        if (m_format.extension == StreamName(m_stream))
-            Complain(m_file,
-                     fmt::format("note: the {} is written raw, its frames one behind the other", StreamName(m_stream)));
+            Open(both ? options.out + "." + m_format->Extension() : options.out, options.force);
     }
 
-    void Begin() { m_out->Begin(); }
-
-    void Take(const Tag& tag, const Bytes& data)
+    void Take(const flvdmx::Frame& frame)
     {
-        if (tag.IsConfig()) {
-            if (const std::string refusal = m_format.configure(data); !refusal.empty())
-                Complain(m_file, fmt::format("warning: byte {}: {}; the one before is kept", tag.position, refusal));
-            return;
-        }
+        if (frame.config_changed())
+            if (const std::string refusal = m_format->Configure(frame.new_config); !refusal.empty())
+                Complain(m_file,
+                         fmt::format("warning: before byte {}: {}; the one before is kept", frame.position, refusal));
         m_bytes.clear();
-        if (!m_format.convert(data, tag.IsKeyframe(), m_bytes) && m_faults++ == 0)
-            m_firstFault = tag.position;
+        if (const char* const fault = m_format->Convert(frame, m_bytes); fault != nullptr && m_faults++ == 0) {
+            m_fault = fault;
+            m_firstFault = frame.position;
+        }
         m_out->Write(m_bytes.data(), m_bytes.size());
+        ++m_frames;
     }
 
-    void Finish()
+    // A stream without frames leaves no file. @return true when there is one
+    bool Finish()
     {
-        m_out->Close();
+        const uint64_t written = m_out->Written() - m_format->Header(0).size();
+        if (written == 0) {
+            Complain(m_file, fmt::format("note: the {} stream has no frames: {} is not written", StreamName(m_stream),
+                                         Printable(m_out->Path())));
+            return false;
+        }
+        if (const std::vector<uint8_t> header = m_format->Header(written); !header.empty())
+            m_out->Rewrite(header);
+        m_out->Finish();
         if (m_faults > 0)
-            Complain(m_file, fmt::format("warning: {} in {} frames, the first at byte {}, left out", m_format.fault,
-                                         m_faults, m_firstFault));
+            Complain(m_file, fmt::format("warning: {} in {}, the first at byte {}, left out", m_fault,
+                                         Plural(m_faults, "frame"), m_firstFault));
+        if (m_format->IsRaw())
+            Complain(m_file,
+                     fmt::format("note: the {} is written raw, one frame after the other", StreamName(m_stream)));
+        if (!m_out->IsStandard())
+            Print(fmt::format("{}: {}, {} bytes\n", Printable(m_out->Path()), Plural(m_frames, "frame"),
+                              m_out->Written()));
+        return true;
     }
 
 private:
+    // Until the size is known the header of the stream has the largest, as it stays in a pipe.
+    void Open(const std::string& path, bool force)
+    {
+        m_out = std::make_unique<OutputFile>(path, m_file, force);
+        const std::vector<uint8_t> header = m_format->Header(std::numeric_limits<uint64_t>::max());
+        m_out->Write(header.data(), header.size());
+    }
+
     const std::string m_file;
-    const uint32_t m_stream;
-    const Format m_format;
+    const flvdmx::Stream m_stream;
+    std::unique_ptr<StreamFormat> m_format;
     std::unique_ptr<OutputFile> m_out;
-    Bytes m_bytes;
+    std::vector<uint8_t> m_bytes;
+    uint64_t m_frames = 0;
+    const char* m_fault = "";
     uint64_t m_faults = 0;
     int64_t m_firstFault = 0;
 };
 
-void Extract(const ExtractOptions& options)
+std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input& input)
 {
-    Demuxer demuxer(options.file, 0);
-    WarnIfCutShort(demuxer);
     std::vector<StreamWriter> writers;
-    for (const uint32_t stream : {FLVD_STREAM_VIDEO, FLVD_STREAM_AUDIO}) {
-        if ((options.streams & demuxer.Streams() & stream) != 0)
-            writers.emplace_back(options, demuxer, stream);
-    }
-    if (writers.empty())
-        throw DemuxError(fmt::format("the file has no {} stream", StreamName(options.streams)));
-    ProgressBar progress(options.file, demuxer.Instance()->data_end);
-    for (StreamWriter& writer : writers) // only now, and all before the first one is touched
-        writer.Open(options.out, writers.size() > 1);
-    for (StreamWriter& writer : writers)
-        writer.Begin();
-    demuxer.AcceptAllTimes();
-    TagReader reader(demuxer);
-    while (const std::optional<Tag> tag = reader.Next()) {
-        progress.ShowDone(tag->position);
-        for (StreamWriter& writer : writers) {
-            if (writer.Stream() == tag->Stream() && (tag->IsFrame() || tag->IsConfig()))
-                writer.Take(*tag, reader.Data(*tag));
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
+        if (const auto bit = static_cast<uint32_t>(stream); (options.streams & bit) != 0) {
+            if (input.Has(stream))
+                writers.emplace_back(input, stream);
+            else if (const std::string why = TagReader(input).WhyNoStream(stream); !why.empty())
+                Complain(input.name, fmt::format("note: the {} is left out: {}", StreamName(stream), why));
         }
-    }
-    for (StreamWriter& writer : writers)
-        writer.Finish();
-    WarnOfSkipped(demuxer, reader);
+    if (writers.empty())
+        throw FileError(input.name, fmt::format("the file has no {} stream",
+                                                StreamName(static_cast<flvdmx::Stream>(options.streams))));
+    if (options.out == STANDARD_STREAM && writers.size() > 1)
+        throw FileError(input.name, "standard output takes one stream: --stream video or --stream audio chooses it");
+    return writers;
 }
 
 } // namespace
 
 int RunExtract(const ExtractOptions& options)
 {
-    try {
-        Extract(options);
-        return DONE;
-    } catch (const DemuxError& error) {
-        Complain(options.file, error.Message());
-        return FAILED;
+    Input input(options.file);
+    input.WarnIfCutShort();
+    std::vector<StreamWriter> writers = MakeWriters(options, input);
+    ProgressBar progress(options.file, input.Instance().data_end);
+    for (StreamWriter& writer : writers)
+        writer.Open(options, writers.size() > 1);
+    AcceptAllTimes(input);
+    Losses losses(input);
+    while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
+        progress.ShowDone(frame->position);
+        losses.Take(*frame);
+        for (StreamWriter& writer : writers)
+            if (writer.Stream() == frame->stream)
+                writer.Take(*frame);
     }
+    progress.Wipe();
+    losses.Finish();
+    bool written = false;
+    for (StreamWriter& writer : writers)
+        written = writer.Finish() || written;
+    losses.Warn();
+    return written ? DONE : FAILED;
 }
 
 } // namespace tool

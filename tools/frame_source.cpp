@@ -1,14 +1,80 @@
 // Frames in the order of their times.
 #include "tools/frame_source.h"
 
+#include <tuple>
 #include <utility>
+
+#include <boost/crc.hpp>
+#include <fmt/core.h>
+
+#include "tools/text.h"
 
 namespace tool {
 
-FrameSource::FrameSource(Demuxer& demuxer, uint32_t streams)
-    : m_demuxer(demuxer),
-      m_streams(streams), m_video{FLVD_STREAM_VIDEO, (streams & FLVD_STREAM_VIDEO) != 0 && demuxer.Video() != nullptr},
-      m_audio{FLVD_STREAM_AUDIO, (streams & FLVD_STREAM_AUDIO) != 0 && demuxer.Audio() != nullptr}
+namespace {
+
+uint32_t Crc32(flvdmx::Bytes bytes)
+{
+    boost::crc_32_type crc;
+    crc.process_bytes(bytes.data(), bytes.size());
+    return crc.checksum();
+}
+
+bool IsBefore(const FrameSource::Frame& a, const FrameSource::Frame& b)
+{
+    if (!a || !b)
+        return a.has_value();
+    return std::tie(a->timeMs, a->position) < std::tie(b->timeMs, b->position);
+}
+
+} // namespace
+
+const char* const FrameRecord::HEADING =
+    " number  stream  key           time          shown      size      position     crc32\n";
+const char* const FrameRecord::CSV_HEADING = "number,stream,keyframe,time_ms,presentation_ms,size,position,crc32\n";
+
+FrameRecord::FrameRecord(const flvdmx::Frame& frame)
+    : stream(frame.stream), keyframe(frame.keyframe), timeMs(frame.time.count()),
+      shownMs(frame.presentation_time().count()), size(frame.data.size()), position(frame.position),
+      crc(Crc32(frame.data))
+{
+}
+
+std::string FrameRecord::Line(uint64_t number) const
+{
+    return fmt::format("{:>7}  {:<6}  {:<3}  {:>13}  {:>13}  {:>8}  {:>12}  {:08x}\n", number, StreamName(stream),
+                       keyframe && IsVideo() ? "key" : "", FormatTime(timeMs), FormatTime(shownMs), size, position,
+                       crc);
+}
+
+std::string FrameRecord::Csv(uint64_t number) const
+{
+    return fmt::format("{},{},{:d},{},{},{},{},{:08x}\n", number, StreamName(stream), keyframe, timeMs, shownMs, size,
+                       position, crc);
+}
+
+Json FrameRecord::Object(uint64_t number) const
+{
+    return {{"number", number},     {"stream", StreamName(stream)},       {"keyframe", keyframe},
+            {"time_ms", timeMs},    {"presentation_ms", shownMs},         {"size", size},
+            {"position", position}, {"crc32", fmt::format("{:08x}", crc)}};
+}
+
+std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream)
+{
+    const flvdmx::result<flvdmx::Frame> frame = input.file.next_frame(stream);
+    if (frame)
+        return *frame;
+    if (frame.error().kind() == flvdmx::Kind::failed)
+        throw FileError(input.name, frame.error());
+    return std::nullopt;
+}
+
+FrameSource::FrameSource(Input& input, uint32_t streams, Losses* losses)
+    : m_input(input), m_streams(streams),
+      m_losses(losses), m_video{flvdmx::Stream::video,
+                                (streams & FLVD_STREAM_VIDEO) != 0 && input.Has(flvdmx::Stream::video)},
+      m_audio{flvdmx::Stream::audio, (streams & FLVD_STREAM_AUDIO) != 0 && input.Has(flvdmx::Stream::audio)}
 {
 }
 
@@ -22,34 +88,30 @@ void FrameSource::Fill(Lane& lane)
 {
     if (!lane.asked || lane.ended || lane.frame)
         return;
-    lane.frame = m_demuxer.NextFrame(lane.stream);
-    lane.ended = !lane.frame;
-    lane.end = lane.ended ? 0 : m_demuxer.Position(lane.stream);
+    const std::optional<flvdmx::Frame> frame = NextFrame(m_input, lane.stream);
+    lane.ended = !frame;
+    if (frame)
+        lane.frame.emplace(*frame);
 }
 
-bool FrameSource::IsBefore(const Lane& a, const Lane& b)
+FrameSource::Frame FrameSource::NextOfOne()
 {
-    if (!a.frame || !b.frame)
-        return a.frame.has_value();
-    return std::pair(a.frame->timeMs, a.end) < std::pair(b.frame->timeMs, b.end);
-}
-
-std::optional<Frame> FrameSource::NextOfOne()
-{
-    for (;;) {
-        const std::optional<Frame> frame = m_demuxer.NextFrame(0);
-        if (!frame || (frame->stream & m_streams) != 0)
-            return frame;
+    while (const std::optional<flvdmx::Frame> frame = NextFrame(m_input, flvdmx::Stream::any)) {
+        if (m_losses != nullptr)
+            m_losses->Take(*frame);
+        if ((static_cast<uint32_t>(frame->stream) & m_streams) != 0)
+            return FrameRecord(*frame);
     }
+    return std::nullopt;
 }
 
-std::optional<Frame> FrameSource::Next()
+FrameSource::Frame FrameSource::Next()
 {
-    if (!m_demuxer.HasSeparateAudio())
+    if ((m_input.Instance().options & FLVD_OPT_SEPARATE_AUDIO_READER) == 0)
         return NextOfOne();
     Fill(m_video);
     Fill(m_audio);
-    Lane& next = IsBefore(m_video, m_audio) ? m_video : m_audio;
+    Lane& next = IsBefore(m_video.frame, m_audio.frame) ? m_video : m_audio;
     return std::exchange(next.frame, std::nullopt);
 }
 

@@ -1,23 +1,51 @@
-// Frames in the order of their times, from one reader or from two.
+// Frames in the order of their times, from one reader or from two, and how they are printed.
 #ifndef FLVDMX_TOOLS_FRAME_SOURCE_H
 #define FLVDMX_TOOLS_FRAME_SOURCE_H
 
 #include <cstdint>
 #include <optional>
+#include <string>
 
-#include "tools/demuxer.h"
+#include "tools/input.h"
+#include "tools/report.h"
+#include "tools/tags.h"
 
 namespace tool {
 
-/** Delivers the frames of a demuxer; with a separate audio reader it merges the two streams by time. */
+/** What is reported of a frame. */
+struct FrameRecord {
+    flvdmx::Stream stream;
+    bool keyframe;
+    int64_t timeMs;   /**< from the first timestamp; negative when the tag is before it */
+    int64_t shownMs;  /**< presentation time */
+    size_t size;      /**< bytes */
+    int64_t position; /**< of the tag in the file */
+    uint32_t crc;     /**< CRC-32 of the frame */
+
+    explicit FrameRecord(const flvdmx::Frame& frame);
+
+    bool IsVideo() const { return stream == flvdmx::Stream::video; }
+    std::string Line(uint64_t number) const; /**< under HEADING */
+    std::string Csv(uint64_t number) const;  /**< under CSV_HEADING */
+    Json Object(uint64_t number) const;
+
+    static const char* const HEADING;
+    static const char* const CSV_HEADING;
+};
+
+/** Delivers the frames of an input; of one with a separate audio reader it merges the two streams by time. */
 class FrameSource {
 public:
-    /** @param demuxer borrowed
-     *  @param streams FLVD_STREAM_* bits of the frames wanted */
-    FrameSource(Demuxer& demuxer, uint32_t streams);
+    using Frame = std::optional<FrameRecord>;
 
-    /** @return the next frame; nothing at the end of the data */
-    std::optional<Frame> Next();
+    /** @param input borrowed
+     *  @param streams FLVD_STREAM_* bits of the frames wanted
+     *  @param losses borrowed, takes the frames of a single reader; may be null */
+    FrameSource(Input& input, uint32_t streams, Losses* losses = nullptr);
+
+    /** @return the next frame; nothing at the end of the data, which a growing file may pass later. Throws
+     *          FileError */
+    Frame Next();
 
     /** The file has grown: streams that were at their end are asked again. */
     void Refresh();
@@ -26,22 +54,24 @@ private:
     // With two readers each stream is asked one frame ahead, to know which one is next. A stream at its end does
     // not hold up the other one.
     struct Lane {
-        uint32_t stream;
+        flvdmx::Stream stream;
         bool asked;
         bool ended = false;
-        std::optional<Frame> frame{};
-        int64_t end = 0; // byte position behind the frame: the order in the file settles equal times
+        Frame frame{};
     };
 
-    std::optional<Frame> NextOfOne();
+    Frame NextOfOne();
     void Fill(Lane& lane);
-    static bool IsBefore(const Lane& a, const Lane& b);
 
-    Demuxer& m_demuxer;
+    Input& m_input;
     const uint32_t m_streams;
+    Losses* const m_losses;
     Lane m_video;
     Lane m_audio;
 };
+
+/** @return the next frame in the file, valid until the next call; nothing at the end. Throws FileError */
+std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream);
 
 } // namespace tool
 

@@ -1,21 +1,23 @@
-// `flvdmx frames`: one line a frame, of a complete file or of one that is still being written.
+// `flvdmx frames`: one line per frame, of a complete file or of one that is still being written.
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
-#include <cstring>
 #include <filesystem>
-#include <memory>
 #include <optional>
 #include <system_error>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include <fmt/core.h>
 
 #include "tools/commands.h"
-#include "tools/demuxer.h"
 #include "tools/frame_source.h"
+#include "tools/input.h"
 #include "tools/progress.h"
 #include "tools/report.h"
 #include "tools/tags.h"
+#include "tools/text.h"
 
 namespace tool {
 
@@ -33,8 +35,8 @@ int64_t FileSize(const std::string& path)
 // Watches the size of a file that is being written.
 class Growth {
 public:
-    Growth(const std::string& path, double timeoutSeconds)
-        : m_path(path), m_timeout(timeoutSeconds), m_size(FileSize(path))
+    Growth(std::string path, double timeoutSeconds)
+        : m_path(std::move(path)), m_timeout(timeoutSeconds), m_size(FileSize(m_path))
     {
     }
 
@@ -61,136 +63,218 @@ private:
     int64_t m_size;
 };
 
-// Prints the frames up to the end of the wanted range, and knows when no more of them can come.
+// Prints the frames of the wanted range, and knows when no more of them can come.
 class FramePrinter {
 public:
-    FramePrinter(const FramesOptions& options, uint32_t streams) : m_options(options), m_open(streams) {}
+    FramePrinter(const FramesOptions& options, uint32_t streams)
+        : m_options(options), m_streams(streams), m_open(streams), m_started(!options.fromMs)
+    {
+    }
 
     bool Done() const { return m_open == 0 || m_number >= m_options.count; }
 
-    void Take(const Frame& frame)
+    void Take(const FrameRecord& frame)
     {
-        if (m_options.toMs && frame.timeMs > *m_options.toMs) {
-            m_open &= ~frame.stream;
-            return;
-        }
-        ++m_number;
-        if (m_options.json)
-            PrintJson(FrameObject(m_number, frame));
+        if (!m_started)
+            Hold(frame);
         else
-            Print(FrameLine(m_number, frame));
-        if (m_options.follow)
-            Flush();
+            Show(frame);
         m_progress.Show(m_number, frame.timeMs);
     }
 
+    // There is no later frame: one that is exactly at the time sought may have waited for it.
+    void Finish()
+    {
+        const auto sought = [this](const FrameRecord& frame) { return frame.timeMs == *m_options.fromMs; };
+        if (std::any_of(m_held.begin(), m_held.end(), sought))
+            ShowHeld();
+    }
+
 private:
+    // Until the time sought comes, the frames since the last keyframe are kept: the range begins there. Without video
+    // it begins at that time.
+    void Hold(const FrameRecord& frame)
+    {
+        const bool video = (m_streams & FLVD_STREAM_VIDEO) != 0;
+        m_started = frame.timeMs > *m_options.fromMs || (!video && frame.timeMs == *m_options.fromMs);
+        if (!video || (!m_started && frame.IsVideo() && frame.keyframe))
+            m_held.clear();
+        m_held.push_back(frame);
+        if (m_started)
+            ShowHeld();
+    }
+
+    void ShowHeld()
+    {
+        for (const FrameRecord& held : std::exchange(m_held, {}))
+            Show(held);
+    }
+
+    void Show(const FrameRecord& frame)
+    {
+        if (m_options.toMs && frame.timeMs > *m_options.toMs) {
+            m_open &= ~static_cast<uint32_t>(frame.stream);
+            return;
+        }
+        if ((m_options.keyframes && !frame.keyframe) || Done())
+            return;
+        ++m_number;
+        switch (m_options.format) {
+        case Format::json:
+            PrintJson(frame.Object(m_number));
+            break;
+        case Format::csv:
+            Print((m_number == 1 ? FrameRecord::CSV_HEADING : "") + frame.Csv(m_number));
+            break;
+        case Format::text:
+            Print((m_number == 1 ? FrameRecord::HEADING : "") + frame.Line(m_number));
+        }
+        if (m_options.follow)
+            Flush();
+    }
+
     const FramesOptions& m_options;
+    const uint32_t m_streams;
     uint32_t m_open; // streams that have not passed the end of the range
+    bool m_started;
+    std::vector<FrameRecord> m_held;
     uint64_t m_number = 0;
     Progress m_progress;
 };
 
-uint32_t OpenBits(const FramesOptions& options)
+flvdmx::Options OpenOptions(const FramesOptions& options)
 {
-    return BitsIf(options.separateAudio, FLVD_OPT_SEPARATE_AUDIO_READER) | BitsIf(options.follow, FLVD_OPT_PROGRESSIVE);
+    flvdmx::Options open;
+    open.separate_audio_reader = options.separateAudio;
+    open.growing = options.follow;
+    return open;
 }
 
-void SeekToStart(Demuxer& demuxer, const FramesOptions& options)
+uint32_t WantedStreams(const FramesOptions& options)
 {
-    if (options.fromMs)
-        demuxer.Seek(*options.fromMs, FLVD_SEEK_BACKWARD);
+    return options.keyframes ? options.streams & FLVD_STREAM_VIDEO : options.streams;
 }
 
-// The entry point does not tell what it passes over: that takes a walk of its own.
-void WarnOfLoss(const Demuxer& demuxer)
+// A file that cannot seek is read from its beginning: the printer waits for the time.
+void SeekToStart(Input& input, int32_t ms)
 {
-    TagReader reader(demuxer);
-    while (reader.Next())
-        ;
-    WarnOfSkipped(demuxer, reader);
+    const flvdmx::error error = input.file.seek(flvdmx::Milliseconds(ms), flvdmx::SeekMode::backward).error();
+    if (error.kind() == flvdmx::Kind::miss)
+        throw FileError(
+            input.name,
+            fmt::format("nothing is at {}: the last frame is at {}", FormatTime(ms), FormatTime(input.info.duration)),
+            error);
+    if (error.kind() != flvdmx::Kind::none && error.code() != FLVD_ERR_NOT_SEEKABLE)
+        throw FileError(input.name, error);
+}
+
+// With two readers the frames come by time: what is between them is looked at in another pass, in file order.
+void WarnOfLossApart(const std::string& file)
+{
+    flvdmx::Options options;
+    options.restarting_timestamps = true;
+    Input input(file, options);
+    Losses losses(input);
+    for (const flvdmx::Frame& frame : input.file.frames())
+        losses.Take(frame);
+    losses.Finish();
+    losses.Warn();
 }
 
 void PrintComplete(const FramesOptions& options)
 {
-    Demuxer demuxer(options.file, OpenBits(options));
-    WarnIfCutShort(demuxer);
-    const uint32_t streams = options.streams & demuxer.Streams();
-    if (streams == 0)
-        throw DemuxError(fmt::format("the file has no {} stream", StreamName(options.streams)));
-    SeekToStart(demuxer, options);
-    demuxer.AcceptAllTimes();
-    FrameSource source(demuxer, streams);
+    Input input(options.file, OpenOptions(options));
+    input.WarnIfCutShort();
+    const uint32_t streams = WantedStreams(options) & input.Streams();
+    if (streams == 0) {
+        const auto wanted = static_cast<flvdmx::Stream>(WantedStreams(options));
+        const std::string why = TagReader(input).WhyNoStream(wanted);
+        throw FileError(options.file, fmt::format("the file has no {} stream{}", StreamName(wanted),
+                                                  why.empty() ? "" : " that is played: " + why));
+    }
+    if (options.fromMs)
+        SeekToStart(input, *options.fromMs);
+    AcceptAllTimes(input);
+    Losses losses(input);
+    FrameSource source(input, streams, &losses);
     FramePrinter printer(options, streams);
     while (!printer.Done()) {
-        const std::optional<Frame> frame = source.Next();
+        const std::optional<FrameRecord> frame = source.Next();
         if (!frame)
             break;
         printer.Take(*frame);
     }
-    if (!printer.Done() && !options.fromMs)
-        WarnOfLoss(demuxer);
+    printer.Finish();
+    if (printer.Done() || options.fromMs)
+        return;
+    if (options.separateAudio)
+        return WarnOfLossApart(options.file);
+    losses.Finish();
+    losses.Warn();
 }
 
-// The streams that the file header promises. Read through the library's own reader, which is put back.
-uint32_t AnnouncedStreams(const Demuxer& demuxer)
+// FLAGS of the file header (FLV file format, version 10.1, annex E.2): the streams that it promises.
+uint32_t AnnouncedStreams(const Input& input)
 {
-    constexpr char SIGNATURE[] = {'F', 'L', 'V'};
     constexpr uint32_t FLAGS_OFFSET = 4;
     constexpr uint8_t VIDEO_FLAG = 0x01;
     constexpr uint8_t AUDIO_FLAG = 0x04;
-    fio_file_t* const reader = demuxer.Reader(FLVD_STREAM_VIDEO);
-    const uint8_t* bytes = nullptr;
+    TagReader reader(input);
+    const uint8_t* const flags = reader.Bytes(FLAGS_OFFSET, 1);
+    if (flags == nullptr)
+        return 0;
     uint32_t streams = 0;
-    if (__FLV_DMX__fioSeek64(reader, 0, FIO_SEEK_SET) == 0 &&
-        __FLV_DMX__fioShowBytesByPtr(&bytes, FLAGS_OFFSET + 1, reader) == FLAGS_OFFSET + 1 &&
-        std::memcmp(bytes, SIGNATURE, sizeof SIGNATURE) == 0) {
-        streams = BitsIf((bytes[FLAGS_OFFSET] & VIDEO_FLAG) != 0, FLVD_STREAM_VIDEO) |
-                  BitsIf((bytes[FLAGS_OFFSET] & AUDIO_FLAG) != 0, FLVD_STREAM_AUDIO);
-    }
-    __FLV_DMX__fioSeek64(reader, demuxer.Instance()->data_offset, FIO_SEEK_SET);
+    streams |= (*flags & VIDEO_FLAG) != 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0;
+    streams |= (*flags & AUDIO_FLAG) != 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0;
     return streams;
 }
 
-// Opens as soon as the file holds enough. With two readers a stream that was not found at the open is never played,
-// so that open waits for all streams that the file header promises.
-std::unique_ptr<Demuxer> OpenGrowing(const FramesOptions& options, Growth& growth)
+// Opens as soon as the file is there and holds enough. With two readers a stream that was not found at the open is
+// never played, so that open waits for all streams that the file header promises.
+Input OpenGrowing(const FramesOptions& options, Growth& growth)
 {
     for (;;) {
-        try {
-            auto demuxer = std::make_unique<Demuxer>(options.file, OpenBits(options));
-            const bool complete = (AnnouncedStreams(*demuxer) & ~demuxer->Streams()) == 0;
+        const std::string path = PathOf(options.file);
+        flvdmx::result<flvdmx::File> file = flvdmx::File::open(path, Host(), OpenOptions(options));
+        const flvdmx::error error = file.error();
+        if (file) {
+            Input input(options.file, std::move(*file));
+            const bool complete = (AnnouncedStreams(input) & ~input.Streams()) == 0;
             if (complete || !options.separateAudio || !growth.Wait())
-                return demuxer;
-        } catch (const DemuxError& error) {
-            if (error.Code() == FLVD_ERR_OPEN_MAIN || error.Code() == FLVD_ERR_OPEN_AUDIO || !growth.Wait())
-                throw;
+                return input;
+            continue;
         }
+        if ((error.kind() != flvdmx::Kind::not_yet && error.system_error() != ENOENT) || !growth.Wait())
+            throw FileError(options.file, OpenFailureText(path, error), error);
     }
 }
 
-void WarnOfRest(const Demuxer& demuxer, const Growth& growth)
+void WarnOfRest(const Input& input, const Growth& growth)
 {
-    const int64_t rest =
-        growth.Size() - std::max(demuxer.Position(FLVD_STREAM_VIDEO), demuxer.Position(FLVD_STREAM_AUDIO));
+    const flvd_ctx_t& instance = input.Instance();
+    const int64_t rest = growth.Size() - std::max(__FLV_DMX__fioTell64(instance.main_reader),
+                                                  __FLV_DMX__fioTell64(instance.audio_reader));
     if (rest > 0)
-        Complain(demuxer.Path(), fmt::format("warning: the last {} bytes hold no whole frame", rest));
+        Complain(input.name, fmt::format("warning: the last {} bytes hold no whole frame", rest));
 }
 
 void PrintGrowing(const FramesOptions& options)
 {
+    if (options.file == STANDARD_STREAM)
+        throw FileError(options.file, "standard input cannot be followed: name the file that is being written");
     Growth growth(options.file, options.timeoutSeconds);
-    const std::unique_ptr<Demuxer> demuxer = OpenGrowing(options, growth);
-    FramePrinter printer(options, options.streams & (AnnouncedStreams(*demuxer) | demuxer->Streams()));
-    SeekToStart(*demuxer, options);
-    FrameSource source(*demuxer, options.streams);
+    Input input = OpenGrowing(options, growth);
+    const uint32_t wanted = WantedStreams(options);
+    FramePrinter printer(options, wanted & (AnnouncedStreams(input) | input.Streams()));
+    FrameSource source(input, wanted);
     while (!printer.Done()) {
-        if (const std::optional<Frame> frame = source.Next()) {
+        if (const std::optional<FrameRecord> frame = source.Next()) {
             printer.Take(*frame);
         } else if (growth.Wait()) {
             source.Refresh();
         } else {
-            WarnOfRest(*demuxer, growth);
+            printer.Finish();
+            WarnOfRest(input, growth);
             return;
         }
     }
@@ -200,16 +284,11 @@ void PrintGrowing(const FramesOptions& options)
 
 int RunFrames(const FramesOptions& options)
 {
-    try {
-        if (options.follow)
-            PrintGrowing(options);
-        else
-            PrintComplete(options);
-        return DONE;
-    } catch (const DemuxError& error) {
-        Complain(options.file, error.Message());
-        return FAILED;
-    }
+    if (options.follow)
+        PrintGrowing(options);
+    else
+        PrintComplete(options);
+    return DONE;
 }
 
 } // namespace tool

@@ -1,33 +1,34 @@
-// The keyframe index against the file. It is read where it lies: a long one takes no memory.
-#include "tools/index_check.h"
+// The keyframe index against the file. It is read where it is: a long one takes no memory.
+#include "tools/chain.h"
 
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <optional>
 #include <string>
 
 #include <fmt/core.h>
 
-#include "tools/time_text.h"
+#include "tools/text.h"
 
 namespace tool {
 
 namespace {
 
-constexpr uint32_t COUNT_SIZE = 4; // AMF0 strict array: the count stands in front of the elements
+constexpr uint32_t COUNT_SIZE = 4; // AMF0 strict array: the count is before the elements
 constexpr uint32_t NUMBER_SIZE = 9;
 constexpr uint8_t NUMBER_MARKER = 0;
 constexpr double MOST_DIFFERENCE_MS = 1000;
 
-uint32_t CountAt(const TagProbe& probe, int64_t elements)
+uint32_t CountAt(TagReader& reader, int64_t elements)
 {
-    const uint8_t* const bytes = probe.Bytes(elements - COUNT_SIZE, COUNT_SIZE);
+    const uint8_t* const bytes = reader.Bytes(elements - COUNT_SIZE, COUNT_SIZE);
     return bytes == nullptr ? 0 : BigEndian(bytes, COUNT_SIZE);
 }
 
-std::optional<double> NumberAt(const TagProbe& probe, int64_t elements, uint32_t number)
+std::optional<double> NumberAt(TagReader& reader, int64_t elements, uint32_t number)
 {
-    const uint8_t* const bytes = probe.Bytes(elements + int64_t{NUMBER_SIZE} * number, NUMBER_SIZE);
+    const uint8_t* const bytes = reader.Bytes(elements + int64_t{NUMBER_SIZE} * number, NUMBER_SIZE);
     if (bytes == nullptr || bytes[0] != NUMBER_MARKER)
         return std::nullopt;
     const uint64_t bits = uint64_t{BigEndian(bytes + 1, 4)} << 32 | BigEndian(bytes + 5, 4);
@@ -42,48 +43,55 @@ std::string TimeText(double seconds)
     return std::abs(seconds) < MOST_SECONDS ? FormatTime(std::llround(seconds * 1000)) : fmt::format("{} s", seconds);
 }
 
-// @return what is wrong with an entry, or nothing
-std::string Judge(const TagProbe& probe, double seconds, double position)
+// What is wrong with an entry: the word for it, which is the same for all entries with that fault, and the text.
+struct Fault {
+    const char* cause;
+    std::string text;
+};
+
+std::optional<Fault> Judge(TagReader& reader, double seconds, double position)
 {
     // Also when it is not a number.
-    if (!(position >= 0 && position < static_cast<double>(probe.FileSize())))
-        return fmt::format("leads to byte {:.15g}, which the file does not have", position);
-    const std::optional<Tag> tag = probe.At(static_cast<int64_t>(position));
-    // The configuration may stand for the first keyframe.
+    if (!(position >= 0 && position < static_cast<double>(reader.FileSize())))
+        return Fault{"outside", fmt::format("leads to byte {:.15g}, which the file does not have", position)};
+    const std::optional<Tag> tag = reader.At(static_cast<int64_t>(position));
+    // The configuration may be there instead of the first keyframe.
     if (!tag || !(tag->IsKeyframe() || (tag->IsAvc() && tag->IsConfig())))
-        return fmt::format("leads to byte {:.15g}, where no keyframe is", position);
+        return Fault{"place", fmt::format("leads to byte {:.15g}, where no keyframe is", position)};
     if (!(std::abs(seconds * 1000 - tag->timestamp) <= MOST_DIFFERENCE_MS))
-        return fmt::format("says {}, the keyframe at byte {:.15g} has {}", TimeText(seconds), position,
-                           FormatTime(tag->timestamp));
-    return {};
+        return Fault{"time", fmt::format("says {}, the keyframe at byte {:.15g} has {}", TimeText(seconds), position,
+                                         FormatTime(tag->timestamp))};
+    return std::nullopt;
 }
 
 } // namespace
 
-void CheckIndex(const flvd_keyframe_index_t& index, const TagProbe& probe, Findings& findings)
+void CheckIndex(const Input& input, TagReader& reader, Findings& findings)
 {
+    const flvd_keyframe_index_t& index = input.Instance().keyframe_index;
     if (index.times_offset == 0 && index.positions_offset == 0)
         return;
     if (index.times_offset == 0 || index.positions_offset == 0) {
-        findings.Add("index", std::max(index.times_offset, index.positions_offset),
+        findings.Add("index", "", std::max(index.times_offset, index.positions_offset),
                      fmt::format("the keyframe index has no {}", index.times_offset == 0 ? "times" : "positions"));
         return;
     }
-    const uint32_t times = CountAt(probe, index.times_offset);
-    const uint32_t positions = CountAt(probe, index.positions_offset);
+    const uint32_t times = CountAt(reader, index.times_offset);
+    const uint32_t positions = CountAt(reader, index.positions_offset);
     if (times != positions)
-        findings.Add("index", index.positions_offset,
+        findings.Add("index", "", index.positions_offset,
                      fmt::format("the keyframe index has {} times and {} positions", times, positions));
     for (uint32_t i = 0; i < std::min(times, positions); ++i) {
         const int64_t offset = index.positions_offset + int64_t{NUMBER_SIZE} * i;
-        const std::optional<double> time = NumberAt(probe, index.times_offset, i);
-        const std::optional<double> position = NumberAt(probe, index.positions_offset, i);
+        const std::optional<double> time = NumberAt(reader, index.times_offset, i);
+        const std::optional<double> position = NumberAt(reader, index.positions_offset, i);
         if (!time || !position) { // the array is not as long as it says
-            findings.Add("index", offset, fmt::format("index entry {} is not a number", i + 1), {{"entry", i + 1}});
+            findings.Add("index", "", offset, fmt::format("index entry {} is not a number", i + 1), {{"entry", i + 1}});
             return;
         }
-        if (const std::string fault = Judge(probe, *time, *position); !fault.empty())
-            findings.Add("index", offset, fmt::format("index entry {} {}", i + 1, fault), {{"entry", i + 1}});
+        if (const std::optional<Fault> fault = Judge(reader, *time, *position))
+            findings.Add("index", fault->cause, offset, fmt::format("index entry {} {}", i + 1, fault->text),
+                         {{"entry", i + 1}});
     }
 }
 

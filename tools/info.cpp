@@ -1,51 +1,90 @@
 // `flvdmx info`: what is in each file, as aligned text or as one JSON document.
+#include <algorithm>
+#include <array>
+#include <cmath>
 #include <cstddef>
 #include <iterator>
+#include <optional>
 #include <utility>
+#include <variant>
 
+#include <fmt/chrono.h>
 #include <fmt/core.h>
 
-#include "tools/codec_names.h"
+#include "tools/codec_config.h"
 #include "tools/commands.h"
-#include "tools/demuxer.h"
+#include "tools/input.h"
 #include "tools/report.h"
-#include "tools/time_text.h"
+#include "tools/scan.h"
+#include "tools/tags.h"
+#include "tools/text.h"
 
 namespace tool {
 
 namespace {
 
-std::string Hex(const uint8_t* data, uint32_t size)
-{
-    std::string text;
-    for (uint32_t i = 0; i < size; ++i)
-        fmt::format_to(std::back_inserter(text), "{:02x}", data[i]);
-    return text;
-}
+// A file and what was found out about it.
+struct Subject {
+    const Input& input;
+    flvdmx::Metadata metadata;
+    std::optional<FileScan> scan;
+    std::string noVideo; // why there is none, though the file has some
+    std::string noAudio;
+};
 
-// Kilobits a second over the whole file: bits a millisecond.
-uint64_t DataRate(const flvd_ctx_t& instance)
+// Kilobits per second over the whole file: bits per millisecond.
+uint64_t DataRate(const Subject& subject)
 {
-    return instance.duration_ms == 0 ? 0 : static_cast<uint64_t>(instance.data_end) * 8 / instance.duration_ms;
+    const auto duration = subject.scan ? subject.scan->played : subject.input.info.duration;
+    const auto bits = static_cast<uint64_t>(subject.input.Instance().data_end) * 8;
+    return duration.count() <= 0 ? 0 : bits / static_cast<uint64_t>(duration.count());
 }
 
 // The count is raised before the arrays are met, so without both arrays it says nothing.
-uint32_t IndexEntries(const flvd_ctx_t& instance)
+uint32_t IndexEntries(const Input& input)
 {
-    const flvd_keyframe_index_t& index = instance.keyframe_index;
+    const flvd_keyframe_index_t& index = input.Instance().keyframe_index;
     return index.times_offset != 0 && index.positions_offset != 0 ? index.entry_count : 0;
 }
 
-const char* SeekMethodName(uint32_t method)
+const char* SeekMethodName(flvdmx::SeekMethod method)
 {
-    constexpr const char* NAMES[] = {"none", "index", "scan"};
-    return method < std::size(NAMES) ? NAMES[method] : "unknown";
+    constexpr std::array NAMES = {"none", "index", "scan"};
+    return NAMES[std::min<size_t>(static_cast<size_t>(method), NAMES.size() - 1)];
 }
 
-const char* SeekMethodText(uint32_t method)
+const char* SeekMethodText(flvdmx::SeekMethod method)
 {
-    constexpr const char* TEXTS[] = {"none, seeking is not possible", "by the keyframe index", "by scanning"};
-    return method < std::size(TEXTS) ? TEXTS[method] : "unknown";
+    constexpr std::array TEXTS = {"none, seeking is not possible", "by the keyframe index", "by scanning"};
+    return TEXTS[std::min<size_t>(static_cast<size_t>(method), TEXTS.size() - 1)];
+}
+
+std::string CodecName(flvdmx::VideoCodec codec)
+{
+    const std::string name = flvdmx::name(codec);
+    return name == "unknown" ? VideoCodecName(codec) : name;
+}
+
+std::string CodecName(flvdmx::AudioCodec codec)
+{
+    const std::string name = flvdmx::name(codec);
+    return name == "unknown" ? fmt::format("unknown ({})", static_cast<uint32_t>(codec)) : name;
+}
+
+// What the tag headers say; AAC and MP3 have a rate of their own, the others theirs from here.
+uint32_t HeaderSampleRate(const Input& input)
+{
+    constexpr std::array<uint32_t, 4> RATES = {5500, 11025, 22050, 44100};
+    return RATES[input.Instance().audio_format_filter >> 2 & 3];
+}
+
+// The last keyframe as the file tells it, or as it was found.
+std::optional<flvdmx::Milliseconds> LastKeyframe(const Subject& subject)
+{
+    if (subject.scan)
+        return subject.scan->lastKeyframe;
+    const flvdmx::Milliseconds told = subject.input.info.video->last_keyframe;
+    return told.count() != 0 ? std::optional(told) : std::nullopt;
 }
 
 // Collects `name  value` lines; a value that the file does not tell is left out.
@@ -53,17 +92,17 @@ class Listing {
 public:
     void Line(std::string_view name, std::string_view value)
     {
-        fmt::format_to(std::back_inserter(m_text), "  {:<18}{}\n", name, value);
+        fmt::format_to(std::back_inserter(m_text), "  {:<23} {}\n", name, value);
     }
     void Number(std::string_view name, double value, std::string_view unit)
     {
         if (value != 0)
             Line(name, fmt::format("{:.7g} {}", value, unit));
     }
-    void Config(const uint8_t* data, uint32_t size)
+    void Config(const std::vector<uint8_t>& config)
     {
-        if (data != nullptr)
-            Line("  configuration", fmt::format("{} bytes: {}", size, Hex(data, size)));
+        if (!config.empty())
+            Line("  configuration", fmt::format("{} bytes: {}", config.size(), Hex(config)));
     }
     const std::string& Text() const { return m_text; }
 
@@ -71,97 +110,215 @@ private:
     std::string m_text;
 };
 
-std::string StreamsText(const Demuxer& demuxer)
+std::string StreamsText(const Input& input)
 {
-    if (demuxer.Video() != nullptr)
-        return demuxer.Audio() != nullptr ? "video and audio" : "video only";
+    if (input.info.video)
+        return input.info.audio ? "video and audio" : "video only";
     return "audio only";
 }
 
-void ListVideo(Listing& listing, const flvd_ctx_t& instance, const flvd_video_info_t& video)
+void ListVideo(Listing& listing, const Subject& subject, const flvdmx::VideoInfo& video)
 {
-    listing.Line("video", VideoCodec(instance));
+    listing.Line("video", CodecName(video.codec));
+    if (!video.config.empty())
+        listing.Line("  profile",
+                     fmt::format("{}, level {}", AvcProfileName(video.config), AvcLevelName(video.config)));
     if (video.width != 0 || video.height != 0)
         listing.Line("  picture size", fmt::format("{} x {}", video.width, video.height));
-    listing.Number("  frame rate", video.frame_rate / 1000.0, "frames/s");
-    if (video.last_key_time_ms != 0)
-        listing.Line("  last keyframe", FormatTime(video.last_key_time_ms));
-    listing.Config(video.config, video.config_size);
+    listing.Number("  frame rate", video.frame_rate, "frames/s");
+    if (const auto last = LastKeyframe(subject))
+        listing.Line("  last keyframe", FormatTime(*last));
+    if (subject.scan) {
+        listing.Line("  frames",
+                     fmt::format("{}, {}", subject.scan->videoFrames, Plural(subject.scan->keyframes, "keyframe")));
+        listing.Line("  keyframe distance",
+                     fmt::format("{:.3g} s on average, {:.3g} s at most", subject.scan->AverageDistanceMs() / 1000,
+                                 static_cast<double>(subject.scan->longestDistance.count()) / 1000));
+    }
+    listing.Config(video.config);
 }
 
-void ListAudio(Listing& listing, const flvd_ctx_t& instance, const flvd_audio_info_t& audio)
+void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo& audio)
 {
-    listing.Line("audio", AudioCodec(instance));
-    listing.Number("  sample rate", audio.sample_rate, "Hz");
+    listing.Line("audio", CodecName(audio.codec));
+    if (!audio.config.empty()) {
+        const AacConfig aac = ParseAacConfig(audio.config);
+        listing.Line("  object type", fmt::format("{} ({})", aac.objectType, AacObjectTypeName(aac.objectType)));
+        if (aac.outputSampleRate != aac.sampleRate)
+            listing.Number("  output rate", aac.outputSampleRate, "Hz");
+    }
+    const uint32_t header = HeaderSampleRate(subject.input);
+    listing.Line("  sample rate", header == audio.sample_rate
+                                      ? fmt::format("{} Hz", audio.sample_rate)
+                                      : fmt::format("{} Hz (the tag headers say {} Hz)", audio.sample_rate, header));
     listing.Line("  channels", std::to_string(audio.channels));
     listing.Number("  data rate", audio.data_rate, "kbit/s");
-    listing.Config(audio.config, audio.config_size);
+    if (subject.scan)
+        listing.Line("  frames", std::to_string(subject.scan->audioFrames));
+    listing.Config(audio.config);
 }
 
-std::string InfoText(const Demuxer& demuxer)
+// Dates as ISO 8601 has them; one that no calendar has is null.
+struct ToJson {
+    Json operator()(const flvdmx::Date& date) const
+    {
+        constexpr double MOST_SECONDS = 1e11; // the year 5138
+        const double seconds = date.milliseconds / 1000;
+        if (!(std::abs(seconds) < MOST_SECONDS))
+            return {};
+        return fmt::format("{:%FT%TZ}", fmt::gmtime(static_cast<time_t>(seconds)));
+    }
+    template <typename Value> Json operator()(const Value& value) const { return value; }
+};
+
+Json ValueOf(const flvdmx::Property& property)
 {
-    const flvd_ctx_t& instance = *demuxer.Instance();
+    return std::visit(ToJson{}, property.value);
+}
+
+std::string ValueText(const flvdmx::Property& property)
+{
+    if (const auto* const number = std::get_if<double>(&property.value))
+        return fmt::format("{:.10g}", *number);
+    const Json value = ValueOf(property);
+    return value.is_string() ? Printable(value.get<std::string>()) : value.dump();
+}
+
+std::string InfoText(const Subject& subject)
+{
+    const Input& input = subject.input;
     Listing listing;
     listing.Line("container", "FLV");
-    listing.Line("size", fmt::format("{} bytes", instance.file_size));
-    listing.Line("streams", StreamsText(demuxer));
-    listing.Line("duration", instance.duration_ms != 0 ? FormatTime(instance.duration_ms) : "unknown");
-    listing.Number("data rate", static_cast<double>(DataRate(instance)), "kbit/s");
-    listing.Line("seek method", SeekMethodText(instance.seek_method));
-    const uint32_t entries = IndexEntries(instance);
+    listing.Line("size", fmt::format("{} bytes", input.info.size));
+    listing.Line("streams", StreamsText(input));
+    listing.Line("duration", input.info.duration.count() != 0 ? FormatTime(input.info.duration) : "unknown");
+    if (subject.scan && subject.scan->restarts > 0)
+        listing.Line("played duration", fmt::format("{}, timestamps start again {}", FormatTime(subject.scan->played),
+                                                    Plural(subject.scan->restarts, "time")));
+    listing.Line("first timestamp", FormatTime(input.info.start_time));
+    listing.Number("data rate", static_cast<double>(DataRate(subject)), "kbit/s");
+    listing.Line("seek method", SeekMethodText(input.info.seek_method));
+    const uint32_t entries = IndexEntries(input);
     listing.Line("keyframe index", entries == 0 ? "none" : fmt::format("{} entries", entries));
-    if (demuxer.Video() != nullptr)
-        ListVideo(listing, instance, *demuxer.Video());
-    if (demuxer.Audio() != nullptr)
-        ListAudio(listing, instance, *demuxer.Audio());
-    return demuxer.Path() + "\n" + listing.Text();
+    if (subject.scan)
+        listing.Line("bytes left out", std::to_string(subject.scan->bytesLeftOut));
+    if (input.info.video)
+        ListVideo(listing, subject, *input.info.video);
+    if (input.info.audio)
+        ListAudio(listing, subject, *input.info.audio);
+    if (subject.metadata.size() > 0)
+        listing.Line("metadata", fmt::format("{} {}", subject.metadata.size(),
+                                             subject.metadata.size() == 1 ? "property" : "properties"));
+    for (const flvdmx::Property& property : subject.metadata)
+        listing.Line("  " + Printable(property.name), ValueText(property));
+    return Printable(input.name) + "\n" + listing.Text();
 }
 
-Json ConfigObject(const uint8_t* data, uint32_t size)
+template <typename Value> Json OrNull(bool known, const Value& value)
 {
-    return data == nullptr ? Json() : Json(Hex(data, size));
+    return known ? Json(value) : Json();
 }
 
-Json VideoObject(const flvd_ctx_t& instance, const flvd_video_info_t& video)
+Json VideoObject(const Subject& subject, const flvdmx::VideoInfo& video)
 {
-    const std::string fourcc(video.fourcc, strnlen(video.fourcc, sizeof video.fourcc));
-    return {{"codec", VideoCodec(instance)},
-            {"fourcc", fourcc.empty() ? Json() : Json(fourcc)},
-            {"width", video.width},
-            {"height", video.height},
-            {"frame_rate", video.frame_rate / 1000.0},
-            {"last_keyframe_ms", video.last_key_time_ms},
-            {"config", ConfigObject(video.config, video.config_size)}};
-}
-
-Json AudioObject(const flvd_ctx_t& instance, const flvd_audio_info_t& audio)
-{
-    return {{"codec", AudioCodec(instance)},
-            {"format_tag", audio.format_tag},
-            {"sample_rate", audio.sample_rate},
-            {"sample_size", audio.sample_size},
-            {"channels", audio.channels},
-            {"data_rate_kbit", audio.data_rate},
-            {"config", ConfigObject(audio.config, audio.config_size)}};
-}
-
-Json InfoObject(const Demuxer& demuxer)
-{
-    const flvd_ctx_t& instance = *demuxer.Instance();
-    Json object = {{"file", demuxer.Path()},
-                   {"container", "FLV"},
-                   {"size", instance.file_size},
-                   {"duration_ms", instance.duration_ms},
-                   {"data_rate_kbit", DataRate(instance)},
-                   {"seek_method", SeekMethodName(instance.seek_method)},
-                   {"index_entries", IndexEntries(instance)},
-                   {"shorter_than_metadata", instance.file_shorter_than_meta != 0},
-                   {"bytes_behind_last_tag", BytesBehindLastTag(instance)}};
-    if (demuxer.Video() != nullptr)
-        object["video"] = VideoObject(instance, *demuxer.Video());
-    if (demuxer.Audio() != nullptr)
-        object["audio"] = AudioObject(instance, *demuxer.Audio());
+    const auto last = LastKeyframe(subject);
+    const bool avc = !video.config.empty();
+    Json object = {{"codec", CodecName(video.codec)},
+                   {"fourcc", OrNull(!video.fourcc.empty(), video.fourcc)},
+                   {"width", video.width},
+                   {"height", video.height},
+                   {"frame_rate", video.frame_rate},
+                   {"last_keyframe_ms", last ? Json(last->count()) : Json()},
+                   {"profile", OrNull(avc, AvcProfileName(video.config))},
+                   {"level", OrNull(avc, AvcLevelName(video.config))},
+                   {"config", OrNull(avc, Hex(video.config))}};
+    if (subject.scan) {
+        object["frames"] = subject.scan->videoFrames;
+        object["keyframes"] = subject.scan->keyframes;
+        object["keyframe_distance_ms"] = {{"average", subject.scan->AverageDistanceMs()},
+                                          {"longest", subject.scan->longestDistance.count()}};
+    }
     return object;
+}
+
+Json AudioObject(const Subject& subject, const flvdmx::AudioInfo& audio)
+{
+    Json object = {{"codec", CodecName(audio.codec)},  {"format_tag", audio.format_tag},
+                   {"sample_rate", audio.sample_rate}, {"header_sample_rate", HeaderSampleRate(subject.input)},
+                   {"sample_size", audio.sample_size}, {"channels", audio.channels},
+                   {"data_rate_kbit", audio.data_rate}};
+    if (!audio.config.empty()) {
+        const AacConfig aac = ParseAacConfig(audio.config);
+        object["object_type"] = aac.objectType;
+        object["output_sample_rate"] = aac.outputSampleRate;
+    }
+    object["config"] = OrNull(!audio.config.empty(), Hex(audio.config));
+    if (subject.scan)
+        object["frames"] = subject.scan->audioFrames;
+    return object;
+}
+
+Json InfoObject(const Subject& subject)
+{
+    const Input& input = subject.input;
+    Json object = {{"file", input.name},
+                   {"container", "FLV"},
+                   {"size", input.info.size},
+                   {"duration_ms", input.info.duration.count()},
+                   {"first_timestamp_ms", input.info.start_time.count()},
+                   {"data_rate_kbit", DataRate(subject)},
+                   {"seek_method", SeekMethodName(input.info.seek_method)},
+                   {"index_entries", IndexEntries(input)},
+                   {"shorter_than_metadata", input.Instance().file_shorter_than_meta != 0},
+                   {"bytes_behind_last_tag", input.Rest()}};
+    if (subject.scan) {
+        object["played_duration_ms"] = subject.scan->played.count();
+        object["timestamp_restarts"] = subject.scan->restarts;
+        object["bytes_left_out"] = subject.scan->bytesLeftOut;
+    }
+    if (input.info.video)
+        object["video"] = VideoObject(subject, *input.info.video);
+    if (input.info.audio)
+        object["audio"] = AudioObject(subject, *input.info.audio);
+    for (const auto& [key, why] :
+         {std::pair("video_not_played", subject.noVideo), std::pair("audio_not_played", subject.noAudio)})
+        if (!why.empty())
+            object[key] = why;
+    Json& metadata = object["metadata"] = Json::object();
+    for (const flvdmx::Property& property : subject.metadata)
+        if (!metadata.contains(property.name))
+            metadata[property.name] = ValueOf(property);
+    return object;
+}
+
+void Warn(const Subject& subject)
+{
+    const Input& input = subject.input;
+    input.WarnIfCutShort();
+    if (subject.scan && subject.scan->restarts > 0)
+        Complain(input.name, fmt::format("warning: the timestamps start again: the last one is at {}, {} are "
+                                         "played in all",
+                                         FormatTime(input.info.duration), FormatTime(subject.scan->played)));
+    for (const auto& [stream, why] : {std::pair("video", subject.noVideo), std::pair("audio", subject.noAudio)})
+        if (!why.empty())
+            Complain(input.name, fmt::format("warning: the {} is not played: {}", stream, why));
+}
+
+Json Inspect(const std::string& name, const InfoOptions& options, bool first)
+{
+    Input input(name);
+    Subject subject{input, {}, {}, {}, {}};
+    if (const auto metadata = input.file.metadata(); metadata)
+        subject.metadata = *metadata;
+    if (options.scan || SeemsToRestart(input))
+        subject.scan = ScanFile(name);
+    TagReader reader(input);
+    subject.noVideo = reader.WhyNoStream(flvdmx::Stream::video);
+    subject.noAudio = reader.WhyNoStream(flvdmx::Stream::audio);
+    Warn(subject);
+    if (!options.json)
+        Print((first ? "" : "\n") + InfoText(subject));
+    return options.json ? InfoObject(subject) : Json();
 }
 
 } // namespace
@@ -172,15 +329,10 @@ int RunInfo(const InfoOptions& options)
     int exitCode = DONE;
     for (const std::string& file : options.files) {
         try {
-            const Demuxer demuxer(file, 0);
-            WarnIfCutShort(demuxer);
-            if (options.json)
-                files.push_back(InfoObject(demuxer));
-            else
-                Print((&file == &options.files.front() ? "" : "\n") + InfoText(demuxer));
-        } catch (const DemuxError& error) {
-            Complain(file, error.Message());
-            files.push_back({{"file", file}, {"error", ErrorObject(error)}});
+            files.push_back(Inspect(file, options, &file == &options.files.front()));
+        } catch (const FileError& error) {
+            Complain(error);
+            files.push_back({{"file", file}, {"error", error.Object()}});
             exitCode = FAILED;
         }
     }

@@ -1,11 +1,13 @@
 // The command line.
+#include <algorithm>
 #include <csignal>
-#include <cstdio>
 #include <exception>
+#include <filesystem>
 #include <functional>
 #include <map>
 #include <string>
 #include <system_error>
+#include <utility>
 #include <vector>
 
 #include <CLI/CLI.hpp>
@@ -15,7 +17,7 @@
 
 #include "tools/commands.h"
 #include "tools/report.h"
-#include "tools/time_text.h"
+#include "tools/text.h"
 
 #ifndef FLVDMX_VERSION
 #define FLVDMX_VERSION "unknown version"
@@ -66,74 +68,91 @@ void AddCount(CLI::App* command, const char* name, uint64_t& count, const char* 
     command->add_option(name, count, help)->check(IS_COUNT)->type_name("N");
 }
 
-using Choices = std::map<std::string, uint32_t>;
+template <typename Value> using Choices = std::map<std::string, Value>;
 
-void AddChoice(CLI::App* command, const char* name, const Choices& choices, const std::function<void(uint32_t)>& take,
-               const char* help)
+template <typename Value>
+CLI::Option* AddChoice(CLI::App* command, const char* name, const Choices<Value>& choices, Value& chosen,
+                       const char* help)
 {
-    const auto check = [choices](const std::string& text) {
-        return choices.count(text) != 0 ? std::string() : fmt::format("'{}' is not among the choices", text);
+    std::string names;
+    for (const auto& choice : choices)
+        names += (names.empty() ? "" : ", ") + choice.first;
+    const auto check = [choices, names](const std::string& text) {
+        return choices.count(text) != 0 ? "" : fmt::format("'{}' is not one of: {}", text, names);
     };
-    command
-        ->add_option_function<std::string>(
-            name, [choices, take](const std::string& text) { take(choices.at(text)); }, help)
+    const auto take = [choices, &chosen](const std::string& text) { chosen = choices.at(text); };
+    return command->add_option_function<std::string>(name, take, help)
         ->check(CLI::Validator(check, "", "choice"))
         ->type_name("NAME");
 }
 
+const Choices<uint32_t> STREAMS = {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}};
+
 void AddInfo(CLI::App& app, InfoOptions& options)
 {
     CLI::App* const command = app.add_subcommand("info", "Show what is in each file");
-    command->add_option("FILE", options.files, "FLV files")->required()->type_name("");
+    command->add_option("FILE", options.files, "FLV files; - is standard input")->required()->type_name("");
     command->add_flag("--json", options.json, "Print one JSON document");
+    command->add_flag("--scan", options.scan,
+                      "Read the whole file: count frames and what is left out, measure keyframe distances");
+    command->footer("  flvdmx info clip.flv\n"
+                    "  flvdmx info --scan --json *.flv\n"
+                    "  curl http://host/clip.flv | flvdmx info -");
 }
 
-void AddFollow(CLI::App* command, FramesOptions& options)
+CLI::Option* AddFollow(CLI::App* command, FramesOptions& options)
 {
     command->add_flag("--follow", options.follow,
-                      "The file is still being written: wait for more and print it as it comes");
-    const CLI::Option* const timeout =
-        command
-            ->add_option("--timeout", options.timeoutSeconds,
-                         "With --follow: stop when the file has not grown for S seconds (default 5)")
-            ->check(IS_SECONDS)
-            ->type_name("S");
-    command->callback([&options, timeout] {
-        if (timeout->count() != 0 && !options.follow)
-            throw CLI::RequiresError("--timeout", "--follow");
-    });
+                      "The file is still being written, or not there yet: wait for more and print it as it comes");
+    return command
+        ->add_option("--timeout", options.timeoutSeconds,
+                     "With --follow: stop when the file has not grown for S seconds (default 5)")
+        ->check(IS_SECONDS)
+        ->type_name("S");
 }
 
 void AddFrames(CLI::App& app, FramesOptions& options)
 {
-    CLI::App* const command = app.add_subcommand("frames", "List the frames, one a line");
-    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
-    command->add_flag("--json", options.json, "Print one JSON object a line");
-    AddChoice(
-        command, "--stream", {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}},
-        [&options](uint32_t stream) { options.streams = stream; }, "List only this stream: video or audio");
+    CLI::App* const command = app.add_subcommand("frames", "List the frames, one per line");
+    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
+    CLI::Option* const json = command->add_flag_callback(
+        "--json", [&options] { options.format = Format::json; }, "Print one JSON object per line");
+    command
+        ->add_flag_callback(
+            "--csv", [&options] { options.format = Format::csv; }, "Print comma-separated values after a line of names")
+        ->excludes(json);
+    command->add_flag("--keyframes", options.keyframes, "List only the keyframes of the video");
+    AddChoice(command, "--stream", STREAMS, options.streams, "List only this stream: video or audio");
     AddCount(command, "--count", options.count, "Stop after N frames");
     AddTime(
-        command, "--from", [&options](int32_t ms) { options.fromMs = ms; }, "Begin at the keyframe at or before TIME");
+        command, "--from", [&options](int32_t ms) { options.fromMs = ms; },
+        "Begin at the keyframe at or before TIME; audio alone begins at TIME");
     AddTime(
         command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "Leave out frames later than TIME");
     command->add_flag("--separate-audio", options.separateAudio,
                       "Read audio with a reader of its own; the streams are merged by time");
-    AddFollow(command, options);
-    command->footer(fmt::format("Each line holds number, stream, time, size in bytes and CRC-32 of the bytes.\n{}\n\n"
+    const CLI::Option* const timeout = AddFollow(command, options);
+    command->callback([&options, timeout] {
+        if (timeout->count() != 0 && !options.follow)
+            throw CLI::RequiresError("--timeout", "--follow");
+        if (options.keyframes && options.streams == FLVD_STREAM_AUDIO)
+            throw CLI::ValidationError("--keyframes", "these are frames of the video");
+    });
+    command->footer(fmt::format("Each line holds number, stream, whether it is a keyframe of the video, time, time to\n"
+                                "show it, size in bytes, place in the file, and CRC-32 of the bytes.\n{}\n\n"
                                 "  flvdmx frames clip.flv\n"
                                 "  flvdmx frames --stream video --from 1:30 --to 1:35 clip.flv\n"
+                                "  flvdmx frames --keyframes --csv clip.flv >keyframes.csv\n"
                                 "  flvdmx frames --follow --timeout 10 recording.flv",
                                 TIME_HELP));
 }
 
 void AddSeekModes(CLI::App* command, SeekOptions& options)
 {
-    AddChoice(
-        command, "--mode", {{"auto", 0}, {"backward", FLVD_SEEK_BACKWARD}, {"forward", FLVD_SEEK_FORWARD}},
-        [&options](uint32_t bits) { options.mode |= bits; },
-        "Land on the keyframe at or before TIME (backward) or at or after it (forward); "
-        "auto, the default: forward, unless TIME lies before the current position");
+    const Choices<uint32_t> modes = {{"backward", FLVD_SEEK_BACKWARD}, {"forward", FLVD_SEEK_FORWARD}, {"auto", 0}};
+    AddChoice(command, "--mode", modes, options.direction,
+              "Land on the keyframe at or before TIME (backward, the default) or at or after it (forward); "
+              "auto: forward, unless TIME is before the current position");
     const auto addBit = [&](const char* name, uint32_t bit, const char* help) {
         command->add_flag_callback(
             name, [&options, bit] { options.mode |= bit; }, help);
@@ -146,7 +165,7 @@ void AddSeekModes(CLI::App* command, SeekOptions& options)
 void AddSeek(CLI::App& app, SeekOptions& options)
 {
     CLI::App* const command = app.add_subcommand("seek", "Seek, show the landing place and the frames from there on");
-    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
+    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
     AddTime(
         command, "TIME", [&options](int32_t ms) { options.timeMs = ms; }, "Where to seek to")
         ->required()
@@ -170,24 +189,29 @@ void AddSeek(CLI::App& app, SeekOptions& options)
 void AddExtract(CLI::App& app, ExtractOptions& options)
 {
     CLI::App* const command = app.add_subcommand("extract", "Write the streams to files that players take");
-    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
-    command->add_option("-o,--output", options.out, "Where to write")->required()->check(IS_NAME)->type_name("OUT");
-    AddChoice(
-        command, "--stream", {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}},
-        [&options](uint32_t stream) { options.streams = stream; }, "Write only this stream: video or audio");
+    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
+    command->add_option("-o,--output", options.out, "Where to write; - is standard output")
+        ->required()
+        ->check(IS_NAME)
+        ->type_name("OUT");
+    AddChoice(command, "--stream", STREAMS, options.streams, "Write only this stream: video or audio");
+    command->add_flag("--force", options.force, "Overwrite files that exist");
     command->footer(
         "OUT is the file to write when there is one stream, or --stream chooses one. Of two streams it is the\n"
         "beginning of the names: OUT.h264 and OUT.aac, for instance. A folder that exists takes files\n"
-        "named as FILE. Extensions: h264 (annex B), aac (ADTS), mp3; video and audio for all else, which is\n"
-        "written raw.\n\n"
+        "named as FILE. Extensions: h264 (Annex B), aac (ADTS), mp3, wav (PCM); video and audio for all else,\n"
+        "which is written raw.\n\n"
         "  flvdmx extract clip.flv -o clip\n"
-        "  flvdmx extract --stream audio clip.flv -o sound.aac");
+        "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
+        "  flvdmx extract --stream video clip.flv -o - | player -");
 }
 
 void AddCheck(CLI::App& app, CheckOptions& options)
 {
     CLI::App* const command = app.add_subcommand("check", "Judge files: damage, timestamps, keyframe index");
-    command->add_option("FILE", options.files, "FLV files")->required()->type_name("");
+    command->add_option("FILE", options.files, "FLV files, and folders of them; - is standard input")
+        ->required()
+        ->type_name("");
     command->add_flag("--json", options.json, "Print one JSON document");
     command->add_option("--jobs", options.jobs, "Check N files at the same time (default 1)")
         ->check(CLI::Range(1, 256))
@@ -196,28 +220,42 @@ void AddCheck(CLI::App& app, CheckOptions& options)
         ->add_option("--jump", options.jumpSeconds, "Report steps forward in time of more than S seconds (default 10)")
         ->check(IS_SECONDS)
         ->type_name("S");
-    command->footer("What is found, by byte:\n"
-                    "  gap              bytes that belong to no tag\n"
-                    "  cut_short        the end of the last tag, or of what the metadata announces, is missing\n"
-                    "  back_pointer     the size behind a tag is wrong\n"
-                    "  no_back_pointer  there is none\n"
-                    "  passed_over      tags that a player leaves out: of another codec, too late, too short\n"
-                    "  jump             time runs back, or forward by more than --jump, within a stream\n"
-                    "  index            an entry leads to no keyframe, or its time is wrong by more than a second\n"
-                    "  not_playable     the file cannot be opened for playing\n"
+    command
+        ->add_option("--max-gap", options.maxGapSeconds,
+                     "Report keyframes more than S seconds apart, and audio and video of which one is more than S "
+                     "seconds ahead in the file")
+        ->check(IS_SECONDS)
+        ->type_name("S");
+    command->footer("What is found, one line per cause:\n"
+                    "  gap                bytes that belong to no tag\n"
+                    "  cut_short          the end of the last tag, or of what the metadata announces, is missing\n"
+                    "  back_pointer       the size after a tag is wrong\n"
+                    "  no_back_pointer    there is none\n"
+                    "  passed_over        tags that a player leaves out: of another codec, too late, too short\n"
+                    "  jump               time runs back, or forward by more than --jump, within a stream\n"
+                    "  index              an entry leads to no keyframe, or its time is wrong by more than a second\n"
+                    "  keyframe_distance  keyframes are more than --max-gap apart\n"
+                    "  interleaving       audio and video are more than --max-gap apart in the file\n"
+                    "  not_playable       the file cannot be opened for playing\n"
+                    "  configuration      a codec configuration changes: listed, but no fault\n"
                     "The first 1000 findings of a file are listed, all are counted.\n\n"
-                    "Exit codes: 0 all files are sound, 1 something was found or a file could not be read.");
+                    "Exit codes: 0 all files are ok, 1 something was found or a file could not be read.");
 }
 
 void AddPlot(CLI::App& app, PlotOptions& options)
 {
     CLI::App* const command = app.add_subcommand("plot", "Draw bit rate, keyframes and interleaving over time");
-    command->add_option("FILE", options.file, "FLV file")->required()->type_name("");
-    command->add_option("-o,--output", options.out, "SVG file to write")->required()->check(IS_NAME)->type_name("OUT");
-    command->footer("  flvdmx plot clip.flv -o clip.svg");
+    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
+    command->add_option("-o,--output", options.out, "SVG file to write; - is standard output")
+        ->required()
+        ->check(IS_NAME)
+        ->type_name("OUT");
+    command->add_flag("--force", options.force, "Overwrite a file that exists");
+    command->footer("The manual page explains the drawing.\n\n"
+                    "  flvdmx plot clip.flv -o clip.svg");
 }
 
-// CLI11 takes `-5` for an option. A blank in front makes it a value, and ParseTime passes over blanks.
+// CLI11 takes `-5` for an option. After a blank it is a value, and ParseTime passes over blanks.
 std::vector<std::string> Arguments(int argc, char** argv)
 {
     std::vector<std::string> arguments(argv + 1, argv + argc);
@@ -230,55 +268,90 @@ std::vector<std::string> Arguments(int argc, char** argv)
     return {arguments.rbegin(), arguments.rend()}; // as CLI11 wants them
 }
 
-int Usage(const CLI::App& app, const CLI::ParseError& error)
+// What the user typed may be the name of a file that looks like an option.
+std::string DashAdvice(const std::vector<std::string>& arguments)
 {
-    if (error.get_exit_code() == static_cast<int>(CLI::ExitCodes::Success)) // help or version
-        return app.exit(error);
+    std::error_code failure;
+    for (const std::string& text : arguments)
+        if (text.size() > 1 && text.front() == '-' && std::filesystem::exists(text, failure))
+            return fmt::format("A file name that begins with a dash goes after '--': flvdmx COMMAND -- {}\n",
+                               Printable(text));
+    return "";
+}
+
+int Usage(const CLI::App& app, const CLI::ParseError& error, const std::vector<std::string>& arguments)
+{
     const std::vector<CLI::App*> commands = app.get_subcommands();
-    Tell(fmt::format("flvdmx: {}\nTry 'flvdmx {}--help'.\n", error.what(),
+    Tell(fmt::format("flvdmx: {}\n{}Try 'flvdmx {}--help'.\n", Printable(error.what()), DashAdvice(arguments),
                      commands.empty() ? "" : commands.front()->get_name() + " "));
     return WRONG_USE;
 }
 
-// A file that is opened must not take the number of a standard stream that was closed: it would get the messages.
+// A file that is opened must not take the number of a standard stream that was closed: it would get the messages. Where
+// output should go nothing can be written, so that it is noticed.
 void OccupyStandardStreams()
 {
-    int descriptor = open("/dev/null", O_RDWR | O_CLOEXEC);
-    while (descriptor >= 0 && descriptor <= STDERR_FILENO)
-        descriptor = open("/dev/null", O_RDWR | O_CLOEXEC);
-    if (descriptor >= 0)
-        close(descriptor);
+    for (int descriptor = STDIN_FILENO; descriptor <= STDERR_FILENO; ++descriptor)
+        if (fcntl(descriptor, F_GETFD) < 0)
+            open("/dev/null", descriptor == STDERR_FILENO ? O_RDWR | O_CLOEXEC : O_RDONLY | O_CLOEXEC);
+}
+
+void AddHelp(CLI::App& app, std::string& topic)
+{
+    CLI::App* const command = app.add_subcommand("help", "Print help; of a command, the command's");
+    Choices<std::string> names;
+    for (const CLI::App* const known : app.get_subcommands([](CLI::App*) { return true; }))
+        names[known->get_name()] = known->get_name();
+    AddChoice(command, "COMMAND", names, topic, "Command to explain")->type_name("");
 }
 
 int Run(int argc, char** argv)
 {
     CLI::App app("Shows what is in FLV files, judges them and takes them apart.", "flvdmx");
-    app.set_version_flag("--version", "flvdmx " FLVDMX_VERSION);
-    app.footer("Exit codes: 0 done, 1 a file could not be handled or is not sound, 2 wrong use.");
-    app.require_subcommand(0, 1); // none is told below, behind what CLI11 has to say of unknown words
+    app.set_version_flag("-V,--version", "flvdmx " FLVDMX_VERSION);
+    app.add_flag_callback("--verbose", ShowCodes, "Tell the library's code and line of a failure")->trigger_on_parse();
+    app.fallthrough();
+    app.footer("Exit codes: 0 done, 1 a file could not be handled or something was found wrong, 2 wrong use.");
+    app.require_subcommand(0, 1); // none is told below, after what CLI11 has to say of unknown words
     InfoOptions info;
     FramesOptions frames;
     SeekOptions seek;
     ExtractOptions extract;
     CheckOptions check;
     PlotOptions plot;
+    std::string topic;
     AddInfo(app, info);
     AddFrames(app, frames);
     AddSeek(app, seek);
     AddExtract(app, extract);
     AddCheck(app, check);
     AddPlot(app, plot);
+    AddHelp(app, topic);
     try {
         app.parse(Arguments(argc, argv));
         if (app.get_subcommands().empty())
-            throw CLI::RequiredError("A subcommand (info, frames, seek, extract, check or plot)");
+            throw CLI::RequiredError("A command (info, frames, seek, extract, check, plot or help)");
+    } catch (const CLI::CallForHelp&) {
+        Print(app.help());
+        return DONE;
+    } catch (const CLI::CallForVersion&) {
+        Print("flvdmx " FLVDMX_VERSION "\n");
+        return DONE;
     } catch (const CLI::ParseError& error) {
-        return Usage(app, error);
+        return Usage(app, error, {argv + 1, argv + argc});
     }
     const std::map<std::string, std::function<int()>> commands = {
-        {"info", [&] { return RunInfo(info); }},    {"frames", [&] { return RunFrames(frames); }},
-        {"seek", [&] { return RunSeek(seek); }},    {"extract", [&] { return RunExtract(extract); }},
-        {"check", [&] { return RunCheck(check); }}, {"plot", [&] { return RunPlot(plot); }}};
+        {"info", [&] { return RunInfo(info); }},
+        {"frames", [&] { return RunFrames(frames); }},
+        {"seek", [&] { return RunSeek(seek); }},
+        {"extract", [&] { return RunExtract(extract); }},
+        {"check", [&] { return RunCheck(check); }},
+        {"plot", [&] { return RunPlot(plot); }},
+        {"help", [&] {
+             Print(topic.empty() ? app.get_formatter()->make_help(&app, "flvdmx", CLI::AppFormatMode::Normal)
+                                 : app.get_subcommand(topic)->help("flvdmx"));
+             return DONE;
+         }}};
     return commands.at(app.get_subcommands().front()->get_name())();
 }
 
@@ -286,7 +359,7 @@ int Run(int argc, char** argv)
 
 } // namespace tool
 
-// A reader that has seen enough, such as `head`, closes the pipe: that is no failure.
+// The one place where failures end. A reader that has seen enough, such as `head`, closes the pipe: that is none.
 int main(int argc, char** argv)
 {
     std::signal(SIGPIPE, SIG_IGN);
@@ -295,6 +368,8 @@ int main(int argc, char** argv)
         const int exitCode = tool::Run(argc, argv);
         tool::Flush();
         return exitCode;
+    } catch (const tool::FileError& error) {
+        tool::Complain(error);
     } catch (const std::system_error& error) {
         if (error.code() == std::errc::broken_pipe)
             return tool::DONE;

@@ -1,7 +1,10 @@
 // A file that is written.
 #include "tools/output_file.h"
 
+#include <array>
+#include <atomic>
 #include <cerrno>
+#include <csignal>
 #include <cstring>
 #include <filesystem>
 #include <system_error>
@@ -12,7 +15,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "tools/demuxer.h"
+#include "tools/input.h"
+#include "tools/report.h"
+#include "tools/text.h"
 
 namespace tool {
 
@@ -20,53 +25,102 @@ namespace {
 
 constexpr mode_t NEW_FILE_MODE = 0666; // less what the process masks
 
+// Names of files that are not finished: one per stream.
+std::array<std::atomic<const char*>, 2> g_unfinished{};
+
+void RemoveUnfinished(int signal)
+{
+    for (const std::atomic<const char*>& path : g_unfinished)
+        if (const char* const name = path; name != nullptr)
+            unlink(name);
+    std::signal(signal, SIG_DFL);
+    raise(signal);
+}
+
+int Remember(const char* path)
+{
+    for (const int signal : {SIGINT, SIGTERM, SIGHUP})
+        if (std::signal(signal, RemoveUnfinished) == SIG_IGN)
+            std::signal(signal, SIG_IGN); // as `nohup` wants it
+    for (size_t slot = 0; slot < g_unfinished.size(); ++slot) {
+        const char* none = nullptr;
+        if (g_unfinished[slot].compare_exchange_strong(none, path))
+            return static_cast<int>(slot);
+    }
+    return -1;
+}
+
+void Forget(int slot)
+{
+    if (slot >= 0)
+        g_unfinished[static_cast<size_t>(slot)] = nullptr;
+}
+
+bool IsSpecial(const std::string& path)
+{
+    struct stat status {};
+    return stat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode);
+}
+
 } // namespace
 
-OutputFile::OutputFile(std::string path, const std::string& input) : m_path(std::move(path))
+OutputFile::OutputFile(std::string path, const std::string& input, bool force) : m_path(std::move(path)), m_input(input)
 {
+    if (m_path == STANDARD_STREAM) {
+        m_file = stdout;
+        return;
+    }
     std::error_code failure;
-    if (std::filesystem::equivalent(m_path, input, failure))
-        throw DemuxError(fmt::format("{} is the file to be read, it is not overwritten", m_path));
-    constexpr int FLAGS = O_WRONLY | O_CREAT | O_CLOEXEC;
-    int descriptor = open(m_path.c_str(), FLAGS | O_EXCL, NEW_FILE_MODE);
-    m_created = descriptor >= 0;
-    if (!m_created && errno == EEXIST)
-        descriptor = open(m_path.c_str(), FLAGS, NEW_FILE_MODE);
+    if (std::filesystem::equivalent(m_path, PathOf(input), failure))
+        throw FileError(input, fmt::format("{} is the file to be read, it is not overwritten", Printable(m_path)));
+    const bool special = IsSpecial(m_path);
+    const int flags = O_WRONLY | O_CLOEXEC | (special ? 0 : O_CREAT | (force ? O_TRUNC : O_EXCL));
+    const int descriptor = open(m_path.c_str(), flags, NEW_FILE_MODE);
+    if (descriptor < 0 && errno == EEXIST)
+        throw FileError(input, fmt::format("{} exists: --force overwrites it", Printable(m_path)));
     if (descriptor < 0)
         Fail();
-    m_file.reset(fdopen(descriptor, "wb"));
+    m_file = fdopen(descriptor, "wb");
+    if (!special)
+        m_slot = Remember(m_path.c_str());
 }
 
 OutputFile::~OutputFile()
 {
-    if (m_created)
+    if (m_file != nullptr && !IsStandard())
+        std::fclose(m_file);
+    if (m_slot >= 0)
         unlink(m_path.c_str());
-}
-
-void OutputFile::Begin()
-{
-    m_created = false;
-    struct stat status {};
-    const int descriptor = fileno(m_file.get());
-    if (fstat(descriptor, &status) == 0 && S_ISREG(status.st_mode) && ftruncate(descriptor, 0) != 0)
-        Fail();
+    Forget(m_slot);
 }
 
 void OutputFile::Write(const void* data, size_t size)
 {
-    if (std::fwrite(data, 1, size, m_file.get()) != size)
+    if (size > 0 && std::fwrite(data, 1, size, m_file) != size)
+        Fail();
+    m_written += size;
+}
+
+void OutputFile::Rewrite(flvdmx::Bytes beginning)
+{
+    if (std::fseek(m_file, 0, SEEK_SET) == 0 && std::fwrite(beginning.data(), 1, beginning.size(), m_file) == 0)
         Fail();
 }
 
-void OutputFile::Close()
+void OutputFile::Finish()
 {
-    if (std::fclose(m_file.release()) != 0)
+    if (IsStandard())
+        return Flush();
+    if (std::fclose(std::exchange(m_file, nullptr)) != 0)
         Fail();
+    Forget(std::exchange(m_slot, -1));
 }
 
 void OutputFile::Fail() const
 {
-    throw DemuxError(fmt::format("cannot write {}: {}", m_path, std::strerror(errno)));
+    if (IsStandard())
+        throw std::system_error(errno, std::generic_category());
+    throw FileError(m_input, fmt::format("cannot write {}: {}", Printable(m_path), std::strerror(errno)));
 }
 
 } // namespace tool

@@ -1,42 +1,49 @@
-// A file that is written.
+// A file that is written, whole or not at all.
 #ifndef FLVDMX_TOOLS_OUTPUT_FILE_H
 #define FLVDMX_TOOLS_OUTPUT_FILE_H
 
+#include <cstdint>
 #include <cstdio>
-#include <memory>
 #include <string>
 #include <string_view>
 
+#include "flvdmx/result.hpp"
+
 namespace tool {
 
-/** A new file; every failure is thrown as DemuxError. */
+/** A file on its way, or standard output; every failure is thrown as FileError. One that is not finished is removed,
+ * also when the user interrupts the program. */
 class OutputFile {
 public:
-    /** Opens or creates `path` and leaves what is in it; refuses to when that is the file `input`. */
-    OutputFile(std::string path, const std::string& input);
-    /** Removes a file that was created and not begun. */
+    /**
+     * Creates `path`; "-" is standard output. A file that exists is refused without `force`, the file `input` always.
+     */
+    OutputFile(std::string path, const std::string& input, bool force);
     ~OutputFile();
     OutputFile(const OutputFile&) = delete;
     OutputFile& operator=(const OutputFile&) = delete;
 
-    /** Empties the file, which is then to be written. */
-    void Begin();
-
     void Write(const void* data, size_t size);
     void Write(std::string_view text) { Write(text.data(), text.size()); }
 
-    /** Must be called at the end: a full disk may not show earlier. */
-    void Close();
+    /** Replaces the first bytes where that is possible, which it is not in a pipe. */
+    void Rewrite(flvdmx::Bytes beginning);
+
+    /** Keeps the file. Must be called at the end: a full disk may not show earlier. */
+    void Finish();
+
+    uint64_t Written() const { return m_written; } /**< bytes */
+    bool IsStandard() const { return m_file == stdout; }
+    const std::string& Path() const { return m_path; }
 
 private:
     [[noreturn]] void Fail() const;
 
-    struct Closer {
-        void operator()(std::FILE* file) const { std::fclose(file); }
-    };
     const std::string m_path;
-    bool m_created = false; // and not begun
-    std::unique_ptr<std::FILE, Closer> m_file;
+    const std::string m_input;
+    std::FILE* m_file = nullptr;
+    int m_slot = -1; // of its name in the list of what is removed
+    uint64_t m_written = 0;
 };
 
 } // namespace tool

@@ -1,21 +1,22 @@
 // `flvdmx plot`: bit rate, keyframes and interleaving over time, as a drawing.
 #include <algorithm>
+#include <cctype>
 #include <cmath>
 #include <cstddef>
 #include <cstdint>
 #include <filesystem>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <fmt/core.h>
 
-#include "tools/codec_names.h"
 #include "tools/commands.h"
-#include "tools/demuxer.h"
+#include "tools/input.h"
 #include "tools/output_file.h"
 #include "tools/report.h"
 #include "tools/svg.h"
-#include "tools/time_text.h"
+#include "tools/text.h"
 #include "tools/timeline.h"
 
 namespace tool {
@@ -30,9 +31,10 @@ constexpr double LARGE = 210;   // height of a diagram
 constexpr double SMALL = 120;   // of the last one
 constexpr double DISTANCE = 78; // between two, for labels and heading
 constexpr double STRIP = 16;    // height of the keyframe marks
+constexpr double MARKS_LEGEND = 26;
 constexpr int MOST_TIME_TICKS = 12;
 constexpr size_t COLUMNS = 460; // twice the pixels between two points of a line
-constexpr double BITS_A_BYTE = 8;
+constexpr double BITS_PER_BYTE = 8;
 
 constexpr const char* STYLE =
     "text{font:13px 'DejaVu Sans',Verdana,Arial,sans-serif;fill:#333}"
@@ -43,7 +45,10 @@ constexpr const char* STYLE =
     "path{fill:none;stroke-linejoin:round}"
     ".video{stroke:#1f6fb4;stroke-width:1.6}.audio{stroke:#dd7715;stroke-width:1.6}"
     ".area-video{fill:#1f6fb4;fill-opacity:.16}.area-audio{fill:#dd7715;fill-opacity:.22}"
-    ".dots{stroke-dasharray:5 4}.keyframe{stroke:#b3304a}.lead{fill:#5b8c3a;fill-opacity:.35;stroke:#5b8c3a}";
+    ".dots{stroke-dasharray:5 4}.keyframe{stroke:#b3304a}.lead{fill:#5b8c3a;fill-opacity:.35;stroke:#5b8c3a}"
+    ".gap{stroke:#8a8a8a;fill:#8a8a8a;fill-opacity:.2;stroke-width:.5}"
+    ".damage{stroke:#d02020;fill:#d02020;fill-opacity:.2}"
+    ".restart{stroke:#7a3fb0;stroke-width:1.4;stroke-dasharray:2 3}";
 
 struct Unit {
     double size;
@@ -68,52 +73,101 @@ std::string Amount(const std::vector<Unit>& units, double value)
     return fmt::format("{:.3g} {}", value / unit.size, unit.name);
 }
 
+const char* ClassOf(Mark::Kind kind)
+{
+    return kind == Mark::Kind::gap ? "gap" : kind == Mark::Kind::damage ? "damage" : "restart";
+}
+
 class Plot {
 public:
-    Plot(const Demuxer& demuxer, const Timeline& timeline)
-        : m_demuxer(demuxer), m_timeline(timeline),
-          m_both(demuxer.Video() != nullptr && demuxer.Audio() != nullptr), m_time{0, timeline.duration, LEFT, RIGHT},
-          m_svg(WIDTH, Height(), STYLE, demuxer.Path())
+    Plot(const Input& input, const Timeline& timeline)
+        : m_input(input), m_timeline(timeline),
+          m_both(HasVideo() && HasAudio()), m_time{0, timeline.duration, LEFT, RIGHT},
+          m_svg(WIDTH, Height(), STYLE, input.name)
     {
     }
 
     std::string Draw()
     {
         DrawTitle();
-        double top = TOP;
-        DrawRates(top);
-        top += LARGE + DISTANCE + (HasKeyframes() ? STRIP : 0);
-        DrawPositions(top);
-        if (m_both)
+        DrawRates(TOP);
+        if (m_both) {
+            const double top = TOP + LARGE + DISTANCE + STRIP;
+            DrawPositions(top);
             DrawLead(top + LARGE + DISTANCE);
+        }
         return m_svg.Document();
     }
 
 private:
-    bool HasKeyframes() const { return m_demuxer.Video() != nullptr; }
+    bool HasVideo() const { return m_input.info.video.has_value(); }
+    bool HasAudio() const { return m_input.info.audio.has_value(); }
 
     double Height() const
     {
-        constexpr double BOTTOM = 50;
-        return TOP + LARGE + (HasKeyframes() ? STRIP : 0) + DISTANCE + LARGE + (m_both ? DISTANCE + SMALL : 0) + BOTTOM;
+        constexpr double BOTTOM = 60; // for the legend of the marks as well
+        return TOP + LARGE + (HasVideo() ? STRIP : 0) + (m_both ? DISTANCE + LARGE + DISTANCE + SMALL : 0) + BOTTOM +
+               (m_timeline.marks.empty() ? 0 : MARKS_LEGEND);
     }
 
     std::string StreamText(const StreamTimeline& stream, const std::string& codec) const
     {
-        const double rate = static_cast<double>(stream.bytes) * BITS_A_BYTE / m_timeline.duration;
-        return fmt::format(" \u00b7 {}, {} frames, {}", codec, stream.frames, Amount(RATE_UNITS, rate));
+        const double rate = static_cast<double>(stream.bytes) * BITS_PER_BYTE / m_timeline.duration;
+        return fmt::format(" \u00b7 {}, {}, {}", codec, Plural(stream.frames, "frame"), Amount(RATE_UNITS, rate));
     }
 
     void DrawTitle()
     {
-        m_svg.Text(LEFT, 34, "title", std::filesystem::path(m_demuxer.Path()).filename().string());
+        constexpr size_t TITLE_COLUMNS = 76; // as many wide letters fit
+        constexpr size_t ABOUT_COLUMNS = 130;
+        const std::string name = std::filesystem::path(m_input.name).filename().string();
+        m_svg.Text(LEFT, 34, "title", Shorten(Printable(name), TITLE_COLUMNS));
         std::string about = fmt::format("{} \u00b7 {}", FormatTime(m_timeline.durationMs),
-                                        Amount(BYTE_UNITS, static_cast<double>(m_demuxer.Instance()->file_size)));
-        if (m_demuxer.Video() != nullptr)
-            about += StreamText(m_timeline.video, VideoCodec(*m_demuxer.Instance()));
-        if (m_demuxer.Audio() != nullptr)
-            about += StreamText(m_timeline.audio, AudioCodec(*m_demuxer.Instance()));
-        m_svg.Text(LEFT, 55, "about", about);
+                                        Amount(BYTE_UNITS, static_cast<double>(m_input.info.size)));
+        if (HasVideo())
+            about += StreamText(m_timeline.video, flvdmx::name(m_input.info.video->codec));
+        if (HasAudio())
+            about += StreamText(m_timeline.audio, flvdmx::name(m_input.info.audio->codec));
+        m_svg.Text(LEFT, 55, "about", Shorten(about, ABOUT_COLUMNS));
+        DrawMarksLegend(Height() - 14);
+    }
+
+    // What the marks mean, under the diagrams.
+    void DrawMarksLegend(double y)
+    {
+        std::vector<std::pair<const char*, std::string>> entries;
+        const auto any = [this](Mark::Kind kind) {
+            return std::any_of(m_timeline.marks.begin(), m_timeline.marks.end(),
+                               [kind](const Mark& mark) { return mark.kind == kind; });
+        };
+        if (any(Mark::Kind::gap))
+            entries.emplace_back("gap", "no frames");
+        if (any(Mark::Kind::damage))
+            entries.emplace_back("damage", fmt::format("damage, {} bytes left out", m_timeline.bytesLeftOut));
+        if (any(Mark::Kind::restart))
+            entries.emplace_back("restart", "timestamps start again");
+        DrawLegend(y, entries);
+    }
+
+    // Each kind is one path: thousands of marks would be thousands of elements.
+    void DrawMarks(double top, double bottom)
+    {
+        constexpr double LEAST_WIDTH = 1;
+        for (const Mark::Kind kind : {Mark::Kind::gap, Mark::Kind::damage, Mark::Kind::restart}) {
+            std::string path;
+            for (const Mark& mark : m_timeline.marks) {
+                const double x = m_time.At(mark.from);
+                if (mark.kind != kind)
+                    continue;
+                if (kind == Mark::Kind::restart)
+                    path += fmt::format("M{:.1f} {}V{}", x, top, bottom);
+                else
+                    path += fmt::format("M{:.1f} {}V{}h{:.1f}V{}Z", x, top, bottom,
+                                        std::max(m_time.At(mark.to) - x, LEAST_WIDTH), top);
+            }
+            if (!path.empty())
+                m_svg.Add("<path class=\"{}\" d=\"{}\"/>", ClassOf(kind), path);
+        }
     }
 
     // Grid, ticks and their labels. @return the axis of the values, which reaches to the tick above the highest
@@ -136,6 +190,7 @@ private:
         m_svg.Line(LEFT, top, LEFT, top + height + below, "axis");
         m_svg.Line(LEFT, top + height, RIGHT, top + height, "axis");
         m_svg.Text(LEFT, top - 12, "heading", fmt::format("{} ({})", heading, unit.name));
+        DrawMarks(top, top + height);
         return values;
     }
 
@@ -167,9 +222,9 @@ private:
     std::vector<std::pair<const char*, std::string>> StreamLegend(const char* audioKind) const
     {
         std::vector<std::pair<const char*, std::string>> entries;
-        if (m_demuxer.Video() != nullptr)
+        if (HasVideo())
             entries.emplace_back("video", "video");
-        if (m_demuxer.Audio() != nullptr)
+        if (HasAudio())
             entries.emplace_back(audioKind, "audio");
         return entries;
     }
@@ -199,41 +254,67 @@ private:
     void DrawRates(double top)
     {
         const Axis values = DrawFrame(top, LARGE, fmt::format("Bit rate over {:.3g} s", m_timeline.interval),
-                                      RATE_UNITS, 0, HighestRate(), HasKeyframes() ? STRIP : 0);
+                                      RATE_UNITS, 0, HighestRate(), HasVideo() ? STRIP : 0);
         auto legend = StreamLegend("audio");
-        if (m_demuxer.Video() != nullptr)
+        if (HasVideo())
             DrawRate(values, m_timeline.video, "video");
-        if (m_demuxer.Audio() != nullptr)
+        if (HasAudio())
             DrawRate(values, m_timeline.audio, "audio");
-        if (HasKeyframes()) {
+        if (HasVideo()) {
             DrawKeyframes(top + LARGE);
-            legend.emplace_back("keyframe", fmt::format("keyframes ({})", m_timeline.keyframes.size()));
+            legend.emplace_back("keyframe", Plural(m_timeline.keyframes.size(), "keyframe"));
         }
         DrawLegend(top - 12, legend);
     }
 
+    // Where frames are missing for a whole interval the line ends, and begins again after it.
     void DrawRate(const Axis& values, const StreamTimeline& stream, const char* kind)
     {
-        std::string steps;
-        for (size_t i = 0; i < stream.bits.size(); ++i)
-            steps += fmt::format("V{:.1f}H{:.1f}", values.At(RateOf(stream, i)), m_time.At(EndOf(i)));
-        m_svg.Add("<path class=\"area-{}\" d=\"M{} {}{}V{}Z\"/>", kind, LEFT, values.from, steps, values.from);
-        m_svg.Add("<path class=\"{}\" d=\"M{} {}{}\"/>", kind, LEFT, values.At(RateOf(stream, 0)), steps);
+        std::string line;
+        std::string area;
+        bool open = false;
+        for (size_t i = 0; i < stream.bits.size(); ++i) {
+            const double begin = static_cast<double>(i) * m_timeline.interval;
+            const bool missing = stream.bits[i] == 0 && m_timeline.IsMissing(begin, EndOf(i));
+            if (open && missing)
+                area += fmt::format("V{}Z", values.from);
+            if (!open && !missing) {
+                line += fmt::format("M{:.1f} {:.1f}", m_time.At(begin), values.At(RateOf(stream, i)));
+                area += fmt::format("M{:.1f} {}", m_time.At(begin), values.from);
+            }
+            open = !missing;
+            const std::string step = fmt::format("V{:.1f}H{:.1f}", values.At(RateOf(stream, i)), m_time.At(EndOf(i)));
+            line += open ? step : "";
+            area += open ? step : "";
+        }
+        if (open)
+            area += fmt::format("V{}Z", values.from);
+        m_svg.Add("<path class=\"area-{}\" d=\"{}\"/>", kind, area);
+        m_svg.Add("<path class=\"{}\" d=\"{}\"/>", kind, line);
     }
 
-    // Many marks are drawn thin, so that a dense row still shows where one is missing.
+    // A mark per keyframe; when they would touch, a mark per few pixels that is the higher the more it stands for.
     void DrawKeyframes(double top)
     {
-        constexpr double LEAST_WIDTH = 0.12;
-        constexpr double MOST_WIDTH = 2;
-        constexpr double SHARE = 0.3; // of the distance
-        const double distance = (RIGHT - LEFT) / static_cast<double>(m_timeline.keyframes.size() + 1);
+        constexpr double CELL = 4; // pixels
+        constexpr auto CELLS = static_cast<size_t>((RIGHT - LEFT) / CELL);
+        constexpr double HEIGHT = STRIP - 2;
+        const auto x = [this](double time) { return m_time.At(std::clamp(time, 0.0, m_timeline.duration)); };
         std::string marks;
-        for (const double time : m_timeline.keyframes)
-            marks +=
-                fmt::format("M{:.2f} {}v{}", m_time.At(std::clamp(time, 0.0, m_timeline.duration)), top + 2, STRIP - 2);
-        m_svg.Add("<path class=\"keyframe\" id=\"keyframes\" style=\"stroke-width:{:.2f}\" d=\"{}\"/>",
-                  std::clamp(distance * SHARE, LEAST_WIDTH, MOST_WIDTH), marks);
+        if (m_timeline.keyframes.size() <= CELLS) {
+            for (const double time : m_timeline.keyframes)
+                marks += fmt::format("M{:.2f} {}v{}", x(time), top + 2, HEIGHT);
+        } else {
+            std::vector<double> counts(CELLS);
+            for (const double time : m_timeline.keyframes)
+                ++counts[std::min(static_cast<size_t>((x(time) - LEFT) / CELL), CELLS - 1)];
+            const double most = *std::max_element(counts.begin(), counts.end());
+            for (size_t i = 0; i < CELLS; ++i)
+                if (counts[i] > 0)
+                    marks += fmt::format("M{:.2f} {}v-{:.1f}", LEFT + (static_cast<double>(i) + 0.5) * CELL,
+                                         top + STRIP, std::max(counts[i] / most * HEIGHT, 2.0));
+        }
+        m_svg.Add("<path class=\"keyframe\" id=\"keyframes\" style=\"stroke-width:1.6\" d=\"{}\"/>", marks);
     }
 
     double ColumnX(size_t column) const
@@ -244,12 +325,10 @@ private:
     void DrawPositions(double top)
     {
         const Axis values = DrawFrame(top, LARGE, "Interleaving: place in the file", BYTE_UNITS, 0,
-                                      static_cast<double>(m_demuxer.Instance()->data_end));
-        if (m_demuxer.Video() != nullptr)
-            DrawPosition(values, m_timeline.video, "video");
-        if (m_demuxer.Audio() != nullptr)
-            DrawPosition(values, m_timeline.audio, m_both ? "audio dots" : "audio");
-        DrawLegend(top - 12, StreamLegend(m_both ? "audio dots" : "audio"));
+                                      static_cast<double>(m_input.Instance().data_end));
+        DrawPosition(values, m_timeline.video, "video");
+        DrawPosition(values, m_timeline.audio, "audio dots");
+        DrawLegend(top - 12, StreamLegend("audio dots"));
     }
 
     void DrawPosition(const Axis& values, const StreamTimeline& stream, const char* kind)
@@ -259,7 +338,8 @@ private:
             const Range& range = stream.positions[column];
             if (range.IsEmpty())
                 continue;
-            points += fmt::format("{}{:.1f} {:.1f}", points.empty() ? 'M' : 'L', ColumnX(column), values.At(range.low));
+            const char move = points.empty() || range.breaks ? 'M' : 'L';
+            points += fmt::format("{}{:.1f} {:.1f}", move, ColumnX(column), values.At(range.low));
             points += fmt::format("V{:.1f}", values.At(range.high));
         }
         m_svg.Add("<path class=\"{}\" d=\"{}\"/>", kind, points.empty() ? "M0 0" : points);
@@ -268,8 +348,6 @@ private:
     void DrawLead(double top)
     {
         Range all{0, 0};
-        std::string upper;
-        std::string lower;
         for (const Range& range : m_timeline.lead) {
             if (!range.IsEmpty()) {
                 all.Take(range.low);
@@ -277,19 +355,25 @@ private:
             }
         }
         const Axis values = DrawFrame(top, SMALL, "Interleaving: audio ahead of video", LEAD_UNITS, all.low, all.high);
+        m_svg.Line(LEFT, values.At(0), RIGHT, values.At(0), "axis");
+        std::string bands;
+        std::string upper;
+        std::string lower;
         for (size_t column = 0; column < COLUMNS; ++column) {
             const Range& range = m_timeline.lead[column];
             if (range.IsEmpty())
                 continue;
+            if (range.breaks && !upper.empty())
+                bands += std::exchange(upper, "") + std::exchange(lower, "") + 'Z';
             upper += fmt::format("{}{:.1f} {:.1f}", upper.empty() ? 'M' : 'L', ColumnX(column), values.At(range.high));
             lower.insert(0, fmt::format("L{:.1f} {:.1f}", ColumnX(column), values.At(range.low)));
         }
-        m_svg.Line(LEFT, values.At(0), RIGHT, values.At(0), "axis");
         if (!upper.empty())
-            m_svg.Add("<path class=\"lead\" d=\"{}{}Z\"/>", upper, lower);
+            m_svg.Add("<path class=\"lead\" d=\"{}{}{}Z\"/>", bands, upper, lower);
+        DrawLegend(top - 12, {{"lead", "minimum to maximum"}});
     }
 
-    const Demuxer& m_demuxer;
+    const Input& m_input;
     const Timeline& m_timeline;
     const bool m_both;
     const Axis m_time;
@@ -300,20 +384,20 @@ private:
 
 int RunPlot(const PlotOptions& options)
 {
-    try {
-        Demuxer demuxer(options.file, 0);
-        WarnIfCutShort(demuxer);
-        const Timeline timeline = ReadTimeline(demuxer, COLUMNS);
-        const std::string drawing = Plot(demuxer, timeline).Draw();
-        OutputFile file(options.out, options.file);
-        file.Begin();
-        file.Write(drawing);
-        file.Close();
-        return DONE;
-    } catch (const DemuxError& error) {
-        Complain(options.file, error.Message());
-        return FAILED;
-    }
+    std::string extension = std::filesystem::path(options.out).extension().string();
+    std::transform(extension.begin(), extension.end(), extension.begin(),
+                   [](unsigned char c) { return std::tolower(c); });
+    for (const char* const picture : {".png", ".jpg", ".jpeg", ".gif", ".webp", ".bmp", ".pdf"})
+        if (extension == picture)
+            throw FileError(options.out, "the drawing is SVG, not a picture of that kind: name it .svg");
+    Input input(options.file);
+    input.WarnIfCutShort();
+    OutputFile file(options.out, options.file, options.force);
+    AcceptAllTimes(input);
+    const Timeline timeline = ReadTimeline(input, COLUMNS);
+    file.Write(Plot(input, timeline).Draw());
+    file.Finish();
+    return DONE;
 }
 
 } // namespace tool

@@ -3,12 +3,12 @@
 
 #include <algorithm>
 #include <cstdio>
-#include <utility>
 
 #include <fmt/core.h>
+#include <sys/ioctl.h>
 #include <unistd.h>
 
-#include "tools/time_text.h"
+#include "tools/text.h"
 
 namespace tool {
 
@@ -18,6 +18,15 @@ constexpr std::chrono::milliseconds INTERVAL{200};
 constexpr std::chrono::seconds BAR_DELAY{1};
 constexpr int64_t BAR_WIDTH = 30;
 constexpr const char* WIPE_LINE = "\r\033[K";
+
+// One column stays free: some terminals wrap the line when the last one is filled.
+size_t TerminalColumns()
+{
+    constexpr size_t UNKNOWN = 80;
+    winsize size{};
+    const bool known = ioctl(STDERR_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0;
+    return (known ? size.ws_col : UNKNOWN) - 1;
+}
 
 } // namespace
 
@@ -35,9 +44,11 @@ void Progress::Wipe()
     m_shown = false;
 }
 
-void Progress::ShowLine(const std::string& text)
+void Progress::ShowLine(const std::string& name, const std::string& text)
 {
-    std::fputs((WIPE_LINE + text).c_str(), stderr);
+    const size_t columns = TerminalColumns();
+    std::fputs((WIPE_LINE + Shorten(name, columns - std::min(columns, text.size())) + text.substr(0, columns)).c_str(),
+               stderr);
     std::fflush(stderr);
     m_shown = true;
     m_next = Clock::now() + INTERVAL;
@@ -46,11 +57,11 @@ void Progress::ShowLine(const std::string& text)
 void Progress::Show(uint64_t frames, int64_t timeMs)
 {
     if (IsDue())
-        ShowLine(fmt::format("{} frames, {}", frames, FormatTime(timeMs)));
+        ShowLine("", fmt::format("{}, {}", Plural(frames, "frame"), FormatTime(timeMs)));
 }
 
-ProgressBar::ProgressBar(std::string name, int64_t total)
-    : Progress(isatty(STDERR_FILENO) != 0, BAR_DELAY), m_name(std::move(name)), m_total(std::max<int64_t>(total, 1))
+ProgressBar::ProgressBar(const std::string& name, int64_t total)
+    : Progress(isatty(STDERR_FILENO) != 0, BAR_DELAY), m_name(Printable(name)), m_total(std::max<int64_t>(total, 1))
 {
 }
 
@@ -60,7 +71,7 @@ void ProgressBar::ShowDone(int64_t done)
         return;
     const double share = std::clamp(static_cast<double>(done) / static_cast<double>(m_total), 0.0, 1.0);
     const std::string bar(static_cast<size_t>(share * BAR_WIDTH), '#');
-    ShowLine(fmt::format("{} [{:<{}}] {:3.0f}%", m_name, bar, BAR_WIDTH, share * 100));
+    ShowLine(m_name, fmt::format(" [{:<{}}] {:3.0f}%", bar, BAR_WIDTH, share * 100));
 }
 
 } // namespace tool

@@ -8,7 +8,7 @@
 
 namespace tool {
 
-/** Shows a line a few times a second, where it can be seen and disturbs nothing. */
+/** Shows a line a few times per second, where it can be seen and disturbs nothing. */
 class Progress {
 public:
     /** For a user who has sent standard output elsewhere: needs standard error, and only that, on a terminal. */
@@ -28,7 +28,7 @@ protected:
 
     Progress(bool visible, Clock::duration delay) : m_visible(visible), m_next(Clock::now() + delay) {}
     bool IsDue() const { return m_visible && Clock::now() >= m_next; }
-    void ShowLine(const std::string& text);
+    void ShowLine(const std::string& name, const std::string& text); /**< the name is shortened to fit the terminal */
 
 private:
     const bool m_visible;
@@ -41,7 +41,7 @@ class ProgressBar : public Progress {
 public:
     /** @param name what is worked on
      *  @param total amount of work, such as bytes */
-    ProgressBar(std::string name, int64_t total);
+    ProgressBar(const std::string& name, int64_t total);
 
     void ShowDone(int64_t done);
 

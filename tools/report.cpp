@@ -7,9 +7,25 @@
 
 #include <fmt/core.h>
 
-#include "tools/time_text.h"
+#include "tools/text.h"
 
 namespace tool {
+
+namespace {
+
+bool g_showsCodes = false;
+
+} // namespace
+
+void ShowCodes()
+{
+    g_showsCodes = true;
+}
+
+Json FileError::Object() const
+{
+    return {{"message", what()}, {"code", m_error.code()}, {"line", m_error.line()}};
+}
 
 void Print(std::string_view text)
 {
@@ -37,50 +53,20 @@ void Tell(const std::string& text)
 void Complain(const std::string& file, std::string_view text)
 {
     std::fflush(stdout); // what came before is to stand before it on a terminal
-    Tell(fmt::format("flvdmx: {}: {}\n", file, text));
+    Tell(fmt::format("flvdmx: {}: {}\n", Printable(file), text));
 }
 
-void WarnIfCutShort(const Demuxer& demuxer)
+void Complain(const FileError& error)
 {
-    const flvd_ctx_t& instance = *demuxer.Instance();
-    if (instance.file_shorter_than_meta != 0)
-        Complain(demuxer.Path(), "warning: the file is cut short: its metadata announces more bytes than it has");
-    if (const int64_t bytes = BytesBehindLastTag(instance); bytes > 0)
-        Complain(demuxer.Path(), fmt::format("warning: the last {} bytes hold no whole tag and are not played", bytes));
+    const flvdmx::error& cause = error.Cause();
+    const bool coded = g_showsCodes && cause.kind() != flvdmx::Kind::none;
+    Complain(error.File(),
+             error.what() + (coded ? fmt::format(" (code {}, line {})", cause.code(), cause.line()) : ""));
 }
 
-void WarnOfSkipped(const Demuxer& demuxer, const TagReader& reader)
+const char* StreamName(flvdmx::Stream stream)
 {
-    if (reader.Skipped() > 0)
-        Complain(demuxer.Path(),
-                 fmt::format("warning: {} bytes, the first at byte {}, hold no sound tag of the streams "
-                             "and are left out",
-                             reader.Skipped(), reader.FirstSkipped()));
-}
-
-Json ErrorObject(const DemuxError& error)
-{
-    return {{"message", error.what()}, {"code", error.Code()}, {"line", error.Line()}};
-}
-
-const char* StreamName(uint32_t stream)
-{
-    return stream == FLVD_STREAM_VIDEO ? "video" : "audio";
-}
-
-std::string FrameLine(uint64_t number, const Frame& frame)
-{
-    return fmt::format("{:>7}  {}  {:>12}  {:>8}  {:08x}\n", number, StreamName(frame.stream), FormatTime(frame.timeMs),
-                       frame.size, frame.crc);
-}
-
-Json FrameObject(uint64_t number, const Frame& frame)
-{
-    return {{"number", number},
-            {"stream", StreamName(frame.stream)},
-            {"time_ms", frame.timeMs},
-            {"size", frame.size},
-            {"crc32", fmt::format("{:08x}", frame.crc)}};
+    return stream == flvdmx::Stream::video ? "video" : "audio";
 }
 
 } // namespace tool

@@ -1,21 +1,42 @@
-// What all subcommands print: frames, JSON documents, errors and warnings.
+// What all subcommands print: documents, errors and warnings.
 #ifndef FLVDMX_TOOLS_REPORT_H
 #define FLVDMX_TOOLS_REPORT_H
 
-#include <cstdint>
+#include <stdexcept>
 #include <string>
 #include <string_view>
 
 #include <nlohmann/json.hpp>
 
-#include "tools/demuxer.h"
-#include "tools/tags.h"
+#include "flvdmx/flvdmx.hpp"
 
 namespace tool {
 
 using Json = nlohmann::ordered_json;
 
-/** Writes to standard output; throws std::system_error when it cannot, as for a pipe that nobody reads any more. */
+/** Ends the work on a file; what() says why in words, without the file's name. */
+class FileError : public std::runtime_error {
+public:
+    FileError(const std::string& file, const std::string& text, const flvdmx::error& error = {})
+        : std::runtime_error(text), m_file(file), m_error(error)
+    {
+    }
+    /** The library's failure in its own words. */
+    FileError(const std::string& file, const flvdmx::error& error) : FileError(file, error.text(), error) {}
+
+    const std::string& File() const { return m_file; }     /**< as the user named it */
+    const flvdmx::error& Cause() const { return m_error; } /**< the library's failure; of Kind::none without one */
+    Json Object() const;                                   /**< message, code and line */
+
+private:
+    std::string m_file;
+    flvdmx::error m_error;
+};
+
+/** From now on messages tell the library's code and line as well. */
+void ShowCodes();
+
+/** Writes to standard output; throws std::system_error when it cannot, as to a pipe that nobody reads any more. */
 void Print(std::string_view text);
 
 /** Hands on at once what was written; throws as Print does. */
@@ -27,26 +48,14 @@ void PrintJson(const Json& document, int indent = -1);
 /** Writes `flvdmx: FILE: TEXT` to standard error. */
 void Complain(const std::string& file, std::string_view text);
 
+/** Writes the error to standard error. */
+void Complain(const FileError& error);
+
 /** Writes to standard error; when that fails there is nobody to tell. */
 void Tell(const std::string& text);
 
-/** Tells on standard error what of a complete file will not be played. */
-void WarnIfCutShort(const Demuxer& demuxer);
-
-/** Tells on standard error what a reader at its end has passed over. */
-void WarnOfSkipped(const Demuxer& demuxer, const TagReader& reader);
-
-/** @return message, code and line as an object */
-Json ErrorObject(const DemuxError& error);
-
 /** @return "video" or "audio" */
-const char* StreamName(uint32_t stream);
-
-/** @return one line: number, stream, time, size in bytes, CRC-32 */
-std::string FrameLine(uint64_t number, const Frame& frame);
-
-/** @return the same as an object: number, stream, time_ms, size, crc32 */
-Json FrameObject(uint64_t number, const Frame& frame);
+const char* StreamName(flvdmx::Stream stream);
 
 } // namespace tool
 

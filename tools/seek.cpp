@@ -1,77 +1,76 @@
 // `flvdmx seek`: seeks, shows where the readers landed and the frames from there on.
+#include <algorithm>
 #include <iterator>
 #include <limits>
 #include <optional>
 #include <utility>
+#include <vector>
 
 #include <fmt/core.h>
 
 #include "tools/commands.h"
-#include "tools/demuxer.h"
 #include "tools/frame_source.h"
+#include "tools/input.h"
 #include "tools/report.h"
-#include "tools/tags.h"
-#include "tools/time_text.h"
+#include "tools/text.h"
 
 namespace tool {
 
 namespace {
 
-constexpr int MOST_TAGS_TO_LOOK_AT = 100;
+using flvdmx::Milliseconds;
+using flvdmx::SeekMode;
+
+constexpr size_t MOST_FRAMES_TO_LOOK_AT = 100;
 
 struct Landing {
-    int32_t timeMs;
+    int64_t timeMs;
     int64_t position;
-    std::optional<int64_t> audioPosition; // only with a reader of its own
-    std::optional<bool> keyframe;         // only with video
+    std::optional<int64_t> audioPosition{}; // only with a reader of its own
+    std::optional<bool> keyframe{};         // only with video
+    std::vector<FrameRecord> frames{};
 };
 
-std::optional<Tag> PeekTag(fio_file_t* reader)
+bool IsRelative(const SeekOptions& options)
 {
-    const uint8_t* bytes = nullptr;
-    const uint32_t available = __FLV_DMX__fioShowBytesByPtr(&bytes, TAG_HEADER_SIZE + 2, reader);
-    return available < TAG_HEADER_SIZE ? std::nullopt : std::optional(Tag::Parse(0, bytes, available));
+    return (options.mode & FLVD_SEEK_RELATIVE) != 0;
 }
 
-// Looks for the next video frame from the reader's position on.
-std::optional<bool> NextPictureIsKeyframe(flvd_ctx_t* instance)
+std::string PlaceText(const Input& input, int64_t position)
 {
-    fio_file_t* const reader = instance->main_reader;
-    for (int i = 0; i < MOST_TAGS_TO_LOOK_AT; ++i) {
-        flvd_tag_info_t tag{};
-        if (FLVD_GetCurrTagInfo(instance, reader, &tag, FLVD_TAG_VIDEO, 0) != 0)
-            return std::nullopt;
-        const std::optional<Tag> found = PeekTag(reader);
-        if (!found || found->IsFrame())
-            return found ? std::optional(found->IsKeyframe()) : std::nullopt;
-        __FLV_DMX__fioSkipBytes(TAG_HEADER_SIZE + tag.data_size + BACK_POINTER_SIZE, reader);
-    }
-    return std::nullopt;
-}
-
-std::string PlaceText(const flvd_ctx_t& instance, int64_t position)
-{
-    const char* const place = position == instance.data_offset ? ", the start"
-                              : position == instance.file_size ? ", the end"
-                                                               : "";
+    const char* const place = position == input.Instance().data_offset ? ", the start"
+                              : position == input.info.size            ? ", the end"
+                                                                       : "";
     return fmt::format("byte {}{}", position, place);
 }
 
-Landing DescribeLanding(const Demuxer& demuxer, int32_t timeMs)
+// The frames that are shown, and whether the first picture among them, or soon after them, is a keyframe.
+Landing Look(Input& input, Milliseconds reached, uint64_t count)
 {
-    Landing landing{timeMs, demuxer.Position(FLVD_STREAM_VIDEO), std::nullopt, std::nullopt};
-    if (demuxer.HasSeparateAudio())
-        landing.audioPosition = demuxer.Position(FLVD_STREAM_AUDIO);
-    if (demuxer.Video() != nullptr) {
-        landing.keyframe = NextPictureIsKeyframe(demuxer.Instance());
-        __FLV_DMX__fioSeek64(demuxer.Instance()->main_reader, landing.position, FIO_SEEK_SET);
+    const flvd_ctx_t& instance = input.Instance();
+    Landing landing{reached.count(), __FLV_DMX__fioTell64(instance.main_reader)};
+    if (instance.audio_reader != instance.main_reader)
+        landing.audioPosition = __FLV_DMX__fioTell64(instance.audio_reader);
+    FrameSource source(input, BOTH_STREAMS);
+    const auto needs = [&](size_t looked) {
+        const bool picture = input.Has(flvdmx::Stream::video) && !landing.keyframe && looked < MOST_FRAMES_TO_LOOK_AT;
+        return landing.frames.size() < count || picture;
+    };
+    for (size_t looked = 0; needs(looked); ++looked) {
+        const std::optional<FrameRecord> frame = source.Next();
+        if (!frame)
+            break;
+        if (frame->IsVideo() && !landing.keyframe)
+            landing.keyframe = frame->keyframe;
+        if (landing.frames.size() < count)
+            landing.frames.push_back(*frame);
     }
     return landing;
 }
 
-const char* DirectionName(uint32_t mode)
+const char* DirectionName(uint32_t direction)
 {
-    switch (mode & FLVD_SEEK_DIRECTION_MASK) {
+    switch (direction) {
     case FLVD_SEEK_BACKWARD:
         return "backward";
     case FLVD_SEEK_FORWARD:
@@ -83,106 +82,106 @@ const char* DirectionName(uint32_t mode)
 
 std::string RequestText(const SeekOptions& options)
 {
-    const bool relative = (options.mode & FLVD_SEEK_RELATIVE) != 0;
-    return fmt::format("{}{} ({}{})", relative && options.timeMs >= 0 ? "+" : "", FormatTime(options.timeMs),
-                       relative ? "relative, " : "", DirectionName(options.mode));
-}
-
-std::string LandingText(const SeekOptions& options, const flvd_ctx_t& instance, const Landing& landing)
-{
-    std::string text = fmt::format("sought    {}\nlanded    {}\n", RequestText(options), FormatTime(landing.timeMs));
-    const auto out = std::back_inserter(text);
-    if (landing.keyframe)
-        fmt::format_to(out, "keyframe  {}\n", *landing.keyframe ? "yes" : "no");
-    fmt::format_to(out, "position  {}\n", PlaceText(instance, landing.position));
-    if (landing.audioPosition)
-        fmt::format_to(out, "audio     {}\n", PlaceText(instance, *landing.audioPosition));
-    return text;
-}
-
-Json LandingObject(const Landing& landing)
-{
-    Json object = {{"time_ms", landing.timeMs}, {"position", landing.position}};
-    if (landing.audioPosition)
-        object["audio_position"] = *landing.audioPosition;
-    object["keyframe"] = landing.keyframe ? Json(*landing.keyframe) : Json();
-    return object;
+    return fmt::format("{}{} ({}{})", IsRelative(options) && options.timeMs >= 0 ? "+" : "", FormatTime(options.timeMs),
+                       IsRelative(options) ? "relative, " : "", DirectionName(options.direction));
 }
 
 Json RequestObject(const SeekOptions& options)
 {
     return {{"file", options.file},
             {"time_ms", options.timeMs},
-            {"relative", (options.mode & FLVD_SEEK_RELATIVE) != 0},
-            {"mode", DirectionName(options.mode)}};
+            {"relative", IsRelative(options)},
+            {"mode", DirectionName(options.direction)}};
 }
 
-void PrintLanding(const SeekOptions& options, Demuxer& demuxer, const Landing& landing)
+void PrintText(const SeekOptions& options, const Input& input, const Landing& landing)
 {
-    FrameSource source(demuxer, FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
-    Json frames = Json::array();
-    if (!options.json)
-        Print(LandingText(options, *demuxer.Instance(), landing));
-    for (uint64_t number = 1; number <= options.count; ++number) {
-        const std::optional<Frame> frame = source.Next();
-        if (!frame)
-            break;
-        if (options.json)
-            frames.push_back(FrameObject(number, *frame));
-        else
-            Print(FrameLine(number, *frame));
-    }
-    if (!options.json)
-        return;
+    std::string text = fmt::format("sought    {}\nlanded    {}\n", RequestText(options), FormatTime(landing.timeMs));
+    const auto out = std::back_inserter(text);
+    if (landing.keyframe)
+        fmt::format_to(out, "keyframe  {}\n", *landing.keyframe ? "yes" : "no");
+    fmt::format_to(out, "position  {}\n", PlaceText(input, landing.position));
+    if (landing.audioPosition)
+        fmt::format_to(out, "audio     {}\n", PlaceText(input, *landing.audioPosition));
+    if (!landing.frames.empty())
+        text += FrameRecord::HEADING;
+    for (size_t i = 0; i < landing.frames.size(); ++i)
+        text += landing.frames[i].Line(i + 1);
+    Print(text);
+}
+
+void PrintObject(const SeekOptions& options, const Landing& landing)
+{
     Json document = RequestObject(options);
-    document["landed"] = LandingObject(landing);
-    document["frames"] = std::move(frames);
+    Json& landed = document["landed"] = {{"time_ms", landing.timeMs}, {"position", landing.position}};
+    if (landing.audioPosition)
+        landed["audio_position"] = *landing.audioPosition;
+    landed["keyframe"] = landing.keyframe ? Json(*landing.keyframe) : Json();
+    Json& frames = document["frames"] = Json::array();
+    for (size_t i = 0; i < landing.frames.size(); ++i)
+        frames.push_back(landing.frames[i].Object(i + 1));
     PrintJson(document, 2);
 }
 
-void PrintMiss(const SeekOptions& options, const SeekMiss& miss, const Demuxer& demuxer)
+int64_t CurrentTime(const Input& input)
 {
-    const int64_t position = demuxer.Position(FLVD_STREAM_VIDEO);
+    const flvd_ctx_t& instance = input.Instance();
+    return input.Has(flvdmx::Stream::video) ? instance.last_video_ts : instance.last_audio_ts;
+}
+
+bool SeeksForward(const SeekOptions& options, int64_t target, int64_t current)
+{
+    if ((options.mode & FLVD_SEEK_RETRY_BACKWARD) != 0)
+        return false; // the last attempt
+    return options.direction == FLVD_SEEK_FORWARD || (options.direction == 0 && target >= current);
+}
+
+// What would have worked, found by trying it.
+std::string Advice(Input& input, int64_t target, bool forward)
+{
+    const auto other = forward ? SeekMode::backward : SeekMode::forward;
+    const auto reached = input.file.seek(Milliseconds(target), other);
+    return reached ? fmt::format("; --mode {} lands at {}", forward ? "backward" : "forward", FormatTime(*reached))
+                   : "";
+}
+
+// Tells of a miss of `target`, the current time having been `current`.
+FileError Miss(const SeekOptions& options, Input& input, int64_t target, int64_t current, const flvdmx::error& error)
+{
+    const bool beyond = input.Instance().last_ts != 0 && Milliseconds(target) > input.info.duration;
+    const bool forward = SeeksForward(options, target, current);
+    const int64_t position = __FLV_DMX__fioTell64(input.Instance().main_reader);
+    const std::string reason = beyond ? fmt::format("that is beyond the end at {}", FormatTime(input.info.duration))
+                                      : fmt::format("no keyframe is at or {} it{}", forward ? "after" : "before",
+                                                    Advice(input, target, forward));
+    FileError miss(input.name, fmt::format("seek to {} missed: {}", FormatTime(target), reason), error);
     if (options.json) {
         Json document = RequestObject(options);
         document["landed"] = nullptr;
-        document["miss"] = miss.BeyondEnd() ? "beyond_end" : "no_keyframe";
+        document["miss"] = beyond ? "beyond_end" : "no_keyframe";
         document["position"] = position;
-        document["error"] = ErrorObject(miss);
+        document["error"] = miss.Object();
         PrintJson(document, 2);
     } else {
         Print(fmt::format("sought    {}\nlanded    nowhere\nposition  {}\n", RequestText(options),
-                          PlaceText(*demuxer.Instance(), position)));
+                          PlaceText(input, position)));
     }
+    return miss;
 }
 
 // Reads frames and drops them. Of two readers the one whose last frame is earlier is asked, as a player does: no
-// reader comes further than the number of frames says.
-void Play(Demuxer& demuxer, uint64_t frames)
+// reader gets further than the number of frames says.
+void Play(Input& input, uint64_t frames)
 {
     constexpr int64_t ENDED = std::numeric_limits<int64_t>::max();
-    int64_t video = demuxer.Video() != nullptr ? -1 : ENDED;
-    int64_t audio = demuxer.Audio() != nullptr ? -1 : ENDED;
+    int64_t video = input.Has(flvdmx::Stream::video) ? -1 : ENDED;
+    int64_t audio = input.Has(flvdmx::Stream::audio) ? -1 : ENDED;
     // With one reader it does not matter which stream is asked.
     while (frames > 0 && (video != ENDED || audio != ENDED)) {
         const bool isVideo = video <= audio;
-        const std::optional<Frame> frame = demuxer.NextFrame(isVideo ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO);
-        (isVideo ? video : audio) = frame ? frame->timeMs : ENDED;
+        const auto frame = NextFrame(input, isVideo ? flvdmx::Stream::video : flvdmx::Stream::audio);
+        (isVideo ? video : audio) = frame ? frame->time.count() : ENDED;
         frames -= frame ? 1U : 0U;
-    }
-}
-
-int SeekIn(Demuxer& demuxer, const SeekOptions& options)
-{
-    Play(demuxer, options.play);
-    try {
-        const int32_t reached = demuxer.Seek(options.timeMs, options.mode);
-        PrintLanding(options, demuxer, DescribeLanding(demuxer, reached));
-        return DONE;
-    } catch (const SeekMiss& miss) {
-        PrintMiss(options, miss, demuxer);
-        Complain(options.file, miss.Message());
-        return FAILED;
     }
 }
 
@@ -190,14 +189,24 @@ int SeekIn(Demuxer& demuxer, const SeekOptions& options)
 
 int RunSeek(const SeekOptions& options)
 {
-    try {
-        Demuxer demuxer(options.file, options.separateAudio ? FLVD_OPT_SEPARATE_AUDIO_READER : 0);
-        WarnIfCutShort(demuxer);
-        return SeekIn(demuxer, options);
-    } catch (const DemuxError& error) {
-        Complain(options.file, error.Message());
-        return FAILED;
-    }
+    flvdmx::Options open;
+    open.separate_audio_reader = options.separateAudio;
+    Input input(options.file, open);
+    input.WarnIfCutShort();
+    Play(input, options.play);
+    const int64_t current = CurrentTime(input);
+    const auto mode = static_cast<SeekMode>(options.mode | options.direction);
+    const auto reached = input.file.seek(Milliseconds(options.timeMs), mode);
+    if (reached.error().kind() == flvdmx::Kind::miss)
+        throw Miss(options, input, options.timeMs + (IsRelative(options) ? current : 0), current, reached.error());
+    if (!reached)
+        throw FileError(input.name, reached.error());
+    const Landing landing = Look(input, *reached, options.count);
+    if (options.json)
+        PrintObject(options, landing);
+    else
+        PrintText(options, input, landing);
+    return DONE;
 }
 
 } // namespace tool

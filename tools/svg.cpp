@@ -3,29 +3,22 @@
 
 #include <cmath>
 #include <cstdlib>
-#include <cstring>
 
-#include "tools/report.h"
+#include "tools/text.h"
 
 namespace tool {
 
 namespace {
 
-constexpr double SECONDS_A_MINUTE = 60;
-constexpr double SECONDS_AN_HOUR = 3600;
+constexpr double SECONDS_PER_MINUTE = 60;
+constexpr double SECONDS_PER_HOUR = 3600;
 
 } // namespace
 
 std::string XmlText(std::string_view text)
 {
-    // The JSON library knows UTF-8: what it takes comes back as it was, the rest as replacement characters.
-    const std::string dump = Json(text).dump(-1, ' ', false, Json::error_handler_t::replace);
     std::string escaped;
-    std::string known = Json::parse(dump).get<std::string>();
-    for (const char* const noCharacter : {"\uFFFE", "\uFFFF"}) // not even XML's references can name these
-        for (size_t at = 0; (at = known.find(noCharacter, at)) != std::string::npos;)
-            known.replace(at, std::strlen(noCharacter), "\uFFFD");
-    for (const char c : known) {
+    for (const char c : Printable(text)) {
         if (c == '&')
             escaped += "&amp;";
         else if (c == '<')
@@ -33,7 +26,7 @@ std::string XmlText(std::string_view text)
         else if (c == '>')
             escaped += "&gt;";
         else
-            escaped += static_cast<unsigned char>(c) < ' ' ? ' ' : c;
+            escaped += c;
     }
     return escaped;
 }
@@ -76,17 +69,17 @@ double TimeStep(double seconds, int most)
         if (step * most >= seconds)
             return step;
     }
-    return std::ceil(RoundStep(seconds / SECONDS_AN_HOUR, most)) * SECONDS_AN_HOUR;
+    return std::ceil(RoundStep(seconds / SECONDS_PER_HOUR, most)) * SECONDS_PER_HOUR;
 }
 
 std::string TimeLabel(double seconds, double range, double step)
 {
-    if (range <= SECONDS_A_MINUTE) {
+    if (range <= SECONDS_PER_MINUTE) {
         const int digits = step >= 1 ? 0 : static_cast<int>(std::ceil(-std::log10(step)));
         return fmt::format("{:.{}f} s", seconds, digits);
     }
     const auto whole = std::lldiv(std::llround(seconds), 60);
-    if (range < SECONDS_AN_HOUR)
+    if (range < SECONDS_PER_HOUR)
         return fmt::format("{}:{:02}", whole.quot, whole.rem);
     return fmt::format("{}:{:02}:{:02}", whole.quot / 60, whole.quot % 60, whole.rem);
 }

@@ -9,7 +9,7 @@
 
 namespace tool {
 
-/** @return the text as XML takes it: escaped, without control characters and broken UTF-8 */
+/** @return the printable text with what XML reserves escaped */
 std::string XmlText(std::string_view text);
 
 /** Collects elements. */

@@ -1,22 +1,24 @@
-// The tags of an open file one after the other, as they are played, with their payload.
+// The tags of a file as they are there, for what playing does not tell: damage, and tags that are not played.
 #ifndef FLVDMX_TOOLS_TAGS_H
 #define FLVDMX_TOOLS_TAGS_H
 
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <optional>
+#include <string>
 #include <vector>
 
-#include "tools/demuxer.h"
+#include "flvdmx/layers.h"
+#include "tools/input.h"
 
 namespace tool {
 
 constexpr uint32_t TAG_HEADER_SIZE = 11;
 constexpr uint32_t BACK_POINTER_SIZE = 4;
 constexpr uint32_t CODEC_ID_MASK = 0x0F;
+constexpr uint8_t EXTENDED_HEADER = 0x80; /**< in the codec byte of enhanced FLV, before a FourCC */
 constexpr uint32_t MOST_FRAME_TYPE = 5;   /**< FrameType of video */
-constexpr uint32_t CODEC_ID_AVC = 7;      /**< CodecID of video */
-constexpr uint32_t SOUND_FORMAT_AAC = 10; /**< SoundFormat of audio */
 
 /** @return the number in the `size` bytes at `bytes`, most significant first */
 uint32_t BigEndian(const uint8_t* bytes, uint32_t size);
@@ -27,62 +29,124 @@ struct Tag {
     uint32_t type; /**< FLVD_TAG_TYPE_* */
     uint32_t size; /**< payload bytes */
     uint32_t timestamp;
+    uint32_t streamId;
     uint8_t codec;
     uint8_t packetType;
 
-    /** @return the tag at `position` whose first bytes, at least a header, are given */
-    static Tag Parse(int64_t position, const uint8_t* bytes, uint32_t available);
-
     int64_t DataEnd() const { return position + TAG_HEADER_SIZE + size; }
-    int64_t End() const { return DataEnd() + BACK_POINTER_SIZE; } /**< behind the back-pointer */
+    int64_t End() const { return DataEnd() + BACK_POINTER_SIZE; } /**< after the back-pointer */
     bool IsVideo() const { return type == FLVD_TAG_TYPE_VIDEO; }
     bool IsAudio() const { return type == FLVD_TAG_TYPE_AUDIO; }
-    bool IsAvc() const { return IsVideo() && (codec & 0x0F) == CODEC_ID_AVC; }
-    bool IsAac() const { return IsAudio() && codec >> 4 == SOUND_FORMAT_AAC; }
-    uint32_t Stream() const { return IsVideo() ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO; }
-    uint32_t CodecHeaderSize() const { return IsAvc() ? 5 : IsAac() ? 2 : 1; } /**< bytes in front of the frame */
+    bool IsScript() const { return type == FLVD_TAG_TYPE_SCRIPT; }
+    flvdmx::VideoCodec VideoCodec() const { return static_cast<flvdmx::VideoCodec>(codec & CODEC_ID_MASK); }
+    flvdmx::AudioCodec AudioCodec() const { return static_cast<flvdmx::AudioCodec>(codec >> 4); }
+    bool IsExtended() const { return IsVideo() && (codec & EXTENDED_HEADER) != 0; } /**< enhanced FLV */
+    bool IsAvc() const { return IsVideo() && VideoCodec() == flvdmx::VideoCodec::avc; }
+    bool IsAac() const { return IsAudio() && AudioCodec() == flvdmx::AudioCodec::aac; }
+    flvdmx::Stream Stream() const { return IsVideo() ? flvdmx::Stream::video : flvdmx::Stream::audio; }
+    uint32_t CodecHeaderSize() const { return IsAvc() ? 5 : IsAac() ? 2 : 1; } /**< bytes before the frame */
     bool IsConfig() const { return (IsAvc() || IsAac()) && packetType == 0; }
     bool IsFrame() const; /**< a tag that is played */
     bool IsKeyframe() const { return IsVideo() && IsFrame() && (codec >> 4 == 1 || codec >> 4 == 4); }
 };
 
-/**
- * Finds the first tag at or after `from`, however much damage lies before it: one search of the library covers a
- * bounded stretch, and the next is worth making while the reader advances and has not passed `end`.
- *
- * @param progress called with the place that each search without a tag has reached
- * @return where the tag and then the reader stand; nothing when there is none
- */
-std::optional<int64_t> FindTag(flvd_ctx_t* instance, fio_file_t* reader, int64_t from, int64_t end,
-                               const std::function<void(int64_t)>& progress);
-
-/** Walks over the tags of the streams that were found, those with codec configurations included. */
+/** Reads tags and numbers anywhere in a file, with a reader of its own. */
 class TagReader {
 public:
-    /** @param demuxer borrowed; its main reader is used */
-    explicit TagReader(const Demuxer& demuxer);
+    /** @param input borrowed; it is played on meanwhile as if nothing happened */
+    explicit TagReader(const Input& input);
 
-    /** @return the next audio or video tag; nothing at the end of the data */
-    std::optional<Tag> Next();
+    int64_t FileSize() const { return m_fileSize; }
 
-    /** @return bytes passed so far that belong to none of these tags and to no script tag */
-    int64_t Skipped() const { return m_skipped; }
-    int64_t FirstSkipped() const { return m_firstSkipped; } /**< their place in the file */
+    /** @return `size` bytes at `position`, valid until the next call; null when not all of them are there */
+    const uint8_t* Bytes(int64_t position, uint32_t size);
 
-    /** @return what stands behind the codec header of a tag just delivered */
-    std::vector<uint8_t> Data(const Tag& tag);
+    /** @return what stands at `position` when it has the type of a tag and is not cut in its header */
+    std::optional<Tag> At(int64_t position);
+
+    /**
+     * Finds the first valid tag of the file's streams at or after `from`, however much damage is before it. One
+     * search of the library covers a bounded stretch; the next follows while the reader advances before `end`.
+     *
+     * @param progress called with the place that each search without a tag has reached
+     */
+    std::optional<Tag> Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress = {});
+
+    /** @return why a tag with nothing wrong about it is not played, such as "are too short for a frame"; empty when it
+     *          is */
+    std::string WhyNotPlayed(const Tag& tag);
+
+    /** @return why no frame of that stream is delivered, from its first tag; empty when frames are, or when there is no
+     *          such tag */
+    const std::string& WhyNoStream(flvdmx::Stream stream);
 
 private:
-    std::optional<Tag> Find();
-    void Skip(int64_t from, int64_t to);
+    std::string NameCodec(const Tag& tag);
+    std::string ExtendedCodec(const Tag& tag);
+    std::string ConfigFault(const Tag& tag);
+    std::string FindReason(flvdmx::Stream stream);
 
-    flvd_ctx_t* m_instance;
-    fio_file_t* m_reader;
-    const uint32_t m_streams;
-    int64_t m_next;
-    int64_t m_end; // of the tag before
-    int64_t m_skipped = 0;
-    int64_t m_firstSkipped = 0;
+    struct Closer {
+        void operator()(fio_file_t* reader) const { __FLV_DMX__fioClose(reader); }
+    };
+    const Input& m_input;
+    flvd_ctx_t* const m_instance;
+    const std::unique_ptr<fio_file_t, Closer> m_reader;
+    int64_t m_fileSize = 0;
+    std::optional<std::string> m_noVideo; // the reasons, once they were sought
+    std::optional<std::string> m_noAudio;
+};
+
+/** @return name and CodecID of a video codec */
+std::string VideoCodecName(flvdmx::VideoCodec codec);
+
+/** Watches for bytes that are left out between the frames of a file. */
+class Losses {
+public:
+    explicit Losses(const Input& input); /**< borrowed */
+
+    /** Takes every frame of the file, in file order. @return true when bytes were left out before it */
+    bool Take(const flvdmx::Frame& frame);
+    /** After the last frame. */
+    void Finish() { Inspect(m_end, m_input.Instance().data_end); }
+
+    int64_t Bytes() const { return m_bytes; } /**< left out so far */
+    /** Tells on standard error what was left out. */
+    void Warn() const;
+
+private:
+    void Inspect(int64_t from, int64_t to);
+    void Lose(int64_t from, int64_t to);
+
+    const Input& m_input;
+    TagReader m_reader;
+    int64_t m_end;
+    int64_t m_bytes = 0;
+    int64_t m_first = 0;
+    std::string m_why; // of the first tag that is valid and left out
+};
+
+/**
+ * Times that go on where a recording starts again from 0: a stream's time that goes back by more than a second begins
+ * another take, which comes after the latest time so far.
+ */
+class Takes {
+public:
+    /** @return the time of a frame, taken in file order */
+    flvdmx::Milliseconds Continue(const flvdmx::Frame& frame);
+
+    size_t Restarts() const { return m_offsets.size() - 1; }
+    flvdmx::Milliseconds Played() const { return m_latest; } /**< the latest time returned */
+
+private:
+    struct Lane {
+        size_t take = 0;
+        flvdmx::Milliseconds last{};
+    };
+    Lane m_video;
+    Lane m_audio;
+    std::vector<flvdmx::Milliseconds> m_offsets{flvdmx::Milliseconds(0)}; // of each take
+    flvdmx::Milliseconds m_latest{};
 };
 
 } // namespace tool

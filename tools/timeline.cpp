@@ -3,9 +3,10 @@
 
 #include <algorithm>
 #include <cmath>
+#include <optional>
 
+#include "tools/frame_source.h"
 #include "tools/progress.h"
-#include "tools/report.h"
 #include "tools/svg.h"
 #include "tools/tags.h"
 
@@ -13,74 +14,138 @@ namespace tool {
 
 namespace {
 
-constexpr double MILLISECONDS_A_SECOND = 1000;
+constexpr double MS_PER_SECOND = 1000;
 constexpr double LEAST_DURATION = 0.1;
 constexpr double LEAST_INTERVAL = 0.1; // a few frames
 constexpr int MOST_INTERVALS = 200;
 
-Timeline Prepare(int64_t durationMs, size_t columns)
+// A frame as it was read.
+struct Point {
+    double time;
+    double position;
+    uint32_t size;
+    bool video;
+    bool keyframe;
+    bool loss;    // bytes were left out before it
+    bool restart; // the timestamps start again with it
+};
+
+std::vector<Point> ReadPoints(Input& input, Timeline& timeline)
 {
-    Timeline timeline{};
-    timeline.durationMs = durationMs;
-    timeline.duration = std::max(static_cast<double>(durationMs) / MILLISECONDS_A_SECOND, LEAST_DURATION);
+    std::vector<Point> points;
+    Takes takes;
+    Losses losses(input);
+    ProgressBar progress(input.name, input.info.size);
+    while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
+        progress.ShowDone(frame->position);
+        const size_t restarts = takes.Restarts();
+        const bool loss = losses.Take(*frame);
+        const auto time = static_cast<double>(takes.Continue(*frame).count()) / MS_PER_SECOND;
+        const bool video = frame->stream == flvdmx::Stream::video;
+        points.push_back({time, static_cast<double>(frame->position), static_cast<uint32_t>(frame->data.size()), video,
+                          video && frame->keyframe, loss, takes.Restarts() > restarts});
+    }
+    progress.Wipe();
+    losses.Finish();
+    losses.Warn();
+    timeline.durationMs = takes.Played().count();
+    timeline.bytesLeftOut = losses.Bytes();
+    return points;
+}
+
+void Divide(Timeline& timeline, size_t columns)
+{
+    timeline.duration = std::max(static_cast<double>(timeline.durationMs) / MS_PER_SECOND, LEAST_DURATION);
     timeline.interval = std::max(TimeStep(timeline.duration, MOST_INTERVALS), LEAST_INTERVAL);
-    timeline.columns = columns;
     timeline.lead.resize(columns);
     for (StreamTimeline* const stream : {&timeline.video, &timeline.audio}) {
         stream->bits.resize(static_cast<size_t>(std::max(std::round(timeline.duration / timeline.interval), 1.0)));
         stream->positions.resize(columns);
     }
-    return timeline;
 }
 
-// Times before the first and behind the last timestamp count to the ends.
+// Times before the first timestamp count to the first cell.
 size_t CellOf(double time, double cellSize, size_t cells)
 {
     return static_cast<size_t>(std::clamp(std::floor(time / cellSize), 0.0, static_cast<double>(cells - 1)));
 }
 
-int64_t TimeOf(const Demuxer& demuxer, const Tag& tag)
+// A pause of a stream that is long for it.
+double LongestStep(const Timeline& timeline, const StreamTimeline& stream)
 {
-    return int64_t{tag.timestamp} - demuxer.Instance()->first_ts;
+    constexpr double LEAST = 1;
+    constexpr double TIMES_THE_AVERAGE = 10;
+    return std::max(LEAST,
+                    TIMES_THE_AVERAGE * timeline.duration / static_cast<double>(std::max<uint64_t>(stream.frames, 1)));
 }
 
-int64_t LatestTime(const Demuxer& demuxer)
-{
-    int64_t latest = demuxer.Instance()->duration_ms;
-    TagReader reader(demuxer);
-    while (const std::optional<Tag> tag = reader.Next())
-        latest = std::max(latest, TimeOf(demuxer, *tag));
-    return latest;
-}
+// Enters the frames one after the other.
+class Gatherer {
+public:
+    explicit Gatherer(Timeline& timeline) : m_timeline(timeline) {}
 
-Timeline Gather(const Demuxer& demuxer, TagReader& reader, int64_t durationMs, size_t columns)
-{
-    Timeline timeline = Prepare(durationMs, columns);
-    std::optional<double> videoTime;
-    std::optional<double> audioTime;
-    double lead = 0;
-    ProgressBar progress(demuxer.Path(), demuxer.Instance()->data_end);
-    while (const std::optional<Tag> tag = reader.Next()) {
-        progress.ShowDone(tag->position);
-        if (!tag->IsFrame())
-            continue;
-        const double time = static_cast<double>(TimeOf(demuxer, *tag)) / MILLISECONDS_A_SECOND;
-        StreamTimeline& stream = tag->IsVideo() ? timeline.video : timeline.audio;
-        const size_t column = CellOf(time, timeline.duration / static_cast<double>(columns), columns);
-        stream.bits[CellOf(time, timeline.interval, stream.bits.size())] += tag->size * 8.0;
-        stream.positions[column].Take(static_cast<double>(tag->position));
-        stream.bytes += tag->size;
-        ++stream.frames;
-        (tag->IsVideo() ? videoTime : audioTime) = time;
-        if (tag->IsKeyframe())
-            timeline.keyframes.push_back(time);
-        if (videoTime && audioTime) {
-            timeline.lead[column].Take(lead); // as it was until here
-            timeline.lead[column].Take(lead = *audioTime - *videoTime);
-        }
+    void Take(const Point& point)
+    {
+        Lane& lane = point.video ? m_video : m_audio;
+        StreamTimeline& stream = point.video ? m_timeline.video : m_timeline.audio;
+        AddMarks(point, lane, stream);
+        const size_t columns = m_timeline.lead.size();
+        const size_t column = CellOf(point.time, m_timeline.duration / static_cast<double>(columns), columns);
+        stream.bits[CellOf(point.time, m_timeline.interval, stream.bits.size())] += point.size * 8.0;
+        Enter(stream.positions[column], lane.breaks, point.position);
+        if (point.keyframe)
+            m_timeline.keyframes.push_back(point.time);
+        lane.last = lane.sinceBreak = point.time;
+        if (m_video.sinceBreak && m_audio.sinceBreak)
+            TakeLead(m_timeline.lead[column], *m_audio.sinceBreak - *m_video.sinceBreak);
     }
-    return timeline;
-}
+
+private:
+    struct Lane {
+        std::optional<double> last{};
+        std::optional<double> sinceBreak{}; // the last time, when it is not from before a break
+        bool breaks = false;                // the curve does not go on
+    };
+
+    static void Enter(Range& range, bool& breaks, double value)
+    {
+        range.breaks = range.breaks || (range.IsEmpty() && breaks);
+        breaks = breaks && !range.breaks;
+        range.Take(value);
+    }
+
+    void AddMarks(const Point& point, Lane& lane, const StreamTimeline& stream)
+    {
+        const double latest = std::max(m_video.last.value_or(0), m_audio.last.value_or(0));
+        const bool gap = lane.last && point.time - *lane.last > LongestStep(m_timeline, stream);
+        if (point.restart)
+            m_timeline.marks.push_back({Mark::Kind::restart, point.time, point.time});
+        if (point.loss)
+            m_timeline.marks.push_back({Mark::Kind::damage, std::min(latest, point.time), point.time});
+        else if (gap)
+            m_timeline.marks.push_back({Mark::Kind::gap, *lane.last, point.time});
+        if (!point.restart && !point.loss && !gap)
+            return;
+        lane.breaks = m_leadBreaks = true;
+        if (!gap)
+            m_video.breaks = m_audio.breaks = true;
+        m_video.sinceBreak = m_audio.sinceBreak = std::nullopt;
+    }
+
+    void TakeLead(Range& range, double lead)
+    {
+        if (!m_leadBreaks)
+            range.Take(m_lead); // as it was until here
+        Enter(range, m_leadBreaks, lead);
+        m_lead = lead;
+    }
+
+    Timeline& m_timeline;
+    Lane m_video;
+    Lane m_audio;
+    double m_lead = 0;
+    bool m_leadBreaks = true;
+};
 
 } // namespace
 
@@ -90,17 +155,25 @@ void Range::Take(double value)
     high = std::max(high, value);
 }
 
-// A file whose times all lie below those at its end is read once. Else the axis needs the latest time first.
-Timeline ReadTimeline(Demuxer& demuxer, size_t columns)
+bool Timeline::IsMissing(double from, double to) const
 {
-    TagReader reader(demuxer);
-    Timeline timeline = Gather(demuxer, reader, demuxer.Instance()->duration_ms, columns);
-    if (reader.Skipped() == 0)
-        return timeline;
-    demuxer.AcceptAllTimes();
-    TagReader again(demuxer);
-    timeline = Gather(demuxer, again, LatestTime(demuxer), columns);
-    WarnOfSkipped(demuxer, again);
+    return std::any_of(marks.begin(), marks.end(),
+                       [=](const Mark& mark) { return mark.from <= from && mark.to >= to; });
+}
+
+Timeline ReadTimeline(Input& input, size_t columns)
+{
+    Timeline timeline{};
+    const std::vector<Point> points = ReadPoints(input, timeline);
+    for (const Point& point : points) {
+        StreamTimeline& stream = point.video ? timeline.video : timeline.audio;
+        ++stream.frames;
+        stream.bytes += point.size;
+    }
+    Divide(timeline, columns);
+    Gatherer gatherer(timeline);
+    for (const Point& point : points)
+        gatherer.Take(point);
     return timeline;
 }
 

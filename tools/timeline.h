@@ -4,10 +4,9 @@
 
 #include <cstdint>
 #include <limits>
-#include <optional>
 #include <vector>
 
-#include "tools/demuxer.h"
+#include "tools/input.h"
 
 namespace tool {
 
@@ -15,6 +14,7 @@ namespace tool {
 struct Range {
     double low = std::numeric_limits<double>::infinity();
     double high = -std::numeric_limits<double>::infinity();
+    bool breaks = false; /**< it does not go on from the range before */
 
     bool IsEmpty() const { return low > high; }
     void Take(double value);
@@ -27,22 +27,32 @@ struct StreamTimeline {
     uint64_t frames = 0;
 };
 
-/** Times in seconds from the first timestamp; intervals, the last one with the rest, and columns divide the duration.
- */
+/** A stretch of time in which something is missing, or a moment. */
+struct Mark {
+    enum class Kind { gap, damage, restart } kind;
+    double from;
+    double to;
+};
+
+/** Times in seconds from the first timestamp, going on where timestamps start again; intervals, the last one with the
+ *  rest, and columns divide the duration. */
 struct Timeline {
     int64_t durationMs;
     double duration; /**< seconds, never 0 */
     double interval; /**< seconds */
-    size_t columns;
     StreamTimeline video;
     StreamTimeline audio;
     std::vector<double> keyframes; /**< their times */
     std::vector<Range> lead;       /**< of each column: by how much audio is ahead of video in the file, seconds */
+    std::vector<Mark> marks;
+    int64_t bytesLeftOut;
+
+    /** @return true when nothing is known of this time */
+    bool IsMissing(double from, double to) const;
 };
 
-/** Reads the whole file, and tells on standard error what it passed over. The memory taken depends on the duration only
- * by the keyframes. */
-Timeline ReadTimeline(Demuxer& demuxer, size_t columns);
+/** Reads the whole file, and tells on standard error what is left out. Takes a few bytes of memory per frame. */
+Timeline ReadTimeline(Input& input, size_t columns);
 
 } // namespace tool
 

@@ -1,0 +1,242 @@
+// Frames as streams that players take.
+#include "tools/formats.h"
+
+#include <algorithm>
+#include <array>
+#include <limits>
+#include <utility>
+
+#include <fmt/core.h>
+
+#include "flvdmx/layers.h"
+#include "tools/codec_config.h"
+#include "tools/report.h"
+#include "tools/tags.h"
+
+namespace tool {
+
+namespace {
+
+constexpr uint32_t SIXTEEN_BITS = 0x02; // SoundSize in the codec byte of audio tags
+
+using Buffer = std::vector<uint8_t>;
+
+void Append(Buffer& out, flvdmx::Bytes bytes)
+{
+    out.insert(out.end(), bytes.begin(), bytes.end());
+}
+
+void AppendLittleEndian(Buffer& out, uint32_t value, uint32_t size)
+{
+    for (uint32_t i = 0; i < size; ++i)
+        out.push_back(static_cast<uint8_t>(value >> 8 * i));
+}
+
+// AVC as a byte stream (ISO/IEC 14496-10, annex B): start codes where the lengths were, and the parameter sets before
+// the first frame and before the first keyframe after each change of the configuration.
+class AnnexB : public StreamFormat {
+public:
+    AnnexB() : StreamFormat("h264") {}
+
+    std::string Configure(flvdmx::Bytes record) override
+    {
+        constexpr size_t LEAST_RECORD_SIZE = 7;
+        constexpr size_t LENGTH_SIZE_OFFSET = 4; // of lengthSizeMinusOne, two bits
+        const uint32_t lengthSize = (record[LENGTH_SIZE_OFFSET] & 3U) + 1;
+        Buffer sets = ParameterSets(record);
+        if (record.size() < LEAST_RECORD_SIZE || lengthSize == 3 || sets.empty())
+            return "the AVC configuration is damaged";
+        m_parameterSets = std::move(sets);
+        m_lengthSize = lengthSize;
+        m_pending = true;
+        return {};
+    }
+
+    const char* Convert(const flvdmx::Frame& frame, Buffer& out) override
+    {
+        constexpr const char* FAULT = "NAL units that do not fit their frame";
+        if (m_pending && (frame.keyframe || !m_begun)) {
+            Append(out, m_parameterSets);
+            m_pending = false;
+        }
+        m_begun = true;
+        const uint8_t* const data = frame.data.data();
+        const size_t size = frame.data.size();
+        for (size_t pos = 0; pos < size;) {
+            if (m_lengthSize > size - pos)
+                return FAULT;
+            const uint32_t length = BigEndian(data + pos, m_lengthSize);
+            pos += m_lengthSize;
+            if (length > size - pos)
+                return FAULT;
+            if (length > 0) {
+                Append(out, {START_CODE.data(), START_CODE.size()});
+                Append(out, {data + pos, length});
+            }
+            pos += length;
+        }
+        return nullptr;
+    }
+
+private:
+    static constexpr std::array<uint8_t, 4> START_CODE = {0, 0, 0, 1};
+
+    // A start code takes two bytes more than the length of a parameter set, and no set is shorter than its length.
+    static Buffer ParameterSets(flvdmx::Bytes record)
+    {
+        Buffer sets(2 * record.size());
+        const int32_t size = FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()),
+                                                          sets.data(), static_cast<int32_t>(sets.size()));
+        sets.resize(size > 0 ? static_cast<size_t>(size) : 0);
+        return sets;
+    }
+
+    Buffer m_parameterSets;
+    uint32_t m_lengthSize = 4;
+    bool m_begun = false;
+    bool m_pending = false; // the parameter sets have not been written
+};
+
+// AAC as an audio data transport stream (ISO/IEC 13818-7, 14496-3): a header before every frame. Of HE-AAC it describes
+// the core; decoders find the rest in the frames.
+class Adts : public StreamFormat {
+public:
+    Adts() : StreamFormat("aac") {}
+
+    std::string Configure(flvdmx::Bytes config) override
+    {
+        const AacConfig aac = ParseAacConfig(config);
+        if (std::string refusal = Refusal(aac); !refusal.empty())
+            return refusal;
+        m_fixed = 0xFFF10000U | (aac.coreObjectType - 1) << 14 | aac.frequencyIndex << 10 | aac.channels << 6;
+        return {};
+    }
+
+    // Syncword, MPEG-4, no checksum; a buffer fullness of all ones, for a variable rate; one raw data block.
+    const char* Convert(const flvdmx::Frame& frame, Buffer& out) override
+    {
+        constexpr uint32_t HEADER_SIZE = 7;
+        constexpr uint32_t MOST_BYTES = 0x1FFF; // 13 bits, header included
+        if (frame.data.empty())
+            return nullptr;
+        if (frame.data.size() > MOST_BYTES - HEADER_SIZE)
+            return "more data than ADTS takes";
+        const uint32_t size = static_cast<uint32_t>(frame.data.size()) + HEADER_SIZE;
+        const uint64_t header = uint64_t{m_fixed | size >> 11} << 24 | (size << 13 & 0xFFFFFF) | 0x1FFC;
+        for (uint32_t shift = 8 * HEADER_SIZE; shift > 0; shift -= 8)
+            out.push_back(static_cast<uint8_t>(header >> (shift - 8)));
+        Append(out, frame.data);
+        return nullptr;
+    }
+
+private:
+    static std::string Refusal(const AacConfig& aac)
+    {
+        constexpr uint32_t MOST_OBJECT_TYPE = 4; // 2 bits hold it less one
+        if (aac.frequencyIndex == AAC_EXPLICIT_FREQUENCY)
+            return "AAC with an explicit sampling frequency cannot be written as ADTS, which has a list of them";
+        if (aac.isShort)
+            return "the AAC configuration is cut short";
+        if (aac.coreObjectType == 0 || aac.coreObjectType > MOST_OBJECT_TYPE)
+            return fmt::format("AAC of object type {} cannot be written as ADTS, which has types 1 to 4",
+                               aac.coreObjectType);
+        if (aac.frequencyIndex >= AAC_FREQUENCIES)
+            return fmt::format("the AAC configuration has the reserved sampling frequency index {}",
+                               aac.frequencyIndex);
+        if (aac.channels == 0)
+            return "AAC of channel configuration 0 cannot be written as ADTS, which has no room for a channel list";
+        if (aac.channels > 7)
+            return fmt::format("AAC of channel configuration {} cannot be written as ADTS, which has 1 to 7",
+                               aac.channels);
+        return {};
+    }
+
+    uint32_t m_fixed = 0; // the first 32 bits without the size
+};
+
+// PCM as RIFF/WAVE. What FLV calls the byte order of the machine that wrote it was little-endian nearly everywhere.
+class Wav : public StreamFormat {
+public:
+    Wav(const flvdmx::AudioInfo& audio, uint32_t bits)
+        : StreamFormat("wav"), m_channels(std::max(audio.channels, 1U)), m_rate(audio.sample_rate), m_bits(bits)
+    {
+    }
+
+    Buffer Header(uint64_t bytes) const override
+    {
+        constexpr uint32_t AFTER_SIZE = 36; // bytes of the header after the field of the whole size
+        constexpr uint32_t FORMAT_SIZE = 16;
+        constexpr uint32_t PCM = 1;
+        constexpr uint64_t MOST = std::numeric_limits<uint32_t>::max() - AFTER_SIZE; // longer ones play as far as that
+        const auto size = static_cast<uint32_t>(std::min(bytes, MOST));
+        const uint32_t frame = m_channels * m_bits / 8;
+        Buffer header;
+        AppendName(header, "RIFF");
+        AppendLittleEndian(header, size + AFTER_SIZE, 4);
+        AppendName(header, "WAVEfmt ");
+        AppendLittleEndian(header, FORMAT_SIZE, 4);
+        AppendLittleEndian(header, PCM, 2);
+        AppendLittleEndian(header, m_channels, 2);
+        AppendLittleEndian(header, m_rate, 4);
+        AppendLittleEndian(header, m_rate * frame, 4);
+        AppendLittleEndian(header, frame, 2);
+        AppendLittleEndian(header, m_bits, 2);
+        AppendName(header, "data");
+        AppendLittleEndian(header, size, 4);
+        return header;
+    }
+
+private:
+    static void AppendName(Buffer& out, std::string_view name) { out.insert(out.end(), name.begin(), name.end()); }
+
+    const uint32_t m_channels;
+    const uint32_t m_rate; // Hz
+    const uint32_t m_bits; // per sample
+};
+
+class Raw : public StreamFormat {
+public:
+    using StreamFormat::StreamFormat;
+    bool IsRaw() const override { return true; }
+};
+
+} // namespace
+
+std::string StreamFormat::Configure(flvdmx::Bytes /*config*/)
+{
+    return {};
+}
+
+Buffer StreamFormat::Header(uint64_t /*bytes*/) const
+{
+    return {};
+}
+
+const char* StreamFormat::Convert(const flvdmx::Frame& frame, Buffer& out)
+{
+    Append(out, frame.data);
+    return nullptr;
+}
+
+std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream)
+{
+    if (stream == flvdmx::Stream::video)
+        return input.info.video->codec == flvdmx::VideoCodec::avc
+                   ? std::unique_ptr<StreamFormat>(std::make_unique<AnnexB>())
+                   : std::make_unique<Raw>("video");
+    switch (input.info.audio->codec) {
+    case flvdmx::AudioCodec::aac:
+        return std::make_unique<Adts>();
+    case flvdmx::AudioCodec::mp3:
+    case flvdmx::AudioCodec::mp3_8khz:
+        return std::make_unique<StreamFormat>("mp3");
+    case flvdmx::AudioCodec::pcm:
+    case flvdmx::AudioCodec::pcm_little_endian:
+        return std::make_unique<Wav>(*input.info.audio,
+                                     (input.Instance().audio_format_filter & SIXTEEN_BITS) != 0 ? 16 : 8);
+    default:
+        return std::make_unique<Raw>("audio");
+    }
+}
+
+} // namespace tool

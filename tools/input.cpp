@@ -1,0 +1,132 @@
+// A file that is read.
+#include "tools/input.h"
+
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <utility>
+
+#include <fmt/core.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "flvdmx/posix_host.h"
+#include "tools/report.h"
+
+namespace tool {
+
+namespace {
+
+// Standard input as something that can be read at any place: itself when it is a file, else a copy in memory.
+int SeekableStandardInput()
+{
+    struct stat status {};
+    if (fstat(STDIN_FILENO, &status) == 0 && S_ISREG(status.st_mode))
+        return STDIN_FILENO;
+    const int copy = memfd_create("standard input", MFD_CLOEXEC);
+    std::array<char, 65536> block{};
+    uint64_t total = 0;
+    for (ssize_t got = 0; (got = read(STDIN_FILENO, block.data(), block.size())) > 0;) {
+        total += static_cast<uint64_t>(got);
+        if (total > STANDARD_INPUT_MAX)
+            throw FileError(STANDARD_STREAM, fmt::format("standard input has more than the {} MiB that are kept in "
+                                                         "memory: write it to a file first",
+                                                         STANDARD_INPUT_MAX >> 20));
+        if (write(copy, block.data(), static_cast<size_t>(got)) != got)
+            throw FileError(STANDARD_STREAM, fmt::format("cannot keep standard input: {}", std::strerror(errno)));
+    }
+    return copy;
+}
+
+// The library says only that there is no valid header; the file itself tells the user more.
+std::string HeaderFailureText(const std::string& path)
+{
+    std::error_code failure;
+    const auto size = std::filesystem::file_size(path, failure);
+    if (failure)
+        return "no FLV file header";
+    if (size == 0)
+        return "no FLV file header: the file is empty";
+    if (HasSignature(path))
+        return fmt::format("the FLV file header is damaged or cut short (the file has {} bytes)", size);
+    return "no FLV file header: this is not an FLV file";
+}
+
+} // namespace
+
+const flvdmx::Host& Host()
+{
+    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
+    return host;
+}
+
+bool HasSignature(const std::string& path)
+{
+    constexpr std::array SIGNATURE = {'F', 'L', 'V'};
+    std::array<char, SIGNATURE.size()> bytes{};
+    std::ifstream(path, std::ios::binary).read(bytes.data(), bytes.size());
+    return bytes == SIGNATURE;
+}
+
+std::string PathOf(const std::string& name)
+{
+    if (name == STANDARD_STREAM) {
+        static const int descriptor = SeekableStandardInput();
+        return fmt::format("/proc/self/fd/{}", descriptor);
+    }
+    struct stat status {};
+    const bool special = stat(name.c_str(), &status) == 0 && !S_ISREG(status.st_mode) && !S_ISBLK(status.st_mode) &&
+                         !S_ISDIR(status.st_mode);
+    if (special) // a pipe that nobody writes to would not even open
+        throw FileError(name,
+                        "cannot be opened: a pipe or device cannot be read at any place; 'flvdmx COMMAND - <FILE' "
+                        "reads a pipe into memory",
+                        {flvdmx::Kind::failed, FLVD_ERR_OPEN_MAIN, 0});
+    return name;
+}
+
+std::string OpenFailureText(const std::string& path, const flvdmx::error& error)
+{
+    if (error.code() == FLVD_ERR_OPEN_MAIN || error.code() == FLVD_ERR_OPEN_AUDIO)
+        return fmt::format("cannot be opened: {}",
+                           error.system_error() != 0 ? std::strerror(error.system_error()) : "no memory");
+    return error.code() == FLVD_ERR_FILE_HEADER ? HeaderFailureText(path) : error.text();
+}
+
+Input::Input(const std::string& file_name, flvdmx::File&& opened)
+    : name(file_name), file(std::move(opened)), info(file.info())
+{
+}
+
+Input::Input(const std::string& file_name, const flvdmx::Options& options) : name(file_name)
+{
+    const std::string path = PathOf(name);
+    flvdmx::result<flvdmx::File> opened = flvdmx::File::open(path, Host(), options);
+    if (!opened)
+        throw FileError(name, OpenFailureText(path, opened.error()), opened.error());
+    file = std::move(*opened);
+    info = file.info();
+}
+
+uint32_t Input::Streams() const
+{
+    return (info.video ? uint32_t{FLVD_STREAM_VIDEO} : 0) | (info.audio ? uint32_t{FLVD_STREAM_AUDIO} : 0);
+}
+
+int64_t Input::Rest() const
+{
+    return Instance().data_end < info.size ? info.size - Instance().data_end : 0;
+}
+
+void Input::WarnIfCutShort() const
+{
+    if (Instance().file_shorter_than_meta != 0)
+        Complain(name, "warning: the file is cut short: its metadata announces more bytes than it has");
+    if (Rest() > 0)
+        Complain(name, fmt::format("warning: the last {} bytes hold no whole tag and are not played", Rest()));
+}
+
+} // namespace tool

@@ -1,0 +1,70 @@
+// What only a look at all frames of a file tells.
+#include "tools/scan.h"
+
+#include <algorithm>
+
+#include "tools/progress.h"
+#include "tools/tags.h"
+
+namespace tool {
+
+double FileScan::AverageDistanceMs() const
+{
+    const auto whole = static_cast<double>((newestKeyframe - firstKeyframe).count());
+    return keyframes < 2 ? 0 : whole / static_cast<double>(keyframes - 1);
+}
+
+FileScan ScanFile(const std::string& name)
+{
+    flvdmx::Options options;
+    options.restarting_timestamps = true;
+    Input input(name, options);
+    FileScan scan;
+    Takes takes;
+    Losses losses(input);
+    ProgressBar progress(name, input.info.size);
+    for (const flvdmx::Frame& frame : input.file.frames()) {
+        progress.ShowDone(frame.position);
+        losses.Take(frame);
+        const flvdmx::Milliseconds time = takes.Continue(frame);
+        ++(frame.stream == flvdmx::Stream::video ? scan.videoFrames : scan.audioFrames);
+        if (frame.stream != flvdmx::Stream::video || !frame.keyframe)
+            continue;
+        if (scan.keyframes++ == 0)
+            scan.firstKeyframe = time;
+        else
+            scan.longestDistance = std::max(scan.longestDistance, time - scan.newestKeyframe);
+        scan.lastKeyframe = frame.time;
+        scan.newestKeyframe = time;
+    }
+    losses.Finish();
+    scan.bytesLeftOut = losses.Bytes();
+    scan.played = takes.Played();
+    scan.restarts = takes.Restarts();
+    return scan;
+}
+
+// The times of a recording that did not restart rise along the file, up to the last one.
+bool SeemsToRestart(const Input& input)
+{
+    constexpr int64_t PLACES = 16;
+    constexpr int64_t NEAR = 1 << 20; // bytes: a place inside a larger tag tells nothing
+    constexpr uint32_t JITTER_MS = 2000;
+    flvdmx::Options options;
+    options.restarting_timestamps = true;
+    const Input any(input.name, options);
+    TagReader reader(any);
+    uint32_t latest = 0;
+    for (int64_t i = 1; i < PLACES; ++i) {
+        const int64_t place = input.info.size / PLACES * i;
+        const std::optional<Tag> tag = reader.Find(place, place + NEAR);
+        if (!tag || tag->IsScript())
+            continue;
+        if (tag->timestamp + JITTER_MS < latest || tag->timestamp > input.Instance().last_ts + JITTER_MS)
+            return true;
+        latest = std::max(latest, tag->timestamp);
+    }
+    return false;
+}
+
+} // namespace tool

@@ -1,0 +1,45 @@
+// Text for people: times as they write and read them, names that may hold anything.
+#ifndef FLVDMX_TOOLS_TEXT_H
+#define FLVDMX_TOOLS_TEXT_H
+
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "flvdmx/flvdmx.hpp"
+
+namespace tool {
+
+/**
+ * Reads `SECONDS[.FRACTION]` or `[HH:]MM:SS[.FRACTION]`, either after blanks and a sign.
+ *
+ * @return milliseconds, rounded to the nearest; nothing when the text is no time or does not fit 32 bits
+ */
+std::optional<int32_t> ParseTime(std::string_view text);
+
+/** @return the time as `H:MM:SS.mmm`, a negative one with a minus before it */
+std::string FormatTime(int64_t milliseconds);
+
+/** The same. */
+inline std::string FormatTime(flvdmx::Milliseconds time)
+{
+    return FormatTime(time.count());
+}
+
+/** @return `1 frame`, `2 frames` */
+std::string Plural(uint64_t count, const char* noun);
+
+/** @return the bytes as hexadecimal digits */
+std::string Hex(flvdmx::Bytes bytes);
+
+/** @return the text as valid UTF-8 for a terminal or a drawing: control characters and whatever is no character in it
+ *          become \xNN */
+std::string Printable(std::string_view text);
+
+/** @return a printable text that takes no more than that many columns: its middle may be replaced by "..." */
+std::string Shorten(std::string_view printable, size_t columns);
+
+} // namespace tool
+
+#endif
