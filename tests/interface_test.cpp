@@ -233,6 +233,42 @@ TEST(Interface, ReportsChangedConfigurations)
     }
 }
 
+// Into the caller's memory goes what follows a frame at once; a small tag that is damaged does not make the large frame
+// after it be passed over. Nothing but damage is told from whole tags.
+TEST(Interface, DeliversIntoTheCallersMemory)
+{
+    Bytes record = SmallAvcRecord();
+    record[3] = 41;
+    Tag bad = Nalu(80, 50);
+    bad.back_pointer = 0;
+    const Flv flv = File({g_avc, g_aac, Nalu(0), Raw(10), Nalu(40, 70000), bad, Nalu(120, 9000), Raw(130),
+                          Tag{9, 140, AvcConfig(record)}, Tag{18, 140, OnMetaData("width: 320")}, Nalu(160), Raw(170)});
+    const Memory memory("memory", flv.bytes);
+    Bytes spare(100'000), own;
+    auto plain = flvdmx::File::open("memory", g_memory);
+    auto file = flvdmx::File::open("memory", g_memory, {0, 0, false, false, false, false, spare.data(), 100'000});
+    std::vector<int64_t> elsewhere;
+    for (int64_t end = flv.tags[2].offset;;) {
+        own.clear();
+        const auto frame = file->next_frame_into([&own](uint32_t size) {
+            own.resize(size);
+            return own.data();
+        });
+        const auto wanted = plain->next_frame();
+        ASSERT_EQ(bool(frame), bool(wanted));
+        if (!frame)
+            break;
+        EXPECT_EQ(Line(*frame), Line(*wanted));
+        EXPECT_EQ(frame->config_changed(), wanted->config_changed());
+        EXPECT_EQ(file->has_whole_tags(end, frame->position), frame->time != 120ms) << frame->time.count();
+        if (frame->data.data() != own.data())
+            elsewhere.push_back(frame->time.count());
+        end = __FLV_DMX__fioTell64(file->instance()->main_reader);
+    }
+    EXPECT_EQ(file->last_error().kind(), flvdmx::Kind::end);
+    EXPECT_EQ(elsewhere, std::vector<int64_t>({0, 120, 160})); // after configurations, damage
+}
+
 // A recording that began anew: most of its frames are later than the last ones.
 TEST(Interface, DeliversAllFramesOfRestartingTimestamps)
 {

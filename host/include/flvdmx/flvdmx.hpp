@@ -450,6 +450,62 @@ public:
     }
 
     /**
+     * The next frame, as next_frame(), written into memory of the caller, who can pass it on without a copy. For files
+     * that were opened with Options::buffer, and without a separate audio reader: the frames whose size is not known
+     * before the request go to that buffer, as those after damage or a configuration do.
+     *
+     * @param allocate uint8_t*(uint32_t size): memory for a frame of `size` bytes, or null when there is none; called
+     *                 at most once
+     * @return as next_frame(); the data lies either at what `allocate` returned or in Options::buffer
+     */
+    template <typename Allocate> result<Frame> next_frame_into(Allocate&& allocate)
+    {
+        if (!can_read())
+            return failure();
+        fio_file_t* const reader = m_instance->main_reader;
+        const int64_t begin = m_next[0] >= 0 ? m_next[0] : __FLV_DMX__fioTell64(reader);
+        const Tag ahead(reader, begin);
+        const uint32_t size = ahead.end() <= m_instance->data_end ? ahead.frame_size() : 0;
+        uint8_t* const memory = size != 0 ? allocate(size) : nullptr;
+        if (memory == nullptr)
+            return next_frame();
+        const auto given = m_given;
+        const flvd_frame_request_t request = std::exchange(m_request, {memory, size, 0});
+        result<Frame> frame = next_frame();
+        m_request = request;
+        if (frame && frame->position == begin)
+            return frame;
+        // What looked like a tag was none, and a frame that does not fit may have been passed over.
+        m_given = given;
+        m_next[0] = begin;
+        m_return = {reader, begin};
+        return next_frame();
+    }
+
+    /**
+     * Tells whether there is no damage between two places. Playing goes on where it was.
+     *
+     * @param from byte in the file where a tag begins
+     * @param to   byte after it
+     * @return true when whole tags fill what is between
+     */
+    bool has_whole_tags(int64_t from, int64_t to)
+    {
+        if (leave().kind() != Kind::none)
+            return false;
+        fio_file_t* const reader = m_return.reader;
+        int64_t reached = from;
+        while (reached < to && move_to(reader, reached)) {
+            const Tag tag = find_tag(reader, FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT);
+            if (tag.position != reached)
+                break;
+            reached = tag.end();
+        }
+        go_back();
+        return reached == to;
+    }
+
+    /**
      * The next frame of a growing file. While there is none yet, `wait` is called and the file is asked again; when
      * `wait` returns false, because writing has stopped, it is asked one last time.
      *
@@ -537,6 +593,12 @@ private:
         // What the packet type of AVC and AAC says: a configuration, a frame, or neither.
         bool is_config() const { return (is_avc() || is_aac()) && m_bytes[12] == 0; }
         bool has_frame() const { return !is_config() && !(is_avc() && m_bytes[12] == 2); }
+        // 0 for a tag without a frame.
+        uint32_t frame_size() const
+        {
+            const bool carries_frame = (is_video() || is_audio()) && has_frame() && data_size() > codec_header_size();
+            return carries_frame ? data_size() - codec_header_size() : 0;
+        }
         int32_t composition_offset() const
         {
             constexpr int32_t sign = 1 << 23;
