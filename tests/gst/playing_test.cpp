@@ -157,7 +157,7 @@ void WriteHoles(const std::string& path)
     const Bytes zeros(tag.size());
     for (uint32_t i = 0; i < pictures; ++i) {
         const bool in_hole = (i % 200 >= 100 && i % 200 < 105 && i < 1600) || (i >= 1700 && i < 1725);
-        const Bytes time = BigEndian(i * 40, 3);
+        const Bytes time = BigEndian(uint64_t{i} * 40, 3);
         std::copy(time.begin(), time.end(), tag.begin() + 4);
         write(in_hole ? zeros : tag);
     }
