@@ -71,6 +71,12 @@ std::vector<Arrival> Pipeline::arrivals(const char* sink)
     return m_arrivals[sink];
 }
 
+GstClockTime Pipeline::last_time(const char* sink)
+{
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    return m_arrivals[sink].empty() ? 0 : m_arrivals[sink].back().dts;
+}
+
 void Pipeline::forget_arrivals()
 {
     const std::lock_guard<std::mutex> lock(m_mutex);

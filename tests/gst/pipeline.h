@@ -50,6 +50,8 @@ public:
     bool seek(int64_t start, int flags, int64_t stop = -1, double rate = 1.0);
     /** What has arrived at the appsink of that name. */
     std::vector<Arrival> arrivals(const char* sink);
+    /** Decoding time of the last one there; 0 without any. */
+    GstClockTime last_time(const char* sink);
     void forget_arrivals();
 
 private:
