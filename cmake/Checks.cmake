@@ -10,7 +10,7 @@ find_program(VALGRIND valgrind REQUIRED)
 file(GLOB_RECURSE compiled CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR}
     flvdmx/*.cpp host/*.c tools/*.cpp gst/*.cpp examples/*.c examples/*.cpp tests/*.cpp bench/*.cpp fuzz/*.cpp)
 if(NOT FLVDMX_GSTREAMER)
-    list(FILTER compiled EXCLUDE REGEX "(^|/)gst/|/play\\.cpp$")
+    list(FILTER compiled EXCLUDE REGEX "(^|/)gst/|/(play|gst_bench)\\.cpp$")
 endif()
 foreach(source IN LISTS compiled)
     set(less "")

@@ -14,7 +14,7 @@ namespace flvdmx_gst {
 
 namespace {
 
-constexpr uint32_t cache_size = 32768;
+constexpr uint32_t cache_size = 16384;
 constexpr int64_t frame_size_max = (1 << 24) - 1;          // the format's own limit
 constexpr GstClockTime interleave_max = 500 * GST_MSECOND; // how far one stream may be ahead of the other in a file
 constexpr GstFlowReturn flow_told = GST_FLOW_CUSTOM_ERROR; // a failure whose message was posted
