@@ -30,6 +30,31 @@ def run(*command):
     return subprocess.run([str(word) for word in command], check=True, stdout=subprocess.PIPE, text=True).stdout
 
 
+class Pipelines:
+    """Seconds per frame in GStreamer, a list by rounds for each medium and demuxer; empty when it was not built."""
+
+    def __init__(self, programs, media, rounds):
+        self.times, self.frames = {}, {}
+        program = programs / "flvdmx-gst-bench"
+        for _ in range(rounds if program.exists() else 0):
+            for entry in json.loads(run(program, media)):
+                name = entry["medium"], entry["demuxer"]
+                self.times.setdefault(name, []).append(entry["seconds"] / entry["frames"])
+                self.frames[name] = entry["frames"]
+
+    def rows(self):
+        for medium in ("small", "hd"):
+            ours, theirs = (medium, "flvdmxdemux"), (medium, "flvdemux")
+            if ours not in self.times:
+                continue
+            ratios = [a / b for a, b in zip(self.times[ours], self.times[theirs])]
+            speeds = [f"{1 / statistics.median(self.times[name]):,.0f}" for name in (ours, theirs)]
+            note = "" if self.frames[ours] == self.frames[theirs] else ", other frames"
+            ratio = statistics.median(ratios)
+            text = f"{ratio:.3g} ({min(ratios):.3g} to {max(ratios):.3g}), {' to '.join(speeds)} frames per second{note}"
+            yield row(f"`filesrc ! flvdmxdemux ! fakesink`, `{medium}`, to `flvdemux`", "≤ 1.0", text, ratio <= 1 and not note)
+
+
 class Times:
     """Nanoseconds of each benchmark, one value per round, and the counters of its last round."""
 
@@ -185,13 +210,21 @@ def put(path, mark, text):
     path.write_text(before + begin + text + end + after)
 
 
+def use_plugin(build):
+    """Lets GStreamer find the plugin of this build."""
+    os.environ["GST_PLUGIN_PATH"] = str(build / "lib/gstreamer-1.0")
+    os.environ["GST_REGISTRY"] = str(build / "bench/gst-registry.bin")
+
+
 def main():
     programs, media, targets, rounds = pathlib.Path(sys.argv[1]), sys.argv[2], pathlib.Path(sys.argv[3]), int(sys.argv[4])
+    use_plugin(programs.parent)
     times = Times(programs / "flvdmx-bench", media, rounds)
     cost = json.loads(run(programs / "flvdmx-cost", media))
     opens = {"open `small`": f"{media}/small.flv", MANY_PROPERTIES: ROOT / "tests/data/avc_aac.flv"}
     own = instructions.measure(programs / "flvdmx-own", opens, programs.parent / "instructions")
     goals = ["| What | Goal | Measured | Met |", "|---|---|---|---|", *time_rows(times), *cost_rows(cost)]
+    goals += Pipelines(programs, media, rounds).rows()
     goals += figure_rows(own, {"small frame": 260, "large frame": 450, "small frame, added by flvdmx.hpp": 160}, "instructions")
     goals += [measured(name, f"{own[name]:.0f} instructions") for name in opens]
     if targets.exists():

@@ -8,7 +8,10 @@ find_program(VALGRIND valgrind REQUIRED)
 # the bench are not checked with the path-sensitive analyzer: it takes minutes for the macros of one test file and
 # complains about those of Google Benchmark, and the tests run with the sanitizers anyway.
 file(GLOB_RECURSE compiled CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR}
-    flvdmx/*.cpp host/*.c tools/*.cpp examples/*.c examples/*.cpp tests/*.cpp bench/*.cpp fuzz/*.cpp)
+    flvdmx/*.cpp host/*.c tools/*.cpp gst/*.cpp examples/*.c examples/*.cpp tests/*.cpp bench/*.cpp fuzz/*.cpp)
+if(NOT FLVDMX_GSTREAMER)
+    list(FILTER compiled EXCLUDE REGEX "(^|/)gst/|/(play|gst_bench)\\.cpp$")
+endif()
 foreach(source IN LISTS compiled)
     set(less "")
     if(source MATCHES "^(tests|bench)/")

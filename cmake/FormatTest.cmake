@@ -2,7 +2,7 @@
 
 find_program(CLANG_FORMAT clang-format REQUIRED)
 
-foreach(folder IN ITEMS flvdmx host tools examples packaging tests bench fuzz)
+foreach(folder IN ITEMS flvdmx host tools gst examples packaging tests bench fuzz)
     file(GLOB_RECURSE found CONFIGURE_DEPENDS RELATIVE ${PROJECT_SOURCE_DIR} ${folder}/*.cpp ${folder}/*.h
         ${folder}/*.hpp ${folder}/*.c)
     list(APPEND sources ${found})

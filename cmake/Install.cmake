@@ -1,5 +1,5 @@
-# Installs three components: runtime, development and tools. Installed files refer to each other by relative paths, so
-# that an installed tree can be moved.
+# Installs four components: runtime, development, tools and gstreamer. Installed files refer to each other by relative
+# paths, so that an installed tree can be moved.
 
 # On Debian, libraries go into the architecture's folder, also in cross builds and below every prefix.
 if(EXISTS /etc/debian_version AND CMAKE_LIBRARY_ARCHITECTURE)
@@ -54,15 +54,24 @@ function(flvdmx_install_man page component)
         DESTINATION ${CMAKE_INSTALL_MANDIR}/man${section} COMPONENT ${component})
 endfunction()
 
-flvdmx_install_man(QVX_FLV_DMX.3 development)
-if(FLVDMX_TOOLS)
-    file(RELATIVE_PATH lib_from_bin /${CMAKE_INSTALL_BINDIR} /${CMAKE_INSTALL_LIBDIR})
-    set_target_properties(flvdmx-tool PROPERTIES INSTALL_RPATH "$ORIGIN/${lib_from_bin}")
-    install(TARGETS flvdmx-tool RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR} COMPONENT tools)
-    # Below the system's own prefix the loader finds the library without a run path.
+# flvdmx_install_user(TARGET FOLDER COMPONENT): installs a program or plugin that finds the library by a relative path.
+# Below the system's own prefix the loader finds it without a run path.
+function(flvdmx_install_user target folder component)
+    file(RELATIVE_PATH lib_from_folder /${folder} /${CMAKE_INSTALL_LIBDIR})
+    set_target_properties(${target} PROPERTIES INSTALL_RPATH "$ORIGIN/${lib_from_folder}")
+    install(TARGETS ${target} RUNTIME DESTINATION ${folder} COMPONENT ${component}
+        LIBRARY DESTINATION ${folder} COMPONENT ${component})
     install(CODE "if(CMAKE_INSTALL_PREFIX STREQUAL \"/usr\")
-        file(RPATH_REMOVE FILE \"\$ENV{DESTDIR}/usr/${CMAKE_INSTALL_BINDIR}/flvdmx\")
-    endif()" COMPONENT tools)
+        file(RPATH_REMOVE FILE \"\$ENV{DESTDIR}/usr/${folder}/$<TARGET_FILE_NAME:${target}>\")
+    endif()" COMPONENT ${component})
+endfunction()
+
+flvdmx_install_man(QVX_FLV_DMX.3 development)
+if(FLVDMX_GSTREAMER)
+    flvdmx_install_user(gstflvdmx ${CMAKE_INSTALL_LIBDIR}/gstreamer-1.0 gstreamer)
+endif()
+if(FLVDMX_TOOLS)
+    flvdmx_install_user(flvdmx-tool ${CMAKE_INSTALL_BINDIR} tools)
     flvdmx_install_man(flvdmx.1 tools)
     install(FILES ${PROJECT_SOURCE_DIR}/packaging/flvdmx.bash RENAME flvdmx
         DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions COMPONENT tools)

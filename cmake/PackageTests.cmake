@@ -18,7 +18,7 @@ function(flvdmx_python_test name script)
 endfunction()
 
 flvdmx_python_test(packages check_packages.py ${CMAKE_CPACK_COMMAND} ${PROJECT_BINARY_DIR} ${PROJECT_VERSION}
-    ${CMAKE_LIBRARY_ARCHITECTURE})
+    ${CMAKE_LIBRARY_ARCHITECTURE} ${FLVDMX_GSTREAMER})
 set_tests_properties(consumer packages PROPERTIES RESOURCE_LOCK install_manifest) # both write it
 
 set(manuals ${PROJECT_SOURCE_DIR}/docs/man)

@@ -1,10 +1,13 @@
-# Debian packages, built by CPack, one per component: libflvdmx1, libflvdmx-dev, flvdmx-tools.
+# Debian packages, built by CPack, one per component: libflvdmx1, libflvdmx-dev, flvdmx-tools, gstreamer1.0-flvdmx.
 
 set(CPACK_GENERATOR DEB)
 set(CPACK_DEB_COMPONENT_INSTALL ON)
 set(CPACK_COMPONENTS_ALL runtime development)
 if(FLVDMX_TOOLS)
     list(APPEND CPACK_COMPONENTS_ALL tools)
+endif()
+if(FLVDMX_GSTREAMER)
+    list(APPEND CPACK_COMPONENTS_ALL gstreamer)
 endif()
 set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_STRIP_FILES ON)
@@ -44,18 +47,28 @@ if(FLVDMX_TOOLS)
         "The program flvdmx lists streams and frames, seeks, extracts elementary\nstreams, checks files for damage and \
 draws their bit rate.")
 endif()
+if(FLVDMX_GSTREAMER)
+    flvdmx_package(gstreamer gstreamer1.0-flvdmx libs same "FLV demultiplexer for GStreamer"
+        "The element flvdmxdemux plays FLV files, also damaged ones, from sources that\ncan be read at any position. \
+Players take it when it is preferred:\nGST_PLUGIN_FEATURE_RANK=flvdmxdemux:MAX.")
+endif()
 
 set(CPACK_DEBIAN_RUNTIME_PACKAGE_CONTROL_EXTRA ${PROJECT_SOURCE_DIR}/packaging/triggers)
 set(CPACK_DEBIAN_DEVELOPMENT_PACKAGE_DEPENDS "libflvdmx${abi} (= ${version})")
 set(CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS "libflvdmx${abi} (>= ${PROJECT_VERSION})")
+set(CPACK_DEBIAN_GSTREAMER_PACKAGE_DEPENDS ${CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS})
 if(CMAKE_CROSSCOMPILING)
     # The cross compiler's libraries belong to packages that do not exist on the target, so the dependencies cannot be
     # derived from them. These are the target's packages in Debian 12.
     set(CPACK_DEBIAN_PACKAGE_ARCHITECTURE armhf)
     set(CPACK_DEBIAN_RUNTIME_PACKAGE_DEPENDS "libc6 (>= 2.36)")
-    string(APPEND CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS ", libc6 (>= 2.36), libgcc-s1, libstdc++6 (>= 12)")
+    set(cxx_runtime "libc6 (>= 2.36), libgcc-s1, libstdc++6 (>= 12)")
+    string(APPEND CPACK_DEBIAN_TOOLS_PACKAGE_DEPENDS ", ${cxx_runtime}")
+    string(APPEND CPACK_DEBIAN_GSTREAMER_PACKAGE_DEPENDS ", ${cxx_runtime}, libglib2.0-0 (>= 2.74), \
+libgstreamer1.0-0 (>= 1.22), libgstreamer-plugins-base1.0-0 (>= 1.22)")
 else()
     set(CPACK_DEBIAN_RUNTIME_PACKAGE_SHLIBDEPS ON)
     set(CPACK_DEBIAN_TOOLS_PACKAGE_SHLIBDEPS ON)
+    set(CPACK_DEBIAN_GSTREAMER_PACKAGE_SHLIBDEPS ON)
 endif()
 include(CPack)

@@ -1,6 +1,8 @@
 """Makes the Debian packages of a build and looks at them: names, fields, dependencies and files.
 
-usage: check_packages.py CPACK BUILD VERSION TRIPLET
+usage: check_packages.py CPACK BUILD VERSION TRIPLET GSTREAMER
+
+GSTREAMER is ON when the build has the plugin for it.
 """
 import pathlib
 import re
@@ -8,7 +10,7 @@ import subprocess
 import sys
 import tempfile
 
-cpack, build, version, triplet = sys.argv[1:]
+cpack, build, version, triplet, gstreamer = sys.argv[1:]
 ARCHITECTURES = {"x86_64-linux-gnu": "amd64", "arm-linux-gnueabihf": "armhf"}
 CONTENTS = pathlib.Path(__file__).resolve().parent.parent / "packaging" / "contents"
 EXPECTED = {
@@ -16,6 +18,8 @@ EXPECTED = {
     "libflvdmx-dev": ("libdevel", "same", {f"libflvdmx1 (= {version}-1)"}),
     "flvdmx-tools": ("video", "foreign", {f"libflvdmx1 (>= {version})", "libc6", "libstdc++6"}),
 }
+if gstreamer == "ON":
+    EXPECTED["gstreamer1.0-flvdmx"] = ("libs", "same", {f"libflvdmx1 (>= {version})", "libgstreamer1.0-0", "libc6"})
 
 
 def run(*command):

@@ -1,0 +1,65 @@
+#include "output.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace flvdmx_gst {
+
+namespace {
+
+constexpr GstClockTime gap_min = 500 * GST_MSECOND; // less is how files interleave their streams
+
+} // namespace
+
+Output::Output(GstElement* element, const char* name, OwnedCaps caps)
+    : m_pad(gst_pad_new_from_template(gst_element_get_pad_template(element, name), name)), m_caps(std::move(caps))
+{
+    gst_pad_use_fixed_caps(m_pad);
+    gst_pad_set_active(m_pad, TRUE);
+}
+
+void Output::start(GstElement* element, guint group)
+{
+    gchar* const id = gst_pad_create_stream_id(m_pad, element, GST_PAD_NAME(m_pad));
+    GstEvent* const event = gst_event_new_stream_start(id);
+    g_free(id);
+    gst_event_set_group_id(event, group);
+    gst_pad_push_event(m_pad, event);
+    gst_pad_push_event(m_pad, gst_event_new_caps(m_caps.get()));
+}
+
+void Output::change_caps(OwnedCaps caps)
+{
+    m_caps = std::move(caps);
+    gst_pad_push_event(m_pad, gst_event_new_caps(m_caps.get()));
+}
+
+GstFlowReturn Output::push(GstBuffer* buffer, const flvdmx::Frame& frame)
+{
+    GST_BUFFER_DTS(buffer) = to_clock_time(frame.time);
+    GST_BUFFER_PTS(buffer) = to_clock_time(frame.presentation_time());
+    GST_BUFFER_OFFSET(buffer) = static_cast<guint64>(frame.position);
+    if (!frame.keyframe)
+        GST_BUFFER_FLAG_SET(buffer, GST_BUFFER_FLAG_DELTA_UNIT);
+    if (std::exchange(m_discontinuity, false))
+        GST_BUFFER_FLAG_SET(buffer, GST_BUFFER_FLAG_DISCONT);
+    if (GST_BUFFER_DTS_IS_VALID(buffer))
+        m_reached = std::max(m_reached, GST_BUFFER_DTS(buffer));
+    return gst_pad_push(m_pad, buffer);
+}
+
+void Output::jump(GstClockTime time)
+{
+    m_discontinuity = true;
+    m_reached = time;
+}
+
+void Output::reach(GstClockTime time)
+{
+    if (m_pad == nullptr || time < m_reached + gap_min)
+        return;
+    gst_pad_push_event(m_pad, gst_event_new_gap(m_reached, time - m_reached));
+    m_reached = time;
+}
+
+} // namespace flvdmx_gst

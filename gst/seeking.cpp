@@ -1,0 +1,186 @@
+// Seeks and queries of the source pads, which come from any thread.
+
+#include "streaming.h"
+
+#include "open_lock.h"
+
+#include <shared_mutex>
+
+namespace flvdmx_gst {
+
+namespace {
+
+// Pushes an event over all source pads, also while the streaming thread is busy.
+void push_downstream(GstElement* element, GstEvent* event)
+{
+    const auto push = [](GstElement*, GstPad* pad, gpointer shared) -> gboolean {
+        gst_pad_push_event(pad, gst_event_ref(static_cast<GstEvent*>(shared)));
+        return TRUE;
+    };
+    gst_element_foreach_src_pad(element, push, event);
+    gst_event_unref(event);
+}
+
+bool lands_after(GstSeekFlags flags)
+{
+    return (flags & GST_SEEK_FLAG_KEY_UNIT) != 0 && (flags & GST_SEEK_FLAG_SNAP_NEAREST) == GST_SEEK_FLAG_SNAP_AFTER;
+}
+
+} // namespace
+
+gboolean Streaming::handle_event(GstPad* pad, GstObject* parent, GstEvent* event)
+{
+    if (GST_EVENT_TYPE(event) != GST_EVENT_SEEK)
+        return gst_pad_event_default(pad, parent, event);
+    const bool done = static_cast<Streaming*>(gst_pad_get_element_private(pad))->seek(event);
+    gst_event_unref(event);
+    return done ? TRUE : FALSE;
+}
+
+gboolean Streaming::handle_query(GstPad* pad, GstObject* parent, GstQuery* query)
+{
+    const bool done = static_cast<Streaming*>(gst_pad_get_element_private(pad))->answer(query);
+    return done ? TRUE : gst_pad_query_default(pad, parent, query);
+}
+
+bool Streaming::seek(GstEvent* event)
+{
+    gdouble rate = 1.0;
+    GstFormat format = GST_FORMAT_UNDEFINED;
+    GstSeekFlags flags = GST_SEEK_FLAG_NONE;
+    GstSeekType start_type = GST_SEEK_TYPE_NONE;
+    GstSeekType stop_type = GST_SEEK_TYPE_NONE;
+    gint64 start = 0;
+    gint64 stop = 0;
+    gst_event_parse_seek(event, &rate, &format, &flags, &start_type, &start, &stop_type, &stop);
+    if (format != GST_FORMAT_TIME || rate <= 0.0 || (flags & GST_SEEK_FLAG_INSTANT_RATE_CHANGE) != 0)
+        return false;
+    const bool flushes = (flags & GST_SEEK_FLAG_FLUSH) != 0;
+    const guint32 sequence = gst_event_get_seqnum(event);
+    const unsigned flush = flushes ? begin_flush(sequence) : 0;
+    if (!flushes)
+        gst_pad_pause_task(m_sink);
+
+    const StreamLock lock(m_sink);
+    if (!m_active || !m_file.is_open())
+        return false;
+    if (flushes && !end_flush(flush, sequence))
+        return true; // a later seek takes over
+    GstSegment segment = m_segment;
+    segment.position = m_position;
+    const bool sought = gst_segment_do_seek(&segment, rate, format, flags, start_type, static_cast<guint64>(start),
+                                            stop_type, static_cast<guint64>(stop), nullptr) != FALSE &&
+                        seek_file(segment, flags);
+    if (!sought && m_source.flow() == GST_FLOW_FLUSHING)
+        return false; // the next seek is waiting, or the end
+    if (sought) {
+        m_sequence = sequence;
+        GST_OBJECT_LOCK(m_element);
+        m_segment = segment;
+        GST_OBJECT_UNLOCK(m_element);
+    }
+    restart();
+    return sought;
+}
+
+// Moves the file to where the segment starts, and with KEY_UNIT the segment to where that led.
+bool Streaming::seek_file(GstSegment& segment, GstSeekFlags flags)
+{
+    const bool after = lands_after(flags);
+    const GstClockTime target = (segment.position + (after ? GST_MSECOND - 1 : 0)) / GST_MSECOND;
+    const flvdmx::SeekMode mode = after ? flvdmx::SeekMode::forward : flvdmx::SeekMode::backward;
+    m_source.clear_flow();
+    const std::shared_lock<OpenLock> lock(open_lock);
+    const auto reached = m_file.seek(flvdmx::Milliseconds(target), mode | flvdmx::SeekMode::to_end_on_miss);
+    if (m_source.flow() != GST_FLOW_OK)
+        return false;
+    if (!reached)
+        return reached.error().kind() == flvdmx::Kind::miss; // at the end
+    m_position = to_clock_time(*reached);
+    if ((flags & GST_SEEK_FLAG_KEY_UNIT) != 0)
+        segment.start = segment.time = segment.position = m_position;
+    if (GST_CLOCK_TIME_IS_VALID(segment.stop) && segment.stop < segment.start)
+        segment.stop = segment.start;
+    return true;
+}
+
+// Plays on from where the file stands, which after a seek that failed is where it was.
+void Streaming::restart()
+{
+    m_next_tag = -1;
+    m_segment_is_new = true;
+    for (Output& output : m_outputs)
+        output.jump(m_position);
+    gst_flow_combiner_reset(m_combiner.get());
+    if ((m_segment.flags & GST_SEGMENT_FLAG_SEGMENT) != 0) {
+        GstMessage* const message = gst_message_new_segment_start(GST_OBJECT(m_element), GST_FORMAT_TIME,
+                                                                  static_cast<gint64>(m_segment.position));
+        gst_message_set_seqnum(message, m_sequence);
+        gst_element_post_message(m_element, message);
+    }
+    start_task();
+}
+
+// Makes the streaming thread leave what it waits for. The flushes of two seeks may overlap: the later one ends both.
+unsigned Streaming::begin_flush(guint32 sequence)
+{
+    const std::lock_guard<std::mutex> lock(m_flush_mutex);
+    GstEvent* const event = gst_event_new_flush_start();
+    gst_event_set_seqnum(event, sequence);
+    gst_pad_push_event(m_sink, gst_event_ref(event));
+    push_downstream(m_element, event);
+    return ++m_flushes;
+}
+
+// False when another flush has begun since.
+bool Streaming::end_flush(unsigned number, guint32 sequence)
+{
+    const std::lock_guard<std::mutex> lock(m_flush_mutex);
+    if (number != m_flushes)
+        return false;
+    GstEvent* const event = gst_event_new_flush_stop(TRUE);
+    gst_event_set_seqnum(event, sequence);
+    gst_pad_push_event(m_sink, gst_event_ref(event));
+    push_downstream(m_element, event);
+    return true;
+}
+
+bool Streaming::answer(GstQuery* query) const
+{
+    GST_OBJECT_LOCK(m_element);
+    const GstSegment segment = m_segment;
+    GST_OBJECT_UNLOCK(m_element);
+    const auto duration = static_cast<gint64>(segment.duration); // GST_CLOCK_TIME_NONE is -1
+    GstFormat format = GST_FORMAT_TIME;
+    switch (GST_QUERY_TYPE(query)) {
+    case GST_QUERY_POSITION: {
+        gst_query_parse_position(query, &format, nullptr);
+        const guint64 position = gst_segment_to_stream_time(&segment, GST_FORMAT_TIME, m_position);
+        if (format == GST_FORMAT_TIME)
+            gst_query_set_position(query, format, static_cast<gint64>(position));
+        return format == GST_FORMAT_TIME;
+    }
+    case GST_QUERY_DURATION:
+        gst_query_parse_duration(query, &format, nullptr);
+        if (format == GST_FORMAT_TIME && duration >= 0)
+            gst_query_set_duration(query, format, duration);
+        return format == GST_FORMAT_TIME && duration >= 0;
+    case GST_QUERY_SEEKING:
+        gst_query_parse_seeking(query, &format, nullptr, nullptr, nullptr);
+        gst_query_set_seeking(query, format, format == GST_FORMAT_TIME ? TRUE : FALSE, 0, duration);
+        return true;
+    case GST_QUERY_SEGMENT: {
+        const bool open_end = !GST_CLOCK_TIME_IS_VALID(segment.stop);
+        const guint64 start = gst_segment_to_stream_time(&segment, GST_FORMAT_TIME, segment.start);
+        const guint64 stop =
+            open_end ? segment.duration : gst_segment_to_stream_time(&segment, GST_FORMAT_TIME, segment.stop);
+        gst_query_set_segment(query, segment.rate, GST_FORMAT_TIME, static_cast<gint64>(start),
+                              static_cast<gint64>(stop));
+        return true;
+    }
+    default:
+        return false;
+    }
+}
+
+} // namespace flvdmx_gst

@@ -1,0 +1,102 @@
+/*
+ * What the element does: it opens the file, pushes its frames and seeks. The task of the sink pad runs loop(); seeks
+ * come from any thread and take the stream lock of the sink pad, which the task holds while it runs.
+ */
+#pragma once
+
+#include "output.h"
+#include "source.h"
+
+#include "flvdmx/flvdmx.hpp"
+
+#include <gst/base/gstflowcombiner.h>
+#include <gst/gst.h>
+
+#include <array>
+#include <atomic>
+#include <memory>
+#include <mutex>
+#include <optional>
+
+GST_DEBUG_CATEGORY_EXTERN(flvdmx_debug);
+
+namespace flvdmx_gst {
+
+/** Keeps the streaming thread of a pad from running, or waits for it to end its turn. */
+class StreamLock {
+public:
+    explicit StreamLock(GstPad* pad) : m_pad(pad) { GST_PAD_STREAM_LOCK(m_pad); }
+    ~StreamLock() { GST_PAD_STREAM_UNLOCK(m_pad); }
+    StreamLock(const StreamLock&) = delete;
+    StreamLock& operator=(const StreamLock&) = delete;
+
+private:
+    GstPad* const m_pad;
+};
+
+class Streaming {
+public:
+    /** Of an element, which outlives it, and its sink pad. */
+    Streaming(GstElement* element, GstPad* sink);
+    ~Streaming();
+    Streaming(const Streaming&) = delete;
+    Streaming& operator=(const Streaming&) = delete;
+
+    /** Starts or stops the task of the sink pad. */
+    bool activate(bool active);
+    /** Removes the pads and closes the file. The task is stopped. */
+    void close();
+
+private:
+    bool start_task();
+
+    /* The streaming thread. */
+    void loop();
+    void stop(GstFlowReturn flow);
+    void finish();
+    GstFlowReturn open();
+    GstFlowReturn expose();
+    void push_tags();
+    void add_output(size_t index, OwnedCaps caps);
+    GstFlowReturn push_frame();
+    GstFlowReturn push_to(Output& output, GstBuffer* buffer, const flvdmx::Frame& frame);
+    void find_damage(int64_t position);
+    void announce_config(const flvdmx::Frame& frame);
+    void push_segment();
+    void push_to_all(GstEvent* event) const;
+    bool has_output() const { return m_outputs[0].pad() != nullptr || m_outputs[1].pad() != nullptr; }
+    Output& output_of(flvdmx::Stream stream) { return m_outputs[stream == flvdmx::Stream::video ? 0 : 1]; }
+
+    /* Any thread. */
+    static gboolean handle_event(GstPad* pad, GstObject* parent, GstEvent* event);
+    static gboolean handle_query(GstPad* pad, GstObject* parent, GstQuery* query);
+    bool seek(GstEvent* event);
+    bool seek_file(GstSegment& segment, GstSeekFlags flags);
+    void restart();
+    unsigned begin_flush(guint32 sequence);
+    bool end_flush(unsigned number, guint32 sequence);
+    bool answer(GstQuery* query) const;
+
+    GstElement* const m_element;
+    GstPad* const m_sink;
+    Source m_source;
+    std::unique_ptr<GstFlowCombiner, void (*)(GstFlowCombiner*)> m_combiner;
+
+    /* Under the stream lock. */
+    bool m_active = false;
+    flvdmx::File m_file;
+    flvdmx::Info m_info;
+    std::unique_ptr<uint8_t[]> m_spare; // for frames whose size is not known beforehand
+    std::array<Output, 2> m_outputs;    // video, audio
+    int64_t m_next_tag = -1;            // where the reader stands, -1 after a jump
+    guint32 m_sequence = 0;             // number of the open or of the last seek, for all events
+    bool m_segment_is_new = false;
+
+    GstSegment m_segment{};                   // written under the stream lock and the object lock, read under either
+    std::atomic<GstClockTime> m_position = 0; // of what was pushed last
+
+    std::mutex m_flush_mutex; // held while a flush begins or ends
+    unsigned m_flushes = 0;   // begun
+};
+
+} // namespace flvdmx_gst

@@ -1,0 +1,241 @@
+// What the element delivers, beside the framework's own demuxer where that plays a file.
+
+#include "pipeline.h"
+
+#include "flvdmx/flvdmx.hpp"
+#include "support/flv_writer.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <array>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+
+namespace flvd_test {
+
+namespace {
+
+const std::string g_data = FLVDMX_TEST_DATA "/";
+
+// A file of the temporary folder, which is removed in the end.
+class TemporaryFile {
+public:
+    TemporaryFile()
+        : m_path(testing::TempDir() + "flvdmx-" + std::to_string(getpid()) + "-" + std::to_string(++s_number))
+    {
+    }
+    explicit TemporaryFile(const Bytes& bytes) : TemporaryFile()
+    {
+        std::ofstream(m_path, std::ios::binary)
+            .write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+    }
+    ~TemporaryFile() { std::filesystem::remove(m_path); }
+    TemporaryFile(const TemporaryFile&) = delete;
+    TemporaryFile& operator=(const TemporaryFile&) = delete;
+    const std::string& path() const { return m_path; }
+
+private:
+    inline static int s_number = 0;
+    std::string m_path;
+};
+
+Bytes Sound(uint8_t header, size_t size)
+{
+    Tags tags;
+    for (uint32_t i = 0; i < 20; ++i)
+        tags.push_back({8, i * 40, AudioData(header, Noise(size, i + 1))});
+    return File(tags, 4).bytes;
+}
+
+// Pictures that can be decoded, of noise: simple profile, 6 x 4 macroblocks, of which the alpha channel has as many.
+// The first byte crops them to 93 x 59.
+Bytes Vp6(bool alpha)
+{
+    Tags tags = {{18, 0, OnMetaData("width: 88 height: 56")}};
+    for (uint32_t i = 0; i < 10; ++i) {
+        const Bytes picture = Concat({{0x28, 0x30, 2, 0, 4, 6, 4, 6}, Noise(1800, i + 1)});
+        const Bytes before_alpha = alpha ? BigEndian(picture.size(), 3) : Bytes();
+        const Bytes data = Concat({{0x88}, before_alpha, picture, alpha ? picture : Bytes()});
+        tags.push_back({9, i * 40, VideoData(1, alpha ? CODEC_VP6A : CODEC_VP6, data)});
+    }
+    return File(tags, 1).bytes;
+}
+
+struct Medium {
+    const char* name;
+    bool video;
+    bool audio;
+    std::function<Bytes()> make = {}; // the sample of that name without
+};
+
+void PrintTo(const Medium& medium, std::ostream* out)
+{
+    *out << medium.name;
+}
+
+class Play : public testing::TestWithParam<Medium> {
+public:
+    // Decoded, or as they come out of the demuxer.
+    static std::map<std::string, std::vector<Arrival>> play(const std::string& path, const char* demuxer, bool decodes)
+    {
+        const std::string decoder = decodes ? "decodebin ! " : "";
+        const auto sink = [&](bool has, const char* name) {
+            return has ? decoder + "appsink sync=false name=" + name : std::string();
+        };
+        Pipeline pipeline(demuxed(path, sink(GetParam().video, "v"), sink(GetParam().audio, "a"), demuxer));
+        EXPECT_EQ(pipeline.play(), "") << demuxer;
+        return {{"v", pipeline.arrivals("v")}, {"a", pipeline.arrivals("a")}};
+    }
+};
+
+TEST_P(Play, GivesWhatTheFrameworksOwnDemuxerGives)
+{
+    const TemporaryFile made(GetParam().make ? GetParam().make() : Bytes());
+    const std::string path = GetParam().make ? made.path() : g_data + GetParam().name + ".flv";
+    for (const bool decodes : {false, true}) {
+        auto ours = play(path, "flvdmxdemux", decodes);
+        auto theirs = play(path, "flvdemux", decodes);
+        for (const auto& [stream, wanted] : {std::pair{"v", GetParam().video}, std::pair{"a", GetParam().audio}}) {
+            SCOPED_TRACE(std::string(stream) + (decodes ? " decoded" : ""));
+            ASSERT_EQ(ours[stream].size(), theirs[stream].size());
+            EXPECT_EQ(ours[stream].size() > 3, wanted);
+            for (size_t i = 0; i < ours[stream].size(); ++i) {
+                const Arrival &one = ours[stream][i], &other = theirs[stream][i];
+                ASSERT_EQ(one.checksum, other.checksum) << i;
+                const bool cut = decodes && i == 0; // by the decoder: what is before the segment of theirs
+                ASSERT_TRUE(cut || one.pts == other.pts) << i;
+                ASSERT_EQ(one.dts, other.dts) << i;
+                ASSERT_EQ(one.delta, other.delta) << i;
+                ASSERT_EQ(one.discont, i == 0) << i;
+            }
+        }
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Gst, Play,
+                         testing::Values(Medium{"avc_aac", true, true}, Medium{"avc_aac_index", true, true},
+                                         Medium{"avc_bframes_aac", true, true}, Medium{"avc_only", true, false},
+                                         Medium{"h263_mp3", true, true}, Medium{"screen", true, false},
+                                         Medium{"aac_only", false, true}, Medium{"mp3_only", false, true},
+                                         Medium{"speex_only", false, true}, Medium{"pcm_only", false, true},
+                                         Medium{"vp6", true, false, [] { return Vp6(false); }},
+                                         Medium{"vp6_alpha", true, false, [] { return Vp6(true); }},
+                                         Medium{"pcm_8_bits", false, true, [] { return Sound(0x0C, 400); }},
+                                         Medium{"adpcm", false, true, [] { return Sound(0x1E, 400); }},
+                                         Medium{"nellymoser", false, true, [] { return Sound(0x6A, 128); }},
+                                         Medium{"nellymoser_16khz", false, true, [] { return Sound(0x4A, 64); }},
+                                         Medium{"a_law", false, true, [] { return Sound(0x72, 160); }},
+                                         Medium{"mu_law", false, true, [] { return Sound(0x82, 160); }}),
+                         [](const testing::TestParamInfo<Medium>& i) { return std::string(i.param.name); });
+
+// What arrives of a damaged file. Pictures and sounds that come after damage are marked.
+struct DamagedCase {
+    const char* name;
+    size_t pictures;
+    size_t sounds;
+    size_t discontinuities; // of the video, the first picture among them
+    std::function<void(const std::string& path)> make = {};
+};
+
+void PrintTo(const DamagedCase& damaged, std::ostream* out)
+{
+    *out << damaged.name;
+}
+
+// 200 MB, 2000 pictures. Eight holes of zeros cover five pictures each, one covers 25: more than 2 MiB.
+void WriteHoles(const std::string& path)
+{
+    constexpr uint32_t pictures = 2000, picture_size = 100'000;
+    std::ofstream out(path, std::ios::binary);
+    const auto write = [&out](const Bytes& bytes) {
+        out.write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+    };
+    write(File({g_avc}, 1).bytes);
+    Bytes tag = File({Nalu(0, picture_size)}, 1).body();
+    const Bytes zeros(tag.size());
+    for (uint32_t i = 0; i < pictures; ++i) {
+        const bool in_hole = (i % 200 >= 100 && i % 200 < 105 && i < 1600) || (i >= 1700 && i < 1725);
+        const Bytes time = BigEndian(uint64_t{i} * 40, 3);
+        std::copy(time.begin(), time.end(), tag.begin() + 4);
+        write(in_hole ? zeros : tag);
+    }
+}
+
+class Damaged : public testing::TestWithParam<DamagedCase> {};
+
+TEST_P(Damaged, PlaysOn)
+{
+    const DamagedCase& wanted = GetParam();
+    const TemporaryFile made{Bytes()};
+    if (wanted.make)
+        wanted.make(made.path());
+    const std::string path = wanted.make ? made.path() : g_data + wanted.name + ".flv";
+    const auto sink = [](size_t count, const char* name) {
+        return count != 0 ? std::string("appsink sync=false name=") + name : std::string();
+    };
+    Pipeline pipeline(demuxed(path, sink(wanted.pictures, "v"), sink(wanted.sounds, "a")));
+    EXPECT_EQ(pipeline.play(), "");
+    const std::vector<Arrival> video = pipeline.arrivals("v");
+    EXPECT_EQ(video.size(), wanted.pictures);
+    EXPECT_EQ(pipeline.arrivals("a").size(), wanted.sounds);
+    EXPECT_EQ(std::count_if(video.begin(), video.end(), [](const Arrival& a) { return a.discont; }),
+              static_cast<std::ptrdiff_t>(wanted.discontinuities));
+}
+
+INSTANTIATE_TEST_SUITE_P(Gst, Damaged,
+                         testing::Values(DamagedCase{"damaged", 60, 104, 2}, DamagedCase{"truncated", 36, 62, 1},
+                                         DamagedCase{"holes", 1935, 0, 10, WriteHoles}),
+                         [](const testing::TestParamInfo<DamagedCase>& i) { return std::string(i.param.name); });
+
+// Configurations that change midway come as caps before the frames that need them; equal ones do not, nor are frames
+// after them marked as discontinuous.
+TEST(Playing, AnnouncesChangedConfigurations)
+{
+    const Tag other_sound = {8, 80, AacConfig({0x11, 0x90})};               // 48 kHz
+    const Bytes small_picture = {0x67, 0x42, 0xC0, 0x28, 0xDA, 0x11, 0xE4}; // 64 x 48
+    const Tag other_video = {9, 80, AvcConfig(AvcRecord({small_picture}, {{0x68, 0xCE, 0x3C, 0x80}}))};
+    const TemporaryFile file(File({g_avc, g_aac, Nalu(0), Raw(0), g_avc, Nalu(40), Raw(40), other_sound, other_video,
+                                   Nalu(80), Raw(80), Raw(120), Nalu(120)})
+                                 .bytes);
+    Pipeline pipeline(demuxed(file.path(), "appsink sync=false name=v", "appsink sync=false name=a"));
+    ASSERT_EQ(pipeline.play(), "");
+    const std::vector<Arrival> video = pipeline.arrivals("v"), audio = pipeline.arrivals("a");
+    ASSERT_EQ(video.size(), 4u);
+    ASSERT_EQ(audio.size(), 4u);
+    for (size_t i = 0; i < 4; ++i) {
+        EXPECT_NE(video[i].caps.find(i < 2 ? "width=(int)320, height=(int)240" : "width=(int)64, height=(int)48"),
+                  std::string::npos)
+            << video[i].caps;
+        EXPECT_NE(audio[i].caps.find(i < 2 ? "rate=(int)44100" : "rate=(int)48000"), std::string::npos);
+        EXPECT_EQ(video[i].discont, i == 0);
+    }
+}
+
+// What cannot be played is said, soon, and with words that help.
+TEST(Playing, RefusesWithReason)
+{
+    const TemporaryFile empty(File({{18, 0, OnMetaData("width: 320")}}).bytes);
+    const TemporaryFile unknown(
+        File({{9, 0, VideoData(1, 9, Noise(100))}, {9, 40, VideoData(1, 9, Noise(100))}}).bytes);
+    const struct {
+        std::string description;
+        const char* text;
+    } cases[] = {
+        {"filesrc location=" + empty.path() + " ! flvdmxdemux ! fakesink", "FLVD_ERR_NO_STREAM"},
+        {"filesrc location=" + g_data + "script_data.txt ! flvdmxdemux ! fakesink", "FLVD_ERR_FILE_HEADER"},
+        {"filesrc location=" + unknown.path() + " ! flvdmxdemux ! fakesink", "no stream of a codec"},
+        {"filesrc location=" + g_data + "avc_aac.flv ! queue ! flvdmxdemux ! fakesink", "can be pulled"},
+    };
+    for (const auto& [description, text] : cases) {
+        Pipeline pipeline(description);
+        const std::string error = pipeline.play();
+        EXPECT_NE(error, "") << description;
+        EXPECT_NE(error.find(text), std::string::npos) << error;
+    }
+}
+
+} // namespace
+
+} // namespace flvd_test

@@ -1,0 +1,186 @@
+// Seeks, queries and events; seeks from other threads while pipelines play.
+
+#include "pipeline.h"
+
+#include "flvdmx/flvdmx.hpp"
+
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <chrono>
+#include <optional>
+#include <random>
+#include <thread>
+
+namespace flvd_test {
+
+namespace {
+
+const std::string g_data = FLVDMX_TEST_DATA "/";
+constexpr int FLUSH = GST_SEEK_FLAG_FLUSH, KEY_UNIT = GST_SEEK_FLAG_FLUSH | GST_SEEK_FLAG_KEY_UNIT;
+constexpr int AFTER = KEY_UNIT | GST_SEEK_FLAG_SNAP_AFTER, BEFORE = KEY_UNIT | GST_SEEK_FLAG_SNAP_BEFORE,
+              ACCURATE = GST_SEEK_FLAG_FLUSH | GST_SEEK_FLAG_ACCURATE;
+
+std::string Path(const char* sample)
+{
+    return g_data + sample + ".flv";
+}
+
+struct SeekCase {
+    int64_t target;
+    int flags;
+    std::optional<int64_t> position; // of the tag that comes next, by the C++ header; none: the end
+    int64_t time = 0;                // when to decode it
+};
+
+// The pipelines are not there yet: all files that are open have one host.
+std::vector<SeekCase> MakeSeeks(const char* sample, int count)
+{
+    std::mt19937 random(7); // NOLINT(cert-msc51-cpp)
+    auto file = flvdmx::File::open(Path(sample));
+    const int64_t duration = file->info().duration.count();
+    std::vector<SeekCase> seeks;
+    for (int i = 0; i < count; ++i) {
+        constexpr int flags[] = {KEY_UNIT, BEFORE, AFTER, AFTER | GST_SEEK_FLAG_SNAP_BEFORE, ACCURATE, FLUSH};
+        SeekCase one = {std::uniform_int_distribution<int64_t>(0, duration)(random), flags[i % 6], {}};
+        const auto mode = one.flags == AFTER ? flvdmx::SeekMode::forward : flvdmx::SeekMode::backward;
+        if (file->seek(flvdmx::Milliseconds(one.target), mode)) {
+            auto frame = file->next_frame();
+            while (frame && frame->stream != flvdmx::Stream::video)
+                frame = file->next_frame();
+            one.position = frame->position;
+            one.time = frame->time.count();
+        }
+        seeks.push_back(one);
+    }
+    return seeks;
+}
+
+class Seek : public testing::TestWithParam<const char*> {};
+
+TEST_P(Seek, LandsWhereTheHeaderDoes)
+{
+    const std::vector<SeekCase> seeks = MakeSeeks(GetParam(), 200);
+    Pipeline pipeline(demuxed(Path(GetParam()), "appsink sync=false name=v", "fakesink async=false"));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    for (const SeekCase& seek : seeks) {
+        SCOPED_TRACE(std::to_string(seek.target) + " ms, flags " + std::to_string(seek.flags));
+        pipeline.forget_arrivals();
+        ASSERT_TRUE(pipeline.seek(seek.target, seek.flags));
+        ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+        const std::vector<Arrival> video = pipeline.arrivals("v");
+        ASSERT_EQ(!video.empty(), seek.position.has_value());
+        if (video.empty())
+            continue;
+        EXPECT_EQ(video[0].offset, static_cast<uint64_t>(*seek.position));
+        EXPECT_EQ(video[0].dts, static_cast<GstClockTime>(seek.time) * GST_MSECOND);
+        EXPECT_TRUE(video[0].discont);
+        EXPECT_FALSE(video[0].delta);
+        const bool moves = (seek.flags & GST_SEEK_FLAG_KEY_UNIT) != 0;
+        EXPECT_EQ(video[0].segment_start, static_cast<GstClockTime>(moves ? seek.time : seek.target) * GST_MSECOND);
+    }
+}
+
+INSTANTIATE_TEST_SUITE_P(Gst, Seek, testing::Values("avc_aac", "avc_aac_index", "avc_bframes_aac", "h263_mp3"),
+                         [](const testing::TestParamInfo<const char*>& i) { return std::string(i.param); });
+
+// A segment ends where it was told to, with a message when that was asked for, and playing goes on from there.
+TEST(Seeking, KeepsToSegments)
+{
+    Pipeline pipeline(demuxed(Path("avc_aac_index"), "appsink sync=false name=v", "appsink sync=false name=a"));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    pipeline.forget_arrivals();
+    ASSERT_TRUE(pipeline.seek(1000, ACCURATE | GST_SEEK_FLAG_SEGMENT, 2000));
+    GstMessage* message = pipeline.play_until(GST_MESSAGE_SEGMENT_DONE | GST_MESSAGE_EOS);
+    ASSERT_NE(message, nullptr);
+    gint64 end = 0;
+    ASSERT_EQ(GST_MESSAGE_TYPE(message), GST_MESSAGE_SEGMENT_DONE);
+    gst_message_parse_segment_done(message, nullptr, &end);
+    gst_message_unref(message);
+    EXPECT_EQ(end, 2 * static_cast<gint64>(GST_SECOND));
+    for (const char* sink : {"v", "a"}) { // which may be behind the message
+        for (int i = 0; i < 500 && pipeline.last_time(sink) <= 1900 * GST_MSECOND; ++i)
+            std::this_thread::sleep_for(std::chrono::milliseconds(10));
+        ASSERT_GT(pipeline.arrivals(sink).size(), 25u);
+        EXPECT_LT(pipeline.last_time(sink), 2 * GST_SECOND);
+    }
+    ASSERT_TRUE(pipeline.seek(2000, GST_SEEK_FLAG_NONE)); // without a flush
+    EXPECT_EQ(pipeline.play(), "");
+    EXPECT_GT(pipeline.last_time("v"), 2900 * GST_MSECOND);
+}
+
+TEST(Seeking, RefusesWhatItCannotAndEndsBeyondTheEnd)
+{
+    Pipeline pipeline(demuxed(Path("avc_aac"), "appsink sync=false name=v", "fakesink"));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    EXPECT_FALSE(pipeline.seek(0, FLUSH, 1000, -1.0));
+    EXPECT_FALSE(gst_element_seek_simple(pipeline.element(), GST_FORMAT_BYTES, GST_SEEK_FLAG_FLUSH, 13));
+    EXPECT_TRUE(pipeline.seek(3'600'000, ACCURATE));
+    EXPECT_EQ(pipeline.play(), "");
+}
+
+TEST(Seeking, AnswersQueries)
+{
+    Pipeline pipeline(demuxed(Path("avc_aac"), "appsink sync=false name=v", "fakesink async=false"));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    gint64 value = 0;
+    EXPECT_TRUE(gst_element_query_duration(pipeline.element(), GST_FORMAT_TIME, &value));
+    EXPECT_EQ(value, 2508 * static_cast<gint64>(GST_MSECOND));
+    ASSERT_TRUE(pipeline.seek(1500, KEY_UNIT) && pipeline.go_to(GST_STATE_PAUSED));
+    EXPECT_TRUE(gst_element_query_position(pipeline.element(), GST_FORMAT_TIME, &value));
+    EXPECT_EQ(value, 1023 * static_cast<gint64>(GST_MSECOND));
+    GstQuery* const query = gst_query_new_seeking(GST_FORMAT_TIME);
+    gboolean seekable = FALSE;
+    EXPECT_TRUE(gst_element_query(pipeline.element(), query));
+    gst_query_parse_seeking(query, nullptr, &seekable, nullptr, &value);
+    EXPECT_TRUE(seekable);
+    EXPECT_EQ(value, 2508 * static_cast<gint64>(GST_MSECOND));
+    gst_query_unref(query);
+}
+
+// Until the time is over.
+void SeekAtRandom(Pipeline& pipeline, unsigned seed, std::chrono::steady_clock::time_point end)
+{
+    std::mt19937 random(seed);
+    while (std::chrono::steady_clock::now() < end) {
+        constexpr int flags[] = {KEY_UNIT, AFTER, ACCURATE, FLUSH};
+        pipeline.seek(std::uniform_int_distribution<int64_t>(0, 2500)(random), flags[random() % 4]);
+        std::this_thread::sleep_for(std::chrono::microseconds(random() % 2000));
+    }
+}
+
+// Several pipelines play, are sought from two threads each, and others are opened and ended beside them. All still
+// reach their end.
+TEST(Seeking, HoldsFromManyThreads)
+{
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(2);
+    std::vector<std::unique_ptr<Pipeline>> pipelines;
+    std::vector<std::thread> threads;
+    for (const char* sample : {"avc_aac", "avc_aac_index", "h263_mp3"}) {
+        pipelines.push_back(std::make_unique<Pipeline>(
+            demuxed(Path(sample), "fakesink sync=true", "fakesink sync=true"))); // by the clock, so that they last
+        Pipeline& pipeline = *pipelines.back();
+        ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+        gst_element_set_state(pipeline.element(), GST_STATE_PLAYING);
+        for (unsigned i = 0; i < 2; ++i)
+            threads.emplace_back([&pipeline, i, end] { SeekAtRandom(pipeline, i, end); });
+    }
+    int played = 0;
+    for (; std::chrono::steady_clock::now() < end; ++played) {
+        Pipeline other(demuxed(Path("avc_only"), "fakesink sync=false", ""));
+        ASSERT_EQ(other.play(), "");
+        Pipeline ended_early(demuxed(Path("damaged"), "fakesink sync=false", "fakesink sync=false"));
+        gst_element_set_state(ended_early.element(), GST_STATE_PLAYING);
+    }
+    for (std::thread& thread : threads)
+        thread.join();
+    EXPECT_GT(played, 0);
+    for (const auto& pipeline : pipelines) {
+        EXPECT_TRUE(pipeline->seek(2000, KEY_UNIT));
+        EXPECT_EQ(pipeline->play(), "");
+    }
+}
+
+} // namespace
+
+} // namespace flvd_test
