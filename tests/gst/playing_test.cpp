@@ -237,7 +237,7 @@ TEST(Playing, TellsTags)
     GstTagList* tags = gst_tag_list_new_empty();
     for (int i = 0; i < 2; ++i) { // of the file, of the stream
         GstMessage* const message = pipeline.play_until(GST_MESSAGE_TAG);
-        ASSERT_NE(message, nullptr);
+        ASSERT_TRUE(message != nullptr && GST_MESSAGE_TYPE(message) == GST_MESSAGE_TAG);
         GstTagList* more = nullptr;
         gst_message_parse_tag(message, &more);
         gst_tag_list_insert(tags, more, GST_TAG_MERGE_APPEND);
