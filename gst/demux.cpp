@@ -109,6 +109,6 @@ static void flvdmx_demux_class_init(FlvdmxDemuxClass* klass)
     gst_element_class_add_static_pad_template(element_class, &sink_template);
     add_template(element_class, "video", flvdmx_gst::video_template_caps());
     add_template(element_class, "audio", flvdmx_gst::audio_template_caps());
-    gst_element_class_set_static_metadata(element_class, "Robust FLV demuxer", "Codec/Demuxer",
-                                          "Demultiplexes FLV files, also damaged ones", "the flvdmx authors");
+    gst_element_class_set_static_metadata(element_class, "FLV demultiplexer", "Codec/Demuxer",
+                                          "Plays FLV files, also damaged ones", "the flvdmx authors");
 }

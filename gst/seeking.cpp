@@ -4,6 +4,7 @@
 
 #include "open_lock.h"
 
+#include <algorithm>
 #include <shared_mutex>
 
 namespace flvdmx_gst {
@@ -155,7 +156,8 @@ bool Streaming::answer(GstQuery* query) const
     switch (GST_QUERY_TYPE(query)) {
     case GST_QUERY_POSITION: {
         gst_query_parse_position(query, &format, nullptr);
-        const guint64 position = gst_segment_to_stream_time(&segment, GST_FORMAT_TIME, m_position);
+        const guint64 position =
+            gst_segment_to_stream_time(&segment, GST_FORMAT_TIME, std::max<guint64>(m_position, segment.start));
         if (format == GST_FORMAT_TIME)
             gst_query_set_position(query, format, static_cast<gint64>(position));
         return format == GST_FORMAT_TIME;

@@ -1,12 +1,18 @@
-// Ends the framework in the end, which lets its tracer report what is still alive.
+// Runs the tests with the plugin of this build and with the framework's tracer of leaks, which speaks when it ends.
 
 #include <gst/gst.h>
 #include <gtest/gtest.h>
 
 int main(int argc, char** argv)
 {
-    gst_init(&argc, &argv);
     testing::InitGoogleTest(&argc, argv);
+    if (GTEST_FLAG_GET(list_tests))
+        return RUN_ALL_TESTS();
+    g_setenv("GST_PLUGIN_PATH", FLVDMX_PLUGIN_PATH, TRUE);
+    g_setenv("GST_REGISTRY", FLVDMX_GST_REGISTRY, TRUE);
+    g_setenv("GST_TRACERS", "leaks", TRUE);
+    g_setenv("GST_DEBUG", "GST_TRACER:7", FALSE);
+    gst_init(nullptr, nullptr);
     const int result = RUN_ALL_TESTS();
     gst_deinit();
     return result;

@@ -213,6 +213,46 @@ TEST(Playing, AnnouncesChangedConfigurations)
     }
 }
 
+// A sink does not wait for sound that ended long before, when the queues hold less than what is left.
+TEST(Playing, FillsGaps)
+{
+    Tags tags = {g_avc, g_aac, Raw(0), Raw(23)};
+    for (uint32_t i = 0; i < 250; ++i)
+        tags.push_back(Nalu(i * 40));
+    const TemporaryFile file(File(tags).bytes);
+    const std::string branch = " ! queue max-size-buffers=20 ! appsink sync=false ";
+    Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux name=d d.video" + branch + "d.audio" +
+                      branch);
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    ASSERT_TRUE(pipeline.seek(5000, GST_SEEK_FLAG_FLUSH | GST_SEEK_FLAG_KEY_UNIT));
+    EXPECT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    EXPECT_EQ(pipeline.play(), "");
+}
+
+TEST(Playing, TellsTags)
+{
+    const Tag meta = {18, 0, OnMetaData("title: 'Film creator: 'Somebody comment: %2.0.2.255.254 videodatarate: 500")};
+    const TemporaryFile file(File({meta, g_avc, Nalu(0), Nalu(40)}, 1).bytes);
+    Pipeline pipeline(demuxed(file.path(), "appsink sync=false", ""));
+    GstTagList* tags = gst_tag_list_new_empty();
+    for (int i = 0; i < 2; ++i) { // of the file, of the stream
+        GstMessage* const message = pipeline.play_until(GST_MESSAGE_TAG);
+        ASSERT_TRUE(message != nullptr && GST_MESSAGE_TYPE(message) == GST_MESSAGE_TAG);
+        GstTagList* more = nullptr;
+        gst_message_parse_tag(message, &more);
+        gst_tag_list_insert(tags, more, GST_TAG_MERGE_APPEND);
+        gst_tag_list_unref(more);
+        gst_message_unref(message);
+    }
+    gchar* const text = gst_tag_list_to_string(tags);
+    const std::string told = text;
+    g_free(text);
+    gst_tag_list_unref(tags);
+    for (const char* wanted : {"title=(string)Film", "artist=(string)Somebody", "bitrate=(uint)500000", "H.264"})
+        EXPECT_NE(told.find(wanted), std::string::npos) << told;
+    EXPECT_EQ(told.find("comment"), std::string::npos) << told; // which is no UTF-8
+}
+
 // What cannot be played is said, soon, and with words that help.
 TEST(Playing, RefusesWithReason)
 {

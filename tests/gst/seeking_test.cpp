@@ -129,6 +129,9 @@ TEST(Seeking, AnswersQueries)
     ASSERT_TRUE(pipeline.seek(1500, KEY_UNIT) && pipeline.go_to(GST_STATE_PAUSED));
     EXPECT_TRUE(gst_element_query_position(pipeline.element(), GST_FORMAT_TIME, &value));
     EXPECT_EQ(value, 1023 * static_cast<gint64>(GST_MSECOND));
+    ASSERT_TRUE(pipeline.seek(1500, ACCURATE) && pipeline.go_to(GST_STATE_PAUSED));
+    EXPECT_TRUE(gst_element_query_position(pipeline.element(), GST_FORMAT_TIME, &value));
+    EXPECT_EQ(value, 1500 * static_cast<gint64>(GST_MSECOND));
     GstQuery* const query = gst_query_new_seeking(GST_FORMAT_TIME);
     gboolean seekable = FALSE;
     EXPECT_TRUE(gst_element_query(pipeline.element(), query));
