@@ -175,8 +175,8 @@ void WarnOfLossApart(const std::string& file)
     options.restarting_timestamps = true;
     Input input(file, options);
     Losses losses(input);
-    for (const flvdmx::Frame& frame : input.file.frames())
-        losses.Take(frame);
+    while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any))
+        losses.Take(*frame);
     losses.Finish();
     losses.Warn();
 }

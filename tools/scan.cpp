@@ -3,6 +3,7 @@
 
 #include <algorithm>
 
+#include "tools/frame_source.h"
 #include "tools/progress.h"
 #include "tools/tags.h"
 
@@ -10,8 +11,7 @@ namespace tool {
 
 double FileScan::AverageDistanceMs() const
 {
-    const auto whole = static_cast<double>((newestKeyframe - firstKeyframe).count());
-    return keyframes < 2 ? 0 : whole / static_cast<double>(keyframes - 1);
+    return keyframes < 2 ? 0 : static_cast<double>(allDistances.count()) / static_cast<double>(keyframes - 1);
 }
 
 FileScan ScanFile(const std::string& name)
@@ -23,19 +23,21 @@ FileScan ScanFile(const std::string& name)
     Takes takes;
     Losses losses(input);
     ProgressBar progress(name, input.info.size);
-    for (const flvdmx::Frame& frame : input.file.frames()) {
-        progress.ShowDone(frame.position);
-        losses.Take(frame);
-        const flvdmx::Milliseconds time = takes.Continue(frame);
-        ++(frame.stream == flvdmx::Stream::video ? scan.videoFrames : scan.audioFrames);
-        if (frame.stream != flvdmx::Stream::video || !frame.keyframe)
+    flvdmx::Milliseconds keyframe{}; // the last one
+    while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
+        progress.ShowDone(frame->position);
+        losses.Take(*frame);
+        const bool video = frame->stream == flvdmx::Stream::video;
+        const flvdmx::Milliseconds time = takes.Continue(*frame);
+        ++(video ? scan.videoFrames : scan.audioFrames);
+        if (!video || !frame->keyframe)
             continue;
-        if (scan.keyframes++ == 0)
-            scan.firstKeyframe = time;
-        else
-            scan.longestDistance = std::max(scan.longestDistance, time - scan.newestKeyframe);
-        scan.lastKeyframe = frame.time;
-        scan.newestKeyframe = time;
+        if (scan.keyframes++ > 0) {
+            scan.longestDistance = std::max(scan.longestDistance, time - keyframe);
+            scan.allDistances += time - keyframe;
+        }
+        scan.lastKeyframe = frame->time;
+        keyframe = time;
     }
     losses.Finish();
     scan.bytesLeftOut = losses.Bytes();

@@ -15,15 +15,14 @@ struct FileScan {
     uint64_t audioFrames = 0;
     uint64_t keyframes = 0;                             /**< of video */
     std::optional<flvdmx::Milliseconds> lastKeyframe{}; /**< from the first timestamp */
-    flvdmx::Milliseconds longestDistance{};             /**< of two keyframes */
+    flvdmx::Milliseconds longestDistance{};             /**< of one keyframe to the next */
+    flvdmx::Milliseconds allDistances{};                /**< their sum */
     flvdmx::Milliseconds played{};                      /**< duration, times going on where they start again */
     uint64_t restarts = 0;                              /**< of the timestamps */
     int64_t bytesLeftOut = 0;
 
     /** @return average distance of the keyframes, 0 for fewer than two */
     double AverageDistanceMs() const;
-    flvdmx::Milliseconds firstKeyframe{}; /**< of times that go on */
-    flvdmx::Milliseconds newestKeyframe{};
 };
 
 /** Plays the whole file. */
