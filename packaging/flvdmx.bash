@@ -12,6 +12,9 @@ _flvdmx() {
         [extract]="--help --force --output --stream"
         [check]="--help --jobs --json --jump --max-gap"
         [plot]="--help --force --output"
+        [repair]="--help --dry-run --force --keep-times --output"
+        [index]="--help --dry-run --force --output"
+        [cut]="--help --dry-run --force --from --keep-times --output --to"
         [help]="--help"
     )
     local command=""

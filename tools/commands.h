@@ -70,12 +70,26 @@ struct PlotOptions {
     bool force = false; /**< overwrite */
 };
 
+/** Of the commands that write a new FLV file. */
+struct RewriteOptions {
+    std::string file;
+    std::string out;
+    bool force = false;            /**< overwrite */
+    bool dryRun = false;           /**< write nothing */
+    bool keepTimes = false;        /**< leave the timestamps as they are */
+    std::optional<int32_t> fromMs; /**< cut: the beginning */
+    std::optional<int32_t> toMs;   /**< cut: the end */
+};
+
 int RunInfo(const InfoOptions& options);
 int RunFrames(const FramesOptions& options);
 int RunSeek(const SeekOptions& options);
 int RunExtract(const ExtractOptions& options);
 int RunCheck(const CheckOptions& options);
 int RunPlot(const PlotOptions& options);
+int RunRepair(const RewriteOptions& options);
+int RunIndex(const RewriteOptions& options);
+int RunCut(const RewriteOptions& options);
 
 } // namespace tool
 

@@ -255,6 +255,50 @@ void AddPlot(CLI::App& app, PlotOptions& options)
                     "  flvdmx plot clip.flv -o clip.svg");
 }
 
+CLI::App* AddRewrite(CLI::App& app, const char* name, const char* help, RewriteOptions& options)
+{
+    CLI::App* const command = app.add_subcommand(name, help);
+    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
+    command->add_option("-o,--output", options.out, "FLV file to write; - is standard output")
+        ->required()
+        ->check(IS_NAME)
+        ->type_name("OUT");
+    command->add_flag("--force", options.force, "Overwrite a file that exists");
+    command->add_flag("--dry-run", options.dryRun, "Say what would be written, and write nothing");
+    return command;
+}
+
+void AddRepair(CLI::App& app, RewriteOptions& options)
+{
+    CLI::App* const command =
+        AddRewrite(app, "repair", "Write a valid file from everything that can be played", options);
+    command->add_flag("--keep-times", options.keepTimes, "Leave timestamps that restart or jump as they are");
+    command->footer("Frames and codec configurations are kept, damage and other bytes are dropped. The metadata gets\n"
+                    "a new duration, file size and keyframe index. Timestamps that go back by more than a second or\n"
+                    "forward by more than ten are made continuous.\n\n"
+                    "  flvdmx repair recording.flv -o repaired.flv");
+}
+
+void AddIndex(CLI::App& app, RewriteOptions& options)
+{
+    AddRewrite(app, "index", "Copy an undamaged file and give it a keyframe index", options)
+        ->footer("All tags but the metadata are copied as they are.\n\n"
+                 "  flvdmx index recording.flv -o seekable.flv");
+}
+
+void AddCut(CLI::App& app, RewriteOptions& options)
+{
+    CLI::App* const command = AddRewrite(app, "cut", "Write a part of a file, with an index of its own", options);
+    AddTime(
+        command, "--from", [&options](int32_t ms) { options.fromMs = ms; }, "Begin at the keyframe at or before TIME");
+    AddTime(
+        command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "End before the keyframe at or after TIME");
+    command->add_flag("--keep-times", options.keepTimes, "Leave the timestamps as they are instead of starting at 0");
+    command->footer(fmt::format("{}\n\n"
+                                "  flvdmx cut film.flv --from 1:00 --to 2:30 -o part.flv",
+                                TIME_HELP));
+}
+
 // CLI11 takes `-5` for an option. After a blank it is a value, and ParseTime passes over blanks.
 std::vector<std::string> Arguments(int argc, char** argv)
 {
@@ -307,7 +351,7 @@ void AddHelp(CLI::App& app, std::string& topic)
 
 int Run(int argc, char** argv)
 {
-    CLI::App app("Shows what is in FLV files, judges them and takes them apart.", "flvdmx");
+    CLI::App app("Shows what is in FLV files, checks, repairs and cuts them.", "flvdmx");
     app.set_version_flag("-V,--version", "flvdmx " FLVDMX_VERSION);
     app.add_flag_callback("--verbose", ShowCodes, "Tell the library's code and line of a failure")->trigger_on_parse();
     app.fallthrough();
@@ -319,6 +363,9 @@ int Run(int argc, char** argv)
     ExtractOptions extract;
     CheckOptions check;
     PlotOptions plot;
+    RewriteOptions repair;
+    RewriteOptions index;
+    RewriteOptions cut;
     std::string topic;
     AddInfo(app, info);
     AddFrames(app, frames);
@@ -326,11 +373,15 @@ int Run(int argc, char** argv)
     AddExtract(app, extract);
     AddCheck(app, check);
     AddPlot(app, plot);
+    AddRepair(app, repair);
+    AddIndex(app, index);
+    AddCut(app, cut);
     AddHelp(app, topic);
     try {
         app.parse(Arguments(argc, argv));
         if (app.get_subcommands().empty())
-            throw CLI::RequiredError("A command (info, frames, seek, extract, check, plot or help)");
+            throw CLI::RequiredError(
+                "A command (info, frames, seek, extract, check, plot, repair, index, cut or help)");
     } catch (const CLI::CallForHelp&) {
         Print(app.help());
         return DONE;
@@ -347,6 +398,9 @@ int Run(int argc, char** argv)
         {"extract", [&] { return RunExtract(extract); }},
         {"check", [&] { return RunCheck(check); }},
         {"plot", [&] { return RunPlot(plot); }},
+        {"repair", [&] { return RunRepair(repair); }},
+        {"index", [&] { return RunIndex(index); }},
+        {"cut", [&] { return RunCut(cut); }},
         {"help", [&] {
              Print(topic.empty() ? app.get_formatter()->make_help(&app, "flvdmx", CLI::AppFormatMode::Normal)
                                  : app.get_subcommand(topic)->help("flvdmx"));

@@ -62,6 +62,18 @@ bool IsSpecial(const std::string& path)
     return stat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode);
 }
 
+// Makes a file whose name the last six letters of `path` complete. Null when that fails.
+std::FILE* CreateTemporary(std::string& path)
+{
+    const int descriptor = mkostemp(path.data(), O_CLOEXEC);
+    if (descriptor < 0)
+        return nullptr;
+    const mode_t mask = umask(0);
+    umask(mask);
+    fchmod(descriptor, NEW_FILE_MODE & ~mask);
+    return fdopen(descriptor, "wb");
+}
+
 } // namespace
 
 OutputFile::OutputFile(std::string path, const std::string& input, bool force) : m_path(std::move(path)), m_input(input)
@@ -73,16 +85,18 @@ OutputFile::OutputFile(std::string path, const std::string& input, bool force) :
     std::error_code failure;
     if (std::filesystem::equivalent(m_path, PathOf(input), failure))
         throw FileError(input, fmt::format("{} is the file to be read, it is not overwritten", Printable(m_path)));
-    const bool special = IsSpecial(m_path);
-    const int flags = O_WRONLY | O_CLOEXEC | (special ? 0 : O_CREAT | (force ? O_TRUNC : O_EXCL));
-    const int descriptor = open(m_path.c_str(), flags, NEW_FILE_MODE);
-    if (descriptor < 0 && errno == EEXIST)
-        throw FileError(input, fmt::format("{} exists: --force overwrites it", Printable(m_path)));
-    if (descriptor < 0)
+    if (IsSpecial(m_path)) {
+        m_file = std::fopen(m_path.c_str(), "wb");
+    } else {
+        if (!force && std::filesystem::exists(m_path, failure))
+            throw FileError(input, fmt::format("{} exists: --force overwrites it", Printable(m_path)));
+        m_temporary = m_path + ".XXXXXX";
+        m_file = CreateTemporary(m_temporary);
+    }
+    if (m_file == nullptr)
         Fail();
-    m_file = fdopen(descriptor, "wb");
-    if (!special)
-        m_slot = Remember(m_path.c_str());
+    if (!m_temporary.empty())
+        m_slot = Remember(m_temporary.c_str());
 }
 
 OutputFile::~OutputFile()
@@ -90,7 +104,7 @@ OutputFile::~OutputFile()
     if (m_file != nullptr && !IsStandard())
         std::fclose(m_file);
     if (m_slot >= 0)
-        unlink(m_path.c_str());
+        unlink(m_temporary.c_str());
     Forget(m_slot);
 }
 
@@ -112,6 +126,8 @@ void OutputFile::Finish()
     if (IsStandard())
         return Flush();
     if (std::fclose(std::exchange(m_file, nullptr)) != 0)
+        Fail();
+    if (!m_temporary.empty() && std::rename(m_temporary.c_str(), m_path.c_str()) != 0)
         Fail();
     Forget(std::exchange(m_slot, -1));
 }

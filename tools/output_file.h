@@ -16,7 +16,8 @@ namespace tool {
 class OutputFile {
 public:
     /**
-     * Creates `path`; "-" is standard output. A file that exists is refused without `force`, the file `input` always.
+     * Creates a file that Finish() gives the name `path`; "-" is standard output. A file that exists is refused without
+     * `force`, the file `input` always.
      */
     OutputFile(std::string path, const std::string& input, bool force);
     ~OutputFile();
@@ -41,6 +42,7 @@ private:
 
     const std::string m_path;
     const std::string m_input;
+    std::string m_temporary; // the name until it is finished
     std::FILE* m_file = nullptr;
     int m_slot = -1; // of its name in the list of what is removed
     uint64_t m_written = 0;

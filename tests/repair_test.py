@@ -1,0 +1,122 @@
+"""`flvdmx repair`, `index` and `cut`: files that `check` finds nothing wrong with, and that hold the same frames."""
+import os
+import random
+
+from flv import retag, split_tags
+from tool_test import DATA, SAMPLES, Case, json_frames, run, sample, sample_bytes
+
+STEP = int(os.environ.get("FLVDMX_SAMPLE", "1"))  # of the damaged copies
+HEADER, TAGS = split_tags(sample_bytes("avc_aac"))
+
+
+def at(tag, time):
+    """The tag with another timestamp."""
+    return tag[:4] + (time & 0xFFFFFF).to_bytes(3, "big") + bytes([time >> 24]) + tag[8:]
+
+
+def time_of(tag):
+    return int.from_bytes(tag[4:7], "big") | tag[7] << 24
+
+
+class Rewritten(Case):
+    def rewrite(self, command, path, *options, stderr="(?s:.*)"):
+        """The new file, which must be sound."""
+        out = path.parent / "out.flv"
+        self.tool(command, path, "-o", out, "--force", *options, stderr=stderr)
+        self.tool("check", out)
+        return out
+
+    def frames(self, path):
+        return json_frames(run("frames", "--json", path).stdout)
+
+    def assertSamePayloads(self, new, old):
+        self.assertEqual([(f[0], f[2], f[3]) for f in self.frames(new)], [(f[0], f[2], f[3]) for f in self.frames(old)])
+
+
+class Repair(Rewritten):
+    def test_every_sample(self):
+        for name in SAMPLES:
+            with self.subTest(name=name):
+                out = self.rewrite("repair", self.write("in.flv", sample_bytes(name)))
+                self.assertEqual(self.frames(out), self.frames(sample(name)))
+
+    def test_damaged_copies(self):
+        """Bytes that are changed, inserted and cut out; a copy that cannot be opened is not written."""
+        for seed in range(0, 200, STEP):
+            random.seed(seed)
+            data = bytearray(sample_bytes(random.choice(SAMPLES)))
+            for _ in range(random.randint(1, 6)):
+                place, size = random.randrange(400, len(data)), random.randint(1, 300)
+                data[place:place + random.choice((0, size))] = random.randbytes(random.choice((0, size)))
+            path = self.write("in.flv", bytes(data))
+            with self.subTest(seed=seed):
+                if run("frames", path).returncode == 0:
+                    self.assertSamePayloads(self.rewrite("repair", path), path)
+
+    def test_times(self):
+        """A recording that starts again, one with a gap, a single wrong time, and a step back that is jitter."""
+        media = [tag for tag in TAGS if tag[0] != 18]
+        last = time_of(media[-1])
+        for name, tags, duration in (
+                ("restart", TAGS + media, 2 * last + 23),
+                ("gap", TAGS + [at(tag, time_of(tag) + 100_000) for tag in media], 2 * last + 23),
+                ("wrong", TAGS[:50] + [at(TAGS[50], 900_000)] + TAGS[51:], last),
+                ("jitter", TAGS[:50] + [at(TAGS[50], time_of(TAGS[50]) - 200)] + TAGS[51:], last)):
+            path = self.write("in.flv", HEADER + b"".join(tags))
+            with self.subTest(name=name):
+                out = self.rewrite("repair", path)
+                self.assertSamePayloads(out, path)
+                self.assertAlmostEqual(self.frames(out)[-1][1], duration, delta=80)
+        kept = path.parent / "kept.flv"
+        self.tool("repair", "--keep-times", path, "-o", kept)
+        self.assertEqual(self.frames(kept), self.frames(path))
+
+    def test_metadata_and_configurations(self):
+        """Other properties are kept as they are, those that are wrong now replaced; each frame has its configuration."""
+        script = (b"\2\0\x0aonMetaData\x08\0\0\0\3\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09"
+                  b"\0\x08duration\0\x7f\xef" + bytes(6) + b"\0\0\x09")
+        config = next(tag for tag in TAGS if tag[0] == 9)
+        changed = retag(config, config[11:14] + bytes(2) + config[16:17] + b"\x4d" + config[18:-4])
+        tags = [retag(TAGS[0], script)] + TAGS[1:90] + [changed] + TAGS[90:]
+        out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(tags)))
+        data = out.read_bytes()
+        self.assertIn(b"\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09", data)
+        self.assertEqual(data.count(b"duration"), 1)
+        for kind in (8, 9):  # a configuration comes before the first frame that needs it
+            self.assertEqual([tag[11:] for tag in split_tags(data)[1] if tag[0] == kind],
+                             [tag[11:] for tag in tags if tag[0] == kind and tag[12] != 2])  # 2: end of sequence
+
+    def test_output(self):
+        """Nothing but a finished file has the name."""
+        path = self.write("in.flv", sample_bytes("avc_aac"))
+        old = path.parent / "old.flv"
+        old.write_bytes(b"old")
+        for options, words in (((path, "-o", old), "exists"), ((path, "-o", path, "--force"), "is the file to be read"),
+                               ((path, "-o", "/dev/full"), "No space left"),
+                               ((self.write("x", b"FLV"), "-o", old, "--force"), "damaged or cut short")):
+            self.tool("repair", *options, code=1, stderr=f".*{words}.*\n")
+        self.assertRegex(self.tool("repair", "--dry-run", path, "-o", old), "^would write: 63 pictures and 109 audio")
+        self.assertEqual((old.read_bytes(), sorted(os.listdir(path.parent))), (b"old", ["in.flv", "old.flv"]))
+        self.assertEqual(path.read_bytes(), sample_bytes("avc_aac"))
+
+
+class IndexAndCut(Rewritten):
+    def test_index(self):
+        path = self.write("in.flv", sample_bytes("avc_aac"))
+        out = self.rewrite("index", path)
+        self.assertEqual(split_tags(out.read_bytes())[1][1:], TAGS[1:])
+        self.assertIn("3 entries", self.tool("info", out))
+        self.tool("index", DATA / "damaged.flv", "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'\n")
+
+    def test_cut(self):
+        """Parts that follow each other hold every frame once."""
+        whole = self.frames(sample("avc_aac_index"))
+        path = self.write("in.flv", sample_bytes("avc_aac_index"))
+        for times in (("--from", "0", "--to", "1"), ("--from", "1.3"), ("--to", "0.5")):
+            out = self.rewrite("cut", path, "--keep-times", *times)
+            first = min(time_of(tag) for tag in split_tags(out.read_bytes())[1][1:])
+            kept = [(kind, time + first, *rest) for kind, time, *rest in self.frames(out)]
+            end = 1223 if "1" in times else 823 if "0.5" in times else 10_000
+            self.assertEqual(sorted(kept), sorted((k, t, *r) for k, t, *r in whole if first <= t < end))
+            moved = self.frames(self.rewrite("cut", path, *times))
+            self.assertEqual([f[1] for f in moved], [f[1] - first for f in kept])

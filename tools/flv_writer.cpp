@@ -1,0 +1,289 @@
+// Writes FLV files.
+#include "tools/flv_writer.h"
+
+#include <algorithm>
+#include <array>
+#include <cstring>
+#include <iterator>
+#include <utility>
+
+#include "flvdmx/layers.h"
+#include "tools/tags.h"
+
+namespace tool {
+
+namespace {
+
+using Buffer = std::vector<uint8_t>;
+using flvdmx::Bytes;
+
+constexpr size_t FILE_HEADER_SIZE = 9;
+constexpr uint8_t HAS_AUDIO = 4; // TypeFlags
+constexpr uint8_t HAS_VIDEO = 1;
+constexpr size_t INDEX_MAX = 65536; // entries; of more keyframes every second, third and so on is listed
+constexpr double MS_PER_SECOND = 1000;
+
+// AMF0 type markers.
+enum : uint8_t {
+    NUMBER = 0,
+    BOOLEAN = 1,
+    STRING = 2,
+    OBJECT = 3,
+    NULL_VALUE = 5,
+    UNDEFINED = 6,
+    REFERENCE = 7,
+    ECMA_ARRAY = 8,
+    OBJECT_END = 9,
+    STRICT_ARRAY = 10,
+    DATE = 11,
+    LONG_STRING = 12
+};
+constexpr int MAX_DEPTH = 16;
+
+constexpr std::array<std::string_view, 5> RENEWED = {"duration", "filesize", "lasttimestamp", "lastkeyframetimestamp",
+                                                     "keyframes"};
+
+void Put(Buffer& out, const Buffer& bytes)
+{
+    out.insert(out.end(), bytes.begin(), bytes.end());
+}
+
+void PutInteger(Buffer& out, uint64_t value, size_t size)
+{
+    while (size-- != 0)
+        out.push_back(static_cast<uint8_t>(value >> 8 * size));
+}
+
+void PutNumber(Buffer& out, double value)
+{
+    uint64_t bits = 0;
+    static_assert(sizeof bits == sizeof value);
+    std::memcpy(&bits, &value, sizeof bits);
+    out.push_back(NUMBER);
+    PutInteger(out, bits, sizeof bits);
+}
+
+void PutKey(Buffer& out, std::string_view key)
+{
+    PutInteger(out, key.size(), 2);
+    out.insert(out.end(), key.begin(), key.end());
+}
+
+void PutObjectEnd(Buffer& out)
+{
+    PutKey(out, "");
+    out.push_back(OBJECT_END);
+}
+
+Buffer TagHeader(uint8_t type, size_t dataSize, uint32_t timestamp)
+{
+    Buffer header = {type};
+    PutInteger(header, dataSize, 3);
+    PutInteger(header, timestamp & 0xFFFFFF, 3);
+    PutInteger(header, timestamp >> 24, 1);
+    PutInteger(header, 0, 3); // StreamID
+    return header;
+}
+
+// Steps over AMF0 values. Once one is damaged or cut short, everything fails.
+class ScriptReader {
+public:
+    explicit ScriptReader(Bytes bytes) : m_bytes(bytes) {}
+
+    const uint8_t* Position() const { return m_bytes.data() + m_position; }
+
+    bool Skip(uint64_t size)
+    {
+        m_failed = m_failed || size > m_bytes.size() - m_position;
+        m_position += m_failed ? 0 : static_cast<size_t>(size);
+        return !m_failed;
+    }
+
+    uint64_t Integer(size_t size)
+    {
+        const uint8_t* const bytes = Position();
+        uint64_t value = 0;
+        if (Skip(size))
+            for (size_t i = 0; i < size; ++i)
+                value = value << 8 | bytes[i];
+        return value;
+    }
+
+    bool Key(std::string& key)
+    {
+        const auto size = static_cast<uint32_t>(Integer(2));
+        const uint8_t* const text = Position();
+        if (Skip(size))
+            key.assign(text, text + size);
+        return !m_failed;
+    }
+
+    bool SkipValue(int depth = 0)
+    {
+        if (depth > MAX_DEPTH)
+            return false;
+        switch (Integer(1)) {
+        case NUMBER:
+            return Skip(sizeof(double));
+        case BOOLEAN:
+            return Skip(1);
+        case STRING:
+            return Skip(Integer(2));
+        case LONG_STRING:
+            return Skip(Integer(4));
+        case DATE:
+            return Skip(sizeof(double) + 2);
+        case REFERENCE:
+            return Skip(2);
+        case ECMA_ARRAY:
+            return Skip(4) && SkipMembers(depth);
+        case OBJECT:
+            return SkipMembers(depth);
+        case STRICT_ARRAY:
+            return SkipElements(depth);
+        case NULL_VALUE:
+        case UNDEFINED:
+            return !m_failed;
+        default:
+            return false;
+        }
+    }
+
+private:
+    bool SkipMembers(int depth)
+    {
+        std::string key;
+        while (Key(key)) {
+            if (key.empty() && Position() != m_bytes.end() && *Position() == OBJECT_END)
+                return Skip(1);
+            if (!SkipValue(depth + 1))
+                return false;
+        }
+        return false;
+    }
+
+    bool SkipElements(int depth)
+    {
+        for (uint64_t count = Integer(4); count != 0; --count)
+            if (!SkipValue(depth + 1))
+                return false;
+        return !m_failed;
+    }
+
+    const Bytes m_bytes;
+    size_t m_position = 0;
+    bool m_failed = false;
+};
+
+} // namespace
+
+std::vector<ScriptProperty> ReadScriptProperties(Bytes payload)
+{
+    std::vector<ScriptProperty> properties;
+    ScriptReader reader(payload);
+    std::string key;
+    if (reader.Integer(1) != STRING || !reader.Key(key) || key != "onMetaData")
+        return properties;
+    const uint64_t marker = reader.Integer(1);
+    if (marker != OBJECT && (marker != ECMA_ARRAY || !reader.Skip(4)))
+        return properties;
+    while (reader.Key(key) && !key.empty()) {
+        const uint8_t* const value = reader.Position();
+        if (!reader.SkipValue())
+            break;
+        properties.push_back({key, Buffer(value, reader.Position())});
+    }
+    return properties;
+}
+
+ScriptProperty NumberProperty(std::string_view name, double value)
+{
+    ScriptProperty property = {std::string(name), {}};
+    PutNumber(property.value, value);
+    return property;
+}
+
+void FlvLayout::Add(const NewTag& tag)
+{
+    m_hasVideo = m_hasVideo || tag.type == FLVD_TAG_TYPE_VIDEO;
+    m_hasAudio = m_hasAudio || tag.type == FLVD_TAG_TYPE_AUDIO;
+    if (tag.keyframe)
+        m_keyframes.push_back({tag.timestamp, m_size});
+    m_firstTimestamp = m_size == 0 ? tag.timestamp : std::min(m_firstTimestamp, tag.timestamp);
+    m_lastTimestamp = std::max(m_lastTimestamp, tag.timestamp);
+    m_size += static_cast<int64_t>(TAG_HEADER_SIZE + tag.header.size() + tag.payload.size() + BACK_POINTER_SIZE);
+}
+
+ScriptProperty FlvLayout::Index(int64_t firstTag) const
+{
+    const size_t step = (m_keyframes.size() + INDEX_MAX - 1) / INDEX_MAX;
+    const size_t count = (m_keyframes.size() + step - 1) / step;
+    Buffer times = {STRICT_ARRAY};
+    Buffer positions = {STRICT_ARRAY};
+    PutInteger(times, count, 4);
+    PutInteger(positions, count, 4);
+    for (size_t i = 0; i < m_keyframes.size(); i += step) {
+        PutNumber(times, m_keyframes[i].timestamp / MS_PER_SECOND);
+        PutNumber(positions, static_cast<double>(firstTag + m_keyframes[i].offset));
+    }
+    ScriptProperty index = {"keyframes", {OBJECT}};
+    PutKey(index.value, "times");
+    Put(index.value, times);
+    PutKey(index.value, "filepositions");
+    Put(index.value, positions);
+    PutObjectEnd(index.value);
+    return index;
+}
+
+std::vector<uint8_t> FlvLayout::ScriptPayload(const std::vector<ScriptProperty>& properties, int64_t firstTag) const
+{
+    std::vector<ScriptProperty> all;
+    std::copy_if(properties.begin(), properties.end(), std::back_inserter(all), [](const ScriptProperty& property) {
+        return std::find(RENEWED.begin(), RENEWED.end(), property.name) == RENEWED.end();
+    });
+    all.push_back(NumberProperty("duration", Duration() / MS_PER_SECOND));
+    all.push_back(NumberProperty("filesize", static_cast<double>(firstTag + m_size)));
+    all.push_back(NumberProperty("lasttimestamp", m_lastTimestamp / MS_PER_SECOND));
+    if (!m_keyframes.empty()) {
+        all.push_back(NumberProperty("lastkeyframetimestamp", m_keyframes.back().timestamp / MS_PER_SECOND));
+        all.push_back(Index(firstTag));
+    }
+    Buffer payload = {STRING};
+    PutKey(payload, "onMetaData");
+    payload.push_back(ECMA_ARRAY);
+    PutInteger(payload, all.size(), 4);
+    for (const ScriptProperty& property : all) {
+        PutKey(payload, property.name);
+        Put(payload, property.value);
+    }
+    PutObjectEnd(payload);
+    return payload;
+}
+
+std::vector<uint8_t> FlvLayout::Beginning(const std::vector<ScriptProperty>& properties) const
+{
+    Buffer out = {'F', 'L', 'V', 1}; // signature, version
+    out.push_back(static_cast<uint8_t>((m_hasAudio ? HAS_AUDIO : 0) | (m_hasVideo ? HAS_VIDEO : 0)));
+    PutInteger(out, FILE_HEADER_SIZE, 4);
+    PutInteger(out, 0, BACK_POINTER_SIZE);                   // PreviousTagSize0
+    const size_t size = ScriptPayload(properties, 0).size(); // the same for all positions
+    const auto firstTag = static_cast<int64_t>(out.size() + TAG_HEADER_SIZE + size + BACK_POINTER_SIZE);
+    Put(out, TagHeader(FLVD_TAG_TYPE_SCRIPT, size, 0));
+    Put(out, ScriptPayload(properties, firstTag));
+    PutInteger(out, TAG_HEADER_SIZE + size, BACK_POINTER_SIZE);
+    return out;
+}
+
+void WriteTag(OutputFile& file, const NewTag& tag)
+{
+    const size_t dataSize = tag.header.size() + tag.payload.size();
+    Buffer header = TagHeader(tag.type, dataSize, tag.timestamp);
+    header.insert(header.end(), tag.header.begin(), tag.header.end());
+    file.Write(header.data(), header.size());
+    file.Write(tag.payload.data(), tag.payload.size());
+    Buffer backPointer;
+    PutInteger(backPointer, TAG_HEADER_SIZE + dataSize, BACK_POINTER_SIZE);
+    file.Write(backPointer.data(), backPointer.size());
+}
+
+} // namespace tool

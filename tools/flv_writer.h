@@ -1,0 +1,77 @@
+// Writes FLV files (FLV file format, version 10.1, annex E). A first pass over the tags measures them, so that the
+// metadata at the beginning can hold an index of the keyframes; a second pass writes them.
+#ifndef FLVDMX_TOOLS_FLV_WRITER_H
+#define FLVDMX_TOOLS_FLV_WRITER_H
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "flvdmx/result.hpp"
+#include "tools/output_file.h"
+
+namespace tool {
+
+/** A tag to write. Bytes are borrowed. */
+struct NewTag {
+    uint8_t type = 0;       /**< FLVD_TAG_TYPE_* */
+    uint32_t timestamp = 0; /**< ms */
+    flvdmx::Bytes header;   /**< codec header, or empty if `payload` includes it */
+    flvdmx::Bytes payload;
+    bool keyframe = false; /**< listed in the index */
+};
+
+/** A property of onMetaData, its value as AMF0 bytes. */
+struct ScriptProperty {
+    std::string name;
+    std::vector<uint8_t> value;
+};
+
+/** @return the properties in the payload of an onMetaData tag, up to the first damaged one; none of other payloads */
+std::vector<ScriptProperty> ReadScriptProperties(flvdmx::Bytes payload);
+
+/** @return a property with this number */
+ScriptProperty NumberProperty(std::string_view name, double value);
+
+/** Measures the tags of a file, and makes what comes before them. */
+class FlvLayout {
+public:
+    /** Adds the next tag of the file. */
+    void Add(const NewTag& tag);
+
+    bool HasVideo() const { return m_hasVideo; }
+    bool HasAudio() const { return m_hasAudio; }
+    uint32_t Duration() const { return m_lastTimestamp - m_firstTimestamp; } /**< ms */
+    size_t Keyframes() const { return m_keyframes.size(); }
+
+    /**
+     * @return the file header and the onMetaData tag with `properties`. Properties that depend on the tags replace
+     * those given: duration, filesize, lasttimestamp, lastkeyframetimestamp, and keyframes, an index of at most 65,536
+     *         entries.
+     */
+    std::vector<uint8_t> Beginning(const std::vector<ScriptProperty>& properties) const;
+
+private:
+    struct Keyframe {
+        uint32_t timestamp;
+        int64_t offset; // from the first tag after onMetaData
+    };
+
+    std::vector<uint8_t> ScriptPayload(const std::vector<ScriptProperty>& properties, int64_t firstTag) const;
+    ScriptProperty Index(int64_t firstTag) const;
+
+    bool m_hasVideo = false;
+    bool m_hasAudio = false;
+    uint32_t m_firstTimestamp = 0;
+    uint32_t m_lastTimestamp = 0;
+    int64_t m_size = 0;
+    std::vector<Keyframe> m_keyframes;
+};
+
+/** Writes a tag and its back-pointer. */
+void WriteTag(OutputFile& file, const NewTag& tag);
+
+} // namespace tool
+
+#endif

@@ -1,0 +1,113 @@
+// `flvdmx repair`, `flvdmx index` and `flvdmx cut`: new files from what can be played of a file.
+#include <algorithm>
+#include <functional>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <fmt/core.h>
+
+#include "tools/commands.h"
+#include "tools/flv_writer.h"
+#include "tools/input.h"
+#include "tools/output_file.h"
+#include "tools/progress.h"
+#include "tools/remux.h"
+#include "tools/report.h"
+#include "tools/text.h"
+
+namespace tool {
+
+namespace {
+
+using Pass = std::function<RemuxReport(const TakeTag& take, const std::function<void(int64_t)>& progress)>;
+
+// Runs a pass that measures and, unless it is a rehearsal, one that writes.
+RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
+{
+    ProgressBar progress(options.file, 2 * size);
+    FlvLayout layout;
+    const RemuxReport report =
+        pass([&](const NewTag& tag) { layout.Add(tag); }, [&](int64_t position) { progress.ShowDone(position); });
+    if (report.videoFrames + report.audioFrames == 0)
+        throw FileError(options.file, "there is no frame to write");
+    uint64_t written = 0;
+    if (!options.dryRun) {
+        OutputFile out(options.out, options.file, options.force);
+        const std::vector<uint8_t> beginning = layout.Beginning(MetadataOf(options.file));
+        out.Write(beginning.data(), beginning.size());
+        pass([&](const NewTag& tag) { WriteTag(out, tag); },
+             [&](int64_t position) { progress.ShowDone(size + position); });
+        out.Finish();
+        written = out.Written();
+    }
+    progress.Wipe();
+    if (options.out == STANDARD_STREAM && !options.dryRun)
+        return report;
+    Print(fmt::format("{}: {} and {}, {}, {} in the index{}\n", options.dryRun ? "would write" : Printable(options.out),
+                      Plural(report.videoFrames, "picture"), Plural(report.audioFrames, "audio frame"),
+                      FormatTime(layout.Duration()), Plural(layout.Keyframes(), "keyframe"),
+                      options.dryRun ? "" : fmt::format(", {} bytes", written)));
+    return report;
+}
+
+// The times between which to cut: those of the keyframes at or before the beginning and at or after the end.
+RemuxOptions CutOptions(const RewriteOptions& options)
+{
+    RemuxOptions remux;
+    Input input(options.file);
+    if (options.fromMs) {
+        const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
+        if (!from)
+            throw FileError(options.file, from.error());
+        remux.fromMs = from->count();
+    }
+    const int64_t start = input.info.start_time.count();
+    remux.offsetMs = options.keepTimes ? start : -std::max<int64_t>(remux.fromMs, 0);
+    if (options.toMs) {
+        const auto to = input.file.seek(flvdmx::Milliseconds(*options.toMs), flvdmx::SeekMode::forward);
+        if (!to && to.error().kind() != flvdmx::Kind::miss) // a miss: no keyframe follows
+            throw FileError(options.file, to.error());
+        if (to)
+            remux.toMs = to->count();
+    }
+    return remux;
+}
+
+} // namespace
+
+int RunRepair(const RewriteOptions& options)
+{
+    const Input input(options.file);
+    RemuxOptions remux;
+    remux.allFrames = true;
+    remux.continuous = !options.keepTimes;
+    remux.offsetMs = input.info.start_time.count();
+    const RemuxReport report = Write(options, input.info.size, [&](const auto& take, const auto& progress) {
+        return Remux(options.file, remux, take, progress);
+    });
+    if (report.breaks != 0)
+        Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
+                         Plural(report.breaks, "place")));
+    const int64_t leftOut = report.bytesLeftOut + input.Rest();
+    if (leftOut != 0)
+        Tell(fmt::format("{}: {} left out\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
+    return DONE;
+}
+
+int RunIndex(const RewriteOptions& options)
+{
+    Write(options, Input(options.file).info.size,
+          [&](const auto& take, const auto& progress) { return CopyTags(options.file, take, progress); });
+    return DONE;
+}
+
+int RunCut(const RewriteOptions& options)
+{
+    const RemuxOptions remux = CutOptions(options);
+    Write(options, Input(options.file).info.size,
+          [&](const auto& take, const auto& progress) { return Remux(options.file, remux, take, progress); });
+    return DONE;
+}
+
+} // namespace tool
