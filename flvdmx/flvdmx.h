@@ -141,7 +141,7 @@ enum {
     FLVD_ERR_INFO_ONLY = -4007,         /**< the instance was opened for information only */
     FLVD_ERR_NO_TAG = -10001,           /**< no valid tag was found */
     FLVD_ERR_SHORT_DATA = -10002,       /**< end of the data, or a short read */
-    FLVD_ERR_NOT_SEEKABLE = -10003      /**< not seekable; growing file: no video, or no index in memory */
+    FLVD_ERR_NOT_SEEKABLE = -10003      /**< not seekable; growing file: no video, or no keyframe index */
 };
 
 /* --------------------------------------------------------------------------- the host's functions */
@@ -265,9 +265,9 @@ typedef struct flvd_frame_t {
 /**
  * First argument of operation 3. The second is an int32_t that receives the time reached, in ms from the first
  * timestamp; it is written on success only. The current position is the time of the last video frame, or of the last
- * audio frame in a file without video. A target at or before 0 goes to the first tag; a relative time of 0 only
- * reports the current position. A seek misses (FLVD_RET_END) when the target is beyond the end or no keyframe lies in
- * its direction. After a miss or any other failure, delivery continues where it was.
+ * audio frame in a file without video. A target whose file timestamp is 0 or less goes to the first tag; a
+ * relative time of 0 only reports the current position. A seek misses (FLVD_RET_END) when the target is beyond the end
+ * or no keyframe lies in its direction. After a miss or any other failure, delivery continues where it was.
  */
 typedef struct flvd_seek_request_t {
     int32_t time;  /**< ms from the first timestamp, or from the current position with FLVD_SEEK_RELATIVE */

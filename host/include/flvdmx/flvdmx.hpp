@@ -238,7 +238,7 @@ struct AudioInfo {
     std::vector<uint8_t> config;            /**< AAC: the first AudioSpecificConfig (ISO/IEC 14496-3) */
 };
 
-/** How a file is seeked. */
+/** How seeking works in a file. */
 enum class SeekMethod : uint32_t {
     none = FLVD_SEEK_NONE,         /**< not at all */
     by_index = FLVD_SEEK_BY_INDEX, /**< by the metadata's keyframe index */
@@ -252,7 +252,7 @@ struct Info {
                                     growing file */
     Milliseconds duration{};   /**< last timestamp minus the first; 0 if unknown, as for a growing file */
     int64_t size = 0;          /**< bytes, 0 for a growing file */
-    SeekMethod seek_method = SeekMethod::none; /**< how it is seeked */
+    SeekMethod seek_method = SeekMethod::none; /**< how seeking works */
     std::optional<VideoInfo> video;            /**< the video stream, if there is one */
     std::optional<AudioInfo> audio;            /**< the audio stream, if there is one */
 };
@@ -424,7 +424,7 @@ public:
     }
 
     /**
-     * Lists the video keyframes, of a growing file those written so far. If the file is seeked by its keyframe index,
+     * Lists the video keyframes, of a growing file those written so far. If the file is sought by its keyframe index,
      * the list comes from the index; otherwise the whole file is scanned, tag by tag. Does not change the playing
      * position.
      *
@@ -549,8 +549,8 @@ public:
      *
      * Time 0 and all earlier times lead to the first tag, whatever its time. With a keyframe index, "at or before"
      * refers to the times in the index, which muxers round or count from another start: the frame reached can be a few
-     * milliseconds later. A growing file can be seeked only if it has video, if its timestamps start at 0, and with
-     * Options::index_in_memory.
+     * milliseconds later. Seeking in a growing file needs video, a keyframe index in the metadata, and timestamps
+     * that start at 0.
      *
      * @param time from the file's first timestamp, or with SeekMode::relative from the current position; clamped to 32
      * bits
@@ -563,7 +563,7 @@ public:
             return failure();
         for (Learned& learned : m_learned)
             learned.is_position = false;
-        // The library goes to the first tag for file timestamps up to 0.
+        // The library goes to the first tag for file timestamps of 0 or less.
         const bool rewinds = !has_mode(mode, SeekMode::relative) && time.count() <= 0;
         const int64_t target = rewinds ? -int64_t{m_instance->first_ts} : time.count();
         const flvd_seek_request_t request = {clamp<int32_t>(target), static_cast<uint32_t>(mode)};
@@ -1217,7 +1217,7 @@ public:
     /** The end of the range. */
     struct Sentinel {};
 
-    /** The place in the range; all of them of one range are the same place. */
+    /** A position in the range. All iterators of a range share it. */
     class Iterator {
     public:
         explicit Iterator(FrameRange* range) : m_range(range) {}      /**< of a range whose frame was taken */
