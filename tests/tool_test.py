@@ -367,7 +367,7 @@ class Failures(Case):
         folder = self.write("-x.flv", AVC_BYTES).parent
         for arguments, words in ((["frames", "--stream", "all", "x"], "'all' is not one of: audio, video"),
                                  (["seek", "--mode", "up", "x", "1"], "not one of: auto, backward, forward"),
-                                 (["help", "me"], "not one of: check, extract"),
+                                 (["help", "me"], "not one of: check, cut, extract"),
                                  (["info", "-x.flv"], "begins with a dash goes after '--': flvdmx COMMAND -- -x.flv")):
             self.assertIn(words, run(*arguments, cwd=folder).stderr)
         self.tool("info", "--", "-x.flv", cwd=folder)
