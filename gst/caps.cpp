@@ -133,15 +133,18 @@ GstCaps* audio_template_caps()
 
 GstCaps* make_caps(const flvdmx::VideoInfo& info)
 {
-    constexpr size_t profile_offset = 1,
-                     profile_size = 3; // of an AVCDecoderConfigurationRecord: as in the parameter set
+    constexpr size_t profile_offset = 1; // of an AVCDecoderConfigurationRecord: as in the parameter set
+    constexpr size_t profile_size = 3;
+    constexpr uint8_t high_444 = 244; // the library misreads the picture size of this profile
     const VideoCaps* const row = find_row(video_table, info.codec);
     const bool is_avc = info.codec == VideoCodec::avc;
     if (row == nullptr || (is_avc && info.config.size() < profile_offset + profile_size))
         return nullptr;
     GstCaps* const caps = gst_caps_from_string(row->caps);
-    set_number(caps, "width", info.width);
-    set_number(caps, "height", info.height);
+    if (!is_avc || info.config[profile_offset] != high_444) {
+        set_number(caps, "width", info.width);
+        set_number(caps, "height", info.height);
+    }
     if (info.frame_rate > 0.0) {
         gint numerator = 0;
         gint denominator = 1;

@@ -56,8 +56,13 @@ bool Streaming::seek(GstEvent* event)
     gst_event_parse_seek(event, &rate, &format, &flags, &start_type, &start, &stop_type, &stop);
     if (format != GST_FORMAT_TIME || rate <= 0.0 || (flags & GST_SEEK_FLAG_INSTANT_RATE_CHANGE) != 0)
         return false;
+    const bool both_set = start_type == GST_SEEK_TYPE_SET && stop_type == GST_SEEK_TYPE_SET;
+    if (both_set && stop >= 0 && start > stop)
+        return false;
     const bool flushes = (flags & GST_SEEK_FLAG_FLUSH) != 0;
     const guint32 sequence = gst_event_get_seqnum(event);
+    if (m_last_seek.exchange(sequence) == sequence)
+        return true;
     const unsigned flush = flushes ? begin_flush(sequence) : 0;
     if (!flushes)
         gst_pad_pause_task(m_sink);
@@ -156,8 +161,9 @@ bool Streaming::answer(GstQuery* query) const
     switch (GST_QUERY_TYPE(query)) {
     case GST_QUERY_POSITION: {
         gst_query_parse_position(query, &format, nullptr);
-        const guint64 position =
-            gst_segment_to_stream_time(&segment, GST_FORMAT_TIME, std::max<guint64>(m_position, segment.start));
+        const guint64 last = GST_CLOCK_TIME_IS_VALID(segment.stop) ? segment.stop : GST_CLOCK_TIME_NONE;
+        const guint64 position = gst_segment_to_stream_time(
+            &segment, GST_FORMAT_TIME, std::clamp<guint64>(m_position, segment.start, std::max(last, segment.start)));
         if (format == GST_FORMAT_TIME)
             gst_query_set_position(query, format, static_cast<gint64>(position));
         return format == GST_FORMAT_TIME;

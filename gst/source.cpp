@@ -25,8 +25,17 @@ Source::Source(GstPad* pad) : m_pad(pad), m_file{}
     flvd_callback_host_add(&m_file);
 }
 
+void Source::reset()
+{
+    m_flow = GST_FLOW_OK;
+    m_size = m_read_end = m_window_start = 0;
+    m_window_size = 0;
+}
+
 uint32_t Source::read(int64_t position, uint8_t* destination, uint32_t size)
 {
+    if (m_flow != GST_FLOW_OK)
+        return 0;
     const bool in_window = position >= m_window_start && position - m_window_start < m_window_size;
     if (in_window || (size < large_read && position != m_read_end))
         return read_window(position, destination, size);
@@ -64,10 +73,11 @@ uint32_t Source::pull(int64_t position, uint8_t* destination, uint32_t size)
     GstBuffer* buffer =
         gst_buffer_new_wrapped_full(GST_MEMORY_FLAG_NO_SHARE, destination, wanted, 0, wanted, nullptr, nullptr);
     const GstFlowReturn flow = gst_pad_pull_range(m_pad, static_cast<guint64>(position), wanted, &buffer);
+    const auto filled = static_cast<uint32_t>(std::min<size_t>(gst_buffer_get_size(buffer), wanted));
     gst_buffer_unref(buffer);
     if (flow != GST_FLOW_OK && flow != GST_FLOW_EOS)
         m_flow = flow;
-    return flow == GST_FLOW_OK ? wanted : 0;
+    return flow == GST_FLOW_OK ? filled : 0;
 }
 
 int64_t Source::size() const

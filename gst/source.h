@@ -27,8 +27,10 @@ public:
     /** Why the last read brought nothing: GST_FLOW_OK when it did, or when the file had ended. The library takes
      *  every such read for the end of the file. */
     GstFlowReturn flow() const { return m_flow; }
-    /** Forgets a failure; call it before the library reads again. */
+    /** Forgets a failure, after which nothing more is read. Call it before the library reads again. */
     void clear_flow() { m_flow = GST_FLOW_OK; }
+    /** Forgets what was read: the peer may have another file now. */
+    void reset();
 
     /** Bytes; -1 when the peer cannot tell. */
     int64_t size() const;

@@ -130,6 +130,8 @@ void Streaming::close()
     gst_flow_combiner_clear(m_combiner.get());
     m_position = 0;
     m_next_tag = -1;
+    m_last_seek = GST_SEQNUM_INVALID;
+    m_source.reset();
     const std::shared_lock<OpenLock> lock(open_lock);
     m_file.close();
 }
@@ -186,9 +188,9 @@ GstFlowReturn Streaming::open()
         error = file.error();
         m_file = *std::move(file);
     }
-    if (m_source.flow() != GST_FLOW_OK) {
+    if (const GstFlowReturn flow = m_source.flow(); flow != GST_FLOW_OK) {
         close();
-        return m_source.flow();
+        return flow;
     }
     if (!m_file.is_open()) {
         GST_ELEMENT_ERROR(m_element, STREAM, DEMUX, (nullptr), ("%s (%s)", error.text(), error.name()));

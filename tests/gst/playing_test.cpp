@@ -229,6 +229,47 @@ TEST(Playing, FillsGaps)
     EXPECT_EQ(pipeline.play(), "");
 }
 
+// Stopped and given another file, an element plays that one alone.
+TEST(Playing, ForgetsThePreviousFile)
+{
+    GstElement* const pipeline = gst_parse_launch("filesrc name=f ! flvdmxdemux name=d", nullptr);
+    std::array<std::atomic<int>, 2> frames{}; // video, audio
+    const auto count = [](GstPad* pad, GstPadProbeInfo*, gpointer counts) {
+        ++(*static_cast<decltype(frames)*>(counts))[*GST_PAD_NAME(pad) == 'v' ? 0 : 1];
+        return GST_PAD_PROBE_OK;
+    };
+    using Count = GstPadProbeReturn (*)(GstPad*, GstPadProbeInfo*, gpointer);
+    static Count s_count = count;
+    const auto link = [](GstElement* demuxer, GstPad* pad, gpointer counts) {
+        GstElement* const sink = gst_element_factory_make("fakesink", nullptr);
+        g_object_set(sink, "async", FALSE, nullptr); // one thread feeds both: none may wait for the other
+        gst_bin_add(GST_BIN(GST_ELEMENT_PARENT(demuxer)), sink);
+        gst_pad_add_probe(pad, GST_PAD_PROBE_TYPE_BUFFER, s_count, counts, nullptr);
+        gst_element_link_pads(demuxer, GST_PAD_NAME(pad), sink, "sink");
+        gst_element_sync_state_with_parent(sink);
+    };
+    GstElement *const source = gst_bin_get_by_name(GST_BIN(pipeline), "f"), *const demuxer = gst_bin_get_by_name(
+                                                                                GST_BIN(pipeline), "d");
+    g_signal_connect(demuxer, "pad-added", G_CALLBACK(+link), &frames);
+    const std::pair<const char*, std::pair<int, int>> files[] = {
+        {"avc_aac", {63, 109}}, {"h263_mp3", {30, 79}}, {"avc_bframes_aac", {50, 95}}};
+    for (const auto& [name, wanted] : files) {
+        frames[0] = frames[1] = 0;
+        g_object_set(source, "location", (g_data + name + ".flv").c_str(), nullptr);
+        gst_element_set_state(pipeline, GST_STATE_PLAYING);
+        GstBus* const bus = gst_element_get_bus(pipeline);
+        const auto end = static_cast<GstMessageType>(GST_MESSAGE_EOS | GST_MESSAGE_ERROR);
+        gst_message_unref(gst_bus_timed_pop_filtered(bus, 30 * GST_SECOND, end));
+        gst_object_unref(bus);
+        EXPECT_EQ(std::pair(frames[0].load(), frames[1].load()), wanted) << name;
+        gst_element_set_state(pipeline, GST_STATE_READY);
+    }
+    gst_element_set_state(pipeline, GST_STATE_NULL);
+    gst_object_unref(source);
+    gst_object_unref(demuxer);
+    gst_object_unref(pipeline);
+}
+
 TEST(Playing, TellsTags)
 {
     const Tag meta = {18, 0, OnMetaData("title: 'Film creator: 'Somebody comment: %2.0.2.255.254 videodatarate: 500")};
