@@ -214,7 +214,7 @@ Flv ConfigFile(const std::string& letters)
     Flv flv = File(tags);
     for (size_t i = 0; i < letters.size(); ++i)
         if (letters[i] == '#')
-            std::fill_n(flv.bytes.begin() + flv.tags[i].offset, flv.tags[i].size(), uint8_t{0});
+            std::fill_n(&flv.bytes[static_cast<size_t>(flv.tags[i].offset)], flv.tags[i].size(), uint8_t{0});
     return flv;
 }
 
