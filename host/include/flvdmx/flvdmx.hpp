@@ -571,6 +571,8 @@ public:
         if (QVX_FLV_DMX(FLVD_OP_SEEK, &m_instance, &request, &reached) != 0)
             return failure();
         m_learned = {};
+        m_video_configs.jump();
+        m_audio_configs.jump();
         return Milliseconds(reached);
     }
 
@@ -659,31 +661,26 @@ private:
 
         bool empty() const { return m_changes.empty(); }
 
-        // Adds a configuration whose tag starts at `position`. If there is no room, forgets all others.
+        // Tells that tags may have been skipped before the next configuration.
+        void jump() { m_jumped = true; }
+
+        // Adds a configuration whose tag starts at `position`. A repetition matters only after a jump: there may be
+        // changes before it that are found later. If there is no room, forgets all others.
         void add(int64_t position, std::vector<uint8_t> bytes)
         {
+            const bool jumped = std::exchange(m_jumped, false);
             if (empty()) {
-                if (*m_given == bytes) {
-                    m_opened_last = std::max(m_opened_last, position);
+                if (*m_given == bytes && !jumped)
                     return;
-                }
-                m_changes.push_back({-1, m_opened_last, m_given});
+                m_changes.push_back({-1, m_given});
             }
             const auto next = after(position);
-            Change* const before = next != m_changes.begin() ? &*(next - 1) : nullptr;
-            if (before != nullptr && *before->config == bytes) {
-                before->last = std::max(before->last, position);
+            const bool repeats = next != m_changes.begin() && *(next - 1)->config == bytes;
+            if (repeats && (!jumped || (next - 1)->position == position))
                 return;
-            }
-            Change change = {position, position, share(std::move(bytes))};
-            const bool splits = before != nullptr && before->last > position; // playing has been past here before
-            const Change rest = splits ? Change{before->last, before->last, before->config} : change;
-            if (splits)
-                before->last = before->position;
-            if (m_changes.size() + 2 > configs_max)
+            Change change = {position, share(std::move(bytes))};
+            if (m_changes.size() == configs_max)
                 m_changes.clear();
-            if (splits)
-                m_changes.insert(after(rest.position), rest);
             m_changes.insert(after(position), std::move(change));
         }
 
@@ -704,7 +701,6 @@ private:
     private:
         struct Change {
             int64_t position;
-            int64_t last; // where its last repetition was seen
             Config config;
         };
 
@@ -721,8 +717,8 @@ private:
         }
 
         std::vector<Change> m_changes; // in file order
-        int64_t m_opened_last = -1;    // `last` of the open's configuration, while there is no other
         Config m_given;
+        bool m_jumped = false;
     };
 
     // How far a reader's tags have been searched for configurations since the last seek; -1: not at all.
