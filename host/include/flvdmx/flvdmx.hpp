@@ -585,6 +585,7 @@ private:
     // Tags (FLV file format, version 10.1, annex E.4).
     static constexpr uint32_t tag_header_size = 11;
     static constexpr uint32_t back_pointer_size = 4;
+    static constexpr int64_t smallest_tag_size = tag_header_size + 1 + back_pointer_size; // of a frame
     static constexpr uint32_t metadata_tags = 102;        // an open looks at the same number
     static constexpr uint32_t script_data_max = 1u << 20; // bytes read from one script tag
     static constexpr uint32_t config_max = 1u << 16;      // bytes; longer configurations are not reported
@@ -906,7 +907,7 @@ private:
             }
             const Tag tag(reader, position);
             if (result != 0 || tag.position < 0)
-                return FLVD_ERR_SHORT_DATA;
+                return end - position < smallest_tag_size ? FLVD_ERR_NONE : FLVD_ERR_SHORT_DATA;
             if (position >= end || !see(tag))
                 return FLVD_ERR_NONE;
             from = tag.end();
@@ -1135,7 +1136,7 @@ private:
                 code = walk_keyframes(m_return.reader, report, list);
         }
         go_back();
-        if (is_failure(code))
+        if (is_failure(code) || (code != FLVD_ERR_NONE && !is_growing())) // a read failed
             return error(Kind::failed, code, 0);
         return list;
     }
