@@ -91,12 +91,13 @@ OutputFile::OutputFile(std::string path, const std::string& input, bool force) :
         if (!force && std::filesystem::exists(m_path, failure))
             throw FileError(input, fmt::format("{} exists: --force overwrites it", Printable(m_path)));
         m_temporary = m_path + ".XXXXXX";
+        m_slot = Remember(m_temporary.c_str()); // before the file is there: a signal may come at once
         m_file = CreateTemporary(m_temporary);
     }
-    if (m_file == nullptr)
+    if (m_file == nullptr) {
+        Forget(m_slot);
         Fail();
-    if (!m_temporary.empty())
-        m_slot = Remember(m_temporary.c_str());
+    }
 }
 
 OutputFile::~OutputFile()

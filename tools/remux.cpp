@@ -20,8 +20,6 @@ namespace tool {
 
 namespace {
 
-using flvdmx::Bytes;
-
 // A step back of up to a second is jitter: the time stands still. A larger one, or a gap of more than ten seconds, is a
 // recording that started again, or a damaged timestamp.
 constexpr int64_t JITTER_MS = 1000;
