@@ -36,7 +36,7 @@ struct SeekCase {
 // The pipelines are not there yet: all files that are open have one host.
 std::vector<SeekCase> MakeSeeks(const char* sample, int count)
 {
-    std::mt19937 random(7); // NOLINT(cert-msc51-cpp)
+    std::mt19937 random(7); // NOLINT(cert-msc51-cpp): the same seeks in every run
     auto file = flvdmx::File::open(Path(sample));
     const int64_t duration = file->info().duration.count();
     std::vector<SeekCase> seeks;
