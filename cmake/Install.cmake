@@ -23,7 +23,7 @@ install(DIRECTORY ${PROJECT_SOURCE_DIR}/host/include/flvdmx
 install(EXPORT flvdmx NAMESPACE flvdmx:: FILE flvdmxTargets.cmake DESTINATION ${package_dir} COMPONENT development)
 configure_package_config_file(${PROJECT_SOURCE_DIR}/cmake/flvdmxConfig.cmake.in ${PROJECT_BINARY_DIR}/flvdmxConfig.cmake
     INSTALL_DESTINATION ${package_dir})
-write_basic_package_version_file(${PROJECT_BINARY_DIR}/flvdmxConfigVersion.cmake COMPATIBILITY SameMinorVersion)
+write_basic_package_version_file(${PROJECT_BINARY_DIR}/flvdmxConfigVersion.cmake COMPATIBILITY SameMajorVersion)
 install(FILES ${PROJECT_BINARY_DIR}/flvdmxConfig.cmake ${PROJECT_BINARY_DIR}/flvdmxConfigVersion.cmake
     DESTINATION ${package_dir} COMPONENT development)
 
