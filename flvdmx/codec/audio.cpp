@@ -1,4 +1,8 @@
-// Audio: the codec byte of FLV audio tags, the AAC AudioSpecificConfig and the MPEG audio frame header.
+// Audio: the codec byte of FLV audio tags (FLV file format, version 10.1, annex E.4.2), the AAC AudioSpecificConfig
+// (ISO/IEC 14496-3) and the MPEG audio frame header (ISO/IEC 11172-3, 13818-3).
+//
+// The codec byte alone describes most formats, but it can only express four rates and two channels. For AAC and MPEG
+// audio the stream's own header overrides it.
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
@@ -17,12 +21,13 @@ constexpr uint32_t FLVD_MP3_PEEK = 16;                           // tag header, 
 
 constexpr uint32_t FLVD_SAMPLE_BITS = 16; // the size after decoding, whatever SoundSize says
 
+// By SoundRate, in Hz. The lowest is the nominal 5.5 kHz; its exact value would be 44100 / 8 = 5512.5.
 constexpr uint32_t g_flvd_soundRate[] = {5500, 11025, 22050, 44100};
 
 // ISO/IEC 14496-3, by samplingFrequencyIndex: 13 and 14 are reserved, 15 is followed by the frequency itself.
 constexpr uint32_t g_flvd_aacFrequency[] = {96000, 88200, 64000, 48000, 44100, 32000, 24000,
                                             22050, 16000, 12000, 11025, 8000,  7350};
-static_assert(std::size(g_flvd_aacFrequency) == 13, "one entry an index");
+static_assert(std::size(g_flvd_aacFrequency) == 13, "one entry per index");
 constexpr uint32_t FLVD_AAC_EXPLICIT_FREQUENCY = 15;
 
 // ISO/IEC 14496-3: channels by channelConfiguration; 8 to 15 are reserved.
@@ -65,6 +70,7 @@ constexpr uint8_t g_flvd_mpegChannels[] = {2, 2, 2, 1}; // stereo, joint stereo,
 constexpr uint8_t g_flvd_mpegFormatTag[] = {0, FLVD_AUDIO_TAG_MP3, FLVD_AUDIO_TAG_MPEG, FLVD_AUDIO_TAG_MP3};
 constexpr int32_t FLVD_MPEG_HEADER_SIZE = 4;
 
+// GetAudioObjectType(): types from 32 on follow an escape code.
 uint32_t FLVD_GetObjectType(FLVD_BitStream* bits)
 {
     const uint32_t type = bits->Get(5);
@@ -99,12 +105,15 @@ void FLVD_ParseAudioSpecificConfig(const uint8_t* data, uint32_t size, flvd_audi
     info->sample_rate = FLVD_GetFrequency(&bits);
     const uint32_t configuration = bits.Get(4);
     info->channels = configuration < std::size(g_flvd_aacChannels) ? g_flvd_aacChannels[configuration] : 0;
+    // Hierarchical signalling of spectral band replication: the extension comes first, and the object type of the core,
+    // whose GASpecificConfig follows, after it.
     if (type == FLVD_AAC_SBR) {
         FLVD_GetFrequency(&bits); // the extension's; the core's is reported
         type = FLVD_GetObjectType(&bits);
     }
     if (type >= 32 || (FLVD_AAC_TYPES_GA >> type & 1u) == 0)
         return;
+    // GASpecificConfig. channelConfiguration 0 means that a program_config_element lists the channels.
     bits.Skip(1); // frameLengthFlag
     const bool depends_on_core = bits.Get(1) != 0;
     bits.Skip(depends_on_core ? 14 + 1 : 1); // coreCoderDelay, extensionFlag
@@ -130,6 +139,8 @@ bool FLVD_ReadMpegHeader(const uint8_t* p, flvd_audio_info_t* info)
     return true;
 }
 
+// An encoder may put other bytes before the first frame, and a tag may begin inside a frame. So this takes the first
+// four bytes that can be a header; sync words inside compressed data are rare enough.
 int32_t FLVD_ParseMpegAudioHeader(const uint8_t* data, int32_t length, flvd_audio_info_t* info)
 {
     if (length < FLVD_MPEG_HEADER_SIZE)
@@ -140,6 +151,8 @@ int32_t FLVD_ParseMpegAudioHeader(const uint8_t* data, int32_t length, flvd_audi
     return -1;
 }
 
+// Describes MPEG audio. The header is searched in the first 16 bytes of the tag, its tag header included. Layers I and
+// II are reported as MP3 too, because that is how FLV labels them.
 int32_t FLVD_ProbeMp3(flvd_ctx_t* ctx, uint32_t format, flvd_site_t short_site, flvd_site_t header_site)
 {
     const uint8_t* tag = nullptr;
@@ -151,7 +164,9 @@ int32_t FLVD_ProbeMp3(flvd_ctx_t* ctx, uint32_t format, flvd_site_t short_site, 
     return 0;
 }
 
-// When the tag is a sequence header, copies and parses its AudioSpecificConfig.
+// When the tag is a sequence header, copies and parses its AudioSpecificConfig. Without one (a recording that began in
+// mid-stream), the stream is still playable for a decoder that is told the configuration by other means, so the values
+// of the codec byte stay.
 int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 {
     flvd_audio_info_t& info = ctx->audio_info;
@@ -172,6 +187,7 @@ int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
     return 0;
 }
 
+// A SoundFormat that is not listed needs no configuration: linear PCM, ADPCM, Nellymoser, A-law, mu-law, Speex.
 int32_t FLVD_ProbeSoundFormat(flvd_ctx_t* ctx, uint8_t audio_byte)
 {
     const uint32_t format = uint32_t{audio_byte} >> FLVD_SOUND_FORMAT_SHIFT;
@@ -210,6 +226,8 @@ int32_t FLVD_ProbeAudioTag(flvd_ctx_t* ctx)
     if (FLVD_FioPeek(&tag, FLVD_AUDIO_PEEK, ctx->cur_reader) < FLVD_AUDIO_PEEK)
         return FLVD_FailShort(ctx, FLVD_SITE_AUDIO_TAG);
     const uint8_t audio_byte = tag[FLVD_CODEC_BYTE_OFFSET];
+    // Set before the format is understood: from here on, tags with another codec byte do not count as tags of this
+    // file.
     ctx->audio_format_filter = audio_byte;
     flvd_audio_info_t& info = ctx->audio_info;
     info.sample_rate = g_flvd_soundRate[audio_byte >> 2u & 3u];

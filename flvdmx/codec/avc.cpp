@@ -1,5 +1,9 @@
 // AVC: the AVCDecoderConfigurationRecord (ISO/IEC 14496-15) and the picture size in a sequence parameter set
 // (ISO/IEC 14496-10, 7.3.2.1.1). The fields of a set are not validated: a damaged set gives a wrong picture size.
+//
+// The parser reads a set as it is stored, without removing emulation_prevention_three_byte: the bytes 00 00 03 before
+// the picture size are so rare that removing them is left to decoders. All fields are read, used or not, because each
+// one's length decides where the next one begins.
 
 #include "flvdmx/codec/codec.h"
 #include "flvdmx/common/bytes.h"
@@ -9,6 +13,9 @@
 namespace {
 
 // AVCDecoderConfigurationRecord.
+// configurationVersion, AVCProfileIndication, profile_compatibility, AVCLevelIndication, lengthSizeMinusOne, the count
+// of sequence parameter sets, and one more byte. The NAL unit length size is not needed here: parameter sets always
+// have 16-bit lengths.
 constexpr int32_t FLVD_AVCC_MIN = 7;
 constexpr uint8_t FLVD_AVCC_VERSION = 1;
 constexpr int32_t FLVD_AVCC_SPS_COUNT = 5; // offset of numOfSequenceParameterSets
@@ -119,6 +126,7 @@ int64_t FLVD_SpsGetSE()
     return (k & 1) != 0 ? (k + 1) / 2 : -(k / 2);
 }
 
+// scaling_list(), 7.3.2.1.1.1: once nextScale is 0, the rest of the list repeats the last value and has no bits.
 void FLVD_SpsSkipScalingList(uint32_t size)
 {
     uint32_t last = 8;
@@ -188,6 +196,9 @@ void FLVD_SpsReadSize(uint32_t chroma_format_idc, flvd_video_info_t* info)
         crop_y = FLVD_SpsGetUE();
         crop_y += FLVD_SpsGetUE();
     }
+    // frame_crop_*_offset count chroma samples, and in field coding twice as many lines: CropUnitX and CropUnitY,
+    // equations 7-19 to 7-22. Pictures are whole macroblocks of 16 x 16, and pic_height_in_map_units_minus1 counts
+    // pairs of them when frames may be coded as fields.
     const bool known = chroma_format_idc <= FLVD_CHROMA_444;
     const flvd_crop_unit_t unit = known ? g_flvd_cropUnit[chroma_format_idc] : flvd_crop_unit_t{1, 1};
     const uint32_t fields = 2 - frame_mbs_only;
@@ -210,6 +221,7 @@ int32_t FLVD_GetAVCSeqHeaderFromAvcC(const uint8_t* record, int32_t length, uint
 {
     if (length < FLVD_AVCC_MIN || record[0] != FLVD_AVCC_VERSION || capacity < 0)
         return 0;
+    // The upper three bits of the count byte are reserved, ones in valid records, and are ignored.
     constexpr int32_t sets = FLVD_AVCC_SPS_COUNT + 1;
     flvd_avcc_t avcc = {record + sets, length - sets, out, capacity};
     if (!FLVD_CopyParameterSets(&avcc, record[FLVD_AVCC_SPS_COUNT] & FLVD_AVCC_SPS_COUNT_MASK))
@@ -232,6 +244,8 @@ int32_t FLVD_ParseH264SPS(flvd_video_info_t* info, const uint8_t* data, int32_t 
     const uint32_t profile_idc = FLVD_SpsGetBits(8);
     FLVD_SpsGetBits(8 + 8); // constraint flags, level_idc
     FLVD_SpsGetUE();        // seq_parameter_set_id
+    // High, High 10, High 4:2:2 and the former High 4:4:4 (144). Later profiles with these fields, such as High 4:4:4
+    // Predictive (244), are read as if they had none, so their picture size is wrong.
     const bool high = profile_idc == 100 || profile_idc == 110 || profile_idc == 122 || profile_idc == 144;
     const uint32_t chroma_format_idc = high ? FLVD_SpsReadHighProfile() : FLVD_CHROMA_420;
     FLVD_SpsGetUE(); // log2_max_frame_num_minus4

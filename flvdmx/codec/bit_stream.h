@@ -1,4 +1,5 @@
-// Reads bits from memory, most significant bit first. Bits past the end read as 0.
+// Reads bits from memory, most significant bit first. Bits past the end read as 0, so that parsers of short or damaged
+// headers need no checks of their own. It is for headers, where simplicity counts more than speed.
 #ifndef FLVDMX_CODEC_BIT_STREAM_H
 #define FLVDMX_CODEC_BIT_STREAM_H
 

@@ -1,4 +1,8 @@
-// Video: the codec byte of FLV video tags and the picture headers of Sorenson H.263 and VP6. AVC is in avc.cpp.
+// Video: the codec byte of FLV video tags (FLV file format, version 10.1, annex E.4.3) and the picture headers of
+// Sorenson H.263 and VP6. AVC is in avc.cpp.
+//
+// FLV has no field for the picture size. These headers have it, so that a host need not wait for metadata, which many
+// files lack; where both exist, the one that comes later in the file is reported.
 
 #include "flvdmx/codec/bit_stream.h"
 #include "flvdmx/codec/codec.h"
@@ -15,9 +19,12 @@ constexpr uint32_t FLVD_VIDEO_PAYLOAD = FLVD_CODEC_BYTE_OFFSET + 1; // codecs wi
 constexpr uint32_t FLVD_PICTURE_PEEK = 128; // bytes of the tag that are searched for a picture header
 
 constexpr int32_t FLVD_VIDEO_HEADER_MIN = 8; // no codec has a shorter header
+// Room for the parameter sets of a record while the first of them is parsed. Larger ones count as damaged: real sets
+// have 20 to 60 bytes.
 constexpr int32_t FLVD_AVC_OUT_CAPACITY = 128;
 
-// Sorenson H.263.
+// Sorenson H.263, H263VIDEOPACKET. PictureSize 0 and 1 are followed by a width and a height of 8 or 16 bits each; 2 to
+// 6 stand for the sizes below, and 7 is reserved.
 constexpr int32_t FLVD_H263_HEADER_MIN = 5;
 constexpr uint32_t FLVD_H263_BEFORE_SIZE = 17 + 5 + 8; // PictureStartCode, Version, TemporalReference
 constexpr uint32_t FLVD_H263_FIRST_FIXED = 2;
@@ -31,7 +38,7 @@ constexpr flvd_picture_size_t g_flvd_h263Size[] = {{352, 288}, {176, 144}, {128,
 
 constexpr uint32_t FLVD_MACROBLOCK = 16; // pixels
 
-// Offset of the first picture start code, or -1.
+// Offset of the first PictureStartCode, 17 bits with the value 1, or -1.
 int32_t FLVD_FindH263Picture(const uint8_t* data, int32_t length)
 {
     for (int32_t p = 0; p <= length - FLVD_H263_HEADER_MIN; ++p)
@@ -40,6 +47,7 @@ int32_t FLVD_FindH263Picture(const uint8_t* data, int32_t length)
     return -1;
 }
 
+// With a reserved PictureSize the size stays as it was, from the metadata or 0.
 int32_t FLVD_ParseH263Header(uint32_t* width, uint32_t* height, const uint8_t* data, int32_t length)
 {
     const int32_t start = FLVD_FindH263Picture(data, length);
@@ -60,6 +68,8 @@ int32_t FLVD_ParseH263Header(uint32_t* width, uint32_t* height, const uint8_t* d
     return 0;
 }
 
+// VP6FLVVIDEOPACKET and, with alpha, VP6FLVALPHAVIDEOPACKET. Only a keyframe has the size: in macroblocks, from which
+// HorizontalAdjustment and VerticalAdjustment cut the pixels that are not shown.
 int32_t FLVD_ParseVP6Header(uint32_t* width, uint32_t* height, const uint8_t* data, int32_t length, bool alpha)
 {
     FLVD_BitStream bits(data, static_cast<uint32_t>(length));
@@ -85,7 +95,8 @@ void FLVD_SetFourcc(flvd_ctx_t* ctx, const char* fourcc)
     std::memcpy(ctx->video_info.fourcc, fourcc, sizeof ctx->video_info.fourcc);
 }
 
-// Probes a codec that has a picture header at the start of its data.
+// Probes a codec that has a picture header at the start of its data. The peek runs into the next tags when this one is
+// small; a file that ends before has no picture worth playing.
 int32_t FLVD_ProbePicture(flvd_ctx_t* ctx, uint32_t codec, const char* fourcc, flvd_site_t short_site,
                           flvd_site_t header_site)
 {
@@ -121,6 +132,8 @@ int32_t FLVD_ProbeAvc(flvd_ctx_t* ctx, uint32_t data_size)
     return 0;
 }
 
+// Describes the stream by CodecID. Screen video and JPEG have no size before their first decoded picture, so the
+// metadata must provide it. An unknown CodecID, as that of a later extension of the format, still delivers its frames.
 int32_t FLVD_ProbeCodec(flvd_ctx_t* ctx, uint32_t codec, uint32_t packet_type, uint32_t data_size)
 {
     switch (codec) {
@@ -173,6 +186,7 @@ int32_t FLVD_ProbeVideoTag(flvd_ctx_t* ctx)
     if (FLVD_FioPeek(&tag, FLVD_TAG_PEEK_SIZE, ctx->cur_reader) < FLVD_TAG_PEEK_SIZE)
         return FLVD_FailShort(ctx, FLVD_SITE_VIDEO_TAG);
     const uint8_t video_byte = tag[FLVD_CODEC_BYTE_OFFSET];
+    // As for audio, set before the codec is understood. Of this byte, only CodecID is compared with that of other tags.
     ctx->video_codec_filter = video_byte;
     return FLVD_ProbeCodec(ctx, video_byte & FLVD_CODEC_ID_MASK, tag[FLVD_PACKET_TYPE_OFFSET],
                            FLVD_GetBE24(tag + FLVD_DATA_SIZE_OFFSET));

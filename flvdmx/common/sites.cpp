@@ -1,4 +1,7 @@
 // The codes and line numbers of the failure sites, and the functions that record them.
+//
+// A failure is recorded where it happens, and a later one replaces it: the caller that knows more of what was attempted
+// has the last word. Nothing clears a record, so only a failed call makes it meaningful.
 
 #include "flvdmx/common/sites.h"
 
@@ -11,6 +14,7 @@ int32_t g_flvd_lErrorLine;
 
 namespace {
 
+// Codes fit 16 bits, and so do line numbers: the table is read-only data of 6 bytes per site.
 struct flvd_site_row_t {
     int16_t code;
     uint16_t line;

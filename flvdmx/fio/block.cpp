@@ -1,4 +1,7 @@
 // Block access to a cached file: peeking by copy, reading, writing, and the read size.
+//
+// Large reads go past the cache, straight into the caller's memory: copying a frame twice would cost more than the host
+// call that this saves. Small ones fill the cache, because more reads usually follow.
 
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/fio/tables.h"
@@ -30,8 +33,8 @@ uint32_t FLVD_FioReadThroughCache(fio_file_t* file, uint8_t* destination, uint32
     return n - taken;
 }
 
-// With overread: reads pieces of the read size straight into the destination, and the rest through the cache. Returns
-// the number of bytes still missing.
+// With overread: reads pieces of the read size straight into the destination, and the rest through the cache, so that
+// the cache again holds bytes beyond the request. Returns the number of bytes still missing.
 uint32_t FLVD_FioReadOver(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
     while (n > file->read_size) {
@@ -53,6 +56,7 @@ void FLVD_FioPutPending(fio_file_t* file, const void* source, uint32_t n)
     file->count += n;
 }
 
+// As for reads, a host that claims more than it was given does not make counts wrap around.
 uint32_t FLVD_FioHostWrite(fio_file_t* file, const void* source, uint32_t n)
 {
     return std::min(g_flvd_fioFuncs.file_write(source, 1, n, file->handle), n);
@@ -62,10 +66,13 @@ uint32_t FLVD_FioHostWrite(fio_file_t* file, const void* source, uint32_t n)
 
 uint32_t FLVD_FioReadBytes(fio_file_t* file, uint8_t* destination, uint32_t n)
 {
+    // A file may be read and written in turn; its pending bytes must reach the host before its position is used again.
     if (file->state == FIO_STATE_WRITE)
         __FLV_DMX__fioFlush(file);
     file->state = FIO_STATE_READ;
     FLVD_FioDropBits(file);
+    // The common case. A request that uses up the cached bytes goes on below, where the cache is refilled for the next
+    // one.
     if (n < file->count) {
         FLVD_FioTake(file, destination, n);
         return n;
@@ -106,12 +113,16 @@ uint32_t __FLV_DMX__fioWrite(const void* source, uint32_t size, uint32_t count, 
         __FLV_DMX__fioFlush(file);
     file->state = FIO_STATE_WRITE;
     FLVD_FioDropBits(file);
+    // Small writes are collected. When the cache would become full, the pending bytes go to the host first, and a block
+    // as large as the cache follows them directly.
     if (uint64_t{file->count} + total < file->capacity) {
         FLVD_FioPutPending(file, source, total);
         return count;
     }
     if (file->count != 0) {
         const uint32_t written = FLVD_FioHostWrite(file, file->cache + file->head, file->count);
+        // After a partial write, the rest stays pending and the new block is refused: the bytes of a file must not
+        // change their order.
         const bool all = written == file->count;
         FLVD_FioConsume(file, written);
         if (!all)

@@ -21,6 +21,8 @@ struct fio_access_t {
     char text[3];
 };
 
+// By the access bits of a mode; text or binary is added afterwards. "w" truncates by definition, so FIO_MODE_TRUNCATE
+// makes a difference only together with both reading and writing.
 constexpr fio_access_t g_flvd_fioAccess[] = {
     {FIO_MODE_READ, "r"},
     {FIO_MODE_WRITE, "w"},
@@ -52,6 +54,7 @@ bool FLVD_FioModeText(uint32_t mode, char (&text)[FIO_MODE_TEXT_MAX])
 fio_file_t* FLVD_FioAllocate(uint32_t cache_size, uint32_t extra, void* handle)
 {
     auto* const file = static_cast<fio_file_t*>(g_flvd_fioFuncs.mem_alloc(sizeof(fio_file_t)));
+    // Both sizes come from the caller; a sum that wraps around would allocate less than the file object claims.
     const bool fits = extra <= UINT32_MAX - cache_size;
     auto* const cache =
         file != nullptr && fits ? static_cast<uint8_t*>(g_flvd_fioFuncs.mem_alloc(cache_size + extra)) : nullptr;
@@ -69,6 +72,7 @@ fio_file_t* FLVD_FioAllocate(uint32_t cache_size, uint32_t extra, void* handle)
 
 enum class FioWidth { Bits32, Bits64 };
 
+// Moves the host. Without file_seek64, a 64-bit seek becomes a 32-bit one: files below 2 GiB still work.
 int32_t FLVD_FioHostSeek(const fio_file_t* file, int64_t offset, int32_t whence, FioWidth width)
 {
     if (width == FioWidth::Bits64 && g_flvd_fioFuncs.file_seek64 != nullptr)
@@ -77,6 +81,8 @@ int32_t FLVD_FioHostSeek(const fio_file_t* file, int64_t offset, int32_t whence,
     return g_flvd_fioFuncs.file_seek(file->handle, static_cast<int32_t>(low), whence);
 }
 
+// Moves the logical position. A short relative step stays inside the read-ahead and costs no host call. Every other
+// seek drops the read-ahead: finding out whether its target is cached would take a tell.
 int32_t FLVD_FioSeekTo(fio_file_t* file, int64_t offset, int32_t whence, FioWidth width)
 {
     if (file->state == FIO_STATE_WRITE)
@@ -152,6 +158,7 @@ int64_t __FLV_DMX__fioTell64(fio_file_t* file)
     return FLVD_FioTell(file);
 }
 
+// The host reports its own end, which the library reaches only after the cached bytes.
 int32_t __FLV_DMX__fioIsEof(fio_file_t* file)
 {
     return file->count != 0 ? 0 : g_flvd_fioFuncs.file_eof(file->handle);
@@ -168,6 +175,7 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
         return n;
     FLVD_FioCompact(file);
     const uint32_t want = std::max(n, file->read_size);
+    // Cached bytes count towards the read size; with overread, the full size is requested in addition to them.
     const uint32_t kept = file->overread != 0 ? 0 : file->count;
     file->count += FLVD_FioHostRead(file, file->cache + file->count, std::min(want - kept, allocated - file->count));
     return std::min(file->count, n);
@@ -208,6 +216,7 @@ int32_t __FLV_DMX__fioSeek64(fio_file_t* file, int64_t offset, int32_t whence)
     return FLVD_FioSeekTo(file, offset, whence, FioWidth::Bits64);
 }
 
+// Kept because they are part of the binary interface.
 uint64_t __FLV_DMX__fiodbgReadBytes(void)
 {
     return 0;

@@ -2,6 +2,9 @@
 // position is the first byte boundary at or after the bit position, so bits_left / 8 whole bytes of `bits` follow it.
 //
 // A bit reader invalidated by another access (bits_left is 0) still consumes bytes of the file, and stays empty.
+//
+// The library itself uses this reader only for the file header. It is exported for tools that parse bit fields of a
+// file; codec headers, which are in memory, are read with FLVD_BitStream.
 
 #include "flvdmx/common/bytes.h"
 #include "flvdmx/fio/fio.h"
@@ -14,6 +17,8 @@ constexpr uint32_t FLVD_BIT_CACHE = 64;
 constexpr uint32_t FLVD_BIT_REFILL = 32; // refilled by this many bits when no more than this many are left
 constexpr uint32_t FLVD_BIT_MAX = 32;    // the longest field
 
+// Every byte access invalidates the bit reader, because it moves the position. The flag tells the skip that the bit
+// reader itself is moving.
 void FLVD_BitConsumeBytes(fio_file_t* file, uint32_t n)
 {
     file->bit_skip_pending = 1;
@@ -32,6 +37,7 @@ uint32_t FLVD_BitWord(const uint8_t* bytes, uint32_t from, uint32_t available)
     return word;
 }
 
+// Adds the next 32 bits below the `left` ones that are still valid; both fit in 64 bits.
 void FLVD_BitRefill(fio_file_t* file)
 {
     const auto left = static_cast<uint32_t>(file->bits_left);
@@ -97,6 +103,7 @@ void __FLV_DMX__bitSkipBitsLong(fio_file_t* file, uint32_t n)
         return;
     }
     const uint32_t ahead = n - static_cast<uint32_t>(file->bits_left) % 8; // bits from the byte position on
+    // Too far for `bits`: skip whole bytes in the file and start again there.
     FLVD_BitConsumeBytes(file, ahead / 8);
     __FLV_DMX__bitInit(file);
     const uint32_t rest = ahead % 8;

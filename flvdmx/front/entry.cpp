@@ -7,7 +7,9 @@
 
 namespace {
 
-// The last codes of two ranges that translate to different results.
+// Error codes are grouped: from -1 on resources, from -1000 on files, -2000 seeks, -3000 codecs, -4000 requests, -10000
+// data. The group of seeks is split: a frame seek that failed (-2000) is a failure for the host, a miss (-2003) is an
+// end.
 constexpr int32_t FLVD_ERR_RESOURCE_LAST = -2002; // resources, file header and probing
 constexpr int32_t FLVD_ERR_PLACE_LAST = -2005;    // places that do not exist in the file
 

@@ -2,6 +2,9 @@
 //
 // Growing files are handled differently: when a tag is still incomplete, the reader moves back to the position saved
 // before that tag, and the next request tries again. In a complete file such a tag is skipped.
+//
+// A request handles one tag per turn, and gives up after FLVD_TAG_BUDGET turns without a frame, so that it returns to
+// its host in bounded time. The host can retry at once: the reader stands after what has been handled.
 
 #include "flvdmx/front/front.h"
 
@@ -23,6 +26,7 @@ struct flvd_payload_sites_t {
     flvd_site_t back_without_back_pointer;
 };
 
+// AAC and other audio differ in two sites only, but hosts know these by their line numbers.
 constexpr flvd_payload_sites_t g_flvd_videoSites = {FLVD_SITE_VIDEO_HEADERS_CUT, FLVD_SITE_VIDEO_NO_ROOM,
                                                     FLVD_SITE_VIDEO_CUT, FLVD_SITE_BACK_TO_CUT_VIDEO,
                                                     FLVD_SITE_BACK_TO_VIDEO_WITHOUT_BACK_POINTER};
@@ -35,6 +39,7 @@ constexpr flvd_payload_sites_t g_flvd_audioSites = {FLVD_SITE_AUDIO_HEADERS_CUT,
 
 // State of one frame request.
 struct flvd_delivery_t {
+    // The reader, the kinds wanted, and the failed checks that are left to the whole request.
     flvd_frame_search_t search;
     int64_t* saved; // growing file: position before the tag being delivered
     bool growing;
@@ -122,6 +127,7 @@ bool FLVD_DeliverCached(const flvd_delivery_t& delivery, const flvd_found_tag_t&
 {
     flvd_ctx_t* const ctx = delivery.search.ctx;
     fio_file_t* const reader = delivery.search.file;
+    // Cannot overflow: DataSize has 24 bits.
     const uint32_t size = tag.data_size + FLVD_TAG_OVERHEAD;
     if (size > reader->count || reader->state != FIO_STATE_READ)
         return false;
@@ -158,6 +164,8 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
         FLVD_Record(ctx, FLVD_PayloadSites(tag).no_room);
         return FLVD_PassTag(delivery, tag, n);
     }
+    // Cached bytes are copied, the rest comes straight from the host. A tag not checked yet is read as well: if it
+    // turns out to be false, nothing but the buffer has changed.
     const uint32_t got = FLVD_FioReadBytes(reader, ctx->frame_buffer, n);
     if (got < n) {
         if (!tag.checked && !FLVD_CheckCutTag(reader, tag, got))
@@ -166,6 +174,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
         return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_to_cut);
     }
     const uint8_t* back_pointer = nullptr;
+    // This peek refills the cache, so the next tag is usually there when it is requested.
     const bool ended = FLVD_FioPeek(&back_pointer, FLVD_BACK_POINTER_SIZE, reader) < FLVD_BACK_POINTER_SIZE;
     if (!tag.checked && (ended || !FLVD_IsBackPointer(back_pointer, tag.data_size)))
         return FlvdTurn::NoTag;
@@ -192,6 +201,7 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
         FLVD_Record(ctx, FLVD_PayloadSites(tag).headers_cut);
         return FLVD_LeaveCutTag(delivery, FLVD_PayloadSites(tag).back_to_cut);
     }
+    // A configuration, an end of sequence, or a tag too short for its codec header: there is no frame in it.
     if (tag.codec_header == 0 || tag.data_size < tag.codec_header)
         return FLVD_PassTag(delivery, tag, FLVD_TAG_HEADER_SIZE + tag.data_size);
     if (FLVD_FioSkip(headers, reader) != headers) {
@@ -204,12 +214,16 @@ FlvdTurn FLVD_DeliverPayload(const flvd_delivery_t& delivery, const flvd_found_t
 // Complete file, no tag found: skips ahead by the size of the last tag, unless the budget of failed checks is used up.
 FlvdTurn FLVD_PassPlace(const flvd_delivery_t& delivery)
 {
+    // After 16,384 false headers more of them are likely, and each costs host calls. Ending the request here lets the
+    // host decide whether to continue.
     const bool checks_used_up = delivery.search.checks_left == 0;
     if (checks_used_up || FLVD_FioSkip(delivery.passing_size + FLVD_TAG_OVERHEAD, delivery.search.file) == 0)
         return FLVD_FailRequest(delivery, FLVD_SITE_FRAME_END);
     return FlvdTurn::Next;
 }
 
+// One turn in a complete file. A tag that turns out to be false does not end the turn: the search continues inside it,
+// because real tags may begin there.
 FlvdTurn FLVD_TurnComplete(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
     flvd_frame_search_t* const search = &delivery->search;
@@ -244,6 +258,7 @@ flvd_site_t FLVD_BeginTurn(const flvd_delivery_t& delivery)
     return resumed ? FLVD_SITE_NONE : FLVD_SITE_FRAME_RESUME;
 }
 
+// One turn in a growing file. Headers are trusted, so each turn can start from the saved position again.
 [[gnu::noinline]] FlvdTurn FLVD_TurnGrowing(flvd_delivery_t* delivery, flvd_frame_t* frame)
 {
     flvd_frame_search_t& search = delivery->search;
@@ -302,7 +317,10 @@ int32_t FLVD_GetFrame(flvd_ctx_t* ctx, const flvd_frame_request_t* request, flvd
         ctx->frame_buffer = request->buffer;
         ctx->frame_buffer_size = request->buffer != nullptr ? request->buffer_size : 0;
     }
+    // Only now, so that a refused request leaves the record as it was.
     *frame = {};
+    // The previous request could not move back to its incomplete tag. Without that, delivery would continue in the
+    // middle of it.
     if (delivery.growing && *delivery.saved != 0 && !FLVD_GoBack(delivery))
         return FLVD_Fail(ctx, FLVD_SITE_FRAME_RESUME);
     for (uint32_t turns = 0; turns < FLVD_TAG_BUDGET; ++turns) {

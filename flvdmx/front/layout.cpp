@@ -1,5 +1,9 @@
-// The layout of the records is part of the binary interface. All records are checked on the 32-bit target, and those
-// that are made of pointer-sized or fixed-width words everywhere.
+// The layout of the records is part of the binary interface: programs that were compiled against an earlier header pass
+// and read them by offset. All records are checked on the 32-bit target, and those that are made of pointer-sized or
+// fixed-width words everywhere.
+//
+// An assertion that fails here means that a header has changed incompatibly. The remedy is to undo that change, or a
+// new soname; these numbers never change.
 
 #include "flvdmx/flvdmx.h"
 
@@ -65,6 +69,8 @@ constexpr size_t g_words[] = {AT(time), AT(mode)};
 static_assert(sizeof(record) == 8 && FLVD_AreWords(g_words, 4));
 } // namespace seek_request
 
+// Records that mix pointers with fields of fixed width: these offsets hold for 32-bit pointers and an int64_t that is
+// aligned to 8 bytes.
 #if defined(__arm__)
 
 namespace file {
@@ -121,6 +127,7 @@ constexpr size_t g_words[] = {AT(cur_reader),  AT(main_reader),     AT(audio_rea
                               AT(seek_method), AT(opened_for_info), AT(frame_buffer), AT(frame_buffer_size),
                               AT(cache_size),  AT(scan_read_size),  AT(byte_rate),    AT(streams),
                               AT(file_info)};
+// From word 40 on: the fields between data_end and the keyframe index.
 constexpr size_t g_times[] = {
     AT(data_offset),   AT(last_frame_size), AT(last_video_ts),  AT(last_audio_ts),      AT(duration_ms),
     AT(first_ts),      AT(last_ts),         AT(audio_delay_ms), AT(video_codec_filter), AT(audio_format_filter),

@@ -1,4 +1,7 @@
 // Opening, up to and including the file header, and releasing an instance.
+//
+// A failed open leaves nothing behind. Every resource has its field in the instance, which starts as zeros, so one
+// release function serves a complete instance and one that was only partly opened.
 
 #include "flvdmx/front/front.h"
 
@@ -14,9 +17,11 @@ namespace {
 constexpr uint32_t FLVD_CACHE_DEFAULT = 4096;
 constexpr uint32_t FLVD_CACHE_MIN = 1024;
 constexpr uint32_t FLVD_SCAN_READ_DEFAULT = FLVD_NARROW_READ;
+// In bytes. Holds the frames of most files without growing; a larger frame makes it grow once.
 constexpr uint32_t FLVD_FRAME_BUFFER_SIZE = 512000;
 
-// FLV file header.
+// FLV file header (annex E.2): Signature, Version, TypeFlags, DataOffset. Version is not checked: files of later
+// versions, if there were any, would have a larger DataOffset.
 constexpr uint32_t FLVD_SIGNATURE = 0x464C56; // "FLV"
 constexpr uint32_t FLVD_SIGNATURE_BITS = 24;
 constexpr uint32_t FLVD_SIGNATURE_STEPS = 1048576; // bytes searched for the signature: 1 MiB
@@ -25,6 +30,7 @@ constexpr int32_t FLVD_DATA_OFFSET_MIN = 9;
 constexpr uint32_t FLVD_HEADER_VIDEO = 0x01;
 constexpr uint32_t FLVD_HEADER_AUDIO = 0x04;
 
+// The two function tables have orders of their own, which are part of the binary interface.
 void FLVD_SetMemFuncs(const flvd_init_t* init)
 {
     g_flvd_memFuncs = {init->mem_free,  init->mem_alloc, init->mem_copy,
@@ -41,6 +47,8 @@ void FLVD_SetFileFuncs(const flvd_init_t* init)
     __FLV_DMX__fioSetFunc(&funcs);
 }
 
+// Applies the settings of the block and their defaults. A cache below the minimum would not hold the headers that
+// probing looks at.
 void FLVD_Configure(flvd_ctx_t* ctx, const flvd_init_t* init, bool for_info)
 {
     ctx->video_codec_filter = FLVD_ANY_CODEC;
@@ -95,6 +103,7 @@ bool FLVD_FindSignature(fio_file_t* file)
     }
 }
 
+// Sets the size of a complete file. Until the end of the valid data is known, the whole file counts as valid.
 bool FLVD_MeasureFile(flvd_ctx_t* ctx)
 {
     if (__FLV_DMX__fioSeek64(ctx->main_reader, 0, FIO_SEEK_END) != 0)
@@ -120,11 +129,13 @@ bool FLVD_ReadFileHeader(flvd_ctx_t* ctx)
         ctx->streams |= FLVD_STREAM_VIDEO;
     if ((flags & FLVD_HEADER_AUDIO) != 0)
         ctx->streams |= FLVD_STREAM_AUDIO;
+    // DataOffset, the size of the file header; 9 in version 1. Values from 2^31 on become negative and are rejected.
     ctx->data_offset = static_cast<int32_t>(__FLV_DMX__bitGetUBits(file, 32));
     if (ctx->data_offset < FLVD_DATA_OFFSET_MIN)
         return false;
     if (!FLVD_IsGrowing(ctx))
         return FLVD_MeasureFile(ctx);
+    // A growing file has no end yet: no size, offset or position in it counts as too large.
     ctx->file_size = INT64_MAX;
     ctx->data_end = INT64_MAX;
     return true;
@@ -143,6 +154,7 @@ flvd_ctx_t* FLVD_OpenInstance(const flvd_init_t* init, flvd_open_info_t* info, b
     FLVD_Configure(ctx, init, for_info);
     FLVD_SetFileFuncs(init);
     FLVD_SetCallbackforMeta(init);
+    // Any failure after this point releases what has been obtained so far, through the same function as a close.
     flvd_site_t site = FLVD_Acquire(ctx, init->file_name);
     if (site == FLVD_SITE_NONE)
         site = FLVD_ReadFileHeader(ctx) ? FLVD_ProbeStreams(ctx, info) : FLVD_SITE_OPEN_FILE_HEADER;
@@ -155,6 +167,8 @@ flvd_ctx_t* FLVD_OpenInstance(const flvd_init_t* init, flvd_open_info_t* info, b
 
 void FLVD_ReleaseInstance(flvd_ctx_t* ctx)
 {
+    // A later open may have replaced the tables. Hosts are told to pass the same functions to every open, and this
+    // relies on it.
     const auto release = g_flvd_memFuncs.mem_free;
     __FLV_DMX__fioClose(ctx->main_reader);
     if (FLVD_HasAudioReader(ctx))

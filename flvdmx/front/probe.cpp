@@ -1,5 +1,8 @@
 // Stream probing: walks the first tags to find the streams, their configuration and the metadata, derives duration and
 // byte rate, and fills the host's records.
+//
+// Complete files are walked with checked back-pointers. In a growing file these may not exist yet, so headers alone
+// count there, and a tag that is cut short fails the open: the host retries it when the file has more data.
 
 #include "flvdmx/front/front.h"
 
@@ -13,11 +16,13 @@
 
 namespace {
 
-constexpr uint32_t FLVD_FOUND_METADATA = 0x4; // in addition to the stream bits
+// In one word with the stream bits, so that one comparison tells whether everything has been found.
+constexpr uint32_t FLVD_FOUND_METADATA = 0x4;
 constexpr uint32_t FLVD_FOUND_ALL = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO | FLVD_FOUND_METADATA;
 constexpr uint32_t FLVD_NO_TIMESTAMP = 0xFFFFFFFF;
 constexpr uint32_t FLVD_BYTE_RATE_SHIFT = 10; // bytes per 1024 ms
 
+// What the walk has found so far. It ends as soon as `found` equals `wanted` and a first timestamp is known.
 struct flvd_probing_t {
     uint32_t wanted;
     uint32_t found;
@@ -51,7 +56,9 @@ int32_t FLVD_ProbeScript(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t data
     return result;
 }
 
-// Handles a tag of a complete file. Configurations do not count towards the first timestamp.
+// Handles a tag of a complete file. Configurations do not count towards the first timestamp: muxers repeat them, or
+// write them with the time 0 whatever the time of the first frame. For AVC only the sequence header describes the
+// stream, and earlier frames cannot be decoded.
 void FLVD_ProbeCompleteTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const flvd_tag_info_t& tag, uint32_t kind)
 {
     const bool config = (kind & FLVD_TAG_CONFIG) != 0;
@@ -93,6 +100,7 @@ flvd_site_t FLVD_ProbeGrowingTag(flvd_ctx_t* ctx, flvd_probing_t* probing, const
     if (FLVD_ProbeTag(ctx, probing, tag.type) == FLVD_ERR_END_OF_DATA)
         return FLVD_SITE_OPEN_TAG_CUT;
     probing->first_ts = std::min(probing->first_ts, tag.timestamp);
+    // Moves by the size in the header, past a back-pointer that may not exist yet.
     const int64_t size = int64_t{tag.data_size} + FLVD_TAG_OVERHEAD;
     const bool moved = __FLV_DMX__fioSeek64(ctx->cur_reader, size, FIO_SEEK_CUR) == 0;
     return moved ? FLVD_SITE_NONE : FLVD_SITE_OPEN_TAG_CUT;
@@ -116,6 +124,7 @@ flvd_site_t FLVD_ProbeTags(flvd_ctx_t* ctx)
 {
     if (FLVD_SeekToFirstTag(ctx, ctx->cur_reader) != 0)
         return FLVD_SITE_OPEN_NO_STREAM;
+    // A header that announces nothing is wrong rather than true; then both streams are looked for.
     const uint32_t wanted = ctx->streams == 0 ? FLVD_FOUND_ALL : ctx->streams | FLVD_FOUND_METADATA;
     flvd_probing_t probing = {wanted, 0, FLVD_NO_TIMESTAMP};
     if (FLVD_IsGrowing(ctx)) {
@@ -125,6 +134,7 @@ flvd_site_t FLVD_ProbeTags(flvd_ctx_t* ctx)
     } else {
         FLVD_ProbeCompleteTags(ctx, &probing);
     }
+    // From here on `streams` holds what was found, no longer what the header announces.
     ctx->streams = probing.found & (FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
     if (ctx->streams == 0)
         return FLVD_SITE_OPEN_NO_STREAM;
@@ -143,6 +153,8 @@ bool FLVD_MeasureExtent(flvd_ctx_t* ctx)
     return true;
 }
 
+// Timestamps that end before they start mean that the clock restarted or that the first ones are damaged. Without a
+// usable range there is nothing to seek by, and times count from 0.
 void FLVD_DeriveDuration(flvd_ctx_t* ctx)
 {
     if (ctx->last_ts < ctx->first_ts) {
@@ -155,6 +167,8 @@ void FLVD_DeriveDuration(flvd_ctx_t* ctx)
     }
     ctx->duration_ms = ctx->last_ts - ctx->first_ts;
     const bool known = ctx->duration_ms != 0 && ctx->data_end != INT64_MAX;
+    // For the estimated position of a seek by scanning. A shift instead of a multiplication by 1000 keeps this free of
+    // overflow for every file size below 2^53 bytes.
     const auto scaled = static_cast<int64_t>(static_cast<uint64_t>(ctx->data_end) << FLVD_BYTE_RATE_SHIFT);
     ctx->byte_rate = known ? static_cast<uint32_t>(static_cast<uint64_t>(scaled / int64_t{ctx->duration_ms})) : 0;
 }

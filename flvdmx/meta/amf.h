@@ -6,7 +6,7 @@
 
 #include <cstring>
 
-// Type markers.
+// Markers of the values that are parsed. Every other marker counts as a value without content.
 enum : uint32_t {
     FLVD_AMF_NUMBER = 0,
     FLVD_AMF_BOOLEAN = 1,

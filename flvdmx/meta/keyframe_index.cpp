@@ -1,3 +1,10 @@
+// The keyframe index: the strict arrays "times" (seconds) and "filepositions" (bytes) of the "keyframes" object in the
+// metadata. No standard defines them, but most muxers that write an index write this one.
+//
+// The index may be in memory, where its numbers have been converted, or only in the file, where each element is nine
+// bytes: a marker and a big-endian double. Nothing in it is trusted: positions are compared with the size of the file,
+// counts with what the arrays really hold, and a seek compares the time with that of the tag.
+
 #include "flvdmx/meta/keyframe_index.h"
 
 #include "flvdmx/common/sites.h"
@@ -11,6 +18,7 @@ namespace {
 
 constexpr uint32_t FLVD_ELEMENT_SIZE = 1 + FLVD_AMF_NUMBER_SIZE; // type marker and number
 
+// Separate from the tables of the file layer, because FLVD_ReadMetadata can be used on its own. Process-wide like them.
 flvd_mem_alloc_fn g_flvd_pfnMetaAlloc;
 flvd_mem_free_fn g_flvd_pfnMetaFree;
 
@@ -21,12 +29,14 @@ template <typename Element> void FLVD_Replace(Element** array, uint32_t* array_c
         g_flvd_pfnMetaFree(*array);
     *array = nullptr;
     *array_count = 0;
+    // The size must fit in 32 bits, since that is what mem_alloc takes.
     if (refused || count > UINT32_MAX / sizeof(Element))
         return;
     const auto size = static_cast<uint32_t>(count * sizeof(Element)); // checked above
     *array = static_cast<Element*>(g_flvd_pfnMetaAlloc(size));
     if (*array == nullptr)
         return;
+    // Elements that turn out not to exist read as 0.
     std::memset(*array, 0, size);
     *array_count = count;
 }
@@ -104,6 +114,7 @@ int32_t FLVD_TrimEntries(flvd_ctx_t* ctx, int64_t end, uint32_t* count)
 {
     uint32_t& entry_count = ctx->keyframe_index.entry_count;
     *count = entry_count;
+    // Most files are valid to their end and need no trimming.
     if (end == ctx->file_size)
         return 0;
     if (FLVD_GoToPositions(ctx, FLVD_SITE_TRIM_POSITIONS_SEEK) != 0)
@@ -143,7 +154,8 @@ int32_t FLVD_ReadLastTime(flvd_ctx_t* ctx, uint32_t count, uint32_t* time)
     return 0;
 }
 
-// Number of entries that have both a time and a position in memory.
+// Number of entries that have both a time and a position in memory. The arrays come from the file and need not have the
+// same length.
 uint32_t FLVD_EntriesInMemory(const flvd_ctx_t* ctx)
 {
     const flvd_keyframe_arrays_t& arrays = ctx->keyframe_arrays;
@@ -252,6 +264,9 @@ flvd_choice_t FLVD_ChooseEntry(const flvd_ctx_t* ctx, FlvdIndex index, uint32_t 
         uint32_t time = 0;
         if (!FLVD_NextTime(&times, &i, &time))
             break; // the index ends with the entry before it
+        // Entries are expected in order of time; the first one at or after the target ends the search. A backward seek
+        // to an exact time takes that entry, except the first one: it then goes to the first tag, which is the same
+        // picture or earlier.
         const bool exact = time == target && i != 0;
         if (time >= target && (!backward || exact))
             return {FlvdChoice::Entry, i, time};
@@ -275,6 +290,8 @@ int32_t FLVD_ReadPosition(flvd_ctx_t* ctx, FlvdIndex index, uint32_t entry, int6
         return 0;
     }
     fio_file_t* const file = ctx->main_reader;
+    // Elements have a fixed size, so the position of any entry is one seek away, whereas its time is only found by
+    // reading all times before it.
     const int64_t element = ctx->keyframe_index.positions_offset + int64_t{FLVD_ELEMENT_SIZE} * entry;
     if (__FLV_DMX__fioSeek64(file, element, FIO_SEEK_SET) != 0)
         return FLVD_Fail(ctx, FLVD_SITE_FILE_INDEX_POSITIONS_SEEK);

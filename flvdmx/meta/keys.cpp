@@ -1,3 +1,6 @@
+// Recognises the names of known properties. Metadata may have thousands of other names, so the length decides first.
+// Case is ignored, because muxers do not agree on it.
+
 #include "flvdmx/meta/keys.h"
 
 #include <iterator>

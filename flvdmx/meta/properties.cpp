@@ -1,4 +1,7 @@
-// Stores the values of known properties in the instance and its stream descriptions.
+// Stores the values of known properties in the instance and its stream descriptions (onMetaData, annex E.5).
+//
+// Values are hints: the first tags of a stream describe it as well and, where they come later, replace what is stored
+// here. Only numbers are used. A property with a value of another type takes whatever the value slot holds.
 
 #include "flvdmx/fio/fio.h"
 #include "flvdmx/meta/amf.h"
@@ -15,6 +18,7 @@ constexpr uint32_t FLVD_META_TIMES_SEEN = 0x20;
 constexpr uint32_t FLVD_META_POSITIONS_SEEN = 0x40;
 constexpr uint32_t FLVD_META_INDEX_SEEN = FLVD_META_IN_KEYFRAMES | FLVD_META_TIMES_SEEN | FLVD_META_POSITIONS_SEEN;
 
+// "filesize". A complete file has been measured by now, so a larger value shows that the file was cut off.
 void FLVD_AssignFileSize(flvd_ctx_t* ctx, uint32_t size)
 {
     if (ctx->file_size == 0)
@@ -23,6 +27,8 @@ void FLVD_AssignFileSize(flvd_ctx_t* ctx, uint32_t size)
         ctx->file_shorter_than_meta = 1;
 }
 
+// After one of the two arrays: the usable entries are those that both have. Once both have been seen, the index is
+// complete, and the offsets of later arrays with these names are ignored.
 void FLVD_AssignEntryCount(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     if (state->array_count < ctx->keyframe_index.entry_count)
@@ -54,6 +60,7 @@ void FLVD_AssignPendingKey(flvd_ctx_t* ctx, flvd_script_state_t* state)
     case FLVD_META_KEY_FILEPOSITIONS:
         FLVD_AssignEntryCount(ctx, state);
         break;
+    // Pixels; muxers write them as doubles, as AMF0 has no integers.
     case FLVD_META_KEY_WIDTH:
         ctx->video_info.width = FLVD_DoubleToU32(number);
         break;
@@ -66,9 +73,11 @@ void FLVD_AssignPendingKey(flvd_ctx_t* ctx, flvd_script_state_t* state)
     case FLVD_META_KEY_FRAMERATE:
         ctx->video_info.frame_rate = FLVD_DoubleToU32(number * FLVD_META_FRAME_RATE_UNIT);
         break;
+    // Seconds in the file.
     case FLVD_META_KEY_AUDIODELAY:
         ctx->audio_delay_ms = FLVD_SecondsToMs(number);
         break;
+    // kbit/s; the sample rate is in Hz and the sample size in bits.
     case FLVD_META_KEY_AUDIODATARATE:
         ctx->audio_info.data_rate = FLVD_DoubleToU32(number);
         break;

@@ -12,6 +12,7 @@
 
 namespace {
 
+// Bounds the stack: each level of nesting is a level of recursion. Real metadata has two or three.
 constexpr uint32_t FLVD_META_CONTAINERS_MAX = 64;
 constexpr uint32_t FLVD_META_SIZE_MAX = 0x7FFFFFFF; // sizes are returned as int32_t
 constexpr uint32_t FLVD_META_DATE_SIZE = 10;        // a double and the time zone
@@ -56,7 +57,8 @@ bool FLVD_ScriptRead(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t n)
     return read == n;
 }
 
-// Consumes a string without keeping it.
+// Consumes a string without keeping it. Short strings are read into the scratch buffer, because skipping past the
+// cached bytes would be a seek.
 bool FLVD_ScriptPassText(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t length)
 {
     if (length == 0)
@@ -74,6 +76,7 @@ uint64_t FLVD_ScriptLeft(const flvd_script_state_t* state)
 
 int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state);
 
+// The value stays in state->value, as the bytes of a double, until the key that it belongs to is assigned.
 int32_t FLVD_ParseNumber(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, FLVD_AMF_NUMBER_SIZE);
@@ -93,6 +96,7 @@ int32_t FLVD_ParseBoolean(flvd_ctx_t* ctx, flvd_script_state_t* state)
     return 1 + 1;
 }
 
+// A reference to an earlier object is not followed. Like a boolean, it only leaves its bytes in the value slot.
 int32_t FLVD_ParseReference(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
     const uint8_t* const bytes = FLVD_ScriptTake(ctx, state, 2);
@@ -152,6 +156,7 @@ FlvdArray FLVD_BeginKeyframeArray(flvd_ctx_t* ctx, flvd_script_state_t* state, u
     const uint32_t count = FLVD_GetBE32(bytes);
     state->array_count = count;
     const FlvdArray array = FLVD_BeginKeyframeArray(ctx, state, count);
+    // The count is not trusted as a size: the loop ends at the first element that the payload does not have.
     uint32_t size = FLVD_META_ARRAY_HEADER;
     for (uint32_t i = 0; i < count; ++i) {
         const int32_t element = FLVD_ParseScriptValue(ctx, state);
@@ -185,6 +190,7 @@ bool FLVD_ParseProperty(flvd_ctx_t* ctx, flvd_script_state_t* state, uint32_t ke
     const int32_t value = FLVD_ParseScriptValue(ctx, state);
     if (value < 0)
         return false;
+    // Length field, key and value, summed in 64 bits so that no size can wrap around.
     const uint64_t total = uint64_t{*sum} + 2 + key_length + static_cast<uint32_t>(value);
     if (total > FLVD_META_SIZE_MAX)
         return false;
@@ -200,6 +206,8 @@ FlvdLoop FLVD_ParseProperties(flvd_ctx_t* ctx, flvd_script_state_t* state, uint3
         const uint8_t* const bytes = FLVD_ScriptPeek(ctx, FLVD_META_END_SIZE);
         if (bytes == nullptr)
             return FlvdLoop::Failed;
+        // SCRIPTDATAOBJECTEND: an empty key, then the marker of an object end. An empty key with any other value ends
+        // the object too, but is left to the container.
         if (FLVD_GetBE24(bytes) == FLVD_META_END) {
             FLVD_ScriptConsume(ctx, state, FLVD_META_END_SIZE);
             return FlvdLoop::AtEnd;
@@ -226,7 +234,8 @@ int32_t FLVD_ParsePropertyList(flvd_ctx_t* ctx, flvd_script_state_t* state, uint
 
 int32_t FLVD_ParseEcmaArray(flvd_ctx_t* ctx, flvd_script_state_t* state)
 {
-    if (FLVD_ScriptTake(ctx, state, 4) == nullptr) // the count is a hint
+    // ECMAArrayLength. Many muxers write 0 or an estimate, so the end marker decides.
+    if (FLVD_ScriptTake(ctx, state, 4) == nullptr)
         return -1;
     return FLVD_ParsePropertyList(ctx, state, FLVD_META_ARRAY_HEADER, -1);
 }
@@ -306,6 +315,8 @@ int32_t FLVD_ReadMetadata(flvd_ctx_t* ctx, uint32_t length)
     state.length = length;
     bool stopped = false;
     const uint64_t total = FLVD_ParseScriptValues(ctx, &state, &stopped);
+    // Whatever was parsed, leave the reader after the payload: values may have ended early or run past it. The seek is
+    // spared in the usual case.
     if (stopped || total != length || state.consumed != length) {
         const int32_t moved = __FLV_DMX__fioSeek64(ctx->cur_reader, start + length, FIO_SEEK_SET);
         if (stopped && moved != 0)

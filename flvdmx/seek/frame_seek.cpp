@@ -1,4 +1,7 @@
 // Frame seek: chooses between the keyframe index and scanning, and seeks by the index, in memory or in the file.
+//
+// Audio has no index, since any of its tags can be the first one played: it is always found by scanning. `result` is
+// a timestamp of the file. Readers are not restored here after a failure; the time seek does that.
 
 #include "flvdmx/seek/seek.h"
 
@@ -26,6 +29,7 @@ constexpr flvd_index_sites_t g_flvd_memoryIndexSites = {FLVD_SITE_MEMORY_INDEX_R
                                                         FLVD_SITE_MEMORY_INDEX_TAG_CUT,
                                                         FLVD_SITE_MEMORY_INDEX_TOLERANCE};
 
+// The target lies before the first entry.
 int32_t FLVD_RewindByIndex(flvd_ctx_t* ctx, uint32_t* result, flvd_site_t site)
 {
     *result = ctx->first_ts;
@@ -42,6 +46,7 @@ int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, u
     const uint8_t* bytes = nullptr;
     if (FLVD_FioPeek(&bytes, FLVD_TAG_HEADER_SIZE, ctx->main_reader) < FLVD_TAG_HEADER_SIZE)
         return FLVD_Fail(ctx, sites.tag_cut);
+    // Type and size of the tag are not checked here: the next frame request does that anyway.
     const uint32_t timestamp = FLVD_TagTimestamp(bytes);
     if (FLVD_TimeDistance(timestamp, expected) > FLVD_INDEX_TOLERANCE_MS)
         return FLVD_Fail(ctx, sites.tolerance);
@@ -49,6 +54,7 @@ int32_t FLVD_LandOnEntry(flvd_ctx_t* ctx, int64_t position, uint32_t expected, u
     return 0;
 }
 
+// Looks up the target and moves the main reader to the keyframe chosen.
 int32_t FLVD_GoToChoice(flvd_ctx_t* ctx, FlvdIndex index, uint32_t target, uint32_t* result, bool backward)
 {
     const flvd_index_sites_t& sites = index == FlvdIndex::InMemory ? g_flvd_memoryIndexSites : g_flvd_fileIndexSites;

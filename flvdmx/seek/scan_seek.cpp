@@ -31,6 +31,8 @@ struct flvd_scan_t {
     int64_t steps;       // number of steps in the last walk
 };
 
+// Walks may turn round: a backward seek that starts before its target walks forward first, and then back to a keyframe.
+// A seek makes at most four walks.
 int32_t FLVD_SeekBackward(flvd_scan_t* scan);
 
 // The result of the seek is ignored: if it fails, the walk starts where the reader stands and still ends on the correct
@@ -52,6 +54,8 @@ int32_t FLVD_Answer(const flvd_scan_t* scan)
     return 0;
 }
 
+// The target lies before the first tag of the kind. Playing from the first tag of the file is then right for all
+// streams.
 int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
 {
     FLVD_SeekToFirstTag(scan->ctx, scan->file);
@@ -133,6 +137,8 @@ int32_t FLVD_SeekBackward(flvd_scan_t* scan)
     return FLVD_EndBackwardWalk(scan, FLVD_Walk(scan, false));
 }
 
+// Audio whose last tag is earlier than the target has ended: it continues at the end of the data, not at that tag,
+// which would be played out of time.
 int32_t FLVD_SeekFromEnd(flvd_scan_t* scan)
 {
     FLVD_StartAt(scan, scan->ctx->data_end);
@@ -150,6 +156,7 @@ int32_t FLVD_SeekFromTag(flvd_scan_t* scan)
 }
 
 // Which place is nearest to the target in time: the start, the end, or a place in the file whose time is known.
+// Timestamps stand for distances in bytes, which holds as long as the bit rate does not vary too much.
 enum class FlvdNearest { Start, Known, End };
 
 FlvdNearest FLVD_Nearest(const flvd_scan_t* scan, uint32_t known)
@@ -176,12 +183,15 @@ int32_t FLVD_FirstTag(flvd_scan_t* scan, uint32_t kind, flvd_site_t site)
     return code == 0 || code == FLVD_ERR_AT_FIRST_TAG ? code : FLVD_ERR_NOT_FOUND;
 }
 
+// File position of a timestamp at a constant byte rate. Tags are small compared with its error, so the file header and
+// script data are not allowed for.
 int64_t FLVD_EstimatePosition(const flvd_ctx_t* ctx, uint32_t target)
 {
     const uint64_t time = target > ctx->first_ts ? target - ctx->first_ts : 0;
     return static_cast<int64_t>(time * ctx->byte_rate / FLVD_BYTE_RATE_MS); // two 32-bit factors: below 2^54
 }
 
+// Answers from the first tag at or after the estimated position.
 int32_t FLVD_SeekFromFirstTag(flvd_scan_t* scan)
 {
     flvd_tag_header_t header;
@@ -214,6 +224,7 @@ int32_t FLVD_SeekAfterVideo(flvd_scan_t* scan)
     return scan->tag.timestamp == scan->target ? FLVD_Answer(scan) : FLVD_SeekFromTag(scan);
 }
 
+// Starts at the next audio tag after the current position. Without one, the target is reached from the end.
 int32_t FLVD_SeekFromHere(flvd_scan_t* scan)
 {
     if (FLVD_GetCurrTagInfo(scan->ctx, scan->file, &scan->tag, FLVD_TAG_AUDIO, 1) != 0)
@@ -221,6 +232,8 @@ int32_t FLVD_SeekFromHere(flvd_scan_t* scan)
     return scan->tag.timestamp == scan->target ? FLVD_Answer(scan) : FLVD_SeekFromTag(scan);
 }
 
+// Audio that no video leads: a file without video, or the shared reader. The current position is a good start, because
+// most seeks are short.
 int32_t FLVD_SeekAudioAlone(flvd_scan_t* scan)
 {
     switch (FLVD_Nearest(scan, scan->ctx->last_audio_ts + scan->ctx->first_ts)) {

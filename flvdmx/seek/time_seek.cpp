@@ -1,7 +1,8 @@
 // Time seek: converts the host's time to a target timestamp and a direction, moves the readers with frame seeks, and
 // restores their positions if anything fails, so that delivery continues where it was.
 //
-// last_video_ts and last_audio_ts count from first_ts; frame seeks use the timestamps of the file.
+// last_video_ts and last_audio_ts count from first_ts; frame seeks use the timestamps of the file. A saved position of
+// 0 stands for none: the file header is there, and no reader goes back to it.
 
 #include "flvdmx/seek/seek.h"
 
@@ -25,6 +26,7 @@ struct flvd_time_seek_t {
     uint32_t reached; // file timestamp
 };
 
+// A relative seek by 0 asks for the current time and moves nothing.
 bool FLVD_IsByZero(const flvd_time_seek_t& seek)
 {
     return (seek.mode & FLVD_SEEK_RELATIVE) != 0 && seek.time == 0;
@@ -49,6 +51,7 @@ void FLVD_ChooseTarget(flvd_time_seek_t* seek)
         seek->target = int64_t{seek->ctx->first_ts} + seek->time;
         backward = seek->target < int64_t{current};
     }
+    // Both direction bits at once count as none.
     const uint32_t forced = seek->mode & FLVD_SEEK_DIRECTION_MASK;
     if (forced == FLVD_SEEK_BACKWARD || forced == FLVD_SEEK_FORWARD)
         backward = forced == FLVD_SEEK_BACKWARD;
@@ -67,6 +70,7 @@ bool FLVD_SavePosition(fio_file_t* reader, int64_t* saved)
     return true;
 }
 
+// A restore that fails keeps the position, so that the next frame request of a growing file can try again.
 void FLVD_RestorePosition(fio_file_t* reader, int64_t* saved)
 {
     if (*saved != 0 && __FLV_DMX__fioSeek64(reader, *saved, FIO_SEEK_SET) == 0)
@@ -118,6 +122,7 @@ int32_t FLVD_MoveStream(flvd_time_seek_t* seek, uint32_t stream, flvd_site_t pos
     return 0;
 }
 
+// One reader delivers both streams, so video decides where it goes, and audio continues from there.
 int32_t FLVD_MoveOneReader(flvd_time_seek_t* seek)
 {
     flvd_ctx_t* const ctx = seek->ctx;
@@ -161,6 +166,7 @@ int32_t FLVD_FollowVideo(const flvd_time_seek_t& seek)
     return 0;
 }
 
+// Only video can be sought in a growing file, since the index has no audio and there is no end to scan from.
 int32_t FLVD_MoveGrowing(flvd_time_seek_t* seek)
 {
     const int32_t result =
@@ -189,6 +195,7 @@ int32_t FLVD_MoveReaders(flvd_time_seek_t* seek)
         return 0;
     }
     FLVD_ChooseTarget(seek);
+    // A target at or before the file timestamp 0 needs no search, and works in files whose tags start later.
     if (seek->target <= 0)
         return FLVD_RewindReaders(seek);
     if (FLVD_IsBeyondEnd(*seek))

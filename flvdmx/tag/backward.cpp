@@ -1,5 +1,6 @@
 // Backward navigation: the four bytes before a tag give the size of the previous tag. Where they do not lead to a
-// consistent tag, the cursor slides back byte by byte until four bytes do.
+// consistent tag, the cursor slides back byte by byte until four bytes do. Going back needs no separate check of
+// back-pointers, since every step follows one and compares it with the header that it leads to.
 //
 // Results of seeks are ignored here: after a failed one, the next peek or header check fails.
 
@@ -16,6 +17,7 @@ int32_t FLVD_PeekBackPointer(fio_file_t* file, int64_t cursor)
     const uint8_t* bytes = nullptr;
     if (FLVD_FioPeek(&bytes, FLVD_BACK_POINTER_SIZE, file) < FLVD_BACK_POINTER_SIZE)
         return 0;
+    // As a signed number, so that values from 2^31 on, which no tag has, are rejected together with 0.
     const auto value = static_cast<int32_t>(FLVD_GetBE32(bytes));
     return value > 0 && value < cursor ? value : 0;
 }
@@ -27,6 +29,7 @@ bool FLVD_IsPreviousTag(const flvd_tag_rules_t& rules, const flvd_tag_header_t& 
            FLVD_IsStreamTag(rules, header);
 }
 
+// The kind that stepping backward reports: less than forward. This is part of the documented interface.
 uint32_t FLVD_BackwardKind(const flvd_tag_header_t& header, uint32_t wanted)
 {
     if (header.IsVideo()) {

@@ -1,5 +1,8 @@
 // Finds the end of the valid data and the last timestamp. The file size is no substitute for that end: other bytes may
 // follow the last tag, and a download may have been cut off inside one.
+//
+// Everything found here bounds what counts as a plausible header from then on: no tag is larger than the valid data,
+// and none is later than the last timestamp. That is what makes false headers rare in damaged files.
 
 #include "flvdmx/tag/tag.h"
 
@@ -11,6 +14,8 @@
 
 namespace {
 
+// Enough to meet both streams in interleaved files without reading far into one that has a long stretch of one stream
+// at its end.
 constexpr uint32_t FLVD_WALK_TAGS = 10;
 
 // End of the tag at the position, its PreviousTagSize included; negative when the tell fails.
@@ -92,6 +97,8 @@ int32_t FLVD_WalkBack(flvd_ctx_t* ctx, int64_t end, flvd_site_t seek_site, flvd_
     return 0;
 }
 
+// For an open that only wants information: a file whose last bytes are no tag is not searched, and then has no
+// duration.
 int32_t FLVD_ProbeExtentQuick(flvd_ctx_t* ctx)
 {
     const int64_t end = FLVD_FindLastTagEnd(ctx, true);
@@ -108,6 +115,7 @@ int32_t FLVD_ProbeExtentQuick(flvd_ctx_t* ctx)
 int32_t FLVD_FindEnd(flvd_ctx_t* ctx, int64_t* end)
 {
     if (!FLVD_IsIndexUsable(ctx)) {
+        // A single entry says that the file has one keyframe: there is nothing to seek to.
         ctx->seek_method = ctx->keyframe_index.entry_count == 1 ? FLVD_SEEK_NONE : FLVD_SEEK_BY_SCAN;
         return FLVD_LastTagEnd(ctx, FLVD_SITE_LAST_TAG, end);
     }

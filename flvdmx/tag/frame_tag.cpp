@@ -1,4 +1,5 @@
-// Finds the tag of the next frame. This runs for every frame delivered.
+// Finds the tag of the next frame. This runs for every frame delivered, so the usual case (the next tag is the one
+// wanted, and is cached) is decided here with a few comparisons. Everything else is left to the search in forward.cpp.
 
 #include "flvdmx/tag/search.h"
 
@@ -9,6 +10,7 @@ namespace {
 bool FLVD_IsNextWanted(const flvd_frame_search_t& search, flvd_tag_header_t* header)
 {
     const fio_file_t* const file = search.file;
+    // With a narrowed read size, as while a caller steps through tags, the full search decides.
     if (file->count < FLVD_TAG_PEEK_SIZE || file->state != FIO_STATE_READ || file->read_size != file->capacity)
         return false;
     *header = FLVD_ReadTagHeader(FLVD_FioCached(file));
@@ -27,6 +29,7 @@ bool FLVD_IsCachedAndValid(const fio_file_t* file, uint32_t data_size)
 
 bool FLVD_CheckPastData(fio_file_t* file, uint32_t data_size)
 {
+    // May move past the end of the file. The peek then finds nothing, which counts as disagreeing.
     FLVD_FioSkip(data_size + FLVD_TAG_HEADER_SIZE, file);
     const uint32_t before = file->read_size;
     const FLVD_ReadSizeGuard narrow(file, before > FLVD_NARROW_READ ? FLVD_BACK_POINTER_SIZE : before, before);
@@ -50,5 +53,6 @@ int32_t FLVD_FindFrameTag(flvd_frame_search_t* search, flvd_found_tag_t* tag)
         return FLVD_SearchFrameTag(search, position, tag);
     tag->start = FLVD_FioTell(search->file);
     tag->budget = FLVD_RESYNC_WINDOW;
+    // A host whose positions run backward could otherwise make a caller repeat the same tag forever.
     return tag->start >= position ? 0 : FLVD_ERR_NOT_FOUND;
 }

@@ -1,10 +1,16 @@
 // Finds the end of the last tag: searches backward from the end of the file and, if other bytes follow the last tag,
 // bisects the file.
+//
+// The search backward handles a few stray bytes and a tag that is cut short. Bisection handles preallocated files,
+// whose end may be gigabytes of zeros: it assumes that valid data ends once, with tags before that place and none after
+// it.
 
 #include "flvdmx/tag/tag.h"
 
 namespace {
 
+// Places before the end of the file at which a back-pointer is looked for, without bisecting first; after it,
+// FLVD_SCAN_CURSORS.
 constexpr uint32_t FLVD_TAIL_CURSORS_QUICK = 16;
 constexpr uint32_t FLVD_TAIL_CURSORS = 256;
 constexpr uint32_t FLVD_SCAN_CURSORS = FLVD_RESYNC_WINDOW;
