@@ -12,7 +12,7 @@
 #include <stdio.h>
 #include <string.h>
 
-/* Until the data ends. 0, or a complaint printed. */
+/* Copies up to the end of the data. Returns 0, or -1 after printing a message. */
 static int copy_stream(flvd_ctx_t* instance, uint32_t stream, FILE* output)
 {
     const flvd_frame_request_t request = {NULL, 0, 0}; /* whatever comes next: the file has one reader */

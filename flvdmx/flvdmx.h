@@ -97,7 +97,7 @@ enum {
 
 /** Mode bits of flvd_seek_request_t::mode. */
 enum {
-    FLVD_SEEK_RELATIVE = 0x10,          /**< `time` is an offset from the current position */
+    FLVD_SEEK_RELATIVE = 0x10,          /**< `time` counts from the current position */
     FLVD_SEEK_DIRECTION_MASK = 0x300,   /**< direction; 0 and 0x300: backward to an earlier target, else forward */
     FLVD_SEEK_BACKWARD = 0x100,         /**< land on the keyframe at or before the target */
     FLVD_SEEK_FORWARD = 0x200,          /**< land on the keyframe at or after the target */
@@ -126,7 +126,7 @@ enum {
     FLVD_ERR_FILE_HEADER = -1004,       /**< no FLV file header, or an invalid one */
     FLVD_ERR_EXTENT = -1005,            /**< the end of the valid data was not found */
     FLVD_ERR_FRAME_SEEK = -2000,        /**< a frame seek failed */
-    FLVD_ERR_SEEK_MISS = -2003,         /**< the target is beyond the end, or no keyframe lies in that direction */
+    FLVD_ERR_SEEK_MISS = -2003,         /**< the target is beyond the end, or no keyframe is in that direction */
     FLVD_ERR_SEEK_PLACE = -2006,        /**< no tag, or an unexpected one, where a seek landed */
     FLVD_ERR_INDEX_ELEMENT = -2007,     /**< a keyframe position in the metadata is not a number */
     FLVD_ERR_AVC_CONFIG = -3001,        /**< AVC record: damaged, or its parameter sets are not 1 to 128 bytes */
@@ -267,7 +267,7 @@ typedef struct flvd_frame_t {
  * timestamp; it is written on success only. The current position is the time of the last video frame, or of the last
  * audio frame in a file without video. A target whose file timestamp is 0 or less goes to the first tag; a
  * relative time of 0 only reports the current position. A seek misses (FLVD_RET_END) when the target is beyond the end
- * or no keyframe lies in its direction. After a miss or any other failure, delivery continues where it was.
+ * or no keyframe is in its direction. After a miss or any other failure, delivery continues where it was.
  */
 typedef struct flvd_seek_request_t {
     int32_t time;  /**< ms from the first timestamp, or from the current position with FLVD_SEEK_RELATIVE */
@@ -276,8 +276,8 @@ typedef struct flvd_seek_request_t {
 
 /** Keyframe index in the file: the AMF0 strict arrays of the metadata's "keyframes" object. */
 typedef struct flvd_keyframe_index_t {
-    int64_t times_offset;     /**< file offset of the first element of "times", 0 when there is none */
-    int64_t positions_offset; /**< file offset of the first element of "filepositions", 0 when there is none */
+    int64_t times_offset;     /**< file position of the first element of "times", 0 when there is none */
+    int64_t positions_offset; /**< file position of the first element of "filepositions", 0 when there is none */
     uint32_t entry_count;     /**< usable entries; 0xFFFFFFFF when "keyframes" held no array */
 } flvd_keyframe_index_t;
 
@@ -286,7 +286,7 @@ typedef struct flvd_keyframe_arrays_t {
     uint32_t times_count;     /**< entries of times_ms */
     uint32_t* times_ms;       /**< ms, or null */
     uint32_t positions_count; /**< entries of positions */
-    int64_t* positions;       /**< file offsets, or null */
+    int64_t* positions;       /**< file positions, or null */
 } flvd_keyframe_arrays_t;
 
 /** Instance: one open file. Operations 0 and 10 create it, operation 1 frees it. A host may read it, never write it. */

@@ -185,7 +185,7 @@ FLVD_API uint32_t __FLV_DMX__fioSkipBytes(uint32_t n, fio_file_t* file);
 
 /**
  * Writes pending bytes, then moves the logical position. Drops the read-ahead even when the host's seek fails; a
- * relative seek to a place inside it keeps it and does not call the host.
+ * relative seek to a position inside it keeps it and does not call the host.
  * @return 0; the host's result when its seek fails; -1 for an unknown origin, with the read-ahead kept
  */
 FLVD_API int32_t __FLV_DMX__fioSeek(fio_file_t* file, int32_t offset, int32_t whence);
@@ -249,7 +249,7 @@ FLVD_API uint32_t __FLV_DMX__bitGetSBits(fio_file_t* file, uint32_t n);
  * Finds the first tag of a wanted kind at or after the reader's position, and describes it. A reader that stands at
  * PreviousTagSize0 starts with the first tag.
  *
- * @param ctx    open instance, borrowed; read to judge headers, not changed
+ * @param ctx    open instance, borrowed; used to check headers, not changed
  * @param file   reader; on success it stands at the first byte of the tag header
  * @param info   caller's record, written on success only
  * @param wanted FLVD_TAG_* bits

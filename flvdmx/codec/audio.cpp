@@ -165,7 +165,7 @@ int32_t FLVD_ProbeMp3(flvd_ctx_t* ctx, uint32_t format, flvd_site_t short_site, 
 }
 
 // When the tag is a sequence header, copies and parses its AudioSpecificConfig. Without one (a recording that began in
-// mid-stream), the stream is still playable for a decoder that is told the configuration by other means, so the values
+// mid-stream), the stream is still playable for a decoder that gets the configuration by other means, so the values
 // of the codec byte stay.
 int32_t FLVD_ProbeAac(flvd_ctx_t* ctx)
 {

@@ -85,7 +85,7 @@ uint32_t FLVD_SpsByte(int32_t index)
 }
 
 // The next bits, left-aligned, from the four bytes at the position: the upper 25 are exact at any bit position, the
-// rest may be 0. The second case loads three bytes, because there the fourth lies past the end and reads as 0.
+// rest may be 0. The second case loads three bytes, because there the fourth is past the end and reads as 0.
 inline uint32_t FLVD_SpsWindow()
 {
     const int32_t byte = g_flvd_spsBits.bit_pos >> 3;

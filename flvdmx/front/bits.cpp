@@ -17,8 +17,8 @@ constexpr uint32_t FLVD_BIT_CACHE = 64;
 constexpr uint32_t FLVD_BIT_REFILL = 32; // refilled by this many bits when no more than this many are left
 constexpr uint32_t FLVD_BIT_MAX = 32;    // the longest field
 
-// Every byte access invalidates the bit reader, because it moves the position. The flag tells the skip that the bit
-// reader itself is moving.
+// Every byte access invalidates the bit reader, because it moves the position. With the flag set, the skip
+// leaves the bit reader valid.
 void FLVD_BitConsumeBytes(fio_file_t* file, uint32_t n)
 {
     file->bit_skip_pending = 1;

@@ -11,7 +11,7 @@ namespace {
 // data. The group of seeks is split: a frame seek that failed (-2000) is a failure for the host, a miss (-2003) is an
 // end.
 constexpr int32_t FLVD_ERR_RESOURCE_LAST = -2002; // resources, file header and probing
-constexpr int32_t FLVD_ERR_PLACE_LAST = -2005;    // places that do not exist in the file
+constexpr int32_t FLVD_ERR_PLACE_LAST = -2005;    // positions that do not exist in the file
 
 // Translates a failure for the host; `result` is what the operation itself returned.
 int32_t FLVD_TranslateError(int32_t result, int32_t error)

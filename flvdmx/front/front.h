@@ -1,4 +1,4 @@
-// Front end: the operations behind the entry point.
+// Front end: the operations of the entry point.
 //
 // Files: entry.cpp dispatches and translates results, open.cpp opens and releases an instance, probe.cpp finds its
 // streams, frame.cpp delivers frames, bits.cpp is the bit reader, layout.cpp asserts the layout of the records.

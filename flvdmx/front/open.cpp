@@ -86,7 +86,7 @@ flvd_site_t FLVD_Acquire(flvd_ctx_t* ctx, const char* file_name)
     return FLVD_SITE_NONE;
 }
 
-// Moves the bit reader to the first "FLV". After 1 MiB without it, takes the bytes at that place for a header anyway.
+// Moves the bit reader to the first "FLV". After 1 MiB without it, parses the bytes there as a header anyway.
 // False when fewer bytes are left than a header has.
 bool FLVD_FindSignature(fio_file_t* file)
 {
@@ -167,7 +167,7 @@ flvd_ctx_t* FLVD_OpenInstance(const flvd_init_t* init, flvd_open_info_t* info, b
 
 void FLVD_ReleaseInstance(flvd_ctx_t* ctx)
 {
-    // A later open may have replaced the tables. Hosts are told to pass the same functions to every open, and this
+    // A later open may have replaced the tables. Hosts must pass the same functions to every open, and this
     // relies on it.
     const auto release = g_flvd_memFuncs.mem_free;
     __FLV_DMX__fioClose(ctx->main_reader);

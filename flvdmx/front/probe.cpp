@@ -16,7 +16,7 @@
 
 namespace {
 
-// In one word with the stream bits, so that one comparison tells whether everything has been found.
+// In one word with the stream bits, so that one comparison shows whether everything has been found.
 constexpr uint32_t FLVD_FOUND_METADATA = 0x4;
 constexpr uint32_t FLVD_FOUND_ALL = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO | FLVD_FOUND_METADATA;
 constexpr uint32_t FLVD_NO_TIMESTAMP = 0xFFFFFFFF;
@@ -124,7 +124,7 @@ flvd_site_t FLVD_ProbeTags(flvd_ctx_t* ctx)
 {
     if (FLVD_SeekToFirstTag(ctx, ctx->cur_reader) != 0)
         return FLVD_SITE_OPEN_NO_STREAM;
-    // A header that announces nothing is wrong rather than true; then both streams are looked for.
+    // A header that announces nothing is wrong rather than true; then both streams are searched for.
     const uint32_t wanted = ctx->streams == 0 ? FLVD_FOUND_ALL : ctx->streams | FLVD_FOUND_METADATA;
     flvd_probing_t probing = {wanted, 0, FLVD_NO_TIMESTAMP};
     if (FLVD_IsGrowing(ctx)) {

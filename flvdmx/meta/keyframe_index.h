@@ -29,11 +29,11 @@ void FLVD_StoreElement(flvd_ctx_t* ctx, FlvdArray array, uint32_t entry, double 
 // The index and the valid data. The functions with an int32_t result return 0, or -1 with the failure recorded, except
 // that an index in the file that ends early records nothing.
 
-// True when the index lies inside the file and has more than one entry.
+// True when the index is inside the file and has more than one entry.
 bool FLVD_IsIndexUsable(const flvd_ctx_t* ctx);
 
-// Finds the last position before the first one that lies outside the file; 0 when there is none. Sets `all_inside` when
-// no position lies outside, or only the last one.
+// Finds the last position before the first one that is outside the file; 0 when there is none. Sets `all_inside` when
+// no position is outside, or only the last one.
 int32_t FLVD_FindLastInside(flvd_ctx_t* ctx, int64_t* last, bool* all_inside);
 
 // Trims the entries past the end of the valid data, except the first of them, and sets the last keyframe time from the

@@ -29,7 +29,7 @@ constexpr flvd_index_sites_t g_flvd_memoryIndexSites = {FLVD_SITE_MEMORY_INDEX_R
                                                         FLVD_SITE_MEMORY_INDEX_TAG_CUT,
                                                         FLVD_SITE_MEMORY_INDEX_TOLERANCE};
 
-// The target lies before the first entry.
+// The target is before the first entry.
 int32_t FLVD_RewindByIndex(flvd_ctx_t* ctx, uint32_t* result, flvd_site_t site)
 {
     *result = ctx->first_ts;

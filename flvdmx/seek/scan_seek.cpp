@@ -15,7 +15,7 @@ namespace {
 
 constexpr uint32_t FLVD_BYTE_RATE_MS = 1024; // byte_rate is in bytes per 1024 ms
 
-// The estimated position may lie inside a tag of up to 16 MiB, and one search for the next tag covers 1 MiB.
+// The estimated position may be inside a tag of up to 16 MiB, and one search for the next tag covers 1 MiB.
 constexpr uint32_t FLVD_FIRST_STEP_TRIES = 16;
 
 // One scan seek.
@@ -54,7 +54,7 @@ int32_t FLVD_Answer(const flvd_scan_t* scan)
     return 0;
 }
 
-// The target lies before the first tag of the kind. Playing from the first tag of the file is then right for all
+// The target is before the first tag of the kind. Playing from the first tag of the file is then right for all
 // streams.
 int32_t FLVD_AnswerFirstTag(const flvd_scan_t* scan)
 {
@@ -148,14 +148,14 @@ int32_t FLVD_SeekFromEnd(flvd_scan_t* scan)
 }
 
 // Walks from the tag at the position and answers. When that tag has the target's time but is not the answer, the answer
-// may lie on either side: the walk then starts against the seek direction, so that the way back passes the tag again.
+// may be on either side: the walk then starts against the seek direction, so that the way back passes the tag again.
 int32_t FLVD_SeekFromTag(flvd_scan_t* scan)
 {
     const bool ahead = scan->target > scan->tag.timestamp || (scan->target == scan->tag.timestamp && scan->backward);
     return ahead ? FLVD_SeekForward(scan) : FLVD_SeekBackward(scan);
 }
 
-// Which place is nearest to the target in time: the start, the end, or a place in the file whose time is known.
+// Which position is nearest to the target in time: the start, the end, or one whose time is known.
 // Timestamps stand for distances in bytes, which holds as long as the bit rate does not vary too much.
 enum class FlvdNearest { Start, Known, End };
 

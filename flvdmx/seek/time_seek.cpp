@@ -26,7 +26,7 @@ struct flvd_time_seek_t {
     uint32_t reached; // file timestamp
 };
 
-// A relative seek by 0 asks for the current time and moves nothing.
+// A relative seek by 0 reports the current time and moves nothing.
 bool FLVD_IsByZero(const flvd_time_seek_t& seek)
 {
     return (seek.mode & FLVD_SEEK_RELATIVE) != 0 && seek.time == 0;
@@ -175,7 +175,7 @@ int32_t FLVD_MoveGrowing(flvd_time_seek_t* seek)
     return result == 0 && follows ? FLVD_FollowVideo(*seek) : result;
 }
 
-// True when the target lies past the end. The last timestamp of a growing file is not known; there the index decides.
+// True when the target is past the end. The last timestamp of a growing file is not known; there the index decides.
 bool FLVD_IsBeyondEnd(const flvd_time_seek_t& seek)
 {
     const bool unknown = seek.growing && seek.ctx->last_ts == 0;

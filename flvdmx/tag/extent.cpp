@@ -14,7 +14,7 @@
 
 namespace {
 
-// Enough to meet both streams in interleaved files without reading far into one that has a long stretch of one stream
+// Enough to find both streams in interleaved files without reading far into one that has a long stretch of one stream
 // at its end.
 constexpr uint32_t FLVD_WALK_TAGS = 10;
 
@@ -75,7 +75,7 @@ int32_t FLVD_IndexedEnd(flvd_ctx_t* ctx, int64_t* end)
     return found ? FLVD_WalkToEnd(ctx, tag, end) : FLVD_StepBackToEnd(ctx, last, end);
 }
 
-// Walks back over at most FLVD_WALK_TAGS tags, until every stream has been met, and stores the largest timestamp: the
+// Walks back over at most FLVD_WALK_TAGS tags, until every stream has been seen, and stores the largest timestamp: the
 // last tag of one stream may be earlier than that of the other.
 int32_t FLVD_WalkBack(flvd_ctx_t* ctx, int64_t end, flvd_site_t seek_site, flvd_site_t step_site)
 {

@@ -2,7 +2,7 @@
 //
 // A search alternates between two steps: examine the header at the position, and if that is not the tag to return, move
 // on. After a valid tag the next header is known to start where this one ends. After anything else the next plausible
-// header is looked for byte by byte. Three budgets make every search end: bytes crossed, failed checks, and the
+// header is searched byte by byte. Three budgets make every search end: bytes crossed, failed checks, and the
 // requirement that the position advances.
 
 #include "flvdmx/tag/search.h"

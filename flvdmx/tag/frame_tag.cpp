@@ -5,7 +5,7 @@
 
 namespace {
 
-// True when enough of the tag at the position is cached to judge its header, and the tag is plausible and wanted. Never
+// True when enough of the tag at the position is cached to check its header, and the tag is plausible and wanted. Never
 // true for script data: the back-pointer of the first script tag need not agree, which only the full search handles.
 bool FLVD_IsNextWanted(const flvd_frame_search_t& search, flvd_tag_header_t* header)
 {

@@ -2,14 +2,14 @@
 // bisects the file.
 //
 // The search backward handles a few stray bytes and a tag that is cut short. Bisection handles preallocated files,
-// whose end may be gigabytes of zeros: it assumes that valid data ends once, with tags before that place and none after
-// it.
+// whose end may be gigabytes of zeros: it assumes that valid data ends once, with tags before that position and none
+// after it.
 
 #include "flvdmx/tag/tag.h"
 
 namespace {
 
-// Places before the end of the file at which a back-pointer is looked for, without bisecting first; after it,
+// Positions before the end of the file that are searched for a back-pointer without bisecting first; after it,
 // FLVD_SCAN_CURSORS.
 constexpr uint32_t FLVD_TAIL_CURSORS_QUICK = 16;
 constexpr uint32_t FLVD_TAIL_CURSORS = 256;
@@ -41,7 +41,8 @@ FlvdProbe FLVD_ProbeBackPointer(fio_file_t* file, uint32_t max_timestamp, int64_
     return agrees && FLVD_TagTimestamp(bytes) <= max_timestamp ? FlvdProbe::Found : FlvdProbe::Nothing;
 }
 
-// Probes `cursors` places, from `cursor` downwards. Returns the end of the tag found, FLVD_NO_LAST_TAG or FLVD_NO_SEEK.
+// Probes `cursors` positions, from `cursor` downwards. Returns the end of the tag found, FLVD_NO_LAST_TAG or
+// FLVD_NO_SEEK.
 int64_t FLVD_ProbeCursors(const flvd_ctx_t* ctx, int64_t cursor, uint32_t cursors)
 {
     fio_file_t* const file = ctx->cur_reader;
@@ -56,7 +57,7 @@ int64_t FLVD_ProbeCursors(const flvd_ctx_t* ctx, int64_t cursor, uint32_t cursor
     return FLVD_NO_LAST_TAG;
 }
 
-// Seeks, then probes `cursors` places from there downwards. Results as above, or FLVD_NO_POSITION.
+// Seeks, then probes `cursors` positions from there downwards. Results as above, or FLVD_NO_POSITION.
 int64_t FLVD_ProbeFrom(const flvd_ctx_t* ctx, int64_t offset, int32_t whence, uint32_t cursors)
 {
     if (__FLV_DMX__fioSeek64(ctx->cur_reader, offset, whence) != 0)
@@ -65,7 +66,7 @@ int64_t FLVD_ProbeFrom(const flvd_ctx_t* ctx, int64_t offset, int32_t whence, ui
     return cursor < 0 ? FLVD_NO_POSITION : FLVD_ProbeCursors(ctx, cursor, cursors);
 }
 
-// Bisects the file until the end of its valid data lies in the last MiB before the result. FLVD_NO_SEEK on failure.
+// Bisects the file until the end of its valid data is in the last MiB before the result. FLVD_NO_SEEK on failure.
 int64_t FLVD_Bisect(flvd_ctx_t* ctx)
 {
     fio_file_t* const file = ctx->cur_reader;

@@ -9,7 +9,7 @@ typedef struct error_text_t {
 
 /* All codes that can be recorded. The last row stands for every other number. */
 static const error_text_t texts[] = {
-    {FLVD_ERR_NONE, "FLVD_ERR_NONE", "no error, or a frame was skipped because it did not fit"},
+    {FLVD_ERR_NONE, "FLVD_ERR_NONE", "no error was recorded"},
     {FLVD_ERR_POSITION, "FLVD_ERR_POSITION", "the position in the file could not be determined"},
     {FLVD_ERR_SEEK, "FLVD_ERR_SEEK", "seeking in the file failed"},
     {FLVD_ERR_NO_MEMORY, "FLVD_ERR_NO_MEMORY", "out of memory for the codec configuration, or it is too short"},
@@ -21,7 +21,7 @@ static const error_text_t texts[] = {
     {FLVD_ERR_FILE_HEADER, "FLVD_ERR_FILE_HEADER", "no valid FLV file header was found"},
     {FLVD_ERR_EXTENT, "FLVD_ERR_EXTENT", "the end of the valid data was not found"},
     {FLVD_ERR_FRAME_SEEK, "FLVD_ERR_FRAME_SEEK", "the seek found no tag to land on"},
-    {FLVD_ERR_SEEK_MISS, "FLVD_ERR_SEEK_MISS", "the target is beyond the end, or no keyframe lies in that direction"},
+    {FLVD_ERR_SEEK_MISS, "FLVD_ERR_SEEK_MISS", "the target is beyond the end, or no keyframe is in that direction"},
     {FLVD_ERR_SEEK_PLACE, "FLVD_ERR_SEEK_PLACE", "the seek did not land on the expected tag"},
     {FLVD_ERR_INDEX_ELEMENT, "FLVD_ERR_INDEX_ELEMENT", "the keyframe index contains a value that is not a number"},
     {FLVD_ERR_AVC_CONFIG, "FLVD_ERR_AVC_CONFIG", "the AVC configuration is damaged"},
@@ -37,7 +37,7 @@ static const error_text_t texts[] = {
     {FLVD_ERR_NO_TAG, "FLVD_ERR_NO_TAG", "no valid tag was found"},
     {FLVD_ERR_SHORT_DATA, "FLVD_ERR_SHORT_DATA", "the end of the data was reached"},
     {FLVD_ERR_NOT_SEEKABLE, "FLVD_ERR_NOT_SEEKABLE",
-     "the file is not seekable: it has no usable keyframe index and cannot be scanned"},
+     "the file is not seekable; a growing file needs video and a keyframe index"},
     {FLVD_ERR_HOST_IN_USE, "FLVD_ERR_HOST_IN_USE", "a file opened with other host functions is still open"},
     {FLVD_ERR_HOST_INCOMPLETE, "FLVD_ERR_HOST_INCOMPLETE", "the host lacks a function that the library calls"},
     {0, "unknown", "unknown error"},

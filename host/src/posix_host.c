@@ -20,7 +20,7 @@
 #include <sys/types.h>
 #include <unistd.h>
 
-static_assert(sizeof(off_t) == sizeof(int64_t), "places beyond 2 GiB must be reached");
+static_assert(sizeof(off_t) == sizeof(int64_t), "positions beyond 2 GiB must be reachable");
 
 enum {
     WINDOW = FLVD_POSIX_HOST_WINDOW,
@@ -33,7 +33,7 @@ typedef struct posix_file_t {
     int descriptor;
     bool large;            /* the last read bypassed the window */
     int64_t descriptor_at; /* where the descriptor stands */
-    int64_t file_end;      /* the size when the library last asked for it */
+    int64_t file_end;      /* the size at the last seek from the end */
     int64_t start;         /* file position of the window */
     uint32_t count;        /* bytes in the window */
     char window[WINDOW];

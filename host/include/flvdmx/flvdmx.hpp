@@ -134,7 +134,7 @@ enum class Stream : uint32_t {
 /**
  * One frame, without FLV headers. AVC: NAL units, each preceded by its length, a big-endian number whose size is given
  * in the configuration (usually 4 bytes); parameter sets are only in the configuration. AAC: a raw access unit without
- * ADTS header. VP6: starts with FLV's own bytes, which tell how to crop the picture.
+ * ADTS header. VP6: starts with FLV's own bytes, which say how to crop the picture.
  */
 struct Frame {
     Stream stream = Stream::any; /**< video or audio */
@@ -156,8 +156,8 @@ enum class VideoCodec : uint32_t {
     jpeg = 1,           /**< JPEG */
     sorenson_h263 = 2,  /**< Sorenson H.263 */
     screen_video = 3,   /**< screen video */
-    vp6 = 4,            /**< On2 VP6 */
-    vp6_alpha = 5,      /**< On2 VP6 with an alpha channel */
+    vp6 = 4,            /**< VP6 */
+    vp6_alpha = 5,      /**< VP6 with an alpha channel */
     screen_video_2 = 6, /**< screen video, version 2 */
     avc = 7             /**< AVC, H.264 */
 };
@@ -424,8 +424,8 @@ public:
     }
 
     /**
-     * Lists the video keyframes, of a growing file those written so far. If the file is sought by its keyframe index,
-     * the list comes from the index; otherwise the whole file is scanned, tag by tag. Does not change the playing
+     * Lists the video keyframes, of a growing file those written so far. If seeking uses the keyframe index of the
+     * file, the list comes from the index; otherwise the whole file is scanned, tag by tag. Does not change the playing
      * position.
      *
      * @param progress bool(int64_t reached, int64_t size): called after each keyframe of a scan with its position and
@@ -450,9 +450,9 @@ public:
      * Returns the next frame, as flvd_next_frame() does: it crosses damage of any length.
      *
      * When the codec configuration of a stream changes, the first frame after the change reports the new one. A seek
-     * back before the change reports the old one again. A seek forward skips tags without looking at them, so a change
-     * among them is not known until playing has passed it. Configurations above 64 KiB are not reported. If a stream
-     * changes more than 256 times, earlier changes are forgotten, and a seek back to them reports nothing.
+     * back before the change reports the old one again. A seek forward does not examine the tags that it skips, so a
+     * change among them is not known until playing has passed it. Configurations above 64 KiB are not reported. If a
+     * stream changes more than 256 times, earlier changes are forgotten, and a seek back to them reports nothing.
      *
      * @param stream video or audio, with a separate audio reader; ignored without one
      * @return the frame; Kind::end, or Kind::not_yet for a growing file; Kind::failed
@@ -502,11 +502,11 @@ public:
     }
 
     /**
-     * Tells whether there is damage between two frames. Does not change the playing position.
+     * Checks whether there is damage between two frames. Does not change the playing position.
      *
      * @param from file position after a tag and its back-pointer
      * @param to   later file position of a tag header
-     * @return true if nothing but valid tags lies between them
+     * @return true if there is nothing but valid tags between them
      */
     bool has_whole_tags(int64_t from, int64_t to)
     {
@@ -540,7 +540,7 @@ public:
         }
     }
 
-    /** The remaining frames, for range-for. Ends at the first request that fails; last_error() tells why. */
+    /** The remaining frames, for range-for. Ends at the first request that fails; last_error() says why. */
     inline FrameRange frames(Stream stream = Stream::any) &;
 
     /**
@@ -586,7 +586,7 @@ private:
     static constexpr uint32_t tag_header_size = 11;
     static constexpr uint32_t back_pointer_size = 4;
     static constexpr int64_t smallest_tag_size = tag_header_size + 1 + back_pointer_size; // of a frame
-    static constexpr uint32_t metadata_tags = 102;        // an open looks at the same number
+    static constexpr uint32_t metadata_tags = 102;        // an open examines the same number
     static constexpr uint32_t script_data_max = 1u << 20; // bytes read from one script tag
     static constexpr uint32_t config_max = 1u << 16;      // bytes; longer configurations are not reported
     static constexpr size_t configs_max = 256;            // remembered per stream
@@ -662,7 +662,7 @@ private:
 
         bool empty() const { return m_changes.empty(); }
 
-        // Tells that tags may have been skipped before the next configuration.
+        // Notes that tags may have been skipped before the next configuration.
         void jump() { m_jumped = true; }
 
         // Adds a configuration whose tag starts at `position`. A repetition matters only after a jump: there may be
@@ -805,7 +805,7 @@ private:
         return init;
     }
 
-    // Without a last timestamp all timestamps are valid. Seeks would take 0 for the end of the file.
+    // Without a last timestamp all timestamps are valid. Seeks would treat 0 as the end of the file.
     void accept_all_times()
     {
         m_instance->last_ts = 0;
