@@ -40,7 +40,7 @@ constexpr uint32_t FLVD_AVC_HEADER_SIZE = 5; // codec byte, packet type, Composi
 constexpr uint32_t FLVD_AAC_HEADER_SIZE = 2; // codec byte, packet type
 constexpr uint32_t FLVD_CODEC_HEADER_SIZE = 1;
 
-// True for AVC packets that carry no picture.
+// True for AVC tags that carry no picture.
 constexpr bool FLVD_IsPicturelessPacket(uint32_t packet_type)
 {
     return packet_type == FLVD_PACKET_SEQUENCE_HEADER || packet_type == FLVD_PACKET_END_OF_SEQUENCE;
