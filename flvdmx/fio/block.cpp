@@ -71,8 +71,8 @@ uint32_t FLVD_FioReadBytes(fio_file_t* file, uint8_t* destination, uint32_t n)
         __FLV_DMX__fioFlush(file);
     file->state = FIO_STATE_READ;
     FLVD_FioDropBits(file);
-    // The common case. A request that uses up the cached bytes is handled below, where the cache is refilled for the
-    // next one.
+    // The common case. A request that uses up the cached bytes is handled below: if little is missing, the rest comes
+    // through the cache, which is then refilled for the next request.
     if (n < file->count) {
         FLVD_FioTake(file, destination, n);
         return n;

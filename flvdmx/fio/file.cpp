@@ -11,6 +11,7 @@
 
 namespace {
 
+// The bits of a mode that say how the file is accessed, and those that distinguish text from binary.
 constexpr uint32_t FIO_ACCESS_MASK = 0x71;
 constexpr uint32_t FIO_FORMAT_MASK = 0x300;
 constexpr uint32_t FIO_SKIP_FAILED = 0xFFFFFFFF;
@@ -169,6 +170,7 @@ uint32_t FLVD_FioRefill(fio_file_t* file, uint32_t n)
     if (file->state == FIO_STATE_WRITE)
         return 0;
     file->state = FIO_STATE_READ;
+    // While reading with overread, the cache may hold more than its nominal capacity.
     const uint32_t allocated = file->capacity + file->overread_extra; // no overflow: checked at open
     n = std::min(n, allocated);
     if (n <= file->count)

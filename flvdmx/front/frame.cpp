@@ -72,7 +72,8 @@ bool FLVD_GoBack(const flvd_delivery_t& delivery)
     return true;
 }
 
-// Growing file: moves back to the saved position, where the next request tries again, and fails this request.
+// Growing file: moves back to the saved position, where the next request tries again, and fails this request. For the
+// host this is the end of the data so far.
 FlvdTurn FLVD_RollBack(const flvd_delivery_t& delivery, flvd_site_t seek_failed)
 {
     return FLVD_FailRequest(delivery, FLVD_GoBack(delivery) ? FLVD_SITE_FRAME_END : seek_failed);

@@ -34,7 +34,8 @@ bool FLVD_IsProbed(const flvd_probing_t& probing)
     return probing.found == probing.wanted && probing.first_ts != FLVD_NO_TIMESTAMP;
 }
 
-// Probes a media tag unless its stream has been found. Returns the result of the codec's probe, or 0 without one.
+// Probes a media tag unless its stream has been found: the first tag that describes it decides. Returns the result of
+// the codec's probe, or 0 without one.
 int32_t FLVD_ProbeTag(flvd_ctx_t* ctx, flvd_probing_t* probing, uint32_t tag_type)
 {
     const uint32_t stream = tag_type == FLVD_TAG_TYPE_VIDEO ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;

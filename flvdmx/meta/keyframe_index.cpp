@@ -80,7 +80,8 @@ struct flvd_positions_t {
 };
 
 // Reads positions, from memory or through the current reader, up to and including the first one that is not below
-// `limit`. False when an array in the file is cut short.
+// `limit`. Positions need not ascend in a damaged index; the first one outside ends the usable part. False when an
+// array in the file is cut short.
 bool FLVD_ReadPositionsBelow(const flvd_ctx_t* ctx, int64_t limit, flvd_positions_t* positions)
 {
     const bool memory = FLVD_IsIndexInMemory(ctx);
@@ -135,6 +136,8 @@ uint32_t FLVD_LastTimeInMemory(const flvd_ctx_t* ctx, uint32_t count)
     return count != 0 ? ctx->keyframe_arrays.times_ms[count - 1] : 0;
 }
 
+// Reads the times in order, because only the last usable one is wanted but an element that is not a number ends the
+// array earlier.
 int32_t FLVD_ReadLastTime(flvd_ctx_t* ctx, uint32_t count, uint32_t* time)
 {
     *time = 0;

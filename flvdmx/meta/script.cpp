@@ -288,7 +288,8 @@ int32_t FLVD_ParseScriptValue(flvd_ctx_t* ctx, flvd_script_state_t* state)
     }
 }
 
-// Parses values until the payload is used up or a value fails or has no content. Returns the size of the values.
+// Parses values until the payload is used up or a value fails or has no content. Script data is a name and a value, but
+// this takes any sequence of values, as some muxers write more than one object. Returns the size of the values.
 uint64_t FLVD_ParseScriptValues(flvd_ctx_t* ctx, flvd_script_state_t* state, bool* stopped)
 {
     uint64_t total = 0;

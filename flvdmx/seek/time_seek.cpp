@@ -95,6 +95,7 @@ int32_t FLVD_RewindReaders(flvd_time_seek_t* seek)
         return FLVD_Fail(ctx, FLVD_SITE_SEEK_REWIND);
     if (FLVD_HasAudioReader(ctx) && FLVD_SeekToFirstTag(ctx, ctx->audio_reader) != 0)
         return FLVD_Fail(ctx, FLVD_SITE_SEEK_REWIND);
+    // Times count from the first timestamp, so both streams are at 0 again.
     ctx->last_video_ts = 0;
     ctx->last_audio_ts = 0;
     seek->reached = ctx->first_ts;
