@@ -251,7 +251,7 @@ std::vector<Scenario> Scenarios()
     const auto large = [](const Tag& config, const auto& frame, size_t size) {
         return File({g_meta, config, frame(0, size), frame(40, size), frame(80, 60), frame(120, 60), frame(160, 60)});
     };
-    const auto mp3 = [](uint32_t ts) { return Tag{8, ts, AudioData(SOUND_MP3, Mp3Frame(LARGE))}; };
+    const auto mp3 = [](uint32_t ts) { return Tag{8, ts, AudioData(SOUND_MP3, Concat({Mp3Frame(), Noise(LARGE)}))}; };
     const std::vector<Seek> seeks = {{500, BACK}, {500, FORTH}, {-200, REL},   {790, FORTH | RETRY},
                                      {9000},      {-1},         {9000, AT_END}};
     const std::vector<Seek> near = {{500, BACK}, {300, FORTH}, {-1}}, to_start = {{0, BACK, VIDEO}},

@@ -13,8 +13,6 @@
 #include <cerrno>
 #include <sstream>
 
-#include <boost/crc.hpp>
-
 using namespace flvd_test;
 using namespace std::chrono_literals;
 using flvdmx::Kind, flvdmx::SeekMode, flvdmx::Stream;
@@ -59,11 +57,9 @@ std::vector<Stream> Streams(bool apart)
 // A frame in one line. Times in ms: decoding, presentation.
 std::string Line(Stream stream, int64_t time, int64_t presentation, bool keyframe, int64_t position, const Bytes& data)
 {
-    boost::crc_32_type crc;
-    crc.process_bytes(data.data(), data.size());
     std::ostringstream line;
     line << (stream == Stream::video ? "video " : "audio ") << time << ' ' << presentation << (keyframe ? " key" : "")
-         << " @" << position << ' ' << data.size() << " bytes " << crc.checksum();
+         << " @" << position << ' ' << data.size() << " bytes " << Crc32(data);
     return line.str();
 }
 
@@ -75,8 +71,7 @@ std::string Line(const flvdmx::Frame& frame)
 
 std::string Line(const Tag& tag, int64_t time, int64_t presentation, bool keyframe)
 {
-    const Bytes data(tag.data.begin() + static_cast<std::ptrdiff_t>(tag.codec_bytes()), tag.data.end());
-    return Line(static_cast<Stream>(tag.stream()), time, presentation, keyframe, tag.offset, data);
+    return Line(static_cast<Stream>(tag.stream()), time, presentation, keyframe, tag.offset, tag.frame());
 }
 
 using Lines = std::vector<std::string>;

@@ -64,11 +64,9 @@ Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
 /** A record of one baseline parameter set, 320 x 240. */
 Bytes SmallAvcRecord();
 /** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
-Bytes Mp3Frame(size_t size = 200);
+Bytes Mp3Frame();
 /** Sorenson H.263 picture header; size_code 2 to 6: a fixed size. */
-Bytes H263Picture(uint32_t size_code, size_t size = 200);
-/** VP6 intra picture of profile 3 showing columns x rows macroblocks; `adjust` is cropped from width, height. */
-Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust = 0, size_t size = 200);
+Bytes H263Picture(uint32_t size_code);
 
 constexpr uint8_t SOUND_MP3 = 0x2F, SOUND_PCM = 0x3E, SOUND_SPEEX = 0xB2;
 constexpr uint8_t CODEC_H263 = 2, CODEC_SCREEN = 3, CODEC_VP6 = 4, CODEC_VP6A = 5;
@@ -91,13 +89,14 @@ struct Tag {
     Bytes data;
     std::optional<uint32_t> back_pointer = {}; /**< PreviousTagSize after it; default: data size + 11 */
     std::optional<uint32_t> data_size = {};    /**< DataSize in the header; default: that of the data */
-    uint32_t stream_id = 0;
-    int64_t offset = 0; /**< of the tag header; filled by File() */
+    int64_t offset = 0;                        /**< of the tag header; filled by File() */
 
     int64_t size() const { return static_cast<int64_t>(data.size()) + 15; } /**< header, data and back-pointer */
     int64_t end() const { return offset + size(); }
     /** Codec header bytes before the frame: 5, 2 or 1. */
     size_t codec_bytes() const;
+    /** The data after them. */
+    Bytes frame() const { return {data.begin() + static_cast<std::ptrdiff_t>(codec_bytes()), data.end()}; }
     /** It carries a frame: no script data, no configuration packet, not too short. */
     bool is_frame() const;
     /** A video frame of FrameType 1. */
