@@ -13,8 +13,6 @@ using namespace flvd_test;
 
 namespace {
 
-using enum Site;
-
 constexpr uint32_t OLD = 77; // what stands in a field before
 
 struct Audio {
@@ -114,38 +112,6 @@ std::string Probe(uint8_t type, const std::vector<Bytes>& tags)
         out << audio.format_tag << ' ' << audio.sample_rate << 'x' << audio.channels << ' ' << audio.data_rate;
     out << ' ' << (type == 9 ? video.config_size : audio.config_size);
     return out.str();
-}
-
-TEST(StreamProbe, TakesWhatTwelveBytesOfAnAudioTagTell)
-{
-    const struct {
-        const char* what;
-        uint8_t header;
-        uint32_t filter, rate, channels;
-        std::optional<Site> site = {}; // where it is given up
-        uint32_t bytes = 12;           // of the tag that the probe gets
-    } rows[] = {
-        {.what = "PCM: needs no more", .header = 0x3E, .filter = 0x3E, .rate = 44100, .channels = 1},
-        {.what = "no AAC packet type", .header = 0xAF, .filter = 0xAF, .rate = 44100, .channels = 2, .site = AUDIO_TAG},
-        {.what = "no MP3 frame header", .header = 0x2A, .filter = 0x2A, .rate = 22050, .channels = 1, .site = MP3_DATA},
-        {.what = "short", .header = 0x3E, .filter = 0xFFFF, .rate = 0, .channels = 0, .site = AUDIO_TAG, .bytes = 11},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.what);
-        FakeHost host(File({Screen(0), {8, 0, AudioData(row.header, Noise(LARGE))}, Screen(9)}).bytes);
-        host.shorten_nth(HostFn::Read, 4, row.bytes); // after file header, tag header and back-pointer
-        host.fail_nth(HostFn::Read, 5);
-        Session session(host, {0, false, SMALL});
-        ASSERT_TRUE(session.opened());
-        const flvd_audio_info_t& info = session.ctx()->audio_info;
-        EXPECT_EQ(session.info().has_audio, row.site ? 0u : 1u);
-        EXPECT_EQ(session.ctx()->audio_format_filter, row.filter);
-        EXPECT_EQ(info.sample_rate, row.rate);
-        EXPECT_EQ(info.channels, row.channels);
-        EXPECT_EQ(info.sample_size, row.channels != 0 ? 16u : 0u);
-        EXPECT_EQ(info.format_tag, 0u);
-        EXPECT_TRUE(session.recorded(row.site)) << session.error_line();
-    }
 }
 
 TEST(StreamProbe, DescribesTheFirstTag)

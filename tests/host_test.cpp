@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <filesystem>
 #include <fstream>
 #include <map>
@@ -89,8 +90,11 @@ TEST_P(Host, ReadsSeeksAndTells)
     for (const int unknown : {-1, 3})
         EXPECT_NE(t.file_seek64(handle, 1, unknown), 0);
     EXPECT_EQ(t.file_tell64(handle), at) << "a seek that failed moves nothing";
-    for (const std::string& path : {folder + "/absent", folder})
+    for (const std::string& path : {folder + "/absent", folder}) {
         EXPECT_EQ(t.file_open(path.c_str(), "rb"), nullptr) << path;
+        const bool is_folder = path == folder && (GetParam() == "stdio" || GetParam() == "posix");
+        EXPECT_EQ(errno, is_folder ? EISDIR : ENOENT) << path;
+    }
 }
 
 // After the end flag, a seek lets the host see what has been added.
@@ -152,6 +156,24 @@ TEST_P(FileHost, TellsWhereAnAppendEnded)
     const uint32_t put = t.file_write("more", 1, 4, handle);
     EXPECT_EQ(put, GetParam() == "posix" ? 0 : 4);
     EXPECT_EQ(t.file_tell64(handle), put == 0 ? 105 : SIZE + 4);
+}
+
+TEST(KitCallbacks, MayFailOrBeMissing)
+{
+    flvd_init_t host;
+    flvd_callback_host_fill(&host);
+    const auto read_at = [](void*, int64_t, void*, uint32_t size) { return size + 1; }; // claims too much
+    flvd_callback_file_t file = {read_at, [](void*) { return int64_t{-1}; }, nullptr, "", nullptr};
+    void* const handle = host.file_open(flvd_callback_host_add(&file), "rb");
+    flvd_callback_host_remove(&file);
+    char byte = 0;
+    EXPECT_EQ(host.file_read(&byte, 1, 1, handle), 0u);
+    EXPECT_NE(host.file_eof(handle), 0);
+    EXPECT_NE(host.file_seek64(handle, 0, FIO_SEEK_END), 0);
+    EXPECT_EQ(host.file_close(handle), 0);
+    EXPECT_EQ(host.file_open(file.name, "rb"), nullptr) << "removed";
+    file.get_size = nullptr;
+    EXPECT_EQ(flvd_callback_host_add(&file), nullptr);
 }
 
 INSTANTIATE_TEST_SUITE_P(Kit, FileHost, testing::Values("stdio", "posix"));

@@ -3,7 +3,6 @@
 #include "flvdmx/flvdmx.hpp"
 #include "flvdmx/memory_host.h"
 #include "flvdmx/posix_host.h"
-#include "support/callback_file.h"
 #include "support/expected.h"
 #include "support/report.h"
 #include "support/session.h"
@@ -402,28 +401,22 @@ TEST(Interface, ForgetsEarlyConfigurations)
     EXPECT_EQ(reported(), config(280));
 }
 
-// Runs a course in which no host call fails, and then one for each call with that call failing. `run` takes the number
-// of the failing call, 0 for none, and returns how many calls were made.
-void FailEachCall(const std::function<uint64_t(uint64_t failing_call)>& run)
+// Uses a host of which no call fails, and then one for each call with that call failing.
+void FailEachCall(const Bytes& bytes, const std::function<void(const flvdmx::Host& host)>& use)
 {
-    Sweep sweep;
-    const uint64_t calls = run(0);
-    for (uint64_t n = 1; n <= calls; ++n)
-        if (sweep.takes_next()) {
-            SCOPED_TRACE(testing::Message() << "call " << n);
-            run(n);
-        }
-}
-
-void FailEachHostCall(const Bytes& bytes, const std::function<void(const flvdmx::Host& host)>& use)
-{
-    FailEachCall([&](uint64_t failing_call) {
+    const auto run = [&](uint64_t failing_call) {
+        SCOPED_TRACE(testing::Message() << "call " << failing_call);
         FakeHost host(bytes);
         host.fail_nth_call(failing_call);
         use(flvdmx::Host(host.init()));
         EXPECT_EQ(host.live_blocks(), 0u);
         return host.failable_calls();
-    });
+    };
+    Sweep sweep;
+    const uint64_t calls = run(0);
+    for (uint64_t n = 1; n <= calls; ++n)
+        if (sweep.takes_next())
+            run(n);
 }
 
 // The configurations that the decoders of video and audio end with, after up to two failed requests.
@@ -444,7 +437,7 @@ std::pair<Bytes, Bytes> LastConfigs(flvdmx::File& file, bool apart)
 TEST(Interface, ReportsConfigurationsAfterAHostFailure)
 {
     for (const bool apart : {false, true})
-        FailEachHostCall(ConfigFile("Aa12CB1cb2121212").bytes, [apart](const flvdmx::Host& host) {
+        FailEachCall(ConfigFile("Aa12CB1cb2121212").bytes, [apart](const flvdmx::Host& host) {
             const flvdmx::Options options = {.cache_size = 1024, .separate_audio_reader = apart};
             auto file = flvdmx::File::open(FakeHost::DEFAULT_FILE, host, options);
             if (!file->info().video || !file->info().audio)
@@ -467,13 +460,6 @@ TEST(Interface, ReportsListsThatCannotBeRead)
         host.fail_nothing();
         EXPECT_EQ(Line(*file->next_frame()), ExpectedLines(sample)[1]);
     }
-}
-
-TEST(Interface, KeepsItsPositionWhenAProgressReportThrows)
-{
-    auto file = flvdmx::File::open(g_data + "avc_aac.flv");
-    EXPECT_THROW((void)file->keyframes([](int64_t, int64_t) -> bool { throw 1; }), int);
-    EXPECT_EQ(Line(*file->next_frame()), ExpectedLines(ReadExpected("avc_aac"))[0]);
 }
 
 TEST(Interface, ListsWhatAGrowingFileHolds)
@@ -600,14 +586,8 @@ TEST(Interface, RefusesASecondHostAndAnIncompleteOne)
 
 TEST(Interface, ReportsWhyAFileDidNotOpen)
 {
-    for (const auto& [fill, is_file] : {std::pair(&flvd_stdio_host_fill, true),
-                                        {flvd_posix_host_fill, true},
-                                        {flvd_memory_host_fill, false},
-                                        {flvd_callback_host_fill, false}}) {
-        const flvdmx::Host host = flvdmx::make_host(fill);
-        EXPECT_EQ(flvdmx::File::open(g_data + "absent", host).error().system_error(), ENOENT);
-        EXPECT_EQ(flvdmx::File::open(g_data, host).error().system_error(), is_file ? EISDIR : ENOENT);
-    }
+    for (const auto& [path, reason] : {std::pair(g_data + "absent", ENOENT), {g_data, EISDIR}})
+        EXPECT_EQ(flvdmx::File::open(path).error().system_error(), reason);
     const auto cut = flvdmx::File::open(g_data + "avc_aac.flv" + '\0' + ".old");
     EXPECT_EQ(cut.error().system_error(), EINVAL);
     const char* const no_callbacks = nullptr;
@@ -655,6 +635,8 @@ TEST(Interface, SurvivesMisuse)
         return true;
     });
     EXPECT_TRUE(walked->is_open());
+    EXPECT_THROW((void)walked->keyframes([](int64_t, int64_t) -> bool { throw 1; }), int);
+    EXPECT_EQ(Line(*walked->next_frame()), ExpectedLines(ReadExpected("avc_aac"))[0]) << "playing goes on";
     int64_t last = 0;
     for (const flvdmx::Keyframe& key : *walked->keyframes()) // a temporary list
         last = key.position;
@@ -684,28 +666,9 @@ TEST(Interface, SurvivesEveryHostFailure)
     const Expected sample = ReadExpected("avc_bframes_aac");
     const Lines whole = ExpectedLines(sample);
     for (const bool growing : {false, true})
-        FailEachHostCall(sample.bytes, [&, growing](const flvdmx::Host& host) {
+        FailEachCall(sample.bytes, [&, growing](const flvdmx::Host& host) {
             UseAll(flvdmx::File::open(FakeHost::DEFAULT_FILE, host, {.growing = growing}), whole);
         });
-}
-
-// A callback file that has been removed plays on, but cannot be opened again.
-TEST(Interface, SurvivesEveryCallbackFailure)
-{
-    const Expected sample = ReadExpected("avc_bframes_aac");
-    const Lines whole = ExpectedLines(sample);
-    const flvdmx::Host host = flvdmx::make_host(flvd_callback_host_fill);
-    FailEachCall([&](uint64_t failing_call) {
-        const CallbackFile callbacks(sample.bytes.data(), sample.bytes.size(), static_cast<int>(failing_call));
-        auto opened = flvdmx::File::open(callbacks.name, host);
-        EXPECT_TRUE(failing_call != 0 || opened);
-        flvd_callback_host_remove(&callbacks);
-        EXPECT_EQ(flvdmx::File::open(callbacks.name, host).error().system_error(), ENOENT);
-        UseAll(std::move(opened), whole);
-        return static_cast<uint64_t>(callbacks.calls);
-    });
-    flvd_callback_file_t incomplete{};
-    EXPECT_EQ(flvd_callback_host_add(&incomplete), nullptr);
 }
 
 // Keyframes every 0.4 s: the index starts at 0, the tags at 23 ms.
@@ -747,11 +710,11 @@ TEST(Interface, SeeksToTheFirstTagForTimeZero)
         }
 }
 
-// A file that arrives 100 bytes at a time, played together with another one: no frame is lost or repeated.
+// A file that arrives 100 bytes at a time: no frame is lost or repeated.
 TEST(Interface, FollowsAGrowingFile)
 {
-    const Expected sample = ReadExpected("avc_aac"), another = ReadExpected("mp3_only");
-    Memory growing(sample.bytes), other(another.bytes);
+    const Expected sample = ReadExpected("avc_aac");
+    Memory growing(sample.bytes);
     const flvdmx::Options options = {.cache_size = 8192, .growing = true};
     for (growing.size = 0; growing.size <= 258; ++growing.size) { // the first media tag starts there
         EXPECT_EQ(growing.open(options).error().kind(), Kind::not_yet) << growing.size;
@@ -759,20 +722,16 @@ TEST(Interface, FollowsAGrowingFile)
     }
     growing.size = 2500;
     const std::lock_guard lock(flvdmx::open_mutex); // its owner can still open and close files
-    auto file = growing.open(options), second = other.open();
-    ASSERT_TRUE(file && second);
+    auto file = growing.open(options);
+    ASSERT_TRUE(file);
     const auto wait = [&] {
         growing.size = std::min<uint64_t>(growing.size + 100, sample.bytes.size());
         return growing.size < sample.bytes.size();
     };
-    Lines frames, others;
-    for (auto frame = file->follow(wait); frame; frame = file->follow(wait)) {
+    Lines frames;
+    for (auto frame = file->follow(wait); frame; frame = file->follow(wait))
         frames.push_back(Line(*frame));
-        if (const auto beside = second->next_frame())
-            others.push_back(Line(*beside));
-    }
     EXPECT_EQ(frames, ExpectedLines(sample));
-    EXPECT_EQ(others, ExpectedLines(another));
     EXPECT_EQ(file->last_error().kind(), Kind::not_yet);
 }
 

@@ -21,7 +21,7 @@ constexpr int32_t UNTOUCHED = -77777;
 // to the end of the file header.
 constexpr int64_t NOWHERE = 0, HERE = 1, REWIND = 2, FIRST_TAG = 9;
 constexpr size_t ALL = 100000;
-constexpr int64_t NO_READ = -1;
+constexpr int64_t NONE = -1;
 
 // Where the elements of a script array begin; past the end of the file without such a key.
 size_t Elements(const Bytes& bytes, const std::string& key)
@@ -281,7 +281,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         int32_t rc = 0;                     // without a site
         uint32_t reached = 0;
         int64_t at = HERE;        // where the reader stands afterwards; HERE: not looked at
-        int64_t left = INT32_MAX; // bytes of the times and of what follows; NO_READ: of the whole file
+        int64_t left = INT32_MAX; // bytes of the times and of what follows; NONE: of the whole file
     };
     const Row rows[] = {
         {.what = "for information", .flv = scan, .open = INFO, .to = 100, .site = SEEK_INFO_ONLY},
@@ -315,21 +315,24 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         {.what = "1 ms later", .flv = ended, .stream = AUDIO, .to = 1979, .mode = BACK, .reached = 2360, .at = end},
         {.what = "to the last audio tag", .flv = ended, .stream = AUDIO, .to = 1978, .mode = BACK, .reached = 1978},
         {.what = "1 ms before it", .flv = ended, .stream = AUDIO, .to = 1977, .mode = BACK, .reached = 1955},
-        {.what = "last time cut", .flv = cut, .stream = VIDEO, .to = 700, .mode = BACK, .reached = 800, .left = 44},
-        {.what = "gone", .flv = cut, .stream = VIDEO, .to = 700, .mode = BACK, .reached = 800, .left = 36},
-        {.what = "two gone", .flv = cut, .stream = VIDEO, .to = 500, .mode = BACK, .reached = 800, .left = 27},
-        {.what = "forward", .flv = cut, .stream = VIDEO, .to = 500, .rc = -101, .left = 27},
-        {.what = "not needed", .flv = cut, .stream = VIDEO, .to = 300, .mode = BACK, .reached = 200, .left = 27},
-        {.what = "all gone", .flv = cut, .stream = VIDEO, .to = 300, .mode = BACK, .reached = 800, .left = 0},
-        {.what = "to the start", .flv = cut, .stream = VIDEO, .mode = BACK, .left = 0},
-        {.what = "no read",
+        {.what = "last time cut short",
+         .flv = cut,
+         .stream = VIDEO,
+         .to = 700,
+         .mode = BACK,
+         .reached = 800,
+         .left = 44},
+        {.what = "two missing", .flv = cut, .stream = VIDEO, .to = 500, .mode = BACK, .reached = 800, .left = 27},
+        {.what = "two missing, forward", .flv = cut, .stream = VIDEO, .to = 500, .rc = -101, .left = 27},
+        {.what = "two missing after it",
          .flv = cut,
          .stream = VIDEO,
          .to = 300,
          .mode = BACK,
-         .site = FILE_INDEX_TAG_CUT,
-         .left = NO_READ},
-        {.what = "forward", .flv = cut, .stream = VIDEO, .to = 300, .rc = -101, .left = NO_READ},
+         .reached = 200,
+         .left = 27},
+        {.what = "none", .flv = cut, .stream = VIDEO, .to = 9, .mode = BACK, .site = FILE_INDEX_TAG_CUT, .left = NONE},
+        {.what = "none, forward", .flv = cut, .stream = VIDEO, .to = 9, .rc = -101, .left = NONE},
     };
     for (const Row& row : rows)
         for (const uint32_t mode : row.mode == EACH ? std::vector{BACK, AUTO} : std::vector{row.mode}) {
@@ -338,7 +341,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
             Session session(host, {row.open, (row.open & INFO) != 0});
             flvd_ctx_t* const ctx = session.ctx();
             host.set_visible(static_cast<int64_t>(Elements(row.flv.bytes, "times")) + row.left);
-            host.fail({HostFn::Read, row.left == NO_READ ? 1u : 0u, true});
+            host.fail({HostFn::Read, row.left == NONE ? 1u : 0u, true});
             uint32_t reached = 0;
             int32_t time = 0;
             const int32_t rc = row.stream == TIME ? session.seek(static_cast<int32_t>(row.to), mode, &time)

@@ -9,10 +9,8 @@ namespace flvd_test {
 
 /** Bytes that the callback host opens by their name, while the object exists. It must outlive their instances. */
 struct CallbackFile : flvd_callback_file_t {
-    /** failing_call: number of the call that fails, from 1; 0 for none. */
-    CallbackFile(const void* bytes, uint64_t length, int failing_call = 0)
-        : flvd_callback_file_t{ReadAt, GetSize, this, "", nullptr}, data(static_cast<const char*>(bytes)), size(length),
-          failing(failing_call)
+    CallbackFile(const void* bytes, uint64_t length)
+        : flvd_callback_file_t{ReadAt, GetSize, this, "", nullptr}, data(static_cast<const char*>(bytes)), size(length)
     {
         flvd_callback_host_add(this);
     }
@@ -22,23 +20,14 @@ struct CallbackFile : flvd_callback_file_t {
 
     const char* const data;
     uint64_t size; /**< may change: the file grows */
-    const int failing;
-    int calls = 0; /**< of both callbacks */
 
 private:
-    bool fails() { return ++calls == failing; }
-    static int64_t GetSize(void* user)
-    {
-        auto& file = *static_cast<CallbackFile*>(user);
-        return file.fails() ? -1 : static_cast<int64_t>(file.size);
-    }
+    static int64_t GetSize(void* user) { return static_cast<int64_t>(static_cast<CallbackFile*>(user)->size); }
     // Reads at most 1000 bytes, as a socket might.
     static uint32_t ReadAt(void* user, int64_t position, void* buffer, uint32_t size)
     {
-        auto& file = *static_cast<CallbackFile*>(user);
-        const int64_t left = file.fails() ? 0 : static_cast<int64_t>(file.size) - position;
-        const int64_t n = std::clamp<int64_t>(left, 0, std::min<int64_t>(size, 1000));
-        std::copy_n(file.data + (n != 0 ? position : 0), n, static_cast<char*>(buffer));
+        const int64_t n = std::clamp<int64_t>(GetSize(user) - position, 0, std::min<int64_t>(size, 1000));
+        std::copy_n(static_cast<CallbackFile*>(user)->data + (n != 0 ? position : 0), n, static_cast<char*>(buffer));
         return static_cast<uint32_t>(n);
     }
 };
