@@ -399,25 +399,19 @@ TEST(LargeFrames, AreReadInOrder)
 // Only a frame that the buffer does not hold is checked first: two seeks. The buffer grows to multiples of 16,384.
 TEST(LargeFrames, AreCheckedFirstWhenTheBufferHasToGrow)
 {
-    const struct {
-        size_t size;
-        uint64_t seeks;
-        uint32_t buffer;
-    } rows[] = {
-        {.size = 512000, .seeks = 0, .buffer = 512000},
-        {.size = 512001, .seeks = 2, .buffer = 524288},
-        {.size = 524288, .seeks = 2, .buffer = 524288},
-        {.size = 524289, .seeks = 2, .buffer = 540672},
-    };
-    for (const auto& row : rows) {
-        FakeHost host(File({g_avc, Nalu(0), Nalu(40, row.size)}, 1).bytes);
+    const auto expect = [](size_t size, uint64_t seeks, uint32_t buffer) {
+        FakeHost host(File({g_avc, Nalu(0), Nalu(40, size)}, 1).bytes);
         Session session(host);
         ASSERT_EQ(session.frame().rc, 0);
         host.reset_calls();
-        EXPECT_EQ(session.frame().frame.data, Noise(row.size));
-        EXPECT_EQ(host.calls(HostFn::Seek), row.seeks) << row.size;
-        EXPECT_EQ(session.ctx()->frame_buffer_size, row.buffer) << row.size;
-    }
+        EXPECT_EQ(session.frame().frame.data, Noise(size));
+        EXPECT_EQ(host.calls(HostFn::Seek), seeks) << size;
+        EXPECT_EQ(session.ctx()->frame_buffer_size, buffer) << size;
+    };
+    expect(512000, 0, 512000);
+    expect(512001, 2, 524288);
+    expect(524288, 2, 524288);
+    expect(524289, 2, 540672);
 }
 
 TEST(LargeFrames, WithAWrongBackPointerAreLostAlone)

@@ -10,6 +10,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <iomanip>
 #include <sstream>
 
 using namespace flvd_test;
@@ -523,15 +524,16 @@ TEST(Interface, ListsKeyframes)
 std::string Text(const flvdmx::Property& property)
 {
     std::ostringstream text;
-    text << property.name << '=';
-    if (const auto* const date = std::get_if<flvdmx::Date>(&property.value))
-        text << date->milliseconds << "ms" << std::showpos << date->zone_minutes;
-    else if (const auto* const string = std::get_if<std::string>(&property.value))
-        text << '\'' << *string << '\'';
-    else if (const auto* const flag = std::get_if<bool>(&property.value))
-        text << (*flag ? "true" : "false");
-    else
-        text << std::get<double>(property.value);
+    text << std::boolalpha << property.name << '=';
+    const auto print = [&text](const auto& value) {
+        if constexpr (std::is_same_v<decltype(value), const flvdmx::Date&>)
+            text << value.milliseconds << "ms" << std::showpos << value.zone_minutes;
+        else if constexpr (std::is_same_v<decltype(value), const std::string&>)
+            text << std::quoted(value, '\'');
+        else
+            text << value;
+    };
+    std::visit(print, property.value);
     return text.str() + ' ';
 }
 

@@ -110,27 +110,18 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
     }
 }
 
-// Many muxers write a wrong size after the first script tag. It may stand up to four bytes after DataOffset.
-TEST(TagHeaders, OfTheFirstScriptTagNeedNoBackPointer)
+// Many muxers write a wrong back-pointer after the first script tag, which may start up to four bytes after DataOffset.
+TEST(TagHeaders, OfAFirstScriptTagNeedNoBackPointer)
 {
-    const struct {
-        const char* what;
-        Tag tag;
-        int64_t at;
-        bool taken;
-    } rows[] = {
-        {.what = "first tag", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG, .taken = true},
-        {.what = "a byte after it", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG + 1, .taken = false},
-        {.what = "large", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG, .taken = true},
-        {.what = "video", .tag = {9, 0, AvcNalu(true, Noise(100)), 7}, .at = FIRST_TAG, .taken = false},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.what);
-        Reader r(Concat({Zeros(row.at) + row.tag, Zeros(6000)}));
+    const auto expect = [](const Tag& tag, int64_t at, const Found& found) {
+        Reader r(Concat({Zeros(at) + tag, Zeros(6000)}));
         r.ctx.data_end = 10000;
-        const Found tag(row.taken ? 0 : ENDED, row.taken ? row.at : 0, 0);
-        EXPECT_EQ(r.at(row.at).verify(ANY), tag);
-    }
+        EXPECT_EQ(r.at(at).verify(ANY), found) << tag.size() << " bytes at " << at;
+    };
+    expect({18, 0, Noise(100), 7}, FIRST_TAG, {0, FIRST_TAG, 0});
+    expect({18, 0, Noise(5000), 7}, FIRST_TAG, {0, FIRST_TAG, 0});
+    expect({18, 0, Noise(100), 7}, FIRST_TAG + 1, {ENDED, 0, 0});
+    expect({9, 0, AvcNalu(true, Noise(100)), 7}, FIRST_TAG, {ENDED, 0, 0});
 }
 
 // The kind reported depends on what is wanted, and on the direction.

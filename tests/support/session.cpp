@@ -9,7 +9,7 @@ const std::vector<Place>& Places()
 {
     constexpr Op CALL = Op::Call, OPEN = Op::Open, CODEC = Op::Codec, EXTENT = Op::Extent, TAG = Op::Tag;
     constexpr Op FRAME = Op::Frame, TIME_SEEK = Op::Seek, FRAME_SEEK = Op::FrameSeek;
-#define FLVD_SITE(operation, name, code, line, growing_line) {Site::name, operation, code, line, growing_line},
+#define FLVD_SITE(operation, name, code, line, growing_line) {#name, operation, code, line, growing_line},
     static const std::vector<Place> places = {
 #include "flvdmx/common/sites.def"
     };

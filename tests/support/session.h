@@ -35,7 +35,7 @@ enum class Site : uint8_t {
 #undef FLVD_SITE
 };
 struct Place {
-    Site site;
+    std::string name;
     Op op;
     int32_t code, line, growing_line; /**< error code; lines, growing_line 0 when it is the same in a growing file */
 
