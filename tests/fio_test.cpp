@@ -41,6 +41,7 @@ public:
         std::istringstream(text) >> name >> std::setbase(0) >> first >> second >> third;
         const auto n = static_cast<uint32_t>(first), size = static_cast<uint32_t>(second);
         const auto signed_n = static_cast<int32_t>(first), whence = static_cast<int32_t>(second);
+        const ReaderOptions other = {.cache_size = CACHE, .mode = n};
         const auto fail = [this](HostFn fn) { host.fail_from(fn, host.calls(fn) + 1); };
         const std::map<std::string, std::function<void()>> changes = {
             {"narrow", [&] { narrow(); }},
@@ -68,10 +69,7 @@ public:
             {"eof", [&] { return told(__FLV_DMX__fioIsEof(file)); }},
             {"flush", [&] { return told(__FLV_DMX__fioFlush(file)); }},
             {"close", [&] { return told(__FLV_DMX__fioClose(std::exchange(file, nullptr))); }},
-            {"mode",
-             [&] {
-                 return told(__FLV_DMX__fioClose(host.open_reader({CACHE, 0, 0, n})));
-             }},
+            {"mode", [&] { return told(__FLV_DMX__fioClose(host.open_reader(other))); }},
             {"size", [&] { return told(__FLV_DMX__fioSetCacheReadSize(file, n)); }},
             {"block", [&] { return told(static_cast<int64_t>(host.size_of(file->cache))); }},
             {"extra", [&] { return told(file->overread_extra); }},

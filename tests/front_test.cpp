@@ -92,7 +92,6 @@ TEST(Failures, OfOpening)
         {.what = "data offset past the end", .file = header(INT32_MAX), .open = {GROWING}, .site = OPEN_NO_STREAM},
         {.what = "no stream", .file = script, .open = {GROWING}, .site = OPEN_NO_STREAM},
         {.what = "no stream in the first tags", .file = unseen, .site = OPEN_NO_STREAM},
-        {.what = "no stream in the first tags", .file = unseen, .open = {GROWING}, .site = OPEN_NO_STREAM},
     };
     for (const Row& row : rows)
         Expect(row, Op::Open);
@@ -445,9 +444,7 @@ TEST(LargeFrames, CostAtMostOnePayloadWhenTheyAreFalse)
         {.what = "half a MiB", .claim = 500000, .most = crossed + 500000},
         {.what = "in turns", .claim = 500000, .most = crossed + 500000, .turns = true},
         {.what = "after a failed check", .claim = 500000, .most = crossed, .before = bad},
-        {.what = "in turns after it", .claim = 500000, .most = crossed, .turns = true, .before = bad},
         {.what = "more than the buffer holds", .claim = 600000, .most = crossed},
-        {.what = "in turns more than it holds", .claim = 600000, .most = crossed, .turns = true},
         {.what = "more than is left", .claim = 750000, .most = crossed + 711000},
     };
     for (const auto& row : rows) {

@@ -1,6 +1,5 @@
 // The hosts of the kit keep the contract of the public header, all on the same bytes.
 
-#include "flvdmx/error_text.h"
 #include "flvdmx/memory_host.h"
 #include "flvdmx/posix_host.h"
 #include "flvdmx/stdio_host.h"
@@ -14,8 +13,6 @@
 #include <filesystem>
 #include <fstream>
 #include <map>
-#include <regex>
-#include <set>
 #include <sys/stat.h>
 #include <thread>
 
@@ -178,27 +175,5 @@ TEST(KitCallbacks, MayFailOrBeMissing)
 
 INSTANTIATE_TEST_SUITE_P(Kit, FileHost, testing::Values("stdio", "posix"));
 INSTANTIATE_TEST_SUITE_P(Kit, Host, testing::Values("stdio", "posix", "memory", "callbacks"));
-
-// The table of texts against the list of codes in the public header.
-TEST(ErrorText, HasEveryCodeOfTheHeader)
-{
-    std::ifstream in(FLVDMX_TEST_DATA "/../../flvdmx/flvdmx.h");
-    const std::string header = {std::istreambuf_iterator<char>(in), {}};
-    const size_t begin = header.find("/** Error codes");
-    ASSERT_NE(begin, std::string::npos);
-    const std::string list = header.substr(begin, header.find("};", begin) - begin);
-    const std::regex row(R"((FLVD_ERR_\w+) = (-?\d+))");
-    std::set<std::string> texts = {flvd_error_text(1)};
-    for (std::sregex_iterator code(list.begin(), list.end(), row), end; code != end; ++code) {
-        const std::string name = (*code)[1];
-        const int32_t number = std::stoi((*code)[2]);
-        EXPECT_EQ(flvd_error_name(number), name);
-        EXPECT_TRUE(texts.insert(flvd_error_text(number)).second) << name << " has no text of its own";
-    }
-    EXPECT_GT(texts.size(), 20U) << "the list of codes was not read";
-    EXPECT_STREQ(flvd_error_name(FLVD_ERR_HOST_IN_USE), "FLVD_ERR_HOST_IN_USE");
-    EXPECT_TRUE(texts.insert(flvd_error_text(FLVD_ERR_HOST_IN_USE)).second);
-    EXPECT_STREQ(flvd_error_name(1), "unknown");
-}
 
 } // namespace

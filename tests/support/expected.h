@@ -5,6 +5,10 @@
 
 namespace flvd_test {
 
+inline const std::string g_samples[] = {"aac_only", "avc_aac",    "avc_aac_index", "avc_bframes_aac",
+                                        "avc_only", "h263_mp3",   "mp3_only",      "pcm_only",
+                                        "screen",   "speex_only", "truncated",     "damaged"};
+
 struct ExpectedStream {
     uint32_t stream = 0; /**< 1 video, 2 audio */
     std::string codec;   /**< the prober's name */
