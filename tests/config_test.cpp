@@ -1,4 +1,4 @@
-// What a file tells of its streams: codec configuration from the first tags, and script data.
+// What a file says about its streams: codec configurations from the first tags, and script data.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -13,7 +13,7 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t OLD = 77; // what stands in a field before
+constexpr uint32_t OLD = 77; // what a field holds before the call
 
 struct Audio {
     int32_t rc;
@@ -141,7 +141,7 @@ TEST(StreamProbe, DescribesTheFirstTag)
     };
     for (const auto& row : rows)
         EXPECT_EQ(Probe(row.type, row.tags), row.described) << row.what;
-    // A header of each codec that looks for one.
+    // Data with a header for each codec that reads one.
     const Bytes any = Concat({{0, 0, 0x46, 15, 0, 0x46, 20, 0, 15, 20}, H263Picture(3)});
     const char* const codecs[] = {" 0x0 0",         "JPEG 0x0 0", "FLV1 176x144 0", "SCR1 0x0 0", "VP60 320x1120 0",
                                   "VP6A 320x240 0", "SCR2 0x0 0", " 0x0 206",       " 0x0 0"};
@@ -234,7 +234,7 @@ TEST(ScriptValue, IsBounded)
     }
     Expect(deep + high + deep + "< height: 240 >", "0 width 320 height 240");
     Expect("[1 " + deep + high, "-1");
-    Expect("< width: 320 >", "-1", 0, 12); // a value begins inside or not at all
+    Expect("< width: 320 >", "-1", 0, 12); // a value that starts after the end is not read
     Expect("< width: 320 >", "0 width 320", 0, 13);
     Expect("{ a: %5 } 1", "0", 0, 16);              // more consumed than counted
     Expect(keys + "< width: 320 >", "0 width 320"); // an empty key counts nothing

@@ -30,14 +30,14 @@ struct Scenario {
     int64_t shown = INT64_MAX; // bytes at first
 };
 
-// The nth call fails, or all from there on; with `bytes` the nth read is cut short instead.
+// The nth call fails, or it and all later ones; with `bytes` the nth read is cut short instead.
 struct Fault {
     uint64_t nth = 0;
     bool later = false;
     uint32_t bytes = 0;
 };
 
-using Seen = std::map<int32_t, std::set<HostFn>>; // lines, and the functions whose failure led there
+using Seen = std::map<int32_t, std::set<HostFn>>; // line numbers, and the functions whose failure led to them
 
 // One scenario under one fault.
 class Course {
@@ -77,14 +77,14 @@ public:
         if (on)
             play_out();
         EXPECT_EQ(session.ctx() != nullptr ? session.close() : 0, 0);
-        return calls; // the host tells what was not given back
+        return calls; // the host reports what was not released
     }
 
 private:
     bool growing() const { return (m_open.options & GROWING) != 0; }
     uint64_t calls() const { return m_fault.bytes != 0 ? m_host.calls(HostFn::Read) : m_host.failable_calls(); }
     bool fired() const { return m_fault.nth != 0 && calls() >= m_fault.nth; }
-    // A growing file without its position is read on inside a tag, where a false header may pass for one.
+    // Without its position, a growing file is read on from inside a tag, where a false header may look valid.
     bool strays() const { return growing() && m_by == HostFn::Tell; }
     void arm(HostFn fn)
     {
@@ -96,11 +96,12 @@ private:
     }
     void note(int32_t code, int32_t line)
     {
-        const auto records = [&](const Place& place) { return place.records(code, line); };
-        EXPECT_TRUE(line == 0 || std::any_of(Places().begin(), Places().end(), records)) << code << " / " << line;
+        const auto records = [&](const FailureSite& site) { return site.records(code, line); };
+        EXPECT_TRUE(line == 0 || std::any_of(FailureSites().begin(), FailureSites().end(), records))
+            << code << " / " << line;
         m_seen[line].insert(m_by);
     }
-    // After every operation: it failed as listed, and what the host holds is what the instance's words say.
+    // After every operation: a failure is a listed one, and the host holds exactly what the instance refers to.
     void judge(Op op, int32_t rc)
     {
         const int32_t code = m_session->last_error(), line = m_session->error_line();
@@ -132,7 +133,7 @@ private:
         EXPECT_EQ(static_cast<size_t>(std::count_if(blocks.begin(), blocks.end(), held)), m_host.live_blocks());
         EXPECT_EQ(m_host.open_handles(), ctx.audio_reader != ctx.main_reader ? 2u : 1u);
     }
-    // One request. It delivers a frame of the file, the next one unless the fault was met on the way.
+    // One request. It delivers a frame of the file: the next one, unless the fault struck during the request.
     int32_t frame(uint32_t stream)
     {
         const bool before = fired();
@@ -150,7 +151,7 @@ private:
         next = index + 1;
         return 0;
     }
-    // Requests of each stream; a growing file grows when it has no more.
+    // Requests frames of each stream; a growing file grows when it has no more.
     void take(uint32_t requests)
     {
         for (const auto& [stream, due] : m_due)
@@ -158,7 +159,7 @@ private:
                 if (frame(stream) == FLVD_RET_END)
                     m_host.grow(STEP);
     }
-    // False: the reader may stand anywhere now.
+    // Returns false if the reader may now be anywhere.
     bool go(const Seek& seek)
     {
         flvd_ctx_t& ctx = *m_session->ctx();
@@ -174,7 +175,7 @@ private:
         judge(Op::Seek, rc);
         EXPECT_TRUE(rc == 0 ? reached >= 0 && reached < 1000 : reached == -1);
         EXPECT_TRUE(rc == 0 || rc == -2 || fired() != before || m_fault.later || !m_exact);
-        const bool waits = ctx.saved_main_pos != 0 || ctx.saved_audio_pos != 0; // the way back failed itself
+        const bool waits = ctx.saved_main_pos != 0 || ctx.saved_audio_pos != 0; // going back failed as well
         EXPECT_TRUE(!waits || growing() || m_fault.later || rc == -2);
         if (rc == 0 || waits || m_fault.later || (seek.mode & AT_END) != 0)
             for (auto& [stream, due] : m_due)
@@ -207,14 +208,14 @@ private:
     Seen& m_seen;
     FakeHost m_host;
     const OpenOptions m_open;
-    // Of each stream asked for the frames of the whole file, with the tags' times, and which comes next.
+    // For each requested stream: all frames of the file with the times of their tags, and which one is next.
     std::map<uint32_t, std::pair<Frames, size_t>> m_due;
     Session* m_session = nullptr;
     HostFn m_by = HostFn::Count; // the function that failed
     bool m_exact = true;
 };
 
-// The first bytes, or more of them.
+// A file cut short, or with bytes after its end.
 Flv Cut(Flv flv, int64_t size)
 {
     flv.bytes.resize(static_cast<size_t>(size), 0xEE);
@@ -319,10 +320,10 @@ TEST(Faults, AreSurvivedAtEveryCall)
                                                      {"seek", HostFn::Seek},
                                                      {"tell", HostFn::Tell}};
     for (const std::vector<std::string>& row : ReadTable("failing_calls.txt")) {
-        const auto is_named = [&row](const Place& place) { return place.name == row.at(1); };
-        const Place& place = *std::find_if(Places().begin(), Places().end(), is_named);
-        EXPECT_TRUE(seen[place.line].contains(functions.at(row[0]))) << row[1];
-        EXPECT_TRUE(place.growing_line == 0 || seen[place.growing_line].contains(functions.at(row[0]))) << row[1];
+        const auto is_named = [&row](const FailureSite& site) { return site.name == row.at(1); };
+        const FailureSite& site = *std::find_if(FailureSites().begin(), FailureSites().end(), is_named);
+        EXPECT_TRUE(seen[site.line].contains(functions.at(row[0]))) << row[1];
+        EXPECT_TRUE(site.growing_line == 0 || seen[site.growing_line].contains(functions.at(row[0]))) << row[1];
     }
 }
 

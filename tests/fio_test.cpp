@@ -1,4 +1,4 @@
-// The cached file and its bit reader by themselves: what they deliver, and which host calls that costs.
+// The cached file and its bit reader alone: what they deliver, and which host calls that costs.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -13,7 +13,7 @@ namespace {
 constexpr uint32_t CACHE = 64;
 constexpr uint32_t UPDATE_BINARY = FIO_MODE_READ | FIO_MODE_WRITE | FIO_MODE_BINARY;
 
-// Byte n of most files holds n, so a value tells where it came from.
+// Byte n of most files is n, so a value shows where it came from.
 Bytes Part(size_t from, size_t to)
 {
     Bytes bytes;
@@ -22,7 +22,7 @@ Bytes Part(size_t from, size_t to)
     return bytes;
 }
 
-// A host with an open file, and the calls that tests/data/cached_file.txt names; the log starts after the opening.
+// A host with an open file, and the calls that tests/data/cached_file.txt names; the log starts after the open.
 class Cached {
 public:
     explicit Cached(const ReaderOptions& options, Bytes contents = Part(0, 200))
@@ -96,7 +96,7 @@ public:
     fio_file_t* file;
 
 private:
-    // The bytes shown in place.
+    // The bytes that a peek shows.
     Bytes peek(uint32_t n) const
     {
         const uint8_t* bytes = nullptr;
@@ -104,7 +104,7 @@ private:
         EXPECT_EQ(bytes == nullptr, file->state == FIO_STATE_WRITE); // untouched when refused
         return Bytes(bytes, bytes + got);
     }
-    // The whole elements read, as bytes.
+    // The complete elements read, as bytes.
     Bytes read(uint32_t count, uint32_t size) const
     {
         Bytes out(size_t{size} * count);
@@ -123,7 +123,7 @@ private:
         const fio_funcs_t funcs = host.funcs();
         __FLV_DMX__fioSetFunc(&funcs);
     }
-    // Where the bytes came from, or the number returned, and the host calls since the last time.
+    // Where the bytes came from, or the number returned, and the host calls since the call before.
     std::string told(const Bytes& got)
     {
         const size_t from = got.empty() ? 0 : got.front();
@@ -170,12 +170,12 @@ TEST(CachedFile, RejectsCountsThatAreTooLarge)
     EXPECT_EQ(__FLV_DMX__fioShowBytesByCopy(&byte, 1, f.file), 1u);
     EXPECT_EQ(byte, 2);
 
-    fio_funcs_t boaster = f.host.funcs(); // claims more than it was asked for
+    fio_funcs_t boaster = f.host.funcs(); // claims more than was requested
     boaster.file_read = [](void*, uint32_t, uint32_t count, void*) { return count + 1000; };
     boaster.file_write = [](const void*, uint32_t, uint32_t count, void*) { return count + 7; };
     boaster.file_tell = [](void*) { return INT32_MIN; };
     __FLV_DMX__fioSetFunc(&boaster);
-    EXPECT_LT(__FLV_DMX__fioTell(f.file), 0); // the read-ahead does not make it a position
+    EXPECT_LT(__FLV_DMX__fioTell(f.file), 0); // subtracting the read-ahead does not make it valid
     f.call("seek 0 0");
     for (const char* const call : {"peek 10", "read 150", "read 5"})
         EXPECT_EQ(f.call(call), "0..0");

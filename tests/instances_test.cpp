@@ -1,5 +1,4 @@
-// Several instances beside each other and one after the other, calls in the wrong order, and arguments that are not
-// what they should be.
+// Several instances at the same time and one after the other, calls in the wrong order, and wrong arguments.
 
 #include "support/report.h"
 #include "support/session.h"
@@ -10,7 +9,7 @@ using namespace flvd_test;
 
 namespace {
 
-// What the nth call of some order of frames and seeks comes to.
+// The outcome of the nth call in a sequence of frame requests and seeks.
 std::string Step(Session& session, uint32_t n)
 {
     int32_t reached = -1;
@@ -45,7 +44,7 @@ TEST(Instances, DoNotDisturbEachOther)
         for (Session& session : together)
             EXPECT_EQ(Step(session, n), alone.at(n)[i++]) << n;
         if (n % 10 == 9)
-            together.pop_back(); // the others go on
+            together.pop_back(); // the others continue
     }
 }
 

@@ -636,7 +636,7 @@ TEST(Interface, SurvivesMisuse)
     });
     EXPECT_TRUE(walked->is_open());
     EXPECT_THROW((void)walked->keyframes([](int64_t, int64_t) -> bool { throw 1; }), int);
-    EXPECT_EQ(Line(*walked->next_frame()), ExpectedLines(ReadExpected("avc_aac"))[0]) << "playing goes on";
+    EXPECT_EQ(Line(*walked->next_frame()), ExpectedLines(ReadExpected("avc_aac"))[0]) << "playing continues";
 }
 
 // Uses all functions of a file. Each frame delivered must be one of the file's, described as its tag says.

@@ -26,7 +26,7 @@ inline void Append(Bytes& out, const Bytes& more)
     out.insert(out.end(), more.begin(), more.end());
 }
 Bytes Concat(const std::vector<Bytes>& parts);
-/** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
+/** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can start in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
 
 /**
@@ -120,7 +120,7 @@ inline const auto Nalu = [](uint32_t ts, size_t size = 60) { return Tag{9, ts, A
 inline const auto Pcm = [](uint32_t ts, size_t size = 60) { return Tag{8, ts, AudioData(SOUND_PCM, Noise(size))}; };
 inline const auto Raw = [](uint32_t ts, size_t size = 60) { return Tag{8, ts, AacRaw(Noise(size))}; };
 inline const Tag g_avc = {9, 0, AvcConfig(SmallAvcRecord())};
-/** Its back-pointer passes for a script tag. */
+/** Its back-pointer looks like the start of a script tag. */
 inline const Tag g_aac = {8, 0, AacConfig({0x12, 0x10, 0x56, 0xE5, 0x00})};
 inline const Tag g_meta = {18, 0, OnMetaData("width: 320")};
 
@@ -130,7 +130,7 @@ struct Flv {
     std::vector<Tag> tags; /**< in file order, with their offsets */
 
     int64_t size() const { return static_cast<int64_t>(bytes.size()); }
-    /** The tags without the file header, before which nothing stands. */
+    /** The tags without the file header and the zero back-pointer after it. */
     Bytes body() const { return {bytes.begin() + 13, bytes.end()}; }
 
     /** Smallest timestamp among the frames: what the library takes as first_ts when all frames count. */
@@ -146,7 +146,7 @@ using IndexHook = std::function<void(std::vector<double>& times, std::vector<dou
 /** A file of these tags; DataOffset leaves room for a file header of `header` bytes after the prefix. */
 Flv File(const Tags& tags, uint8_t flags = 5, const Bytes& prefix = {}, uint32_t header = 9);
 
-/** The same after onMetaData with an index of every keyframe among them, at its real place. */
+/** The same after onMetaData with an index of all keyframes and their positions. */
 Flv IndexedFile(const Tags& tags, const IndexHook& hook = {}, const std::string& properties = "", uint8_t flags = 5);
 
 /**

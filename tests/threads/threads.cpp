@@ -1,5 +1,5 @@
 // Ten callback files played on ten threads at the same time: threads FILE. The thread sanitizer, with which this is
-// compiled, ends it when two of them touch the same memory.
+// compiled, ends it when two of them access the same memory without a lock.
 
 #include "flvdmx/flvdmx.hpp"
 #include "support/callback_file.h"
@@ -19,7 +19,7 @@ namespace {
 constexpr size_t THREADS = 10;
 constexpr int ROUNDS = 5;
 
-// Frames from the beginning and, after a seek, from the middle; 0 when anything failed.
+// Counts the frames from the start and, after a seek, from the middle; 0 if anything failed.
 size_t Play(flvdmx::File& file)
 {
     size_t frames = 0;
@@ -31,13 +31,13 @@ size_t Play(flvdmx::File& file)
     return listed ? frames : 0;
 }
 
-// Opens under the lock that opening takes by itself, and plays when all are open.
+// Opens, under the lock that File::open takes, and plays when all files are open.
 void PlayOwnFile(const std::vector<char>& bytes, std::atomic<size_t>& opened, size_t& frames)
 {
     const flvd_test::CallbackFile source(bytes.data(), bytes.size());
     auto file = flvdmx::File::open(source.name, flvdmx::make_host(flvd_callback_host_fill));
     ++opened;
-    while (opened < THREADS) // an open must not run beside a frame
+    while (opened < THREADS) // an open must not run during another call
         std::this_thread::yield();
     frames = file ? Play(*file) : 0;
 }
