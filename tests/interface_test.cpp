@@ -49,10 +49,9 @@ const flvdmx::Options g_reader_options[] = {
     {}, {.growing = true}, {.separate_audio_reader = true}, {.separate_audio_reader = true, .growing = true}};
 
 // The streams to request, one after the other.
-std::vector<Stream> Streams(bool apart)
-{
+const auto Streams = [](bool apart) {
     return apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any};
-}
+};
 
 // A frame in one line. Times in ms: decoding, presentation.
 std::string Line(Stream stream, int64_t time, int64_t presentation, bool keyframe, int64_t position, const Bytes& data)
@@ -189,8 +188,7 @@ TEST(Interface, DescribesEachFrame)
     const auto picture = [](uint32_t ts, int32_t offset, size_t size) {
         return Tag{9, ts, AvcNalu(false, Noise(size), offset)};
     };
-    Tag bad = Raw(0x1000020);
-    bad.back_pointer = 0;
+    const Tag bad = {8, 0x1000020, AacRaw(Noise(60)), 0};
     const Flv flv = File({g_meta, g_avc, g_aac, Nalu(0x1000000), picture(0x1000008, -8, 60), Raw(0x1000010), g_meta,
                           bad, picture(0x1000028, 0x7FFFFF, 5000), picture(0x1000030, -0x800000, 70000),
                           Raw(0x1000040, 0), Tag{9, 0x1000048, g_avc_end}, Nalu(0x1000050)});
@@ -304,8 +302,7 @@ TEST(Interface, ReportsChangedConfigurations)
 // large frame after it to be skipped. Only damage, not other tags, counts as a break between whole tags.
 TEST(Interface, DeliversIntoTheCallersMemory)
 {
-    Tag bad = Nalu(80, 50);
-    bad.back_pointer = 0;
+    const Tag bad = {9, 80, AvcNalu(true, Noise(50)), 0};
     const Flv flv =
         File({g_avc, g_aac, Nalu(0), Raw(10), Nalu(40, 70000), bad, Nalu(120, 9000), Raw(130),
               Tag{9, 140, AvcConfig(ConfigOf('B'))}, Tag{18, 140, OnMetaData("width: 320")}, Nalu(160), Raw(170)});

@@ -269,7 +269,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
     Flv text = index; // the positions have a string at 800 ms, the times one instead of 1600 ms
     for (const auto& [key, element] : {std::pair("filepositions", 4 * 9), {"times", 8 * 9}})
         std::copy(g_string.begin(), g_string.end(), &text.bytes[Elements(text.bytes, key)] + element);
-    struct Row {
+    const struct {
         const char* what;
         const Flv& flv;
         uint32_t open = ONE, stream = TIME; // TIME: a time seek, else the frame seek of a stream
@@ -279,8 +279,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         uint32_t reached = 0;
         int64_t at = HERE;        // where the reader stands afterwards; HERE: not checked
         int64_t left = INT32_MAX; // bytes left from the times on; NONE: nothing can be read
-    };
-    const Row rows[] = {
+    } rows[] = {
         {.what = "for information", .flv = scan, .open = INFO, .to = 100, .site = SEEK_INFO_ONLY},
         {.what = "growing: information", .flv = index, .open = GROWING | INFO, .to = 100, .site = SEEK_INFO_ONLY},
         {.what = "growing: no index", .flv = scan, .open = GROWING, .to = 100, .site = SEEK_NOT_SEEKABLE},
@@ -329,7 +328,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         {.what = "none", .flv = cut, .stream = VIDEO, .to = 9, .mode = BACK, .site = FILE_INDEX_TAG_CUT, .left = NONE},
         {.what = "none, forward", .flv = cut, .stream = VIDEO, .to = 9, .rc = -101, .left = NONE},
     };
-    for (const Row& row : rows)
+    for (const auto& row : rows)
         for (const uint32_t mode : row.mode == EACH ? std::vector{BACK, AUTO} : std::vector{row.mode}) {
             SCOPED_TRACE(std::to_string(&row - rows) + ": " + row.what);
             FakeHost host(row.flv.bytes);

@@ -69,7 +69,8 @@ Bytes operator+(const Bytes& front, const Tag& tag)
 TEST(TagHeaders, ArePlausibleUpToTheirBounds)
 {
     constexpr uint32_t ANY_CODEC = 0xFFFF, NONE = 0, STANDING = 1, SCANNING = 2, BACKWARD = 4, ALL = 7;
-    struct Row {
+    const Bytes avc5 = {0x57, 1, 0, 0, 0}, avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
+    const struct {
         const char* what;
         uint32_t taken; // the searches that find it
         Bytes data = {0x17, 1, 0, 0, 0};
@@ -78,9 +79,7 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
         int64_t data_end = 1000;
         uint32_t video = ANY_CODEC, audio = ANY_CODEC; // filters
         uint8_t type = 9;
-    };
-    const Bytes avc5 = {0x57, 1, 0, 0, 0}, avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
-    const Row rows[] = {
+    } rows[] = {
         {.what = "at the last time", .taken = STANDING | BACKWARD, .last_ts = 5000},
         {.what = "before it", .taken = ALL, .last_ts = 5001},
         {.what = "after it", .taken = NONE, .last_ts = 4999},
@@ -99,7 +98,7 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
         {.what = "audio, filter of another rate", .taken = NONE, .audio = 0x13, .type = 8},
         {.what = "tag type 10", .taken = NONE, .type = 10},
     };
-    for (const Row& row : rows) {
+    for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
         Reader r(Zeros(FIRST_TAG) + Tag{row.type, row.timestamp, row.data});
         std::tie(r.ctx.last_ts, r.ctx.data_end) = std::tie(row.last_ts, row.data_end);

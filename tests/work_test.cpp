@@ -21,15 +21,9 @@ constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000;        // of valid file
 
 struct Cost {
     uint64_t calls = 0, bytes = 0;
+    friend Cost operator+(Cost a, Cost b) { return {a.calls + b.calls, a.bytes + b.bytes}; }
+    friend Cost operator*(uint64_t n, Cost a) { return {n * a.calls, n * a.bytes}; }
 };
-Cost operator+(Cost a, Cost b)
-{
-    return {a.calls + b.calls, a.bytes + b.bytes};
-}
-Cost operator*(uint64_t n, Cost a)
-{
-    return {n * a.calls, n * a.bytes};
-}
 
 constexpr Cost FALSE_HEADER = {5, 0}; // position, seek to its back-pointer, read, seek back, refill; bytes: Forward()
 constexpr Cost TAG = {5, 0};          // positions before and after it; at a refill two queries of the end and a read

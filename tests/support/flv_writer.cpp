@@ -112,27 +112,6 @@ Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps)
     return out;
 }
 
-Bytes SmallAvcRecord()
-{
-    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
-}
-
-// A payload of 200 bytes: a header and noise.
-static Bytes Filled(const Bytes& header)
-{
-    return Concat({header, Noise(200 - header.size())});
-}
-
-Bytes Mp3Frame()
-{
-    return Filled({0xFF, 0xFB, 0x90, 0x64});
-}
-
-Bytes H263Picture(uint32_t size_code)
-{
-    return Filled(Bits("1/17 0/5 1/8 " + std::to_string(size_code) + "/3"));
-}
-
 void PrintTo(const Frame& frame, std::ostream* out)
 {
     *out << (frame.stream == 1 ? "video " : "audio ") << frame.timestamp << " ms, " << frame.data.size() << " bytes";

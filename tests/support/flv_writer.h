@@ -62,11 +62,15 @@ inline const auto AacRaw = [](const Bytes& payload, uint8_t header = 0xAF) { ret
 /** AVCDecoderConfigurationRecord with the given parameter sets. */
 Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
 /** A record of one baseline parameter set, 320 x 240. */
-Bytes SmallAvcRecord();
+inline const auto SmallAvcRecord = [] {
+    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 5, 7, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
+};
 /** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
-Bytes Mp3Frame();
+inline const auto Mp3Frame = [] { return Concat({{0xFF, 0xFB, 0x90, 0x64}, Noise(196)}); };
 /** Sorenson H.263 picture header; size_code 2 to 6: a fixed size. */
-Bytes H263Picture(uint32_t size_code);
+inline const auto H263Picture = [](uint32_t size_code) {
+    return Concat({Bits("1/17 0/5 1/8 " + std::to_string(size_code) + "/3"), Noise(195)});
+};
 
 constexpr uint8_t SOUND_MP3 = 0x2F, SOUND_PCM = 0x3E, SOUND_SPEEX = 0xB2;
 constexpr uint8_t CODEC_H263 = 2, CODEC_SCREEN = 3, CODEC_VP6 = 4, CODEC_VP6A = 5;
