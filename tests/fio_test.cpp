@@ -44,7 +44,12 @@ public:
         const ReaderOptions other = {.cache_size = CACHE, .mode = n};
         const auto fail = [this](HostFn fn) { host.fail_from(fn, host.calls(fn) + 1); };
         const std::map<std::string, std::function<void()>> changes = {
-            {"narrow", [&] { narrow(); }},
+            {"narrow",
+             [&] {
+                 host.use_32_bit_only(); // from here on
+                 const fio_funcs_t funcs = host.funcs();
+                 __FLV_DMX__fioSetFunc(&funcs);
+             }},
             {"short-write", [&] { host.shorten_nth(HostFn::Write, host.calls(HostFn::Write) + 1, n); }},
             {"start-bits", [&] { __FLV_DMX__bitInit(file); }},
             {"skip-bits", [&] { __FLV_DMX__bitSkipBits(file, n); }},
@@ -115,13 +120,6 @@ private:
     {
         const Bytes bytes = Part(static_cast<size_t>(from), static_cast<size_t>(to));
         return __FLV_DMX__fioWrite(bytes.data(), size, static_cast<uint32_t>(bytes.size()) / size, file);
-    }
-    // From here on the host has no 64-bit functions.
-    void narrow()
-    {
-        host.use_32_bit_only();
-        const fio_funcs_t funcs = host.funcs();
-        __FLV_DMX__fioSetFunc(&funcs);
     }
     // Where the bytes came from, or the number returned, and the host calls since the call before.
     std::string told(const Bytes& got)

@@ -22,11 +22,12 @@ namespace {
 const std::string g_data = FLVDMX_TEST_DATA "/";
 const flvdmx::Host g_memory = flvdmx::make_host(flvd_memory_host_fill);
 
-// A file in memory.
+// A file in memory. Of several, the newest is the one that can be opened.
 struct Memory : flvd_memory_file_t {
-    explicit Memory(Bytes contents) : flvd_memory_file_t{}, bytes(std::move(contents)), path(std::to_string(++made))
+    explicit Memory(Bytes contents)
+        : flvd_memory_file_t{"memory", nullptr, contents.size(), nullptr}, bytes(std::move(contents))
     {
-        std::tie(name, data, size) = std::tuple(path.c_str(), bytes.data(), bytes.size());
+        data = bytes.data();
         flvd_memory_host_add(this);
     }
     ~Memory() { flvd_memory_host_remove(this); }
@@ -38,15 +39,7 @@ struct Memory : flvd_memory_file_t {
     }
 
     const Bytes bytes;
-
-private:
-    const std::string path;
-    static inline int made = 0;
 };
-
-// One reader or two, of a complete or of a growing file.
-const flvdmx::Options g_reader_options[] = {
-    {}, {.growing = true}, {.separate_audio_reader = true}, {.separate_audio_reader = true, .growing = true}};
 
 // The streams to request, one after the other.
 const auto Streams = [](bool apart) {
@@ -277,13 +270,11 @@ TEST(Interface, ReportsChangedConfigurations)
     for (const auto& test : cases) {
         const Flv flv = ConfigFile(test.file);
         Memory memory(flv.bytes);
-        for (flvdmx::Options options : g_reader_options) {
-            const auto& [apart, growing] = std::tie(options.separate_audio_reader, options.growing);
+        for (const auto& [apart, growing] : {std::pair(false, false), {false, true}, {true, false}, {true, true}}) {
             SCOPED_TRACE(testing::Message()
                          << test.name << (apart ? ", two readers" : "") << (growing ? ", growing" : ""));
             memory.size = growing ? static_cast<uint64_t>(flv.tags[3].end()) : flv.bytes.size();
-            options.cache_size = 1024;
-            auto file = memory.open(options);
+            auto file = memory.open({.cache_size = 1024, .separate_audio_reader = apart, .growing = growing});
             const auto grow = [&] {
                 EXPECT_FALSE(file->seek(1s)) << "changes nothing";
                 memory.size = std::min<uint64_t>(memory.size + 7 + flv.bytes.size() / 200, flv.bytes.size());

@@ -128,7 +128,6 @@ std::vector<WorkCase> Cases()
     return {
         FalseHeaders("false headers", 0, CACHE, Forward(700000, 600000)),
         FalseHeaders("false headers, two readers", SEPARATE, CACHE, Forward(700000, 600000)),
-        FalseHeaders("false headers, larger cache", 0, CACHE * NARROW, Forward(700000, 600000, CACHE * NARROW)),
         FalseHeaders("false headers in the cache", 0, BIG_CACHE, in_cache),
         FalseHeaders("false headers, growing", GROWING, CACHE, Forward(700000)),
         Tail("zeros", {0}, 3 * MIB),
@@ -136,7 +135,6 @@ std::vector<WorkCase> Cases()
         Tail("small distances", {0, 0, 0, 15}, 2 * MIB),
         Slide("slide", 300000, NARROW, 4),
         Slide("slide by reads of a byte", 30000, 1),
-        Slide("slide by wide reads", 30000, CACHE),
         ManyTags("audio alone", false, 100, false, TAG),
         ManyTags("large tags", true, CACHE, false, LARGE_TAG),
         ManyTags("large tags, two readers", true, CACHE, false, LARGE_TAG, SEPARATE),
