@@ -11,7 +11,7 @@ namespace {
 constexpr uint32_t ANY_CODEC = 0xFFFF;
 constexpr int64_t BEYOND = 64; // how far past the end of the file a reader may be moved
 constexpr flvd_tag_info_t UNTOUCHED = {0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A};
-constexpr int32_t UNKNOWN = 1; // the host was asked to seek before the file: what follows is not defined
+constexpr int32_t UNKNOWN = 1; // a seek before the start of the file was requested: what follows is not defined
 
 struct Found {
     int32_t rc = FLVD_ERR_END_OF_DATA;

@@ -119,6 +119,7 @@ private:
         require(info.file_info == &m_ctx->file_info, "wrong record of the file");
         require(info.video_info == (video ? &m_ctx->video_info : nullptr), "wrong record of the video");
         require(info.audio_info == (audio ? &m_ctx->audio_info : nullptr), "wrong record of the audio");
+        require(info.video_config == info.video_info && info.audio_config == info.audio_info, "records that differ");
         copy_of(m_ctx->video_info.config, m_ctx->video_info.config_size);
         copy_of(m_ctx->audio_info.config, m_ctx->audio_info.config_size);
         copy_of(arrays.times_ms, arrays.times_count * sizeof *arrays.times_ms);

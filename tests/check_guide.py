@@ -1,7 +1,7 @@
 #!/usr/bin/env python3
-"""Compares the tables of codes and lines in docs/host-guide.md with the sources.
+"""Compares the codes and lines in docs/host-guide.md, and the host kit's texts of the codes, with the sources.
 
-Three codes are results of the navigation, never recorded: those stand in no table.
+Three codes are results of the navigation and never recorded, so no table has them.
 """
 import pathlib
 import re
@@ -31,5 +31,8 @@ told_sites = [(name, int(line)) for lines, name in rows for line in lines.split(
 
 faults = differences("codes in the guide", [(name, int(code)) for code, name in told], codes)
 faults += differences("lines in the guide", told_sites, sites)
+texts = dict(re.findall(r'^    \{(FLVD_ERR_\w+), "\1",\s+"(.+)"\},$', read("host/src/error_text.c"), re.M))
+named = [name for name, _ in codes] + ["FLVD_ERR_HOST_IN_USE", "FLVD_ERR_HOST_INCOMPLETE"]
+faults += differences("names of texts", texts, named) + differences("texts", texts.values(), texts.values())
 print(*faults, f"{len(codes)} codes, {len(set(sites))} lines, {len(faults)} faults", sep="\n")
 sys.exit(1 if faults or not sites or not codes else 0)

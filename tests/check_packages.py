@@ -1,4 +1,4 @@
-"""Makes the Debian packages of a build and looks at them: names, fields, dependencies and files.
+"""Makes the Debian packages of a build and checks their names, fields, dependencies and files.
 
 usage: check_packages.py CPACK BUILD VERSION TRIPLET GSTREAMER
 

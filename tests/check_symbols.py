@@ -44,6 +44,6 @@ faults = differences("version script", script, declared) + differences("exports"
 faults += differences("imports", ALLOWED_IMPORTS | set(imports), ALLOWED_IMPORTS)
 faults += differences("dynamic section", {LIBC, *dynamic}, {LIBC, SONAME})
 if absent.encode() in pathlib.Path(library).read_bytes():
-    faults.append(f"{absent} stands in the library")
+    faults.append(f"the library contains {absent}")
 print(*faults, f"{len(exports)} exports, {len(imports)} imports, {len(faults)} faults", sep="\n")
 sys.exit(1 if faults or not exports else 0)

@@ -1,4 +1,4 @@
-// What a file tells of its streams: codec configuration from the first tags, and script data.
+// What a file says about its streams: codec configurations from the first tags, and script data.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -13,9 +13,7 @@ using namespace flvd_test;
 
 namespace {
 
-using enum Site;
-
-constexpr uint32_t OLD = 77; // what stands in a field before
+constexpr uint32_t OLD = 77; // what a field holds before the call
 
 struct Audio {
     int32_t rc;
@@ -116,38 +114,6 @@ std::string Probe(uint8_t type, const std::vector<Bytes>& tags)
     return out.str();
 }
 
-TEST(StreamProbe, TakesWhatTwelveBytesOfAnAudioTagTell)
-{
-    const struct {
-        const char* what;
-        uint8_t header;
-        uint32_t filter, rate, channels;
-        std::optional<Site> site = {}; // where it is given up
-        uint32_t bytes = 12;           // of the tag that the probe gets
-    } rows[] = {
-        {.what = "PCM: needs no more", .header = 0x3E, .filter = 0x3E, .rate = 44100, .channels = 1},
-        {.what = "no AAC packet type", .header = 0xAF, .filter = 0xAF, .rate = 44100, .channels = 2, .site = AUDIO_TAG},
-        {.what = "no MP3 frame header", .header = 0x2A, .filter = 0x2A, .rate = 22050, .channels = 1, .site = MP3_DATA},
-        {.what = "short", .header = 0x3E, .filter = 0xFFFF, .rate = 0, .channels = 0, .site = AUDIO_TAG, .bytes = 11},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.what);
-        FakeHost host(File({Screen(0), {8, 0, AudioData(row.header, Noise(LARGE))}, Screen(9)}).bytes);
-        host.shorten_nth(HostFn::Read, 4, row.bytes); // after file header, tag header and back-pointer
-        host.fail_nth(HostFn::Read, 5);
-        Session session(host, {0, false, SMALL});
-        ASSERT_TRUE(session.opened());
-        const flvd_audio_info_t& info = session.ctx()->audio_info;
-        EXPECT_EQ(session.info().has_audio, row.site ? 0u : 1u);
-        EXPECT_EQ(session.ctx()->audio_format_filter, row.filter);
-        EXPECT_EQ(info.sample_rate, row.rate);
-        EXPECT_EQ(info.channels, row.channels);
-        EXPECT_EQ(info.sample_size, row.channels != 0 ? 16u : 0u);
-        EXPECT_EQ(info.format_tag, 0u);
-        EXPECT_TRUE(session.recorded(row.site)) << session.error_line();
-    }
-}
-
 TEST(StreamProbe, DescribesTheFirstTag)
 {
     const auto parameters = [](size_t size) { // in start-code form
@@ -175,7 +141,7 @@ TEST(StreamProbe, DescribesTheFirstTag)
     };
     for (const auto& row : rows)
         EXPECT_EQ(Probe(row.type, row.tags), row.described) << row.what;
-    // A header of each codec that looks for one.
+    // Data with a header for each codec that reads one.
     const Bytes any = Concat({{0, 0, 0x46, 15, 0, 0x46, 20, 0, 15, 20}, H263Picture(3)});
     const char* const codecs[] = {" 0x0 0",         "JPEG 0x0 0", "FLV1 176x144 0", "SCR1 0x0 0", "VP60 320x1120 0",
                                   "VP6A 320x240 0", "SCR2 0x0 0", " 0x0 206",       " 0x0 0"};
@@ -268,7 +234,7 @@ TEST(ScriptValue, IsBounded)
     }
     Expect(deep + high + deep + "< height: 240 >", "0 width 320 height 240");
     Expect("[1 " + deep + high, "-1");
-    Expect("< width: 320 >", "-1", 0, 12); // a value begins inside or not at all
+    Expect("< width: 320 >", "-1", 0, 12); // a value that starts after the end is not read
     Expect("< width: 320 >", "0 width 320", 0, 13);
     Expect("{ a: %5 } 1", "0", 0, 16);              // more consumed than counted
     Expect(keys + "< width: 320 >", "0 width 320"); // an empty key counts nothing

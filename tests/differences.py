@@ -1,10 +1,10 @@
-"""What the checks of names share."""
+"""For the scripts that compare lists of names."""
 
 
 def differences(what, actual, expected):
-    """Lines that tell what one side lacks, and what the first has too much or twice."""
+    """One line for each item that is missing from the actual list, or stands there twice or without being expected."""
     actual = list(actual)
     twice = {item for item in actual if actual.count(item) > 1}
     missing, wrong = set(expected) - set(actual), set(actual) - set(expected)
-    kinds = (("is missing", missing), ("stands twice", twice), ("is not so", wrong))
+    kinds = (("is missing", missing), ("stands twice", twice), ("is not expected", wrong))
     return [f"{what}: {item} {fault}" for fault, items in kinds for item in sorted(items)]

@@ -1,8 +1,9 @@
-// The cached file and its bit reader by themselves: what they deliver, and which host calls that costs.
+// The cached file and its bit reader alone: what they deliver, and which host calls that costs.
 
 #include "support/expected.h"
 #include "support/report.h"
 
+#include <iomanip>
 #include <sstream>
 
 using namespace flvd_test;
@@ -12,7 +13,7 @@ namespace {
 constexpr uint32_t CACHE = 64;
 constexpr uint32_t UPDATE_BINARY = FIO_MODE_READ | FIO_MODE_WRITE | FIO_MODE_BINARY;
 
-// Byte n of most files holds n, so a value tells where it came from.
+// Byte n of most files is n, so a value shows where it came from.
 Bytes Part(size_t from, size_t to)
 {
     Bytes bytes;
@@ -21,7 +22,7 @@ Bytes Part(size_t from, size_t to)
     return bytes;
 }
 
-// A host with an open file, and the calls that tests/data/cached_file.txt names; the log starts after the opening.
+// A host with an open file, and the calls that tests/data/cached_file.txt names; the log starts after the open.
 class Cached {
 public:
     explicit Cached(const ReaderOptions& options, Bytes contents = Part(0, 200))
@@ -37,12 +38,18 @@ public:
         std::string name;
         int64_t first = 0, second = 1; // numbers
         uint32_t third = 1;
-        std::istringstream(text) >> name >> first >> second >> third;
+        std::istringstream(text) >> name >> std::setbase(0) >> first >> second >> third;
         const auto n = static_cast<uint32_t>(first), size = static_cast<uint32_t>(second);
         const auto signed_n = static_cast<int32_t>(first), whence = static_cast<int32_t>(second);
+        const ReaderOptions other = {.cache_size = CACHE, .mode = n};
         const auto fail = [this](HostFn fn) { host.fail_from(fn, host.calls(fn) + 1); };
         const std::map<std::string, std::function<void()>> changes = {
-            {"narrow", [&] { narrow(); }},
+            {"narrow",
+             [&] {
+                 host.use_32_bit_only(); // from here on
+                 const fio_funcs_t funcs = host.funcs();
+                 __FLV_DMX__fioSetFunc(&funcs);
+             }},
             {"short-write", [&] { host.shorten_nth(HostFn::Write, host.calls(HostFn::Write) + 1, n); }},
             {"start-bits", [&] { __FLV_DMX__bitInit(file); }},
             {"skip-bits", [&] { __FLV_DMX__bitSkipBits(file, n); }},
@@ -67,7 +74,10 @@ public:
             {"eof", [&] { return told(__FLV_DMX__fioIsEof(file)); }},
             {"flush", [&] { return told(__FLV_DMX__fioFlush(file)); }},
             {"close", [&] { return told(__FLV_DMX__fioClose(std::exchange(file, nullptr))); }},
+            {"mode", [&] { return told(__FLV_DMX__fioClose(host.open_reader(other))); }},
             {"size", [&] { return told(__FLV_DMX__fioSetCacheReadSize(file, n)); }},
+            {"block", [&] { return told(static_cast<int64_t>(host.size_of(file->cache))); }},
+            {"extra", [&] { return told(file->overread_extra); }},
             {"held", [&] { return told(file->count); }},
             {"copies", [&] { return told(static_cast<int64_t>(host.calls(HostFn::Copy))); }},
             {"contents", [&] { return told(host.contents()); }},
@@ -91,7 +101,7 @@ public:
     fio_file_t* file;
 
 private:
-    // The bytes shown in place.
+    // The bytes that a peek shows.
     Bytes peek(uint32_t n) const
     {
         const uint8_t* bytes = nullptr;
@@ -99,7 +109,7 @@ private:
         EXPECT_EQ(bytes == nullptr, file->state == FIO_STATE_WRITE); // untouched when refused
         return Bytes(bytes, bytes + got);
     }
-    // The whole elements read, as bytes.
+    // The complete elements read, as bytes.
     Bytes read(uint32_t count, uint32_t size) const
     {
         Bytes out(size_t{size} * count);
@@ -111,14 +121,7 @@ private:
         const Bytes bytes = Part(static_cast<size_t>(from), static_cast<size_t>(to));
         return __FLV_DMX__fioWrite(bytes.data(), size, static_cast<uint32_t>(bytes.size()) / size, file);
     }
-    // From here on the host has no 64-bit functions.
-    void narrow()
-    {
-        host.use_32_bit_only();
-        const fio_funcs_t funcs = host.funcs();
-        __FLV_DMX__fioSetFunc(&funcs);
-    }
-    // Where the bytes came from, or the number returned, and the host calls since the last time.
+    // Where the bytes came from, or the number returned, and the host calls since the call before.
     std::string told(const Bytes& got)
     {
         const size_t from = got.empty() ? 0 : got.front();
@@ -132,33 +135,6 @@ private:
     }
 };
 
-TEST(FioOpen, TurnsModeBitsIntoModeStrings)
-{
-    // Empty: refused before the host is asked.
-    const std::pair<uint32_t, const char*> cases[] = {
-        {0x10, "r"},   {0x20, "w"},   {0x21, "w"},    {0x30, "r+"},  {0x31, "w+"},   {0x40, "a"},    {0x50, "a+"},
-        {0x110, "rt"}, {0x210, "rb"}, {0x131, "w+t"}, {0x221, "wb"}, {0x230, "r+b"}, {0x150, "a+t"}, {0x240, "ab"},
-        {0xFC1E, "r"}, {0x0, ""},     {0x1, ""},      {0x11, ""},    {0x41, ""},     {0x51, ""},     {0x60, ""},
-        {0x61, ""},    {0x70, ""},    {0x71, ""},     {0x310, ""},   {0x331, ""},    {0x200, ""}};
-    for (const auto& [mode, text] : cases) {
-        FakeHost host(Part(0, 10));
-        host.start_log();
-        EXPECT_EQ(__FLV_DMX__fioClose(host.open_reader({CACHE, 0, 0, mode})), 0);
-        EXPECT_EQ(host.take_log(), *text != '\0' ? "open(a.flv," + std::string(text) + ")=1 close()=0" : "") << mode;
-    }
-}
-
-TEST(FioOpen, TakesTheExtraWithOverreadOnly)
-{
-    for (const uint32_t extra : {0u, 32u}) {
-        const Cached f({CACHE, extra != 0 ? 1 : 0, 32});
-        EXPECT_EQ(f.host.size_of(f.file->cache), CACHE + extra);
-        EXPECT_EQ(f.file->overread_extra, extra);
-    }
-    FakeHost host(Part(0, 10));
-    EXPECT_EQ(host.open_reader({0xFFFFFFF0, 1, 0x20}), nullptr); // the sum does not fit 32 bits
-}
-
 TEST(CachedFile, DoesWhatTheTableSays)
 {
     std::optional<Cached> f;
@@ -167,7 +143,7 @@ TEST(CachedFile, DoesWhatTheTableSays)
         std::string opening;
         std::istringstream(row[0]) >> opening >> cache >> extra;
         if (opening == "file")
-            f.emplace(extra != 0 ? ReaderOptions{cache, 1, extra} : ReaderOptions{cache, 0, 0, UPDATE_BINARY});
+            f.emplace(extra != 0 ? ReaderOptions{cache, 1, extra} : ReaderOptions{cache, 0, 32, UPDATE_BINARY});
         else if (opening == "new")
             f.emplace(ReaderOptions{cache, 0, 0, UPDATE_BINARY | FIO_MODE_TRUNCATE});
         else
@@ -192,18 +168,19 @@ TEST(CachedFile, RejectsCountsThatAreTooLarge)
     EXPECT_EQ(__FLV_DMX__fioShowBytesByCopy(&byte, 1, f.file), 1u);
     EXPECT_EQ(byte, 2);
 
-    fio_funcs_t boaster = f.host.funcs(); // claims more than it was asked for
+    fio_funcs_t boaster = f.host.funcs(); // claims more than was requested
     boaster.file_read = [](void*, uint32_t, uint32_t count, void*) { return count + 1000; };
     boaster.file_write = [](const void*, uint32_t, uint32_t count, void*) { return count + 7; };
     boaster.file_tell = [](void*) { return INT32_MIN; };
     __FLV_DMX__fioSetFunc(&boaster);
-    EXPECT_LT(__FLV_DMX__fioTell(f.file), 0); // the read-ahead does not make it a position
+    EXPECT_LT(__FLV_DMX__fioTell(f.file), 0); // subtracting the read-ahead does not make it valid
     f.call("seek 0 0");
     for (const char* const call : {"peek 10", "read 150", "read 5"})
         EXPECT_EQ(f.call(call), "0..0");
     EXPECT_EQ(f.file->count, 0u);
     f.call("write 0 10");
     EXPECT_EQ(__FLV_DMX__fioWrite(&byte, 1, 0xFFFFFFF8, f.file), 0xFFFFFFF8); // no room for all, though the sum wraps
+    EXPECT_EQ(f.host.open_reader({0xFFFFFFF0, 1, 0x20}), nullptr);            // the sum does not fit 32 bits
 }
 
 } // namespace

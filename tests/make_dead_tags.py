@@ -1,4 +1,4 @@
-"""Puts 150 tags without a frame, more than one request passes, into an FLV file: its first video tag, the configuration.
+"""Puts 150 tags without a frame, more than one request skips, into an FLV file: its first video tag, the configuration.
 The file gets a title as well.
 
 usage: make_dead_tags.py FILE OUTPUT

@@ -1,5 +1,5 @@
-// Tag navigation: which headers count, how damage is crossed, what a step costs the host, and where the valid data of
-// an opened file ends.
+// Tag navigation: which headers are plausible, how damage is crossed, which host calls a step costs, and where the
+// valid data of a file ends.
 
 #include "support/report.h"
 #include "support/session.h"
@@ -16,9 +16,9 @@ constexpr int64_t DATA_OFFSET = 9, FIRST_TAG = 13;
 constexpr uint32_t CACHE = 4096;
 constexpr int64_t MIB = 0x100000;                        // what resynchronisation covers
 constexpr int64_t WINDOW = CACHE - 12;                   // candidate starts in a cache
-constexpr int64_t SCANNED = (MIB / WINDOW + 1) * WINDOW; // what a failed scan has looked at
+constexpr int64_t SCANNED = (MIB / WINDOW + 1) * WINDOW; // what a failed scan has examined
 
-using Found = std::tuple<int32_t, int64_t, uint32_t>; // result, place and kind, the latter two on success alone
+using Found = std::tuple<int32_t, int64_t, uint32_t>; // result; position and kind on success
 
 // A reader on some bytes, with an instance that knows nothing of its streams.
 struct Reader {
@@ -65,28 +65,27 @@ Bytes operator+(const Bytes& front, const Tag& tag)
     return Concat({front, File({tag}).body()});
 }
 
-// A header at its bounds: taken by a search that stands on it, by one that scans for it, and on the way back.
+// A header at its bounds: found by a search that starts at it, by one that scans for it, and by one going backward.
 TEST(TagHeaders, ArePlausibleUpToTheirBounds)
 {
     constexpr uint32_t ANY_CODEC = 0xFFFF, NONE = 0, STANDING = 1, SCANNING = 2, BACKWARD = 4, ALL = 7;
-    struct Row {
+    const Bytes avc5 = {0x57, 1, 0, 0, 0}, avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
+    const struct {
         const char* what;
-        uint32_t taken; // by which searches
+        uint32_t taken; // the searches that find it
         Bytes data = {0x17, 1, 0, 0, 0};
         uint32_t timestamp = 5000;
         uint32_t last_ts = 0; // 0: not known
         int64_t data_end = 1000;
         uint32_t video = ANY_CODEC, audio = ANY_CODEC; // filters
         uint8_t type = 9;
-    };
-    const Bytes avc5 = {0x57, 1, 0, 0, 0}, avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
-    const Row rows[] = {
+    } rows[] = {
         {.what = "at the last time", .taken = STANDING | BACKWARD, .last_ts = 5000},
         {.what = "before it", .taken = ALL, .last_ts = 5001},
         {.what = "after it", .taken = NONE, .last_ts = 4999},
         {.what = "no time known", .taken = ALL, .timestamp = UINT32_MAX - 1},
-        {.what = "the last time of all", .taken = STANDING | BACKWARD, .timestamp = UINT32_MAX},
-        {.what = "size of all data", .taken = BACKWARD, .data_end = 5},
+        {.what = "the largest time", .taken = STANDING | BACKWARD, .timestamp = UINT32_MAX},
+        {.what = "as large as all data", .taken = BACKWARD, .data_end = 5},
         {.what = "one byte less", .taken = ALL, .data_end = 6},
         {.what = "frame type 5", .taken = ALL, .data = avc5, .video = 7},
         {.what = "frame type 6", .taken = NONE, .data = avc6, .video = 7},
@@ -99,7 +98,7 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
         {.what = "audio, filter of another rate", .taken = NONE, .audio = 0x13, .type = 8},
         {.what = "tag type 10", .taken = NONE, .type = 10},
     };
-    for (const Row& row : rows) {
+    for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
         Reader r(Zeros(FIRST_TAG) + Tag{row.type, row.timestamp, row.data});
         std::tie(r.ctx.last_ts, r.ctx.data_end) = std::tie(row.last_ts, row.data_end);
@@ -110,38 +109,27 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
     }
 }
 
-// Many muxers write a wrong size after the first script tag. It may stand up to four bytes after DataOffset.
-TEST(TagHeaders, OfTheFirstScriptTagNeedNoBackPointer)
+// Many muxers write a wrong back-pointer after the first script tag, which may start up to four bytes after DataOffset.
+TEST(TagHeaders, OfAFirstScriptTagNeedNoBackPointer)
 {
-    const struct {
-        const char* what;
-        Tag tag;
-        int64_t at;
-        bool taken;
-    } rows[] = {
-        {.what = "first tag", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG, .taken = true},
-        {.what = "before it", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG - 1, .taken = true},
-        {.what = "a byte after it", .tag = {18, 0, Noise(100), 7}, .at = FIRST_TAG + 1, .taken = false},
-        {.what = "large", .tag = {18, 0, Noise(5000), 7}, .at = FIRST_TAG, .taken = true},
-        {.what = "beyond the end", .tag = {18, 0, Noise(100), 7, 9000}, .at = FIRST_TAG, .taken = true},
-        {.what = "video", .tag = {9, 0, AvcNalu(true, Noise(100)), 7}, .at = FIRST_TAG, .taken = false},
-    };
-    for (const auto& row : rows) {
-        SCOPED_TRACE(row.what);
-        Reader r(Concat({Zeros(row.at) + row.tag, Zeros(6000)}));
+    const auto expect = [](const Tag& tag, int64_t at, const Found& found) {
+        Reader r(Concat({Zeros(at) + tag, Zeros(6000)}));
         r.ctx.data_end = 10000;
-        const Found tag(row.taken ? 0 : ENDED, row.taken ? row.at : 0, 0);
-        EXPECT_EQ(r.at(row.at).verify(ANY), tag);
-    }
+        EXPECT_EQ(r.at(at).verify(ANY), found) << tag.size() << " bytes at " << at;
+    };
+    expect({18, 0, Noise(100), 7}, FIRST_TAG, {0, FIRST_TAG, 0});
+    expect({18, 0, Noise(5000), 7}, FIRST_TAG, {0, FIRST_TAG, 0});
+    expect({18, 0, Noise(100), 7}, FIRST_TAG + 1, {ENDED, 0, 0});
+    expect({9, 0, AvcNalu(true, Noise(100)), 7}, FIRST_TAG, {ENDED, 0, 0});
 }
 
-// The kind reported depends on what is wanted, and on the direction.
+// The kind reported depends on the kinds wanted and on the direction.
 TEST(TagKinds, AreReportedInBothDirections)
 {
     constexpr uint32_t s = SCRIPT, v = VIDEO, a = AUDIO, k = KEY;
     constexpr uint32_t vc = VIDEO | CONFIG, kc = KEY | CONFIG, ac = AUDIO | CONFIG;
     struct Kinds {
-        uint32_t next = 0, previous = 0; // 0: such a tag is passed
+        uint32_t next = 0, previous = 0; // 0: the tag is skipped
     };
     struct Row {
         const char* what;
@@ -188,7 +176,7 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
 {
     const auto find = [](int64_t distance, int64_t limit) {
         SCOPED_TRACE(testing::PrintToString(std::pair(distance, limit)));
-        const bool covered = distance < (limit + WINDOW - 1) / WINDOW * WINDOW; // whole windows are looked at
+        const bool covered = distance < (limit + WINDOW - 1) / WINDOW * WINDOW; // whole windows are examined
         Reader r(Zeros(100 + distance) + AudioTag(), CACHE, 16);
         EXPECT_EQ(r.at(100).find(limit), covered ? distance : NOT_FOUND);
         EXPECT_EQ(__FLV_DMX__fioGetCacheReadSize(r.file), 16u);
@@ -198,51 +186,51 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
     for (const int64_t distance : {int64_t{0}, int64_t{1}, WINDOW - 1, WINDOW, SCANNED - 1, SCANNED})
         for (const int64_t limit : {int64_t{0}, int64_t{1}, WINDOW, WINDOW + 1, MIB})
             find(distance, limit);
-    EXPECT_EQ(Reader(Bytes() + AudioTag(), 12).at(0).find(), NOT_FOUND); // no header fits this cache
+    EXPECT_EQ(Reader(Bytes() + AudioTag(), 12).at(0).find(), NOT_FOUND); // the cache is too small for a header
 }
 
-// An audio tag of 20 bytes whose header is plausible and whose back-pointer is not; and many of them.
+// An audio tag of 20 bytes with a plausible header and a wrong back-pointer; and many of them.
 const Tag BAD{8, 0, Bytes{0xAF, 1, 0xEE, 0xEE, 0xEE}, 0xEEEEEEEE};
-constexpr int64_t BAD_SIZE = 20, CHECKS = 16384; // of which one search makes so many
+constexpr int64_t BAD_SIZE = 20, CHECKS = 16384; // CHECKS: how many may fail in one search
 const auto Bad = [](int64_t count) { return File(std::vector(static_cast<size_t>(count), BAD)).body(); };
 
-// From place 100 on, damage and then the wanted tag, which begins at `found`; else each search ends with a result.
+// From position 100 on: damage, then the wanted tag, which each search finds or gives up with a result.
 TEST(Resynchronisation, CoversOneMiBInAll)
 {
     const Bytes half = Zeros(MIB / 2 + 1000), two_gaps = Concat({half + AudioTag(), half});
     const Bytes failed = Concat({Bad(CHECKS), Zeros(30)});
-    // With a failed check every 64 bytes all of the MiB is crossed: such a check costs no distance.
+    // With a failed check every 64 bytes the whole MiB is crossed: a check costs no distance.
     const Bytes sparse = Concat(std::vector<Bytes>(MIB / 64 - 1, Concat({Bad(1), Zeros(64 - BAD_SIZE)})));
-    // Nor does one after which the scan finds nothing: the whole MiB is left.
+    // Nor does one after which a scan finds nothing: a whole MiB is left.
     const Bytes gap = Concat({Bad(1), Zeros(1 + SCANNED - BAD_SIZE + MIB)});
     struct Results {
         int32_t verify = 0, next = 0, trust = 0;
     };
     constexpr Results none = {NOT_FOUND, NOT_FOUND, NOT_FOUND}, ended = {ENDED, ENDED, ENDED};
-    constexpr Results spent = {NOT_FOUND, NOT_FOUND, 0};        // the checks, of which a trusting search makes none
-    constexpr Results by_place = {NOT_FOUND, ENDED, NOT_FOUND}; // a step looks where its budget was used up
+    constexpr Results spent = {NOT_FOUND, NOT_FOUND, 0};        // the checks; a search that trusts makes none
+    constexpr Results by_place = {NOT_FOUND, ENDED, NOT_FOUND}; // a step checks where its budget ran out
     const struct {
         const char* what;
         Bytes damage;
         Results rc = {};      // 0: the tag is found
-        bool tag = true;      // follows the damage
+        bool tag = true;      // after the damage
         int64_t data_end = 0; // 0: of the file
-        bool again = false;   // what is not found is found by the next search, which goes on from there
+        bool again = false;   // the next search continues and finds it
     } rows[] = {
         {.what = "one MiB", .damage = Zeros(MIB)},
         {.what = "one byte more", .damage = Zeros(MIB + 1), .rc = none},
-        {.what = "data ends", .damage = Zeros(MIB / 2), .rc = ended, .tag = false},
-        // Of the last 12 bytes none can begin a header.
-        {.what = "data ends first", .damage = Zeros(MIB + 12), .rc = ended, .tag = false},
-        {.what = "limit comes first", .damage = Zeros(MIB + 13), .rc = by_place, .tag = false},
+        {.what = "the data ends", .damage = Zeros(MIB / 2), .rc = ended, .tag = false},
+        // No header can start in the last 12 bytes.
+        {.what = "the data ends first", .damage = Zeros(MIB + 12), .rc = ended, .tag = false},
+        {.what = "the limit comes first", .damage = Zeros(MIB + 13), .rc = by_place, .tag = false},
         {.what = "near it", .damage = Zeros(2 * MIB), .rc = by_place, .tag = false, .data_end = 101 + SCANNED + 12},
         {.what = "not near", .damage = Zeros(2 * MIB), .rc = none, .tag = false, .data_end = 101 + SCANNED + 13},
         {.what = "a valid tag restores the budget of a careful search", .damage = two_gaps, .rc = {0, 0, NOT_FOUND}},
-        {.what = "failed checks all over it", .damage = sparse},
+        {.what = "failed checks everywhere", .damage = sparse},
         {.what = "all checks but one fail", .damage = Bad(CHECKS - 1)},
         {.what = "all checks fail", .damage = Bad(CHECKS), .rc = spent},
-        {.what = "twice but one", .damage = Bad(2 * CHECKS - 1), .rc = spent, .again = true},
-        {.what = "then data end", .damage = failed, .rc = {NOT_FOUND, NOT_FOUND, ENDED}, .tag = false},
+        {.what = "one less than twice that", .damage = Bad(2 * CHECKS - 1), .rc = spent, .again = true},
+        {.what = "then the data ends", .damage = failed, .rc = {NOT_FOUND, NOT_FOUND, ENDED}, .tag = false},
         {.what = "one byte after a bad tag", .damage = {8}, .rc = {0, 0, ENDED}, .data_end = MIB}, // of 0x090000 bytes
         {.what = "one MiB after a failed scan", .damage = gap, .rc = {0, 0, NOT_FOUND}},
         {.what = "one byte more after it", .damage = Concat({gap, {0}}), .rc = none},
@@ -266,7 +254,7 @@ TEST(Resynchronisation, CoversOneMiBInAll)
     }
 }
 
-// A position query that tells another place, or a seek that fails and is not tried again.
+// A position query that returns another position, or a seek that fails and is not retried.
 TEST(Position, ThatDoesNotAdvanceEndsASearch)
 {
     // Video of 65 bytes and 15 more, audio of 115 bytes in all, video; the first tag starts at FIRST_TAG. Or audio that
@@ -286,9 +274,9 @@ TEST(Position, ThatDoesNotAdvanceEndsASearch)
     } rows[] = {
         {.what = "before the search", .step = describe, .from = audio, .nth = 2, .error = -1},
         {.what = "after a tag: its start", .step = describe, .from = audio, .nth = 3, .error = -115},
-        {.what = "a byte on", .step = describe, .from = audio, .nth = 3, .error = -114, .found = {0, last, 0}},
+        {.what = "a byte later", .step = describe, .from = audio, .nth = 3, .error = -114, .found = {0, last, 0}},
         {.what = "its start, stepping", .step = next, .from = audio, .nth = 3, .error = -115},
-        {.what = "a byte on, stepping", .step = next, .from = audio, .nth = 3, .error = -114, .found = {0, last, KEY}},
+        {.what = "later, stepping", .step = next, .from = audio, .nth = 3, .error = -114, .found = {0, last, KEY}},
         {.what = "before a tag: its end", .step = prev, .from = last, .nth = 2, .error = 115},
         {.what = "a byte back", .step = prev, .from = last, .nth = 2, .error = 114, .found = {0, FIRST_TAG, VIDEO}},
         {.what = "none before a tag", .step = prev, .from = last, .nth = 2, .error = -last},
@@ -311,14 +299,14 @@ TEST(Position, ThatDoesNotAdvanceEndsASearch)
 
 TEST(PrevTag, IsNoneBeforeTheFirst)
 {
-    Reader r(Bytes() + AudioTag()); // nor does a back-pointer to the start of the file lead to one
+    Reader r(Bytes() + AudioTag()); // a back-pointer to the start of the file is no tag
     for (const int64_t from : {DATA_OFFSET, r.end}) {
         EXPECT_EQ(r.at(from).prev(ANY), Found(FLVD_ERR_AT_FIRST_TAG, 0, 0));
         EXPECT_EQ(__FLV_DMX__fioTell64(r.file), DATA_OFFSET);
     }
 }
 
-TEST(PrevTag, SlidesBackOneMiBInAll)
+TEST(PrevTag, GoesBackOneMiBInAll)
 {
     Reader twice(Concat({Zeros(FIRST_TAG) + AudioTag(), Zeros(MIB - 1) + VideoTag(), {0}}), CACHE, 16);
     EXPECT_EQ(twice.at(twice.end).prev(AUDIO), Found(0, FIRST_TAG, AUDIO)); // the valid tag restores the budget
@@ -335,20 +323,17 @@ TEST(HostCalls, OfTheBackPointerCheck)
     const std::string back = " seek64(13,0)=0"; // to the tag
     const std::string cut = cache + "50 tell64()=63 read(4046)=50 read(3996)=50" + back;
     const std::string narrow = begin + "16)=16 tell64()=29 seek64(95,1)=0 read(16)=16" + back;
-    const std::string narrower = begin + "13)=13 tell64()=26 seek64(98,1)=0 read(5)=5" + back;
     const struct {
         const char* what;
         size_t size;
-        std::string log;                      // begins so; no seek follows
+        std::string log;                      // its start; no seek follows
         uint32_t read_size = 0, most = CACHE; // of each read
     } rows[] = {
-        {.what = "cached", .size = 100, .log = cache + "230 tell64()=243"},
         {.what = "as large as the cache", .size = 4081, .log = whole},
         {.what = "one byte larger", .size = 4082, .log = whole + " read(1)=1" + back},
         {.what = "larger", .size = 5000, .log = whole + " seek64(915,1)=0 read(4)=4" + back},
         {.what = "in short reads", .size = 100, .log = cut, .most = 50},
         {.what = "narrow reads", .size = 100, .log = narrow, .read_size = 16},
-        {.what = "narrower than a header", .size = 100, .log = narrower, .read_size = 5},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
@@ -363,7 +348,7 @@ TEST(HostCalls, OfTheBackPointerCheck)
     }
 }
 
-// What opening finds out.
+// What an open finds out.
 struct Extent {
     int64_t end; // of the valid data
     uint32_t last_ts;
@@ -406,7 +391,7 @@ TEST(Extent, EndsWithTheLastTag)
     // Opened for information.
     ExpectExtent("15 bytes", with(Bytes(15, 0xEE)), QUICK, {.end = end, .last_ts = 782, .method = FLVD_SEEK_NONE});
     ExpectExtent("16 bytes", with(Bytes(16, 0xEE)), QUICK, {.end = end + 16, .last_ts = 0, .method = FLVD_SEEK_NONE});
-    for (uint64_t nth = 255; nth < 275; ++nth) { // a seek of the tail, of the halving or of the last places
+    for (uint64_t nth = 255; nth < 275; ++nth) { // a seek of the search for the last tag
         FakeHost host(with(Zeros(3 * MIB)));
         host.fail_nth(HostFn::Seek, nth);
         Session session(host);
@@ -435,11 +420,12 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
     const auto cut = [&flv](size_t tag) {
         return Bytes(flv.bytes.data(), flv.bytes.data() + flv.tags[tag].offset + 20);
     };
-    const Bytes negative = Indexed([](auto&, auto& at) { at.back() = -5; }).bytes; // no matter: all entries are inside
+    const Bytes negative =
+        Indexed([](auto&, auto& at) { at.back() = -5; }).bytes; // does not matter: no entry is past the end
     const Bytes astray =
         Indexed([&](auto&, auto& at) { at[3] = static_cast<double>(flv.size()) + 24, at[4] = 1e12; }).bytes;
     const Bytes fewer = Concat({Indexed([](auto& times, auto&) { times.resize(3); }).bytes, Bytes(100, 0xEE)});
-    // Neither the last position inside the file nor the bytes after its tags lead to a tag.
+    // Neither the last position in the file nor the bytes after its tags lead to a tag.
     const Bytes no_step = Concat({astray, Bytes(20, 0xEE), {0, 0, 0, 7, 0xEE}});
     for (const OpenOptions& open : {OpenOptions{INDEX}, OpenOptions{}}) {
         SCOPED_TRACE(open.options);
@@ -453,8 +439,8 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
         expect("cut in a frame", cut(34), flv.tags[34].offset, 437, 7, 480);
         expect("cut in a keyframe", cut(31), flv.tags[31].offset, 391, 6, 400);
         // Seven times of nine bytes less.
-        expect("fewer times than places", fewer, flv.size() - 63, 782, 3, 160);
-        expect("entries astray", no_step, flv.size(), 782, 4, 240);
+        expect("fewer times than positions", fewer, flv.size() - 63, 782, 3, 160);
+        expect("entries past the end", no_step, flv.size(), 782, 4, 240);
     }
 }
 

@@ -6,6 +6,8 @@
 #include <sstream>
 #include <stdexcept>
 
+#include <boost/crc.hpp>
+
 namespace flvd_test {
 
 static void Require(bool holds, const std::string& otherwise)
@@ -29,15 +31,11 @@ static Bytes FromHex(const std::string& text)
     return out;
 }
 
-// CRC-32 of ISO/IEC 8802-3, as make_expected.py takes it from zlib.
-static uint32_t Crc32(const uint8_t* data, size_t size)
+uint32_t Crc32(const Bytes& bytes)
 {
-    uint32_t crc = UINT32_MAX;
-    for (size_t bit = 0; bit < 8 * size; ++bit) {
-        crc ^= bit % 8 == 0 ? uint32_t{data[bit / 8]} : 0;
-        crc = crc >> 1 ^ ((crc & 1) != 0 ? 0xEDB88320 : 0);
-    }
-    return ~crc;
+    boost::crc_32_type crc;
+    crc.process_bytes(bytes.data(), bytes.size());
+    return crc.checksum();
 }
 
 // Each line is a kind and fields, key=value.
@@ -63,14 +61,13 @@ Expected ReadExpected(const std::string& name)
             Require(number("size") == out.bytes.size(), name + " has another size");
         if (kind != "packet")
             continue;
-        const size_t pos = number("pos"), size = number("size");
+        const size_t pos = number("pos");
         const uint8_t* const at = &out.bytes.at(pos + 14) - 14; // header and back-pointer are there
         const auto length = static_cast<size_t>(at[1] << 16 | at[2] << 8 | at[3]);
         const uint8_t* const end = &out.bytes.at(pos + 14 + length) - 3;
-        const Bytes data(at + 11, end);
-        const Tag tag{*at, number("dts"), data, {}, {}, 0, static_cast<int64_t>(pos)};
-        Require(tag.type == (video ? 9 : 8) && data.size() == tag.codec_bytes() + size &&
-                    Crc32(&data[tag.codec_bytes()], size) == number("crc", 16),
+        const Tag tag{*at, number("dts"), {at + 11, end}, {}, {}, static_cast<int64_t>(pos)};
+        const Bytes frame = tag.frame();
+        Require(tag.type == (video ? 9 : 8) && frame.size() == number("size") && Crc32(frame) == number("crc", 16),
                 name + ": another packet at " + fields["pos"]);
         out.tags.push_back(tag);
         out.packets.push_back({number("pts"), number("key") != 0});

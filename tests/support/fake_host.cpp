@@ -121,7 +121,7 @@ FakeHost::Handle& FakeHost::handle(void* pointer)
     return m_none;
 }
 
-// Memory that begins in one of the blocks has to end in it. Memory of others is not known here.
+// Memory that starts in one of the blocks must end in it. Other memory is unknown here.
 void FakeHost::check_range(const char* what, const void* pointer, uint32_t count)
 {
     const auto* const begin = static_cast<const uint8_t*>(pointer);

@@ -1,7 +1,7 @@
 /*
  * A host in memory: files, memory functions and file functions that can be made to fail, that count and log every
- * call, and that watch over the contract: every block and handle is given back once, nothing is used after that,
- * copies have a length, reads stay inside the block that they begin in.
+ * call, and that check the contract: every block and handle is released once and not used afterwards, copies are not
+ * empty, and reads stay inside the block that they start in.
  *
  * The library's tables carry no context, so there is one current host: the newest FakeHost object, until it ends.
  * A breach of the contract, and whatever is still held when the host ends, goes to the violation handler; without
@@ -104,9 +104,9 @@ public:
     void limit_reads(uint32_t k) { m_faults.shortened[index(HostFn::Read)] = {EACH, k}; }
     /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
-    /** Set, it changes every position that is told. */
+    /** If set, changes every position that is returned. */
     std::function<int64_t(int64_t position)> on_tell;
-    /** Called with every block that is given back, while it still holds what it held. */
+    /** Called with every block that is released, before its contents are overwritten. */
     std::function<void(const void* block, uint32_t size)> on_release;
 
     /* -- what happened */
@@ -202,7 +202,7 @@ private:
     std::map<const uint8_t*, uint32_t> m_blocks;
     Counts m_counts;
     Faults m_faults;
-    Handle m_none = {std::make_shared<File>()}; // what stands for a handle that is not open
+    Handle m_none = {std::make_shared<File>()}; // used instead of a handle that is not open
     bool m_only_32 = false, m_logging = false, m_log_memory = false;
     std::string m_log;
 };

@@ -103,40 +103,13 @@ Bytes AvcNalu(bool key, const Bytes& payload, int32_t composition_ms, uint8_t pa
 
 Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps)
 {
-    Bytes out{1, 0x42, 0xC0, 0x28, 0xFF, static_cast<uint8_t>(0xE0 | sps.size())};
-    for (const Bytes& set : sps)
-        Append(out, Concat({BigEndian(set.size(), 2), set}));
-    out.push_back(static_cast<uint8_t>(pps.size()));
-    for (const Bytes& set : pps)
-        Append(out, Concat({BigEndian(set.size(), 2), set}));
+    Bytes out{1, 0x42, 0xC0, 0x28, 0xFF};
+    for (const auto& [count, sets] : {std::pair(0xE0 | sps.size(), sps), {pps.size(), pps}}) {
+        out.push_back(static_cast<uint8_t>(count));
+        for (const Bytes& set : sets)
+            Append(out, Concat({BigEndian(set.size(), 2), set}));
+    }
     return out;
-}
-
-Bytes SmallAvcRecord()
-{
-    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 0x05, 0x07, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
-}
-
-// A payload that begins so and goes on with noise.
-static Bytes Filled(const Bytes& head, size_t size)
-{
-    return Concat({head, Noise(std::max(size, head.size()) - head.size())});
-}
-
-Bytes Mp3Frame(size_t size)
-{
-    return Filled({0xFF, 0xFB, 0x90, 0x64}, size);
-}
-
-Bytes H263Picture(uint32_t size_code, size_t size)
-{
-    return Filled(Bits("1/17 0/5 1/8 " + std::to_string(size_code) + "/3"), size);
-}
-
-Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust, size_t size)
-{
-    const Bytes offset_to_alpha = alpha ? Bytes{0, 0, 100} : Bytes{};
-    return Filled(Concat({{adjust}, offset_to_alpha, {0x00, 0x46, rows, columns, rows, columns}}), size);
 }
 
 void PrintTo(const Frame& frame, std::ostream* out)
@@ -169,12 +142,9 @@ uint32_t Flv::first_ts() const
 Frames Flv::frames(uint32_t streams, uint32_t first) const
 {
     Frames out;
-    for (const Tag& tag : tags) {
-        if (!tag.is_frame() || (tag.stream() & streams) == 0)
-            continue;
-        const auto begin = tag.data.begin() + static_cast<std::ptrdiff_t>(tag.codec_bytes());
-        out.push_back({tag.stream(), tag.timestamp - first, Bytes(begin, tag.data.end())});
-    }
+    for (const Tag& tag : tags)
+        if (tag.is_frame() && (tag.stream() & streams) != 0)
+            out.push_back({tag.stream(), tag.timestamp - first, tag.frame()});
     return out;
 }
 
@@ -213,7 +183,7 @@ Flv File(const Tags& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
         Append(flv.bytes, Concat({{tag.type},
                                   BigEndian(tag.data_size.value_or(size), 3),
                                   BigEndian(uint64_t{tag.timestamp} << 8 | tag.timestamp >> 24, 4),
-                                  BigEndian(tag.stream_id, 3),
+                                  BigEndian(0, 3), // StreamID
                                   tag.data,
                                   BigEndian(tag.back_pointer.value_or(size + 11), 4)}));
     }

@@ -26,7 +26,7 @@ inline void Append(Bytes& out, const Bytes& more)
     out.insert(out.end(), more.begin(), more.end());
 }
 Bytes Concat(const std::vector<Bytes>& parts);
-/** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can begin in them. */
+/** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can start in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);
 
 /**
@@ -62,13 +62,15 @@ inline const auto AacRaw = [](const Bytes& payload, uint8_t header = 0xAF) { ret
 /** AVCDecoderConfigurationRecord with the given parameter sets. */
 Bytes AvcRecord(const std::vector<Bytes>& sps, const std::vector<Bytes>& pps);
 /** A record of one baseline parameter set, 320 x 240. */
-Bytes SmallAvcRecord();
+inline const auto SmallAvcRecord = [] {
+    return AvcRecord({{0x67, 0x42, 0xC0, 0x28, 0xDA, 5, 7, 0xE4}}, {{0x68, 0xCE, 0x3C, 0x80}});
+};
 /** MPEG-1 layer III, 128 kbit/s, 44100 Hz, joint stereo, header and noise. */
-Bytes Mp3Frame(size_t size = 200);
+inline const auto Mp3Frame = [] { return Concat({{0xFF, 0xFB, 0x90, 0x64}, Noise(196)}); };
 /** Sorenson H.263 picture header; size_code 2 to 6: a fixed size. */
-Bytes H263Picture(uint32_t size_code, size_t size = 200);
-/** VP6 intra picture of profile 3 showing columns x rows macroblocks; `adjust` is cropped from width, height. */
-Bytes Vp6Picture(bool alpha, uint8_t columns, uint8_t rows, uint8_t adjust = 0, size_t size = 200);
+inline const auto H263Picture = [](uint32_t size_code) {
+    return Concat({Bits("1/17 0/5 1/8 " + std::to_string(size_code) + "/3"), Noise(195)});
+};
 
 constexpr uint8_t SOUND_MP3 = 0x2F, SOUND_PCM = 0x3E, SOUND_SPEEX = 0xB2;
 constexpr uint8_t CODEC_H263 = 2, CODEC_SCREEN = 3, CODEC_VP6 = 4, CODEC_VP6A = 5;
@@ -91,13 +93,14 @@ struct Tag {
     Bytes data;
     std::optional<uint32_t> back_pointer = {}; /**< PreviousTagSize after it; default: data size + 11 */
     std::optional<uint32_t> data_size = {};    /**< DataSize in the header; default: that of the data */
-    uint32_t stream_id = 0;
-    int64_t offset = 0; /**< of the tag header; filled by File() */
+    int64_t offset = 0;                        /**< of the tag header; filled by File() */
 
     int64_t size() const { return static_cast<int64_t>(data.size()) + 15; } /**< header, data and back-pointer */
     int64_t end() const { return offset + size(); }
     /** Codec header bytes before the frame: 5, 2 or 1. */
     size_t codec_bytes() const;
+    /** The data after them. */
+    Bytes frame() const { return {data.begin() + static_cast<std::ptrdiff_t>(codec_bytes()), data.end()}; }
     /** It carries a frame: no script data, no configuration packet, not too short. */
     bool is_frame() const;
     /** A video frame of FrameType 1. */
@@ -121,7 +124,7 @@ inline const auto Nalu = [](uint32_t ts, size_t size = 60) { return Tag{9, ts, A
 inline const auto Pcm = [](uint32_t ts, size_t size = 60) { return Tag{8, ts, AudioData(SOUND_PCM, Noise(size))}; };
 inline const auto Raw = [](uint32_t ts, size_t size = 60) { return Tag{8, ts, AacRaw(Noise(size))}; };
 inline const Tag g_avc = {9, 0, AvcConfig(SmallAvcRecord())};
-/** Its back-pointer passes for a script tag. */
+/** Its back-pointer looks like the start of a script tag. */
 inline const Tag g_aac = {8, 0, AacConfig({0x12, 0x10, 0x56, 0xE5, 0x00})};
 inline const Tag g_meta = {18, 0, OnMetaData("width: 320")};
 
@@ -131,7 +134,7 @@ struct Flv {
     std::vector<Tag> tags; /**< in file order, with their offsets */
 
     int64_t size() const { return static_cast<int64_t>(bytes.size()); }
-    /** The tags without the file header, before which nothing stands. */
+    /** The tags without the file header and the zero back-pointer after it. */
     Bytes body() const { return {bytes.begin() + 13, bytes.end()}; }
 
     /** Smallest timestamp among the frames: what the library takes as first_ts when all frames count. */
@@ -147,7 +150,7 @@ using IndexHook = std::function<void(std::vector<double>& times, std::vector<dou
 /** A file of these tags; DataOffset leaves room for a file header of `header` bytes after the prefix. */
 Flv File(const Tags& tags, uint8_t flags = 5, const Bytes& prefix = {}, uint32_t header = 9);
 
-/** The same after onMetaData with an index of every keyframe among them, at its real place. */
+/** The same after onMetaData with an index of all keyframes and their positions. */
 Flv IndexedFile(const Tags& tags, const IndexHook& hook = {}, const std::string& properties = "", uint8_t flags = 5);
 
 /**

@@ -5,19 +5,19 @@
 
 namespace flvd_test {
 
-const std::vector<Place>& Places()
+const std::vector<FailureSite>& FailureSites()
 {
     constexpr Op CALL = Op::Call, OPEN = Op::Open, CODEC = Op::Codec, EXTENT = Op::Extent, TAG = Op::Tag;
     constexpr Op FRAME = Op::Frame, TIME_SEEK = Op::Seek, FRAME_SEEK = Op::FrameSeek;
-#define FLVD_SITE(operation, name, code, line, growing_line) {Site::name, operation, code, line, growing_line},
-    static const std::vector<Place> places = {
+#define FLVD_SITE(operation, name, code, line, growing_line) {#name, operation, code, line, growing_line},
+    static const std::vector<FailureSite> sites = {
 #include "flvdmx/common/sites.def"
     };
 #undef FLVD_SITE
-    return places;
+    return sites;
 }
 
-int32_t Place::result() const
+int32_t FailureSite::result() const
 {
     switch (op == Op::FrameSeek ? FLVD_ERR_NONE : code) { // a frame seek is no operation of the entry point
     case FLVD_ERR_NO_INSTANCE:
@@ -35,8 +35,8 @@ int32_t Place::result() const
 
 bool IsListed(Op op, int32_t rc, int32_t code, int32_t line)
 {
-    return std::any_of(Places().begin(), Places().end(), [&](const Place& place) {
-        return place.op == op && place.result() == rc && place.records(code, line);
+    return std::any_of(FailureSites().begin(), FailureSites().end(), [&](const FailureSite& site) {
+        return site.op == op && site.result() == rc && site.records(code, line);
     });
 }
 

@@ -16,26 +16,27 @@ constexpr uint32_t VIDEO = FLVD_STREAM_VIDEO, AUDIO = FLVD_STREAM_AUDIO, BOTH = 
 constexpr uint32_t SMALL = 1024;               // a cache below LARGE tags, which then cost host calls of their own
 constexpr size_t LARGE = 3000, GROWN = 600000; // bytes; GROWN is above the first frame buffer
 
-/** The streams to ask for, one after the other, of a file that is opened so. */
+/** The streams to request, one after the other, of a file that is opened with these options. */
 inline std::vector<uint32_t> Streams(uint32_t options)
 {
     return (options & SEPARATE) != 0 ? std::vector{VIDEO, AUDIO} : std::vector{BOTH};
 }
 
 /**
- * What fails at a place: a call without an instance, an open, a frame request, a time seek, a frame seek. Besides these
- * an open records why a tag does not describe its stream and why it finds no end, a request why it delivers no tag.
+ * The operation that fails: a call without an instance, an open, a frame request, a time seek, a frame seek. Besides
+ * these an open records why a tag does not describe its stream and why it finds no end, a request why it delivers no
+ * tag.
  */
 enum class Op { Call, Open, Codec, Extent, Tag, Frame, Seek, FrameSeek };
 
-/** The places of failure, named as in the library's table of them. */
+/** The failure sites, named as in the library's table. */
 enum class Site : uint8_t {
 #define FLVD_SITE(operation, name, code, line, growing_line) name,
 #include "flvdmx/common/sites.def"
 #undef FLVD_SITE
 };
-struct Place {
-    Site site;
+struct FailureSite {
+    std::string name;
     Op op;
     int32_t code, line, growing_line; /**< error code; lines, growing_line 0 when it is the same in a growing file */
 
@@ -50,11 +51,11 @@ struct Place {
     /** What an operation returns that fails here. */
     int32_t result() const;
 };
-/** All places, in the order of their sites. */
-const std::vector<Place>& Places();
-inline const Place& At(Site site)
+/** All failure sites, in the order of the enumeration. */
+const std::vector<FailureSite>& FailureSites();
+inline const FailureSite& At(Site site)
 {
-    return Places().at(static_cast<size_t>(site));
+    return FailureSites().at(static_cast<size_t>(site));
 }
 bool IsListed(Op op, int32_t rc, int32_t code, int32_t line);
 
@@ -88,7 +89,7 @@ public:
     /** Null after a failed open and after close(). */
     flvd_ctx_t* ctx() const { return m_ctx; }
 
-    /** stream: looked at with FLVD_OPT_SEPARATE_AUDIO_READER only. */
+    /** stream: ignored without FLVD_OPT_SEPARATE_AUDIO_READER. */
     FrameResult frame(uint32_t stream = 0);
     /** What the last request left in its record, which was full of POISON, and the buffer that it offered. */
     const flvd_frame_t& record() const { return m_record; }
@@ -99,7 +100,7 @@ public:
     int32_t last_error() { return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr); }
     /** Line of the last failure: the instance's, or the global one after a failed open. */
     int32_t error_line() const { return m_ctx != nullptr ? m_ctx->error_line : g_flvd_lErrorLine; }
-    /** The last failure is that of a place, or there is none. */
+    /** The last failure is that of the site, or there is none. */
     bool recorded(std::optional<Site> site)
     {
         return last_error() == (site ? At(*site).code : 0) && error_line() == (site ? At(*site).line_of(m_options) : 0);

@@ -1,8 +1,8 @@
 // Ten callback files played on ten threads at the same time: threads FILE. The thread sanitizer, with which this is
-// compiled, ends it when two of them touch the same memory.
+// compiled, ends it when two of them access the same memory without a lock.
 
-#include "flvdmx/callback_host.h"
 #include "flvdmx/flvdmx.hpp"
+#include "support/callback_file.h"
 
 #include <algorithm>
 #include <array>
@@ -19,23 +19,7 @@ namespace {
 constexpr size_t THREADS = 10;
 constexpr int ROUNDS = 5;
 
-using Source = std::vector<char>;
-
-uint32_t ReadAt(void* user, int64_t position, void* buffer, uint32_t size)
-{
-    const Source& bytes = *static_cast<Source*>(user);
-    const auto end = static_cast<int64_t>(bytes.size());
-    const auto count = std::clamp<int64_t>(end - position, 0, size);
-    std::copy_n(bytes.begin() + std::min(position, end), count, static_cast<char*>(buffer));
-    return static_cast<uint32_t>(count);
-}
-
-int64_t GetSize(void* user)
-{
-    return static_cast<int64_t>(static_cast<const Source*>(user)->size());
-}
-
-// Frames from the beginning and, after a seek, from the middle; 0 when anything failed.
+// Counts the frames from the start and, after a seek, from the middle; 0 if anything failed.
 size_t Play(flvdmx::File& file)
 {
     size_t frames = 0;
@@ -47,14 +31,13 @@ size_t Play(flvdmx::File& file)
     return listed ? frames : 0;
 }
 
-// Opens under the lock that opening takes by itself, and plays when all are open.
-void PlayOwnFile(Source& bytes, std::atomic<size_t>& opened, size_t& frames)
+// Opens, under the lock that File::open takes, and plays when all files are open.
+void PlayOwnFile(const std::vector<char>& bytes, std::atomic<size_t>& opened, size_t& frames)
 {
-    flvd_callback_file_t source = {ReadAt, GetSize, &bytes, "", nullptr};
-    auto file = flvdmx::File::open(flvd_callback_host_add(&source), flvdmx::make_host(flvd_callback_host_fill));
-    flvd_callback_host_remove(&source);
+    const flvd_test::CallbackFile source(bytes.data(), bytes.size());
+    auto file = flvdmx::File::open(source.name, flvdmx::make_host(flvd_callback_host_fill));
     ++opened;
-    while (opened < THREADS) // an open must not run beside a frame
+    while (opened < THREADS) // an open must not run during another call
         std::this_thread::yield();
     frames = file ? Play(*file) : 0;
 }
@@ -66,7 +49,7 @@ int main(int argc, char** argv)
     if (argc != 2)
         return 2;
     std::ifstream in(argv[1], std::ios::binary);
-    Source bytes{std::istreambuf_iterator<char>(in), {}};
+    const std::vector<char> bytes{std::istreambuf_iterator<char>(in), {}};
     size_t wanted = 0;
     for (int round = 0; round < ROUNDS; ++round) {
         std::atomic<size_t> opened = 0;
@@ -74,7 +57,7 @@ int main(int argc, char** argv)
         std::vector<std::thread> threads;
         threads.reserve(THREADS);
         for (size_t& count : frames)
-            threads.emplace_back(PlayOwnFile, std::ref(bytes), std::ref(opened), std::ref(count));
+            threads.emplace_back(PlayOwnFile, std::cref(bytes), std::ref(opened), std::ref(count));
         for (std::thread& thread : threads)
             thread.join();
         wanted = round == 0 ? frames[0] : wanted;
