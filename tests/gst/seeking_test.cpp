@@ -33,6 +33,17 @@ struct SeekCase {
     int64_t time = 0;                // when to decode it
 };
 
+// Goes to the keyframe before the target, or as the flags say after it or to the nearest; after the last one, to that.
+flvdmx::result<flvdmx::Milliseconds> Reach(flvdmx::File& file, const SeekCase& seek)
+{
+    const flvdmx::Milliseconds target(seek.target);
+    const auto before = file.seek(target, flvdmx::SeekMode::backward);
+    const auto after = (seek.flags & AFTER) == AFTER ? file.seek(target, flvdmx::SeekMode::forward) : before;
+    const bool nearest = (seek.flags & BEFORE) == BEFORE;
+    const bool goes_back = !after || (nearest && target - *before < *after - target);
+    return goes_back ? file.seek(target, flvdmx::SeekMode::backward) : after;
+}
+
 // The pipelines are not there yet: all files that are open have one host.
 std::vector<SeekCase> MakeSeeks(const char* sample, int count)
 {
@@ -43,8 +54,7 @@ std::vector<SeekCase> MakeSeeks(const char* sample, int count)
     for (int i = 0; i < count; ++i) {
         constexpr int flags[] = {KEY_UNIT, BEFORE, AFTER, AFTER | GST_SEEK_FLAG_SNAP_BEFORE, ACCURATE, FLUSH};
         SeekCase one = {std::uniform_int_distribution<int64_t>(0, duration)(random), flags[i % 6], {}};
-        const auto mode = one.flags == AFTER ? flvdmx::SeekMode::forward : flvdmx::SeekMode::backward;
-        if (file->seek(flvdmx::Milliseconds(one.target), mode)) {
+        if (Reach(*file, one)) {
             auto frame = file->next_frame();
             while (frame && frame->stream != flvdmx::Stream::video)
                 frame = file->next_frame();
