@@ -16,6 +16,7 @@ namespace flvdmx_gst {
 namespace {
 
 constexpr uint32_t cache_size = 16384;
+constexpr int back_pointer_size = 4;              // before the first tag
 constexpr int64_t frame_size_max = (1 << 24) - 1; // the format's own limit
 
 // How far a configuration is searched for that does not come before the first frames.
@@ -76,6 +77,7 @@ GstFlowReturn Streaming::open_file()
     if (!m_file.is_open())
         return file_failed(error);
     m_info = m_file.info();
+    m_next_tag = m_file.instance()->data_offset + back_pointer_size;
     const bool has_duration = m_info.duration.count() != 0;
     m_seekable = has_duration && m_info.seek_method != flvdmx::SeekMethod::none;
     if (!has_duration)

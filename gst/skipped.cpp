@@ -50,12 +50,17 @@ std::optional<RawTag> read_tag(Source& source, int64_t position)
     return tag;
 }
 
-bool is_before_restart(Source& source, const RawTag& tag, const flvdmx::File& file)
+bool is_before_restart(Source& source, int64_t position, const flvdmx::File& file)
 {
-    if (!is_late(tag, file))
-        return false;
-    const std::optional<RawTag> next = read_tag(source, tag.end);
-    return next && is_late(*next, file);
+    std::optional<RawTag> tag;
+    bool late = false;
+    for (int i = 0; i < examined_tags && (tag = read_tag(source, position)); ++i, position = tag->end) {
+        const bool follows_late = late;
+        late = is_late(*tag, file);
+        if (late && follows_late)
+            return true;
+    }
+    return false;
 }
 
 std::string reason_to_skip(const RawTag& tag, const flvdmx::File& file, const flvdmx::Info& info)

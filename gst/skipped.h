@@ -27,9 +27,12 @@ struct RawTag {
 /** Reads the tag at a position; none when its header and its back-pointer do not agree. */
 std::optional<RawTag> read_tag(Source& source, int64_t position);
 
-/** True when the tag and the next one are later than what the library takes for the end of the file: then the
- *  timestamps start again somewhere after them. */
-bool is_before_restart(Source& source, const RawTag& tag, const flvdmx::File& file);
+/** How many tags are examined: those that are skipped may come after some that carry no frame. */
+constexpr int examined_tags = 8;
+
+/** True when two tags in a row, of the first ones at a position, are later than what the library takes for the end of
+ *  the file: then the timestamps start again somewhere after them. */
+bool is_before_restart(Source& source, int64_t position, const flvdmx::File& file);
 
 /** Why the file's description rules out the tag, as a sentence; "" when it does not. */
 std::string reason_to_skip(const RawTag& tag, const flvdmx::File& file, const flvdmx::Info& info);

@@ -181,11 +181,12 @@ bool Streaming::goes_back(int64_t position)
     }
     if (whole && position >= 0)
         return false;
-    const std::optional<RawTag> tag = read_tag(m_source, m_next_tag);
-    if (tag && is_before_restart(m_source, *tag, m_file)) {
+    if (is_before_restart(m_source, m_next_tag, m_file)) {
         GST_INFO_OBJECT(m_element, "the timestamps start again after byte %" G_GINT64_FORMAT, m_next_tag);
         m_seekable = false;
         m_file.accept_restart(m_next_tag);
+        if (!has_output())
+            m_timeline.start_at_first_frame();
         return true;
     }
     warn_of_skipped(m_next_tag);
@@ -198,12 +199,11 @@ bool Streaming::goes_back(int64_t position)
     return false;
 }
 
-// Says once per stream why its tags are left out. They may come after tags that carry no frame.
+// Says once per stream why its tags are left out.
 void Streaming::warn_of_skipped(int64_t position)
 {
-    constexpr int tags_max = 8;
     std::optional<RawTag> tag;
-    for (int i = 0; i < tags_max && (tag = read_tag(m_source, position)); ++i, position = tag->end) {
+    for (int i = 0; i < examined_tags && (tag = read_tag(m_source, position)); ++i, position = tag->end) {
         bool& warned = m_warned[tag->stream == flvdmx::Stream::video ? 0 : 1];
         const std::string reason = warned ? "" : reason_to_skip(*tag, m_file, m_info);
         if (reason.empty())
@@ -217,10 +217,11 @@ void Streaming::warn_of_skipped(int64_t position)
 // The timestamps have started again: what is left of the file comes after what has been played.
 void Streaming::lengthen()
 {
-    if (m_info.duration.count() == 0)
+    const flvdmx::Milliseconds offset = m_timeline.offset();
+    if (m_info.duration.count() == 0 || offset.count() < 0)
         return;
     GST_OBJECT_LOCK(m_element);
-    m_segment.duration = std::max(m_segment.duration, to_clock_time(m_info.duration + m_timeline.offset()));
+    m_segment.duration = std::max(m_segment.duration, to_clock_time(m_info.duration + offset));
     GST_OBJECT_UNLOCK(m_element);
     gst_element_post_message(m_element, gst_message_new_duration_changed(GST_OBJECT(m_element)));
 }

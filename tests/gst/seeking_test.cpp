@@ -117,6 +117,32 @@ TEST(Seeking, KeepsToSegments)
     ASSERT_TRUE(pipeline.seek(2000, GST_SEEK_FLAG_NONE)); // without a flush
     EXPECT_EQ(pipeline.play(), "");
     EXPECT_GT(pipeline.last_time("v"), 2900 * GST_MSECOND);
+    EXPECT_EQ(pipeline.arrivals("v").back().segment_base, GST_SECOND); // continues where the other one ended
+}
+
+// An index may count from the first frame where the timestamps do not. Without times that rise, nothing can be sought.
+TEST(Seeking, DoesWithoutAnIndex)
+{
+    const auto hook = [](std::vector<double>& times, std::vector<double>&) {
+        std::for_each(times.begin(), times.end(), [](double& time) { time -= 100.0; });
+    };
+    const TemporaryFile file(MakeChain({.index = true, .pictures = 100, .first_ts = 100'000, .hook = hook}).bytes);
+    for (const int flags : {ACCURATE, KEY_UNIT, AFTER}) {
+        Pipeline pipeline(demuxed(file.path(), "appsink sync=false name=v", "fakesink async=false"));
+        ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+        pipeline.forget_arrivals();
+        ASSERT_TRUE(pipeline.seek(2100, flags) && pipeline.go_to(GST_STATE_PAUSED));
+        EXPECT_EQ(pipeline.last_time("v"), (flags == AFTER ? 2200 : 2000) * GST_MSECOND);
+    }
+    const TemporaryFile wrapped(File({g_avc, Nalu(0xFFFFFFB0), Nalu(0)}, 1).bytes);
+    Pipeline pipeline(demuxed(wrapped.path(), "appsink sync=false", ""));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    GstQuery* const query = gst_query_new_seeking(GST_FORMAT_TIME);
+    gboolean seekable = TRUE;
+    EXPECT_TRUE(gst_element_query(pipeline.element(), query));
+    gst_query_parse_seeking(query, nullptr, &seekable, nullptr, nullptr);
+    EXPECT_FALSE(seekable || pipeline.seek(0, FLUSH));
+    gst_query_unref(query);
 }
 
 TEST(Seeking, RefusesWhatItCannotAndEndsBeyondTheEnd)
