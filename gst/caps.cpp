@@ -1,6 +1,7 @@
 #include "caps.h"
 
 #include <gst/pbutils/pbutils.h>
+#include <gst/video/video.h>
 
 #include <array>
 
@@ -32,6 +33,7 @@ struct AudioCaps {
     const char* caps;
 };
 
+constexpr double frame_rate_min = 0.01; // per second
 constexpr const char* pcm_caps = "audio/x-raw, format=(string){ U8, S16LE }, layout=(string)interleaved";
 constexpr const char* mp3_caps = "audio/mpeg, mpegversion=(int)1, layer=(int)3, parsed=(boolean)true";
 
@@ -86,8 +88,20 @@ void set_number(GstCaps* caps, const char* field, uint32_t value)
         gst_caps_set_simple(caps, field, G_TYPE_INT, static_cast<gint>(value), nullptr);
 }
 
+// The metadata has 29.97 for 30000/1001.
+void set_frame_rate(GstCaps* caps, double rate)
+{
+    gint numerator = 0;
+    gint denominator = 1;
+    if (rate < frame_rate_min)
+        return;
+    if (gst_video_guess_framerate(static_cast<GstClockTime>(GST_SECOND / rate), &numerator, &denominator) == FALSE)
+        gst_util_double_to_fraction(rate, &numerator, &denominator);
+    gst_caps_set_simple(caps, "framerate", GST_TYPE_FRACTION, numerator, denominator, nullptr);
+}
+
 // The stream header of Speex (The Speex Codec Manual, section 8): FLV leaves it out, since all its Speex is wideband,
-// mono, one frame of 320 samples per packet. An empty comment follows.
+// mono, one frame of 320 samples per packet. A comment with a vendor alone follows, as in a Vorbis stream.
 void set_speex_header(GstCaps* caps)
 {
     constexpr std::array<uint8_t, 80> header = {
@@ -104,7 +118,8 @@ void set_speex_header(GstCaps* caps)
         0,    0,    0,    0,                                                      // vbr
         1,    0,    0,    0,                                                      // frames_per_packet
     };
-    constexpr std::array<uint8_t, 8> comment = {}; // no vendor, no comments
+    constexpr std::array<uint8_t, 15> comment = {6,   0,   0, 0, 'f', 'l', 'v', 'd', // vendor_length, vendor_string
+                                                 'm', 'x', 0, 0, 0,   0,   1};       // no comments, framing bit
     GValue array = G_VALUE_INIT;
     gst_value_array_init(&array, 2);
     const auto append = [&array](const auto& bytes) {
@@ -145,12 +160,7 @@ GstCaps* make_caps(const flvdmx::VideoInfo& info)
         set_number(caps, "width", info.width);
         set_number(caps, "height", info.height);
     }
-    if (info.frame_rate > 0.0) {
-        gint numerator = 0;
-        gint denominator = 1;
-        gst_util_double_to_fraction(info.frame_rate, &numerator, &denominator);
-        gst_caps_set_simple(caps, "framerate", GST_TYPE_FRACTION, numerator, denominator, nullptr);
-    }
+    set_frame_rate(caps, info.frame_rate);
     if (is_avc) {
         set_config(caps, info.config);
         gst_codec_utils_h264_caps_set_level_and_profile(caps, info.config.data() + profile_offset, profile_size);

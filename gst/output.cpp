@@ -7,7 +7,11 @@ namespace flvdmx_gst {
 
 namespace {
 
-constexpr GstClockTime gap_min = 500 * GST_MSECOND; // less is how files interleave their streams
+// How far a stream is behind the other one when a gap is announced. Files interleave their streams by less than the
+// second. Sinks that wait for their first buffer stop the whole pipeline: there, queues may hold little more than the
+// first.
+constexpr GstClockTime gap_min = 500 * GST_MSECOND;
+constexpr GstClockTime first_gap_min = 100 * GST_MSECOND;
 
 } // namespace
 
@@ -30,34 +34,37 @@ void Output::start(GstElement* element, guint group)
 
 void Output::change_caps(OwnedCaps caps)
 {
+    if (gst_caps_is_equal(m_caps.get(), caps.get()) != FALSE)
+        return;
     m_caps = std::move(caps);
     gst_pad_push_event(m_pad, gst_event_new_caps(m_caps.get()));
 }
 
-GstFlowReturn Output::push(GstBuffer* buffer, const flvdmx::Frame& frame)
+GstFlowReturn Output::push(GstBuffer* buffer, const flvdmx::Frame& frame, flvdmx::Milliseconds time)
 {
-    GST_BUFFER_DTS(buffer) = to_clock_time(frame.time);
-    GST_BUFFER_PTS(buffer) = to_clock_time(frame.presentation_time());
+    GST_BUFFER_DTS(buffer) = to_clock_time(time);
+    GST_BUFFER_PTS(buffer) = to_clock_time(time + frame.composition_offset);
     GST_BUFFER_OFFSET(buffer) = static_cast<guint64>(frame.position);
     if (!frame.keyframe)
         GST_BUFFER_FLAG_SET(buffer, GST_BUFFER_FLAG_DELTA_UNIT);
     if (std::exchange(m_discontinuity, false))
         GST_BUFFER_FLAG_SET(buffer, GST_BUFFER_FLAG_DISCONT);
-    if (GST_BUFFER_DTS_IS_VALID(buffer))
-        m_reached = std::max(m_reached, GST_BUFFER_DTS(buffer));
+    m_reached = std::max(m_reached, GST_BUFFER_DTS(buffer));
+    m_waits = false;
     return gst_pad_push(m_pad, buffer);
 }
 
 void Output::jump(GstClockTime time)
 {
-    m_discontinuity = true;
+    m_discontinuity = m_waits = true;
     m_reached = time;
 }
 
 void Output::reach(GstClockTime time)
 {
-    if (m_pad == nullptr || time < m_reached + gap_min)
+    if (m_pad == nullptr || time < m_reached + (m_waits ? first_gap_min : gap_min))
         return;
+    m_waits = false;
     gst_pad_push_event(m_pad, gst_event_new_gap(m_reached, time - m_reached));
     m_reached = time;
 }

@@ -36,10 +36,10 @@ public:
 
     /** The events that come before all others. */
     void start(GstElement* element, guint group);
-    /** Announces other caps. */
+    /** Announces other caps, unless they are the same. */
     void change_caps(OwnedCaps caps);
-    /** Pushes a frame whose bytes are in the buffer, which it takes. */
-    GstFlowReturn push(GstBuffer* buffer, const flvdmx::Frame& frame);
+    /** Pushes a frame that is to be decoded at `time` and whose bytes are in the buffer, which it takes. */
+    GstFlowReturn push(GstBuffer* buffer, const flvdmx::Frame& frame, flvdmx::Milliseconds time);
 
     /** What comes next does not follow what came before, and begins at about `time`. */
     void jump(GstClockTime time);
@@ -53,6 +53,7 @@ private:
     OwnedCaps m_caps;
     GstClockTime m_reached = 0; // by the last buffer or gap
     bool m_discontinuity = true;
+    bool m_waits = true; // a sink that has received nothing since the start or a jump
 };
 
 } // namespace flvdmx_gst

@@ -11,4 +11,4 @@ static gboolean register_elements(GstPlugin* plugin)
 
 #define PACKAGE "flvdmx"
 GST_PLUGIN_DEFINE(GST_VERSION_MAJOR, GST_VERSION_MINOR, flvdmx, "Demultiplexer for the FLV container",
-                  register_elements, FLVDMX_VERSION, "MIT/X11", "flvdmx", "the flvdmx authors")
+                  register_elements, FLVDMX_VERSION, "MIT/X11", "flvdmx", "Unknown package origin")

@@ -22,11 +22,6 @@ void push_downstream(GstElement* element, GstEvent* event)
     gst_event_unref(event);
 }
 
-bool lands_after(GstSeekFlags flags)
-{
-    return (flags & GST_SEEK_FLAG_KEY_UNIT) != 0 && (flags & GST_SEEK_FLAG_SNAP_NEAREST) == GST_SEEK_FLAG_SNAP_AFTER;
-}
-
 } // namespace
 
 gboolean Streaming::handle_event(GstPad* pad, GstObject* parent, GstEvent* event)
@@ -54,7 +49,7 @@ bool Streaming::seek(GstEvent* event)
     gint64 start = 0;
     gint64 stop = 0;
     gst_event_parse_seek(event, &rate, &format, &flags, &start_type, &start, &stop_type, &stop);
-    if (format != GST_FORMAT_TIME || rate <= 0.0 || (flags & GST_SEEK_FLAG_INSTANT_RATE_CHANGE) != 0)
+    if (!m_seekable || format != GST_FORMAT_TIME || rate <= 0.0 || (flags & GST_SEEK_FLAG_INSTANT_RATE_CHANGE) != 0)
         return false;
     const bool both_set = start_type == GST_SEEK_TYPE_SET && stop_type == GST_SEEK_TYPE_SET;
     if (both_set && stop >= 0 && start > stop)
@@ -81,6 +76,7 @@ bool Streaming::seek(GstEvent* event)
         return false; // the next seek is waiting, or the end
     if (sought) {
         m_sequence = sequence;
+        m_timeline.jump(flvdmx::Milliseconds(m_position / GST_MSECOND));
         GST_OBJECT_LOCK(m_element);
         m_segment = segment;
         GST_OBJECT_UNLOCK(m_element);
@@ -92,16 +88,16 @@ bool Streaming::seek(GstEvent* event)
 // Moves the file to where the segment starts, and with KEY_UNIT the segment to where that led.
 bool Streaming::seek_file(GstSegment& segment, GstSeekFlags flags)
 {
-    const bool after = lands_after(flags);
-    const GstClockTime target = (segment.position + (after ? GST_MSECOND - 1 : 0)) / GST_MSECOND;
-    const flvdmx::SeekMode mode = after ? flvdmx::SeekMode::forward : flvdmx::SeekMode::backward;
+    constexpr auto to_end = flvdmx::SeekMode::backward | flvdmx::SeekMode::to_end_on_miss;
+    const bool after = (flags & GST_SEEK_FLAG_KEY_UNIT) != 0 && (flags & GST_SEEK_FLAG_SNAP_AFTER) != 0;
+    const flvdmx::Milliseconds target((segment.position + (after ? GST_MSECOND - 1 : 0)) / GST_MSECOND);
     m_source.clear_flow();
     const std::shared_lock<OpenLock> lock(open_lock);
-    const auto reached = m_file.seek(flvdmx::Milliseconds(target), mode | flvdmx::SeekMode::to_end_on_miss);
+    const auto reached = target > m_info.duration ? m_file.seek(target, to_end) : go_to_keyframe(target, flags);
     if (m_source.flow() != GST_FLOW_OK)
         return false;
     if (!reached)
-        return reached.error().kind() == flvdmx::Kind::miss; // at the end
+        return target > m_info.duration && reached.error().kind() == flvdmx::Kind::miss;
     m_position = to_clock_time(*reached);
     if ((flags & GST_SEEK_FLAG_KEY_UNIT) != 0)
         segment.start = segment.time = segment.position = m_position;
@@ -110,13 +106,38 @@ bool Streaming::seek_file(GstSegment& segment, GstSeekFlags flags)
     return true;
 }
 
+// After the last keyframe, SNAP_AFTER leads to that one, as there is something to play.
+flvdmx::result<flvdmx::Milliseconds> Streaming::go_to_keyframe(flvdmx::Milliseconds target, GstSeekFlags flags)
+{
+    const bool snaps = (flags & GST_SEEK_FLAG_KEY_UNIT) != 0;
+    const int snap = snaps ? flags & GST_SEEK_FLAG_SNAP_NEAREST : 0;
+    const auto before = go_to(target, flvdmx::SeekMode::backward);
+    if (!before || (snap & GST_SEEK_FLAG_SNAP_AFTER) == 0)
+        return before;
+    const auto after = go_to(target, flvdmx::SeekMode::forward);
+    if (!after)
+        return before;
+    const bool before_is_nearer = snap == GST_SEEK_FLAG_SNAP_NEAREST && target - *before < *after - target;
+    return before_is_nearer ? go_to(target, flvdmx::SeekMode::backward) : after;
+}
+
+// An index that counts from another start, or is of another file, leads nowhere.
+flvdmx::result<flvdmx::Milliseconds> Streaming::go_to(flvdmx::Milliseconds target, flvdmx::SeekMode mode)
+{
+    const auto reached = m_file.seek(target, mode);
+    if (reached || reached.error().kind() != flvdmx::Kind::failed || m_source.flow() != GST_FLOW_OK)
+        return reached;
+    m_file.ignore_index();
+    return m_file.seek(target, mode);
+}
+
 // Plays on from where the file stands, which after a seek that failed is where it was.
 void Streaming::restart()
 {
     m_next_tag = -1;
     m_segment_is_new = true;
     for (Output& output : m_outputs)
-        output.jump(m_position);
+        output.jump(std::max<GstClockTime>(m_position, m_segment.start));
     gst_flow_combiner_reset(m_combiner.get());
     if ((m_segment.flags & GST_SEGMENT_FLAG_SEGMENT) != 0) {
         GstMessage* const message = gst_message_new_segment_start(GST_OBJECT(m_element), GST_FORMAT_TIME,
@@ -175,7 +196,7 @@ bool Streaming::answer(GstQuery* query) const
         return format == GST_FORMAT_TIME && duration >= 0;
     case GST_QUERY_SEEKING:
         gst_query_parse_seeking(query, &format, nullptr, nullptr, nullptr);
-        gst_query_set_seeking(query, format, format == GST_FORMAT_TIME ? TRUE : FALSE, 0, duration);
+        gst_query_set_seeking(query, format, format == GST_FORMAT_TIME && m_seekable ? TRUE : FALSE, 0, duration);
         return true;
     case GST_QUERY_SEGMENT: {
         const bool open_end = !GST_CLOCK_TIME_IS_VALID(segment.stop);

@@ -3,6 +3,8 @@
 
 #include "source.h"
 
+#include "open_lock.h"
+
 #include <algorithm>
 #include <cstring>
 
@@ -30,6 +32,14 @@ void Source::reset()
     m_flow = GST_FLOW_OK;
     m_size = m_read_end = m_window_start = 0;
     m_window_size = 0;
+}
+
+bool Source::read_all(int64_t position, uint8_t* destination, size_t size)
+{
+    size_t got = 0;
+    for (size_t more = 1; got < size && more != 0; got += more)
+        more = read_window(position + static_cast<int64_t>(got), destination + got, static_cast<uint32_t>(size - got));
+    return got == size;
 }
 
 uint32_t Source::read(int64_t position, uint8_t* destination, uint32_t size)
@@ -61,9 +71,19 @@ uint32_t Source::read_window(int64_t position, uint8_t* destination, uint32_t si
     return got;
 }
 
+// A peer may bring less than was requested, although only the end of the file should make it so.
+uint32_t Source::pull(int64_t position, uint8_t* destination, uint32_t size)
+{
+    const OpenLock::Pause pause;
+    uint32_t got = 0;
+    for (uint32_t more = 1; got < size && more != 0; got += more)
+        more = pull_once(position + got, destination + got, size - got);
+    return got;
+}
+
 // The peer fills a buffer that is made of the destination. Near the end of the file it would not say how much it
 // filled.
-uint32_t Source::pull(int64_t position, uint8_t* destination, uint32_t size)
+uint32_t Source::pull_once(int64_t position, uint8_t* destination, uint32_t size)
 {
     if (position >= m_size)
         m_size = this->size();
@@ -82,6 +102,7 @@ uint32_t Source::pull(int64_t position, uint8_t* destination, uint32_t size)
 
 int64_t Source::size() const
 {
+    const OpenLock::Pause pause;
     gint64 size = -1;
     return gst_pad_peer_query_duration(m_pad, GST_FORMAT_BYTES, &size) != FALSE ? size : -1;
 }

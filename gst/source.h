@@ -7,12 +7,13 @@
 
 #include <gst/gst.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <memory>
 
 namespace flvdmx_gst {
 
-/** Used by one thread at a time. */
+/** Used by one thread at a time, which may hold the lock for opens: it is released while the peer is busy. */
 class Source {
 public:
     /** Reads through a sink pad in pull mode. */
@@ -34,11 +35,14 @@ public:
 
     /** Bytes; -1 when the peer cannot tell. */
     int64_t size() const;
+    /** Reads so many bytes; false when there are fewer. */
+    bool read_all(int64_t position, uint8_t* destination, size_t size);
 
 private:
     uint32_t read(int64_t position, uint8_t* destination, uint32_t size);
     uint32_t read_window(int64_t position, uint8_t* destination, uint32_t size);
     uint32_t pull(int64_t position, uint8_t* destination, uint32_t size);
+    uint32_t pull_once(int64_t position, uint8_t* destination, uint32_t size);
 
     GstPad* const m_pad;
     flvd_callback_file_t m_file;

@@ -5,7 +5,9 @@
 #pragma once
 
 #include "output.h"
+#include "skipped.h"
 #include "source.h"
+#include "timeline.h"
 
 #include "flvdmx/flvdmx.hpp"
 
@@ -55,13 +57,20 @@ private:
     void stop(GstFlowReturn flow);
     void finish();
     GstFlowReturn open();
+    GstFlowReturn open_file();
+    GstFlowReturn find_config();
+    void close_file();
     GstFlowReturn expose();
     void push_tags();
     void add_output(size_t index, OwnedCaps caps);
     GstFlowReturn push_frame();
     GstFlowReturn push_to(Output& output, GstBuffer* buffer, const flvdmx::Frame& frame);
-    void find_damage(int64_t position);
+    bool goes_back(int64_t position);
+    void warn_of_skipped(int64_t position);
+    void lengthen();
     void announce_config(const flvdmx::Frame& frame);
+    GstFlowReturn source_failed();
+    GstFlowReturn file_failed(const flvdmx::error& error);
     void push_segment();
     void push_to_all(GstEvent* event) const;
     bool has_output() const { return m_outputs[0].pad() != nullptr || m_outputs[1].pad() != nullptr; }
@@ -72,10 +81,14 @@ private:
     static gboolean handle_query(GstPad* pad, GstObject* parent, GstQuery* query);
     bool seek(GstEvent* event);
     bool seek_file(GstSegment& segment, GstSeekFlags flags);
+    flvdmx::result<flvdmx::Milliseconds> go_to_keyframe(flvdmx::Milliseconds target, GstSeekFlags flags);
+    flvdmx::result<flvdmx::Milliseconds> go_to(flvdmx::Milliseconds target, flvdmx::SeekMode mode);
     void restart();
     unsigned begin_flush(guint32 sequence);
     bool end_flush(unsigned number, guint32 sequence);
     bool answer(GstQuery* query) const;
+
+    static constexpr GstFlowReturn flow_told = GST_FLOW_CUSTOM_ERROR; // a failure whose message was posted
 
     GstElement* const m_element;
     GstPad* const m_sink;
@@ -86,14 +99,19 @@ private:
     bool m_active = false;
     flvdmx::File m_file;
     flvdmx::Info m_info;
+    flvdmx::Metadata m_metadata;
     std::unique_ptr<uint8_t[]> m_spare; // for frames whose size is not known beforehand
     std::array<Output, 2> m_outputs;    // video, audio
     int64_t m_next_tag = -1;            // where the reader stands, -1 after a jump
     guint32 m_sequence = 0;             // number of the open or of the last seek, for all events
     bool m_segment_is_new = false;
+    std::array<bool, 2> m_warned{}; // of tags that are left out: video, audio
+    Timeline m_timeline;
 
     GstSegment m_segment{};                   // written under the stream lock and the object lock, read under either
     std::atomic<GstClockTime> m_position = 0; // of what was pushed last
+
+    std::atomic<bool> m_seekable = false;
 
     std::mutex m_flush_mutex; // held while a flush begins or ends
     unsigned m_flushes = 0;   // begun

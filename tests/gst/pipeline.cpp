@@ -1,7 +1,5 @@
 #include "pipeline.h"
 
-#include <gtest/gtest.h>
-
 namespace flvd_test {
 
 Pipeline::Pipeline(const std::string& description) : m_pipeline(gst_parse_launch(description.c_str(), nullptr))
@@ -42,14 +40,15 @@ GstMessage* Pipeline::play_until(int types)
     return message;
 }
 
-std::string Pipeline::play()
+std::string Pipeline::play(int types)
 {
-    GstMessage* const message = play_until(GST_MESSAGE_EOS);
+    GstMessage* const message = play_until(types | GST_MESSAGE_EOS);
+    const GstMessageType type = message != nullptr ? GST_MESSAGE_TYPE(message) : GST_MESSAGE_UNKNOWN;
     std::string text = message == nullptr ? "no end within 30 seconds" : "";
-    if (message != nullptr && GST_MESSAGE_TYPE(message) == GST_MESSAGE_ERROR) {
+    if (type == GST_MESSAGE_ERROR || type == GST_MESSAGE_WARNING) {
         gchar* debug = nullptr;
         GError* error = nullptr;
-        gst_message_parse_error(message, &error, &debug);
+        (type == GST_MESSAGE_ERROR ? gst_message_parse_error : gst_message_parse_warning)(message, &error, &debug);
         text = std::string(error->message) + ": " + (debug != nullptr ? debug : "");
         g_error_free(error);
         g_free(debug);
@@ -114,7 +113,7 @@ void Pipeline::keep(GstAppSink* sink, GstSample* sample)
             {GST_BUFFER_DTS(buffer), GST_BUFFER_PTS(buffer), GST_BUFFER_OFFSET(buffer),
              GST_BUFFER_FLAG_IS_SET(buffer, GST_BUFFER_FLAG_DISCONT) != FALSE,
              GST_BUFFER_FLAG_IS_SET(buffer, GST_BUFFER_FLAG_DELTA_UNIT) != FALSE, gst_sample_get_segment(sample)->start,
-             checksum, caps});
+             gst_sample_get_segment(sample)->base, checksum, caps});
     }
     g_free(caps);
     g_free(checksum);

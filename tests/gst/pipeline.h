@@ -5,9 +5,14 @@
 
 #include <gst/app/gstappsink.h>
 #include <gst/gst.h>
+#include <gtest/gtest.h>
+
+#include "support/flv_writer.h"
 
 #include <atomic>
 #include <cstdint>
+#include <filesystem>
+#include <fstream>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -17,6 +22,28 @@
 
 namespace flvd_test {
 
+/** A file of the temporary folder, which is removed in the end. */
+class TemporaryFile {
+public:
+    TemporaryFile()
+        : m_path(testing::TempDir() + "flvdmx-" + std::to_string(getpid()) + "-" + std::to_string(++s_number))
+    {
+    }
+    explicit TemporaryFile(const Bytes& bytes) : TemporaryFile()
+    {
+        std::ofstream(m_path, std::ios::binary)
+            .write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
+    }
+    ~TemporaryFile() { std::filesystem::remove(m_path); }
+    TemporaryFile(const TemporaryFile&) = delete;
+    TemporaryFile& operator=(const TemporaryFile&) = delete;
+    const std::string& path() const { return m_path; }
+
+private:
+    inline static int s_number = 0;
+    std::string m_path;
+};
+
 /** What arrived in one buffer. */
 struct Arrival {
     GstClockTime dts = GST_CLOCK_TIME_NONE;
@@ -25,6 +52,7 @@ struct Arrival {
     bool discont = false;
     bool delta = false;
     GstClockTime segment_start = 0; /**< of the segment in force */
+    GstClockTime segment_base = 0;  /**< likewise */
     std::string checksum;           /**< of the bytes */
     std::string caps;               /**< in force */
 };
@@ -44,8 +72,8 @@ public:
     bool go_to(GstState state);
     /** Plays until a message of one of these types; null after 30 seconds. */
     GstMessage* play_until(int types);
-    /** Plays to the end. Returns "" or the error's text. */
-    std::string play();
+    /** Plays to the end, or to a message of a type that carries a text. Returns that text or the error's, else "". */
+    std::string play(int types = GST_MESSAGE_EOS);
     /** A seek in time, in milliseconds; `stop` -1: to the end. */
     bool seek(int64_t start, int flags, int64_t stop = -1, double rate = 1.0);
     /** What has arrived at the appsink of that name. */

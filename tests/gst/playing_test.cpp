@@ -19,28 +19,6 @@ namespace {
 
 const std::string g_data = FLVDMX_TEST_DATA "/";
 
-// A file of the temporary folder, which is removed in the end.
-class TemporaryFile {
-public:
-    TemporaryFile()
-        : m_path(testing::TempDir() + "flvdmx-" + std::to_string(getpid()) + "-" + std::to_string(++s_number))
-    {
-    }
-    explicit TemporaryFile(const Bytes& bytes) : TemporaryFile()
-    {
-        std::ofstream(m_path, std::ios::binary)
-            .write(reinterpret_cast<const char*>(bytes.data()), static_cast<std::streamsize>(bytes.size()));
-    }
-    ~TemporaryFile() { std::filesystem::remove(m_path); }
-    TemporaryFile(const TemporaryFile&) = delete;
-    TemporaryFile& operator=(const TemporaryFile&) = delete;
-    const std::string& path() const { return m_path; }
-
-private:
-    inline static int s_number = 0;
-    std::string m_path;
-};
-
 Bytes Sound(uint8_t header, size_t size)
 {
     Tags tags;
@@ -213,6 +191,84 @@ TEST(Playing, AnnouncesChangedConfigurations)
     }
 }
 
+// Recordings that were joined, cut or written carelessly: all of the video arrives, and its times never go back.
+TEST(Playing, PutsTimesInOrder)
+{
+    const auto video = [](const std::vector<uint32_t>& times) {
+        Tags tags = {g_avc};
+        std::transform(times.begin(), times.end(), std::back_inserter(tags), [](uint32_t time) { return Nalu(time); });
+        return tags;
+    };
+    const Tag rate = {18, 0, OnMetaData("framerate: 29.97")}, screen = {9, 0, VideoData(1, 6, Noise(60))};
+    const struct {
+        Tags tags;
+        std::vector<uint64_t> times; // ms
+        const char* caps = "video/x-h264";
+    } cases[] = {
+        {.tags = video({0, 40, 2000, 2040, 0, 40}), .times = {0, 40, 2000, 2040, 2080, 2120}},
+        {.tags = video({0, 40, 4000, 4040, 0, 40, 80}), .times = {0, 40, 4000, 4040, 4080, 4120, 4160}},
+        {.tags = video({0xFFFFFFB0, 0xFFFFFFD8, 0, 40}), .times = {0, 40, 80, 120}},
+        {.tags = Tags{g_meta} + video({20, 0, 40}), .times = {0, 0, 20}}, // the first one is not the earliest
+        {.tags = {g_avc, Nalu(0), {9, 40, AvcNalu(false, {})}, Nalu(80)}, .times = {0, 80}}, // one is empty
+        {.tags = {rate, g_avc, Nalu(0)}, .times = {0}, .caps = "framerate=(fraction)30000/1001"},
+        {.tags = {screen}, .times = {0}, .caps = "video/x-flash-screen2"},
+    };
+    for (const auto& [tags, times, caps] : cases) {
+        const TemporaryFile file(File(tags, 1).bytes);
+        Pipeline pipeline(demuxed(file.path(), "appsink sync=false name=v", ""));
+        EXPECT_EQ(pipeline.play(), "");
+        std::vector<uint64_t> arrived;
+        for (const Arrival& arrival : pipeline.arrivals("v")) {
+            arrived.push_back(arrival.dts / GST_MSECOND);
+            EXPECT_NE(arrival.caps.find(caps), std::string::npos) << arrival.caps;
+        }
+        EXPECT_EQ(arrived, times);
+    }
+}
+
+// What is left out is said once; the rest plays on.
+TEST(Playing, WarnsOfWhatIsLeftOut)
+{
+    const Tag h263 = {9, 80, VideoData(1, CODEC_H263, H263Picture(3))};
+    const Tag pcm_stereo = {8, 40, AudioData(SOUND_PCM | 1, Noise(60))};
+    const struct {
+        Tags tags;
+        const char* text;
+    } cases[] = {
+        {{g_avc, Nalu(0), g_aac, Raw(0), h263, h263, Raw(80)}, "from H.264 (AVC) to Sorenson H.263"},
+        {{Pcm(0), Pcm(20), pcm_stereo, pcm_stereo}, "its sample rate, size or channels change"},
+        {{g_aac, Nalu(0), Raw(0), Nalu(40), Raw(23)}, "no AVC configuration"},
+        {{g_aac, Raw(0), {8, 23, AacConfig({0xFF})}, Raw(23)}, "is damaged and not used"},
+        {{g_avc, Nalu(0), Raw(0), Nalu(40)}, "the audio cannot be decoded"},
+    };
+    for (const auto& [tags, text] : cases) {
+        const TemporaryFile file(File(tags).bytes);
+        Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux ! fakesink");
+        const std::string warning = pipeline.play(GST_MESSAGE_WARNING);
+        EXPECT_NE(warning.find(text), std::string::npos) << warning;
+        EXPECT_EQ(pipeline.play(), "") << text;
+    }
+}
+
+TEST(Playing, FindsAConfigurationThatComesLate)
+{
+    const TemporaryFile file(File({g_avc, Nalu(0), Raw(0), Raw(23), Nalu(40), g_aac, Raw(46), Raw(69)}).bytes);
+    Pipeline pipeline(demuxed(file.path(), "fakesink", "appsink sync=false name=a"));
+    EXPECT_EQ(pipeline.play(), "");
+    ASSERT_EQ(pipeline.arrivals("a").size(), 4u);
+    EXPECT_NE(pipeline.arrivals("a")[0].caps.find("codec_data=(buffer)121056e500"), std::string::npos);
+}
+
+// A source that brings nothing stops only its own pipeline, and not even that from ending.
+TEST(Playing, GoesOnBesideABlockedSource)
+{
+    Pipeline blocked("appsrc stream-type=random-access format=bytes size=100000 ! flvdmxdemux ! fakesink");
+    gst_element_set_state(blocked.element(), GST_STATE_PLAYING);
+    g_usleep(G_USEC_PER_SEC / 10);
+    Pipeline other(demuxed(g_data + "avc_aac.flv", "fakesink", "fakesink"));
+    EXPECT_EQ(other.play(), "");
+}
+
 // A sink does not wait for sound that ended long before, when the queues hold less than what is left.
 TEST(Playing, FillsGaps)
 {
@@ -220,7 +276,7 @@ TEST(Playing, FillsGaps)
     for (uint32_t i = 0; i < 250; ++i)
         tags.push_back(Nalu(i * 40));
     const TemporaryFile file(File(tags).bytes);
-    const std::string branch = " ! queue max-size-buffers=20 ! appsink sync=false ";
+    const std::string branch = " ! queue max-size-buffers=5 ! appsink sync=false ";
     Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux name=d d.video" + branch + "d.audio" +
                       branch);
     ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
@@ -241,7 +297,7 @@ TEST(Playing, ForgetsThePreviousFile)
     using Count = GstPadProbeReturn (*)(GstPad*, GstPadProbeInfo*, gpointer);
     static Count s_count = count;
     const auto link = [](GstElement* demuxer, GstPad* pad, gpointer counts) {
-        GstElement* const sink = gst_element_factory_make("fakesink", nullptr);
+        GstElement* const sink = gst_element_factory_make("fakesink", GST_PAD_NAME(pad));
         g_object_set(sink, "async", FALSE, nullptr); // one thread feeds both: none may wait for the other
         gst_bin_add(GST_BIN(GST_ELEMENT_PARENT(demuxer)), sink);
         gst_pad_add_probe(pad, GST_PAD_PROBE_TYPE_BUFFER, s_count, counts, nullptr);
@@ -259,10 +315,18 @@ TEST(Playing, ForgetsThePreviousFile)
         gst_element_set_state(pipeline, GST_STATE_PLAYING);
         GstBus* const bus = gst_element_get_bus(pipeline);
         const auto end = static_cast<GstMessageType>(GST_MESSAGE_EOS | GST_MESSAGE_ERROR);
-        gst_message_unref(gst_bus_timed_pop_filtered(bus, 30 * GST_SECOND, end));
+        GstMessage* message = gst_bus_timed_pop_filtered(bus, 30 * GST_SECOND, end);
+        EXPECT_TRUE(message != nullptr && GST_MESSAGE_TYPE(message) == GST_MESSAGE_EOS) << name;
+        gst_clear_message(&message);
         gst_object_unref(bus);
         EXPECT_EQ(std::pair(frames[0].load(), frames[1].load()), wanted) << name;
         gst_element_set_state(pipeline, GST_STATE_READY);
+        for (const char* pad : {"video", "audio"}) { // the pads are gone, and with them what ends the sinks
+            GstElement* const sink = gst_bin_get_by_name(GST_BIN(pipeline), pad);
+            gst_element_set_state(sink, GST_STATE_NULL);
+            gst_bin_remove(GST_BIN(pipeline), sink);
+            gst_object_unref(sink);
+        }
     }
     gst_element_set_state(pipeline, GST_STATE_NULL);
     gst_object_unref(source);
@@ -297,7 +361,7 @@ TEST(Playing, TellsTags)
 // What cannot be played is said, soon, and with words that help.
 TEST(Playing, RefusesWithReason)
 {
-    const TemporaryFile empty(File({{18, 0, OnMetaData("width: 320")}}).bytes);
+    const TemporaryFile empty(File({{18, 0, OnMetaData("width: 320")}}).bytes), configs(File({g_avc, g_aac}).bytes);
     const TemporaryFile unknown(
         File({{9, 0, VideoData(1, 9, Noise(100))}, {9, 40, VideoData(1, 9, Noise(100))}}).bytes);
     const struct {
@@ -305,6 +369,8 @@ TEST(Playing, RefusesWithReason)
         const char* text;
     } cases[] = {
         {"filesrc location=" + empty.path() + " ! flvdmxdemux ! fakesink", "FLVD_ERR_NO_STREAM"},
+        {"filesrc location=" + configs.path() + " ! flvdmxdemux ! fakesink", "has no frames"},
+        {"appsrc stream-type=random-access format=bytes ! flvdmxdemux ! fakesink", "size of the file"},
         {"filesrc location=" + g_data + "script_data.txt ! flvdmxdemux ! fakesink", "FLVD_ERR_FILE_HEADER"},
         {"filesrc location=" + unknown.path() + " ! flvdmxdemux ! fakesink", "no stream of a codec"},
         {"filesrc location=" + g_data + "avc_aac.flv ! queue ! flvdmxdemux ! fakesink", "can be pulled"},

@@ -33,6 +33,17 @@ struct SeekCase {
     int64_t time = 0;                // when to decode it
 };
 
+// Goes to the keyframe before the target, or as the flags say after it or to the nearest; after the last one, to that.
+flvdmx::result<flvdmx::Milliseconds> Reach(flvdmx::File& file, const SeekCase& seek)
+{
+    const flvdmx::Milliseconds target(seek.target);
+    const auto before = file.seek(target, flvdmx::SeekMode::backward);
+    const auto after = (seek.flags & AFTER) == AFTER ? file.seek(target, flvdmx::SeekMode::forward) : before;
+    const bool nearest = (seek.flags & BEFORE) == BEFORE;
+    const bool goes_back = !after || (nearest && target - *before < *after - target);
+    return goes_back ? file.seek(target, flvdmx::SeekMode::backward) : after;
+}
+
 // The pipelines are not there yet: all files that are open have one host.
 std::vector<SeekCase> MakeSeeks(const char* sample, int count)
 {
@@ -43,8 +54,7 @@ std::vector<SeekCase> MakeSeeks(const char* sample, int count)
     for (int i = 0; i < count; ++i) {
         constexpr int flags[] = {KEY_UNIT, BEFORE, AFTER, AFTER | GST_SEEK_FLAG_SNAP_BEFORE, ACCURATE, FLUSH};
         SeekCase one = {std::uniform_int_distribution<int64_t>(0, duration)(random), flags[i % 6], {}};
-        const auto mode = one.flags == AFTER ? flvdmx::SeekMode::forward : flvdmx::SeekMode::backward;
-        if (file->seek(flvdmx::Milliseconds(one.target), mode)) {
+        if (Reach(*file, one)) {
             auto frame = file->next_frame();
             while (frame && frame->stream != flvdmx::Stream::video)
                 frame = file->next_frame();
@@ -107,6 +117,32 @@ TEST(Seeking, KeepsToSegments)
     ASSERT_TRUE(pipeline.seek(2000, GST_SEEK_FLAG_NONE)); // without a flush
     EXPECT_EQ(pipeline.play(), "");
     EXPECT_GT(pipeline.last_time("v"), 2900 * GST_MSECOND);
+    EXPECT_EQ(pipeline.arrivals("v").back().segment_base, GST_SECOND); // continues where the other one ended
+}
+
+// An index may count from the first frame where the timestamps do not. Without times that rise, nothing can be sought.
+TEST(Seeking, DoesWithoutAnIndex)
+{
+    const auto hook = [](std::vector<double>& times, std::vector<double>&) {
+        std::for_each(times.begin(), times.end(), [](double& time) { time -= 100.0; });
+    };
+    const TemporaryFile file(MakeChain({.index = true, .pictures = 100, .first_ts = 100'000, .hook = hook}).bytes);
+    for (const int flags : {ACCURATE, KEY_UNIT, AFTER}) {
+        Pipeline pipeline(demuxed(file.path(), "appsink sync=false name=v", "fakesink async=false"));
+        ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+        pipeline.forget_arrivals();
+        ASSERT_TRUE(pipeline.seek(2100, flags) && pipeline.go_to(GST_STATE_PAUSED));
+        EXPECT_EQ(pipeline.last_time("v"), (flags == AFTER ? 2200 : 2000) * GST_MSECOND);
+    }
+    const TemporaryFile wrapped(File({g_avc, Nalu(0xFFFFFFB0), Nalu(0)}, 1).bytes);
+    Pipeline pipeline(demuxed(wrapped.path(), "appsink sync=false", ""));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    GstQuery* const query = gst_query_new_seeking(GST_FORMAT_TIME);
+    gboolean seekable = TRUE;
+    EXPECT_TRUE(gst_element_query(pipeline.element(), query));
+    gst_query_parse_seeking(query, nullptr, &seekable, nullptr, nullptr);
+    EXPECT_FALSE(seekable || pipeline.seek(0, FLUSH));
+    gst_query_unref(query);
 }
 
 TEST(Seeking, RefusesWhatItCannotAndEndsBeyondTheEnd)

@@ -576,6 +576,36 @@ public:
         return Milliseconds(reached);
     }
 
+    /** Seeks by scanning from tag to tag from now on: for a file whose keyframe index turns out to be wrong. */
+    void ignore_index()
+    {
+        if (m_instance != nullptr && m_instance->seek_method == FLVD_SEEK_BY_INDEX)
+            m_instance->seek_method = FLVD_SEEK_BY_SCAN;
+    }
+
+    /**
+     * Continues at a tag, from now on as with Options::restarting_timestamps: for a file whose timestamps turn out to
+     * restart. For files without a separate audio reader.
+     *
+     * @param position file position of a tag header before which all frames have been delivered
+     */
+    void accept_restart(int64_t position)
+    {
+        if (m_instance == nullptr)
+            return;
+        accept_all_times();
+        m_return = {m_instance->main_reader, position};
+        m_learned[0] = {position, false};
+    }
+
+    /** File position at which the next request starts to read; -1 if the host's tell fails or nothing is open. */
+    int64_t position() const
+    {
+        if (m_return.reader != nullptr)
+            return m_return.position;
+        return m_instance != nullptr ? __FLV_DMX__fioTell64(m_instance->main_reader) : -1;
+    }
+
     /** The last failure of a frame request or a seek; Kind::none if there was none. Successes do not reset it. */
     error last_error() const { return failure(); }
 

@@ -1,0 +1,42 @@
+#include "timeline.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace flvdmx_gst {
+
+namespace {
+
+// The timestamps of one stream go back by a little where they were written out of order, by more where they restart.
+constexpr flvdmx::Milliseconds jitter_max{1000};
+
+} // namespace
+
+void Timeline::jump(flvdmx::Milliseconds time)
+{
+    *this = Timeline();
+    m_latest = time;
+}
+
+void Timeline::start_at_first_frame()
+{
+    m_starts_at_first_frame = true;
+}
+
+flvdmx::Milliseconds Timeline::follow(const flvdmx::Frame& frame)
+{
+    if (std::exchange(m_starts_at_first_frame, false))
+        m_offset = -frame.time;
+    Stream& stream = m_streams[frame.stream == flvdmx::Stream::video ? 0 : 1];
+    const flvdmx::Milliseconds least = stream.last.value_or(flvdmx::Milliseconds(0)) - jitter_max;
+    if (frame.time + m_offset < least)
+        m_offset = m_latest + stream.distance - frame.time;
+    const flvdmx::Milliseconds time = std::max(frame.time + m_offset, flvdmx::Milliseconds(0));
+    if (stream.last && time > *stream.last)
+        stream.distance = time - *stream.last;
+    stream.last = time;
+    m_latest = std::max(m_latest, time);
+    return time;
+}
+
+} // namespace flvdmx_gst
