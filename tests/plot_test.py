@@ -74,7 +74,7 @@ class Plot(Case):
         damaged = b"".join([header, *tags[:100], bytes(sum(map(len, tags[100:120]))), *tags[120:]])
         for name, data, kind, ticks, stderr in (
                 ("gap", b"".join([header, *tags[:100], *late]), "gap", 11, ""),
-                ("damage", damaged, "damage", 2.6, ".*left out.*\n"),
+                ("damage", damaged, "damage", 2.6, ".*skipped.*\n"),
                 ("restart", header + b"".join(tags + tags[1:] + tags[1:]), "restart", 8, "")):
             with self.subTest(name):
                 root = self.plot(f"{name}.flv", data, stderr)

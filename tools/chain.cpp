@@ -57,7 +57,7 @@ void Chain::JudgePlayed(const Tag& tag)
     if (why.empty())
         return;
     m_findings.Lose(tag.End() - tag.position);
-    m_findings.Add("passed_over", why, tag.position, fmt::format("tags from here on {}", why));
+    m_findings.Add("passed_over", why, tag.position, fmt::format("players skip this tag: {}", why));
 }
 
 bool Chain::IsChained(const Tag& tag)

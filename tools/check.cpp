@@ -71,6 +71,10 @@ Json Judge(Subject& subject, const CheckOptions& options, const Chain::Progress&
     Chain chain(input, reader, limits, findings, progress);
     chain.Walk();
     CheckIndex(input, reader, findings);
+    if (const std::string fault = ConfigFault(input); !fault.empty())
+        findings.Add("no_configuration", "", input.Instance().data_offset, fault);
+    if (const std::string note = UndefinedCodec(input); !note.empty())
+        findings.Note("codec", input.Instance().data_offset, note);
     if (input.Instance().file_shorter_than_meta != 0)
         findings.Add("cut_short", "", reader.FileSize(), "the metadata announces more bytes than the file has");
     Json object = {{"file", input.name},

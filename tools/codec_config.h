@@ -31,6 +31,15 @@ std::string AacObjectTypeName(uint32_t objectType);
 /** @return profile of an AVCDecoderConfigurationRecord, such as "High", "profile 44" for one without a name here */
 std::string AvcProfileName(flvdmx::Bytes record);
 
+/** Width and height in pixels; 0 when they are not known. */
+struct PictureSize {
+    uint32_t width = 0;
+    uint32_t height = 0;
+};
+
+/** @return size of the pictures after cropping, by the first sequence parameter set of the record */
+PictureSize AvcPictureSize(flvdmx::Bytes record);
+
 /** @return its level, such as "3.1" */
 std::string AvcLevelName(flvdmx::Bytes record);
 

@@ -67,21 +67,21 @@ public:
     // A stream without frames leaves no file. @return true when there is one
     bool Finish()
     {
+        if (m_faults > 0)
+            Complain(m_file, fmt::format("warning: skipped {} in {}, the first at byte {}", m_fault,
+                                         Plural(m_faults, "frame"), m_firstFault));
         const uint64_t written = m_out->Written() - m_format->Header(0).size();
         if (written == 0) {
-            Complain(m_file, fmt::format("note: the {} stream has no frames: {} is not written", StreamName(m_stream),
-                                         Printable(m_out->Path())));
+            Complain(m_file, fmt::format("note: there are no {} frames to write: {} is not created",
+                                         StreamName(m_stream), Printable(m_out->Path())));
             return false;
         }
         if (const std::vector<uint8_t> header = m_format->Header(written); !header.empty())
             m_out->Rewrite(header);
         m_out->Finish();
-        if (m_faults > 0)
-            Complain(m_file, fmt::format("warning: {} in {}, the first at byte {}, left out", m_fault,
-                                         Plural(m_faults, "frame"), m_firstFault));
         if (m_format->IsRaw())
-            Complain(m_file,
-                     fmt::format("note: the {} is written raw, one frame after the other", StreamName(m_stream)));
+            Complain(m_file, fmt::format("note: the {} is written raw: the bare frames, one after the other",
+                                         StreamName(m_stream)));
         if (!m_out->IsStandard())
             Print(fmt::format("{}: {}, {} bytes\n", Printable(m_out->Path()), Plural(m_frames, "frame"),
                               m_out->Written()));
@@ -111,16 +111,18 @@ private:
 std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input& input)
 {
     std::vector<StreamWriter> writers;
-    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
-        if (const auto bit = static_cast<uint32_t>(stream); (options.streams & bit) != 0) {
-            if (input.Has(stream))
-                writers.emplace_back(input, stream);
-            else if (const std::string why = TagReader(input).WhyNoStream(stream); !why.empty())
-                Complain(input.name, fmt::format("note: the {} is left out: {}", StreamName(stream), why));
-        }
+    std::string missing;
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio}) {
+        if ((options.streams & static_cast<uint32_t>(stream)) == 0)
+            continue;
+        if (input.Has(stream))
+            writers.emplace_back(input, stream);
+        else if (const std::string why = TagReader(input).WhyNoStream(stream); !why.empty())
+            missing = " that is played: " + why;
+    }
     if (writers.empty())
-        throw FileError(input.name, fmt::format("the file has no {} stream",
-                                                StreamName(static_cast<flvdmx::Stream>(options.streams))));
+        throw FileError(input.name, fmt::format("the file has no {} stream{}",
+                                                StreamName(static_cast<flvdmx::Stream>(options.streams)), missing));
     if (options.out == STANDARD_STREAM && writers.size() > 1)
         throw FileError(input.name, "standard output takes one stream: --stream video or --stream audio chooses it");
     return writers;

@@ -17,8 +17,6 @@ namespace tool {
 
 namespace {
 
-constexpr uint32_t SIXTEEN_BITS = 0x02; // SoundSize in the codec byte of audio tags
-
 using Buffer = std::vector<uint8_t>;
 
 void Append(Buffer& out, flvdmx::Bytes bytes)
@@ -105,6 +103,8 @@ public:
 
     std::string Configure(flvdmx::Bytes config) override
     {
+        if (config.empty()) // it may still come
+            return {};
         const AacConfig aac = ParseAacConfig(config);
         if (std::string refusal = Refusal(aac); !refusal.empty())
             return refusal;
@@ -119,8 +119,10 @@ public:
         constexpr uint32_t MOST_BYTES = 0x1FFF; // 13 bits, header included
         if (frame.data.empty())
             return nullptr;
+        if (m_fixed == 0)
+            return "data without an AAC configuration";
         if (frame.data.size() > MOST_BYTES - HEADER_SIZE)
-            return "more data than ADTS takes";
+            return "data that is too long for ADTS";
         const uint32_t size = static_cast<uint32_t>(frame.data.size()) + HEADER_SIZE;
         const uint64_t header = uint64_t{m_fixed | size >> 11} << 24 | (size << 13 & 0xFFFFFF) | 0x1FFC;
         for (uint32_t shift = 8 * HEADER_SIZE; shift > 0; shift -= 8)
@@ -151,7 +153,7 @@ private:
         return {};
     }
 
-    uint32_t m_fixed = 0; // the first 32 bits without the size
+    uint32_t m_fixed = 0; // the first 32 bits without the size; 0 until there is a configuration
 };
 
 // PCM as RIFF/WAVE. What FLV calls the byte order of the machine that wrote it was little-endian nearly everywhere.
@@ -218,6 +220,12 @@ const char* StreamFormat::Convert(const flvdmx::Frame& frame, Buffer& out)
     return nullptr;
 }
 
+uint32_t PcmSampleSize(const Input& input)
+{
+    constexpr uint32_t SIXTEEN_BITS = 0x02; // SoundSize in the codec byte of audio tags
+    return (input.Instance().audio_format_filter & SIXTEEN_BITS) != 0 ? 16 : 8;
+}
+
 std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream)
 {
     if (stream == flvdmx::Stream::video)
@@ -232,8 +240,7 @@ std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream
         return std::make_unique<StreamFormat>("mp3");
     case flvdmx::AudioCodec::pcm:
     case flvdmx::AudioCodec::pcm_little_endian:
-        return std::make_unique<Wav>(*input.info.audio,
-                                     (input.Instance().audio_format_filter & SIXTEEN_BITS) != 0 ? 16 : 8);
+        return std::make_unique<Wav>(*input.info.audio, PcmSampleSize(input));
     default:
         return std::make_unique<Raw>("audio");
     }

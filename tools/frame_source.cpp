@@ -62,12 +62,15 @@ Json FrameRecord::Object(uint64_t number) const
 
 std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream)
 {
-    const flvdmx::result<flvdmx::Frame> frame = input.file.next_frame(stream);
-    if (frame)
-        return *frame;
-    if (frame.error().kind() == flvdmx::Kind::failed)
-        throw FileError(input.name, frame.error());
-    return std::nullopt;
+    for (;;) {
+        const flvdmx::result<flvdmx::Frame> frame = input.file.next_frame(stream);
+        if (frame.error().kind() == flvdmx::Kind::failed)
+            throw FileError(input.name, frame.error());
+        if (!frame)
+            return std::nullopt;
+        if (input.Has(frame->stream)) // frames of a stream that the open did not find come without its codec
+            return *frame;
+    }
 }
 
 FrameSource::FrameSource(Input& input, uint32_t streams, Losses* losses)

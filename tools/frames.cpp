@@ -213,22 +213,6 @@ void PrintComplete(const FramesOptions& options)
     losses.Warn();
 }
 
-// FLAGS of the file header (FLV file format, version 10.1, annex E.2): the streams that it promises.
-uint32_t AnnouncedStreams(const Input& input)
-{
-    constexpr uint32_t FLAGS_OFFSET = 4;
-    constexpr uint8_t VIDEO_FLAG = 0x01;
-    constexpr uint8_t AUDIO_FLAG = 0x04;
-    TagReader reader(input);
-    const uint8_t* const flags = reader.Bytes(FLAGS_OFFSET, 1);
-    if (flags == nullptr)
-        return 0;
-    uint32_t streams = 0;
-    streams |= (*flags & VIDEO_FLAG) != 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0;
-    streams |= (*flags & AUDIO_FLAG) != 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0;
-    return streams;
-}
-
 // Opens as soon as the file is there and holds enough. With two readers a stream that was not found at the open is
 // never played, so that open waits for all streams that the file header promises.
 Input OpenGrowing(const FramesOptions& options, Growth& growth)
@@ -239,7 +223,7 @@ Input OpenGrowing(const FramesOptions& options, Growth& growth)
         const flvdmx::error error = file.error();
         if (file) {
             Input input(options.file, std::move(*file));
-            const bool complete = (AnnouncedStreams(input) & ~input.Streams()) == 0;
+            const bool complete = (TagReader(input).AnnouncedStreams() & ~input.Streams()) == 0;
             if (complete || !options.separateAudio || !growth.Wait())
                 return input;
             continue;
@@ -265,7 +249,7 @@ void PrintGrowing(const FramesOptions& options)
     Growth growth(options.file, options.timeoutSeconds);
     Input input = OpenGrowing(options, growth);
     const uint32_t wanted = WantedStreams(options);
-    FramePrinter printer(options, wanted & (AnnouncedStreams(input) | input.Streams()));
+    FramePrinter printer(options, wanted & (TagReader(input).AnnouncedStreams() | input.Streams()));
     FrameSource source(input, wanted);
     while (!printer.Done()) {
         if (const std::optional<FrameRecord> frame = source.Next()) {

@@ -15,6 +15,7 @@
 
 #include "flvdmx/posix_host.h"
 #include "tools/report.h"
+#include "tools/tag.h"
 
 namespace tool {
 
@@ -93,12 +94,17 @@ std::string OpenFailureText(const std::string& path, const flvdmx::error& error)
     if (error.code() == FLVD_ERR_OPEN_MAIN || error.code() == FLVD_ERR_OPEN_AUDIO)
         return fmt::format("cannot be opened: {}",
                            error.system_error() != 0 ? std::strerror(error.system_error()) : "no memory");
-    return error.code() == FLVD_ERR_FILE_HEADER ? HeaderFailureText(path) : error.text();
+    if (error.code() == FLVD_ERR_FILE_HEADER)
+        return HeaderFailureText(path);
+    const std::string why = WhyNothingIsPlayed(path, error.code());
+    return why.empty() ? error.text() : why;
 }
 
 Input::Input(const std::string& file_name, flvdmx::File&& opened)
     : name(file_name), file(std::move(opened)), info(file.info())
 {
+    if (info.video && (Instance().video_codec_filter & EXTENDED_HEADER) != 0) // enhanced FLV: no frame is delivered
+        info.video.reset();
 }
 
 Input::Input(const std::string& file_name, const flvdmx::Options& options) : name(file_name)
@@ -107,8 +113,7 @@ Input::Input(const std::string& file_name, const flvdmx::Options& options) : nam
     flvdmx::result<flvdmx::File> opened = flvdmx::File::open(path, Host(), options);
     if (!opened)
         throw FileError(name, OpenFailureText(path, opened.error()), opened.error());
-    file = std::move(*opened);
-    info = file.info();
+    *this = Input(name, std::move(*opened));
 }
 
 uint32_t Input::Streams() const

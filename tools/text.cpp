@@ -2,6 +2,7 @@
 #include "tools/text.h"
 
 #include <algorithm>
+#include <cmath>
 #include <iterator>
 #include <limits>
 
@@ -132,6 +133,16 @@ std::string FormatTime(int64_t milliseconds)
 std::string Plural(uint64_t count, const char* noun)
 {
     return fmt::format("{} {}{}", count, noun, count == 1 ? "" : "s");
+}
+
+std::string Number(double value, int decimals)
+{
+    constexpr double MOST = 1e18;
+    if (!(std::abs(value) < MOST))
+        return fmt::format("{:g}", value);
+    const std::string text = fmt::format("{:.{}f}", value, decimals);
+    const size_t last = text.find_last_not_of('0');
+    return text.substr(0, text[last] == '.' ? last : last + 1);
 }
 
 std::string Hex(flvdmx::Bytes bytes)

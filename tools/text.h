@@ -30,6 +30,10 @@ inline std::string FormatTime(flvdmx::Milliseconds time)
 /** @return `1 frame`, `2 frames` */
 std::string Plural(uint64_t count, const char* noun);
 
+/** @return the number with at most `decimals` decimals, at least 1, and no trailing zeros; with an exponent only from
+ * 1e18 on */
+std::string Number(double value, int decimals = 3);
+
 /** @return the bytes as hexadecimal digits */
 std::string Hex(flvdmx::Bytes bytes);
 
