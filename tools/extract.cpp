@@ -138,7 +138,7 @@ int RunExtract(const ExtractOptions& options)
     ProgressBar progress(options.file, input.Instance().data_end);
     for (StreamWriter& writer : writers)
         writer.Open(options, writers.size() > 1);
-    AcceptAllTimes(input);
+    input.file.accept_all_times();
     Losses losses(input);
     while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
         progress.ShowDone(frame->position);

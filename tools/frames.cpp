@@ -194,7 +194,7 @@ void PrintComplete(const FramesOptions& options)
     }
     if (options.fromMs)
         SeekToStart(input, *options.fromMs);
-    AcceptAllTimes(input);
+    input.file.accept_all_times();
     Losses losses(input);
     FrameSource source(input, streams, &losses);
     FramePrinter printer(options, streams);

@@ -152,8 +152,8 @@ void ListVideo(Listing& listing, const Subject& subject, const flvdmx::VideoInfo
                      fmt::format("{}, {}", subject.scan->videoFrames, Plural(subject.scan->keyframes, "keyframe")));
         if (subject.scan->keyframes > 1)
             listing.Line("  keyframe distance",
-                         fmt::format("{} s on average, {} s at most", Number(subject.scan->AverageDistanceMs() / 1000),
-                                     Number(static_cast<double>(subject.scan->longestDistance.count()) / 1000)));
+                         fmt::format("{} s on average, {} s at most", Number(subject.scan->averageDistanceMs / 1000),
+                                     Number(static_cast<double>(subject.scan->longestDistanceMs) / 1000)));
     }
     listing.Config(video.config);
 }
@@ -214,9 +214,9 @@ std::string InfoText(const Subject& subject)
     listing.Line("size", fmt::format("{} bytes", input.info.size));
     listing.Line("streams", StreamsText(input));
     listing.Line("duration", input.info.duration.count() != 0 ? FormatTime(input.info.duration) : "unknown");
-    if (subject.scan && subject.scan->restarts > 0)
-        listing.Line("played duration", fmt::format("{}, timestamps restart {}", FormatTime(subject.scan->played),
-                                                    Plural(subject.scan->restarts, "time")));
+    if (subject.scan && subject.scan->jumps > 0)
+        listing.Line("played duration", fmt::format("{}, timestamps jump {}", FormatTime(subject.scan->played),
+                                                    Plural(subject.scan->jumps, "time")));
     listing.Line("first timestamp", FormatTime(input.info.start_time));
     listing.Quantity("data rate", static_cast<double>(DataRate(subject)), "kbit/s");
     listing.Line("seek method", SeekMethodText(input.info.seek_method));
@@ -258,8 +258,9 @@ Json VideoObject(const Subject& subject, const flvdmx::VideoInfo& video)
     if (subject.scan) {
         object["frames"] = subject.scan->videoFrames;
         object["keyframes"] = subject.scan->keyframes;
-        object["keyframe_distance_ms"] = {{"average", subject.scan->AverageDistanceMs()},
-                                          {"longest", subject.scan->longestDistance.count()}};
+        const bool known = subject.scan->keyframes > 1;
+        object["keyframe_distance_ms"] = {{"average", OrNull(known, subject.scan->averageDistanceMs)},
+                                          {"longest", OrNull(known, subject.scan->longestDistanceMs)}};
     }
     return object;
 }
@@ -299,7 +300,7 @@ Json InfoObject(const Subject& subject)
                    {"bytes_behind_last_tag", input.Rest()}};
     if (subject.scan) {
         object["played_duration_ms"] = subject.scan->played.count();
-        object["timestamp_restarts"] = subject.scan->restarts;
+        object["timestamp_restarts"] = subject.scan->jumps;
         object["bytes_left_out"] = BytesSkipped(subject);
     }
     if (input.info.video)
@@ -321,10 +322,9 @@ void Warn(const Subject& subject)
 {
     const Input& input = subject.input;
     input.WarnIfCutShort();
-    if (subject.scan && subject.scan->restarts > 0)
-        Complain(input.name,
-                 fmt::format("warning: the timestamps restart: the last one is {}, but the frames play for {}",
-                             FormatTime(input.info.duration), FormatTime(subject.scan->played)));
+    if (subject.scan && subject.scan->jumps > 0)
+        Complain(input.name, fmt::format("warning: the timestamps jump: the last one is {}, but the frames play for {}",
+                                         FormatTime(input.info.duration), FormatTime(subject.scan->played)));
     for (const auto& [stream, why] : {std::pair("video", subject.noVideo), std::pair("audio", subject.noAudio)})
         if (!why.empty())
             Complain(input.name, fmt::format("warning: the {} is not played: {}", stream, why));

@@ -14,6 +14,7 @@
 #include <unistd.h>
 
 #include "flvdmx/posix_host.h"
+#include "tools/progress.h"
 #include "tools/report.h"
 #include "tools/tag.h"
 
@@ -56,11 +57,30 @@ std::string HeaderFailureText(const std::string& path)
     return "no FLV file header: this is not an FLV file";
 }
 
+const flvd_init_t& PosixFunctions()
+{
+    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
+    return host.functions();
+}
+
+uint32_t ReadAndShow(void* buffer, uint32_t size, uint32_t count, void* handle)
+{
+    ReadProgress::ShowRead(PosixFunctions().file_tell64(handle));
+    return PosixFunctions().file_read(buffer, size, count, handle);
+}
+
+flvdmx::Host MakeHost()
+{
+    flvd_init_t functions = PosixFunctions();
+    functions.file_read = ReadAndShow;
+    return flvdmx::Host(functions);
+}
+
 } // namespace
 
 const flvdmx::Host& Host()
 {
-    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
+    static const flvdmx::Host host = MakeHost();
     return host;
 }
 

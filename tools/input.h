@@ -43,12 +43,6 @@ struct Input {
     void WarnIfCutShort() const;
 };
 
-/** From now on frames may have any time, as with Options::restarting_timestamps; no seek may follow. */
-inline void AcceptAllTimes(Input& input)
-{
-    input.file.instance()->last_ts = 0;
-}
-
 /** @return what to tell of a file that could not be opened */
 std::string OpenFailureText(const std::string& path, const flvdmx::error& error);
 

@@ -50,6 +50,26 @@ private:
     const int64_t m_total;
 };
 
+/** A bar that follows what the library reads of files, also during one long search. One at a time, and no other thread
+ *  may read. */
+class ReadProgress : public ProgressBar {
+public:
+    /** @param passes how often the file will be read */
+    ReadProgress(const std::string& name, int64_t size, int passes = 1);
+    ~ReadProgress();
+    ReadProgress(const ReadProgress&) = delete;
+    ReadProgress& operator=(const ReadProgress&) = delete;
+
+    void NextPass() { m_pass += m_size; }
+
+    /** Shows that a file is being read at this position. */
+    static void ShowRead(int64_t position);
+
+private:
+    const int64_t m_size;
+    int64_t m_pass = 0; // bytes of the passes before
+};
+
 } // namespace tool
 
 #endif

@@ -15,58 +15,16 @@
 #include "tools/input.h"
 #include "tools/report.h"
 #include "tools/tags.h"
+#include "tools/times.h"
 
 namespace tool {
 
 namespace {
 
-// A step back of up to a second is jitter: the time stands still. A larger one, or a gap of more than ten seconds, is a
-// recording that started again, or a damaged timestamp.
-constexpr int64_t JITTER_MS = 1000;
-constexpr int64_t GAP_MS = 10000;
-constexpr int64_t LONGEST_FRAME_MS = 1000;
-
 constexpr uint32_t SCRIPT_DATA_MAX = 1 << 20; // bytes
 constexpr int TAGS_BEFORE_METADATA = 102;     // as far as players look
 constexpr size_t MOST_CODEC_BYTES = 5;
 constexpr uint8_t AVC_KEYFRAME = 0x17; // FrameType 1, CodecID 7
-
-// Makes the times of both streams continuous.
-class Continuity {
-public:
-    int64_t Next(flvdmx::Stream stream, int64_t time)
-    {
-        Lane& lane = m_lanes.at(stream == flvdmx::Stream::video ? 0 : 1);
-        if (lane.isEmpty) {
-            lane = {false, time + m_shift, 0};
-            return lane.last;
-        }
-        const int64_t step = time + m_shift - lane.last;
-        if (step < -JITTER_MS || step > GAP_MS) {
-            m_shift = std::max(After(m_lanes[0]), After(m_lanes[1])) - time;
-            ++m_breaks;
-        } else if (step > 0) {
-            lane.step = std::min(step, LONGEST_FRAME_MS);
-        }
-        lane.last = std::max(lane.last, time + m_shift);
-        return lane.last;
-    }
-
-    uint64_t Breaks() const { return m_breaks; }
-
-private:
-    struct Lane {
-        bool isEmpty = true;
-        int64_t last = 0; // time of its last frame
-        int64_t step = 0; // from the frame before that one
-    };
-
-    static int64_t After(const Lane& lane) { return lane.isEmpty ? 0 : lane.last + lane.step; }
-
-    std::array<Lane, 2> m_lanes;
-    int64_t m_shift = 0;
-    uint64_t m_breaks = 0;
-};
 
 // Bytes anywhere in a file. The codec's bytes before a frame are not delivered with it.
 class RawFile {
@@ -126,7 +84,7 @@ public:
         }
     }
 
-    RemuxReport Run(const std::function<void(int64_t)>& progress)
+    RemuxReport Run()
     {
         while (const std::optional<flvdmx::Frame> frame = NextFrame(m_input, flvdmx::Stream::any)) {
             Track& track = frame->stream == flvdmx::Stream::video ? m_video : m_audio;
@@ -139,11 +97,10 @@ public:
                 break;
             if (time >= m_options.fromMs && time < m_options.toMs)
                 Take(*frame, track);
-            progress(frame->position);
         }
         if (m_options.toMs == std::numeric_limits<int64_t>::max())
             m_losses.Finish();
-        m_report.breaks = m_continuity.Breaks();
+        m_report.jumps = m_times.Jumps();
         m_report.bytesLeftOut = m_losses.Bytes();
         return m_report;
     }
@@ -154,8 +111,10 @@ private:
     void Take(const flvdmx::Frame& frame, const Track& track)
     {
         int64_t time = frame.time.count() + m_options.offsetMs;
-        if (m_options.continuous)
-            time = m_continuity.Next(frame.stream, time);
+        if (m_options.continuous) {
+            m_times.Take(frame.stream, time);
+            time = m_times.Time();
+        }
         const auto timestamp = static_cast<uint32_t>(std::max<int64_t>(time, 0)); // 32 bits, wrapping
         if (m_report.videoFrames + m_report.audioFrames == 0) {
             PutConfig(m_video, timestamp);
@@ -183,7 +142,7 @@ private:
     Losses m_losses;
     Track m_video;
     Track m_audio;
-    Continuity m_continuity;
+    Times m_times;
     RemuxReport m_report;
 };
 
@@ -220,13 +179,12 @@ Metadata FindMetadata(const Input& input)
 
 } // namespace
 
-RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take,
-                  const std::function<void(int64_t)>& progress)
+RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take)
 {
-    return Remuxer(file, options, take).Run(progress);
+    return Remuxer(file, options, take).Run();
 }
 
-RemuxReport CopyTags(const std::string& file, const TakeTag& take, const std::function<void(int64_t)>& progress)
+RemuxReport CopyTags(const std::string& file, const TakeTag& take)
 {
     const Input input(file);
     const RawFile raw(file);
@@ -234,7 +192,7 @@ RemuxReport CopyTags(const std::string& file, const TakeTag& take, const std::fu
     TagReader reader(input);
     RemuxReport report;
     std::vector<uint8_t> bytes; // payload and back-pointer
-    for (int64_t position = FirstTag(input); position < reader.FileSize(); progress(position)) {
+    for (int64_t position = FirstTag(input); position < reader.FileSize();) {
         const std::optional<Tag> tag = reader.At(position);
         if (!tag || tag->End() > reader.FileSize())
             throw FileError(file, fmt::format("the file is damaged at byte {}: use 'flvdmx repair'", position));

@@ -20,15 +20,14 @@ namespace tool {
 
 namespace {
 
-using Pass = std::function<RemuxReport(const TakeTag& take, const std::function<void(int64_t)>& progress)>;
+using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
 // Runs a pass that measures and, unless it is a rehearsal, one that writes.
 RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
 {
-    ProgressBar progress(options.file, 2 * size);
+    ReadProgress progress(options.file, size, options.dryRun ? 1 : 2);
     FlvLayout layout;
-    const RemuxReport report =
-        pass([&](const NewTag& tag) { layout.Add(tag); }, [&](int64_t position) { progress.ShowDone(position); });
+    const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); });
     if (report.videoFrames + report.audioFrames == 0)
         throw FileError(options.file, "there is no frame to write");
     uint64_t written = 0;
@@ -36,8 +35,8 @@ RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
         OutputFile out(options.out, options.file, options.force);
         const std::vector<uint8_t> beginning = layout.Beginning(MetadataOf(options.file));
         out.Write(beginning.data(), beginning.size());
-        pass([&](const NewTag& tag) { WriteTag(out, tag); },
-             [&](int64_t position) { progress.ShowDone(size + position); });
+        progress.NextPass();
+        pass([&](const NewTag& tag) { WriteTag(out, tag); });
         out.Finish();
         written = out.Written();
     }
@@ -83,12 +82,11 @@ int RunRepair(const RewriteOptions& options)
     remux.allFrames = true;
     remux.continuous = !options.keepTimes;
     remux.offsetMs = input.info.start_time.count();
-    const RemuxReport report = Write(options, input.info.size, [&](const auto& take, const auto& progress) {
-        return Remux(options.file, remux, take, progress);
-    });
-    if (report.breaks != 0)
+    const RemuxReport report = Write(
+        options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
-                         Plural(report.breaks, "place")));
+                         Plural(report.jumps, "place")));
     const int64_t leftOut = report.bytesLeftOut + input.Rest();
     if (leftOut != 0)
         Tell(fmt::format("{}: {} left out\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
@@ -98,7 +96,7 @@ int RunRepair(const RewriteOptions& options)
 int RunIndex(const RewriteOptions& options)
 {
     Write(options, Input(options.file).info.size,
-          [&](const auto& take, const auto& progress) { return CopyTags(options.file, take, progress); });
+          [&](const TakeTag& take) { return CopyTags(options.file, take); });
     return DONE;
 }
 
@@ -106,7 +104,7 @@ int RunCut(const RewriteOptions& options)
 {
     const RemuxOptions remux = CutOptions(options);
     Write(options, Input(options.file).info.size,
-          [&](const auto& take, const auto& progress) { return Remux(options.file, remux, take, progress); });
+          [&](const TakeTag& take) { return Remux(options.file, remux, take); });
     return DONE;
 }
 

@@ -201,18 +201,4 @@ void Losses::Warn() const
                                            m_unplayed.why));
 }
 
-flvdmx::Milliseconds Takes::Continue(const flvdmx::Frame& frame)
-{
-    constexpr flvdmx::Milliseconds JITTER{1000};
-    Lane& lane = frame.stream == flvdmx::Stream::video ? m_video : m_audio;
-    if (frame.time + JITTER < lane.last) {
-        if (++lane.take == m_offsets.size())
-            m_offsets.push_back(m_latest - frame.time);
-    }
-    lane.last = frame.time;
-    const flvdmx::Milliseconds time = frame.time + m_offsets[lane.take];
-    m_latest = std::max(m_latest, time);
-    return time;
-}
-
 } // namespace tool

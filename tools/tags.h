@@ -100,29 +100,6 @@ private:
     Loss m_unplayed; // tags without a fault that are not played
 };
 
-/**
- * Times that go on where a recording starts again from 0: a stream's time that goes back by more than a second begins
- * another take, which comes after the latest time so far.
- */
-class Takes {
-public:
-    /** @return the time of a frame, taken in file order */
-    flvdmx::Milliseconds Continue(const flvdmx::Frame& frame);
-
-    size_t Restarts() const { return m_offsets.size() - 1; }
-    flvdmx::Milliseconds Played() const { return m_latest; } /**< the latest time returned */
-
-private:
-    struct Lane {
-        size_t take = 0;
-        flvdmx::Milliseconds last{};
-    };
-    Lane m_video;
-    Lane m_audio;
-    std::vector<flvdmx::Milliseconds> m_offsets{flvdmx::Milliseconds(0)}; // of each take
-    flvdmx::Milliseconds m_latest{};
-};
-
 } // namespace tool
 
 #endif
