@@ -1,4 +1,4 @@
-"""Holds the manual page and the completion against what the program's --help says: commands and long options.
+"""Compares the manual page and the completion with the program's --help: commands and long options.
 
 usage: check_options.py PROGRAM MANUAL COMPLETION
 """
@@ -20,7 +20,7 @@ def help_of(*command):
 
 
 def from_help():
-    commands = re.findall(r"^  (\w+)  ", help_of().split("Subcommands:")[1], re.M)
+    commands = re.findall(r"^  (\w+)  ", help_of().split("Commands:")[1], re.M)
     texts = {TOP: help_of(), **{command: help_of(command) for command in commands}}
     return {name: set(re.findall(r"^  (?:-\w,)?(--[\w-]+)", text, re.M)) for name, text in texts.items()}
 
@@ -29,7 +29,7 @@ def from_manual():
     first, *sections = re.split(r"^\.Ss (\w+).*\n", read(manual).split(".Sh THE DRAWING")[0], flags=re.M)
     texts = {TOP: first, **dict(zip(sections[::2], sections[1::2]))}
     items = {name: " ".join(re.findall(r"^\.It (Fl .*)", text, re.M)) for name, text in texts.items()}
-    return {name: {"--help", *("--" + option for option in re.findall(r"Fl Fl ([\w-]+)", text))}  # help: told once
+    return {name: {"--help", *("--" + option for option in re.findall(r"Fl Fl ([\w-]+)", text))}  # --help is described once
             for name, text in items.items()}
 
 

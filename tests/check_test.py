@@ -152,9 +152,9 @@ class Check(Case):
         result = run("check", "--json", root)
         self.assertEqual([d["file"] for d in json.loads(result.stdout)["files"]],
                          [f"{root}/b.flv", f"{root}/c.flv", f"{root}/sub/a"])
-        self.assertRegex(result.stderr, rf"{root}: note: skips 1 file that is not FLV\n.*c.flv: .*is empty\n\Z")
+        self.assertRegex(result.stderr, rf"{root}: note: skipped 1 file that is not FLV\n.*c.flv: .*is empty\n\Z")
         (root / "sub/a").unlink()
-        self.tool("check", root / "sub", code=1, stderr=".*no FLV file is in this folder\n")
+        self.tool("check", root / "sub", code=1, stderr=".*there is no FLV file in this folder\n")
 
     def test_jobs_say_the_same_as_one(self):
         files = [*map(sample, SAMPLES), "missing.flv", DATA / "make_samples.sh", self.write("ruined.flv", RUINED)] * 3
@@ -170,7 +170,7 @@ class Check(Case):
         ruined = documents[-1]  # not listed whole
         self.assertEqual((ruined["counts"], len(ruined["findings"]), ruined["unlisted"]), ({"gap": 1500}, 1000, 500))
         text = self.tool("check", sample("aac_only"), "--jobs", 9)
-        self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, 0 of them lost\n")
+        self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, 0 of them not playable\n")
 
     def test_jobs_end_when_nobody_reads(self):
         files = [self.write("ruined.flv", RUINED)] * 20

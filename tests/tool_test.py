@@ -21,7 +21,7 @@ from flv import retag, split_tags
 TOOL = os.environ["FLVDMX_TOOL"]
 DATA = pathlib.Path(os.environ["FLVDMX_TEST_DATA"])
 SAMPLES = sorted(path.stem for path in DATA.glob("*.flv"))
-WARNINGS = {"truncated": ".*no whole tag.*\n", "damaged": ".*without a valid tag.*\n"}
+WARNINGS = {"truncated": ".*not a complete tag.*\n", "damaged": ".*without a valid tag.*\n"}
 CODECS = {"h264": "H.264 (AVC)", "flv1": "Sorenson H.263", "flashsv": "screen video", "aac": "AAC", "mp3": "MP3",
           "speex": "Speex", "pcm_s16le": "PCM, little-endian"}
 KIND, TIME = operator.itemgetter(0), operator.itemgetter(1)  # of a frame
@@ -346,7 +346,7 @@ class Failures(Case):
                 (folder, "Is a directory"),
                 (self.write("empty.flv", b""), "the file is empty"),
                 (self.write("tiny.flv", b"FLV\x01\x05"), "damaged or cut short (the file has 5 bytes)"),
-                (self.write("text.flv", b"no video here\n" * 9), "this is not an FLV file"),
+                (self.write("text.flv", b"no video here\n" * 9), "does not start with the signature"),
                 (self.write("bare.flv", header), "damaged or cut short (the file has 9 bytes)"),
                 (self.write("header.flv", header + bytes(4)), "audio stream was found"),
                 ("/dev/null", "a pipe or device")):
@@ -400,7 +400,7 @@ class Failures(Case):
         for arguments, words in ((["frames", "--stream", "all", "x"], "'all' is not one of: audio, video"),
                                  (["seek", "--mode", "up", "x", "1"], "not one of: auto, backward, forward"),
                                  (["help", "me"], "not one of: check, cut, extract"),
-                                 (["info", "-x.flv"], "begins with a dash goes after '--': flvdmx COMMAND -- -x.flv")):
+                                 (["info", "-x.flv"], "that begins with a dash: flvdmx COMMAND -- -x.flv")):
             self.assertIn(words, run(*arguments, cwd=folder).stderr)
         self.tool("info", "--", "-x.flv", cwd=folder)
 

@@ -1,4 +1,4 @@
-// What codec configurations say.
+// Fields of codec configurations.
 #include "tools/codec_config.h"
 
 #include <algorithm>
@@ -15,7 +15,7 @@ constexpr uint32_t ESCAPED_OBJECT_TYPE = 31;
 constexpr uint32_t SBR_OBJECT_TYPE = 5; // HE-AAC: output rate and the core's own type follow
 constexpr uint32_t PS_OBJECT_TYPE = 29; // HE-AAC version 2, likewise
 
-// A configuration as a row of bits; those past its end are 0.
+// Reads a configuration bit by bit; bits past its end are 0.
 class Bits {
 public:
     explicit Bits(flvdmx::Bytes bytes) : m_bytes(bytes) {}

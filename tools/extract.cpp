@@ -1,4 +1,4 @@
-// `flvdmx extract`: elementary streams as players take them.
+// `flvdmx extract`: writes elementary streams that players accept.
 #include <cstdint>
 #include <filesystem>
 #include <limits>
@@ -24,7 +24,7 @@ namespace tool {
 
 namespace {
 
-// One stream on its way into its file.
+// Writes one stream to its file.
 class StreamWriter {
 public:
     StreamWriter(const Input& input, flvdmx::Stream stream)
@@ -38,7 +38,7 @@ public:
 
     flvdmx::Stream Stream() const { return m_stream; }
 
-    // A folder takes files named as the input; otherwise two streams need two names.
+    // Files in a folder are named after the input; two streams need two names.
     void Open(const ExtractOptions& options, bool both)
     {
         const std::string base = m_file == STANDARD_STREAM ? "stdin" : std::filesystem::path(m_file).stem().string();
@@ -54,7 +54,7 @@ public:
         if (frame.config_changed())
             if (const std::string refusal = m_format->Configure(frame.new_config); !refusal.empty())
                 Complain(m_file,
-                         fmt::format("warning: before byte {}: {}; the one before is kept", frame.position, refusal));
+                         fmt::format("warning: before byte {}: {}; the previous one is used", frame.position, refusal));
         m_bytes.clear();
         if (const char* const fault = m_format->Convert(frame, m_bytes); fault != nullptr && m_faults++ == 0) {
             m_fault = fault;
@@ -89,7 +89,7 @@ public:
     }
 
 private:
-    // Until the size is known the header of the stream has the largest, as it stays in a pipe.
+    // The header states the largest size until the real one is known; in a pipe it cannot be corrected.
     void Open(const std::string& path, bool force)
     {
         m_out = std::make_unique<OutputFile>(path, m_file, force);
@@ -124,7 +124,8 @@ std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input
         throw FileError(input.name, fmt::format("the file has no {} stream{}",
                                                 StreamName(static_cast<flvdmx::Stream>(options.streams)), missing));
     if (options.out == STANDARD_STREAM && writers.size() > 1)
-        throw FileError(input.name, "standard output takes one stream: --stream video or --stream audio chooses it");
+        throw FileError(input.name,
+                        "standard output takes one stream: select it with --stream video or --stream audio");
     return writers;
 }
 

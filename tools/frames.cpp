@@ -69,6 +69,8 @@ public:
     FramePrinter(const FramesOptions& options, uint32_t streams)
         : m_options(options), m_streams(streams), m_open(streams), m_started(!options.fromMs)
     {
+        if (options.format == Format::csv)
+            Print(FrameRecord::CSV_HEADING);
     }
 
     bool Done() const { return m_open == 0 || m_number >= m_options.count; }
@@ -124,7 +126,7 @@ private:
             PrintJson(frame.Object(m_number));
             break;
         case Format::csv:
-            Print((m_number == 1 ? FrameRecord::CSV_HEADING : "") + frame.Csv(m_number));
+            Print(frame.Csv(m_number));
             break;
         case Format::text:
             Print((m_number == 1 ? FrameRecord::HEADING : "") + frame.Line(m_number));

@@ -1,4 +1,4 @@
-// `flvdmx info`: what is in each file, as aligned text or as one JSON document.
+// `flvdmx info`: shows what is in each file, as aligned text or as one JSON document.
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -24,7 +24,7 @@ namespace tool {
 
 namespace {
 
-// A file and what was found out about it.
+// A file and its description.
 struct Subject {
     const Input& input;
     flvdmx::Metadata metadata{};
@@ -41,7 +41,7 @@ uint64_t DataRate(const Subject& subject)
     return duration.count() <= 0 ? 0 : bits / static_cast<uint64_t>(duration.count());
 }
 
-// The count is raised before the arrays are met, so without both arrays it says nothing.
+// The library counts entries before it has found the arrays. Without both of them the count means nothing.
 uint32_t IndexEntries(const Input& input)
 {
     const flvd_keyframe_index_t& index = input.Instance().keyframe_index;
@@ -62,7 +62,7 @@ const char* SeekMethodName(flvdmx::SeekMethod method)
 
 const char* SeekMethodText(flvdmx::SeekMethod method)
 {
-    constexpr std::array TEXTS = {"none, seeking is not possible", "by the keyframe index", "by scanning"};
+    constexpr std::array TEXTS = {"none: seeking is not possible", "by the keyframe index", "by scanning"};
     return TEXTS[std::min<size_t>(static_cast<size_t>(method), TEXTS.size() - 1)];
 }
 
@@ -96,16 +96,16 @@ PictureSize SizeOf(const flvdmx::VideoInfo& video)
     return size.width != 0 ? size : PictureSize{video.width, video.height};
 }
 
-// The last keyframe as the file tells it, or as it was found.
+// The last keyframe that was found, otherwise the one that the file states.
 std::optional<flvdmx::Milliseconds> LastKeyframe(const Subject& subject)
 {
     if (subject.scan)
         return subject.scan->lastKeyframe;
-    const flvdmx::Milliseconds told = subject.input.info.video->last_keyframe;
-    return told.count() != 0 ? std::optional(told) : std::nullopt;
+    const flvdmx::Milliseconds stated = subject.input.info.video->last_keyframe;
+    return stated.count() != 0 ? std::optional(stated) : std::nullopt;
 }
 
-// Collects `name  value` lines; a value that the file does not tell is left out.
+// Collects `name  value` lines, without values that are not known.
 class Listing {
 public:
     void Line(std::string_view name, std::string_view value)
@@ -180,7 +180,7 @@ void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo
     listing.Config(audio.config);
 }
 
-// Dates as ISO 8601 has them; one that no calendar has is null.
+// Dates in ISO 8601 format; null for one that no calendar has.
 struct ToJson {
     Json operator()(const flvdmx::Date& date) const
     {

@@ -71,9 +71,10 @@ void ProgressBar::ShowDone(int64_t done)
 {
     if (!IsDue())
         return;
+    const auto width = std::min(BAR_WIDTH, static_cast<int64_t>(TerminalColumns()) / 3);
     const double share = std::clamp(static_cast<double>(done) / static_cast<double>(m_total), 0.0, 1.0);
-    const std::string bar(static_cast<size_t>(share * BAR_WIDTH), '#');
-    ShowLine(m_name, fmt::format(" [{:<{}}] {:3.0f}%", bar, BAR_WIDTH, share * 100));
+    const std::string bar(static_cast<size_t>(share * static_cast<double>(width)), '#');
+    ShowLine(m_name, fmt::format(" [{:<{}}] {:3.0f}%", bar, width, share * 100));
 }
 
 ReadProgress::ReadProgress(const std::string& name, int64_t size, int passes)

@@ -1,4 +1,4 @@
-// What all subcommands print.
+// What all commands print.
 #include "tools/report.h"
 
 #include <cerrno>
@@ -41,7 +41,7 @@ void Flush()
 
 void PrintJson(const Json& document, int indent)
 {
-    // A file name need not be UTF-8, the document has to be.
+    // A file name may be invalid UTF-8, a JSON document may not.
     Print(document.dump(indent, ' ', false, Json::error_handler_t::replace) + "\n");
 }
 
@@ -52,7 +52,7 @@ void Tell(const std::string& text)
 
 void Complain(const std::string& file, std::string_view text)
 {
-    std::fflush(stdout); // what came before is to stand before it on a terminal
+    std::fflush(stdout); // keeps the order of output and messages on a terminal
     Tell(fmt::format("flvdmx: {}: {}\n", Printable(file), text));
 }
 
