@@ -14,6 +14,7 @@ namespace tool {
 namespace {
 
 constexpr uint32_t READER_CACHE = 4096; // more would bypass the window that the host reads ahead
+constexpr int TAGS_PROBED = 102;        // in which an open finds the streams
 constexpr uint32_t BYTES_WITH_CODEC = TAG_HEADER_SIZE + 2;
 
 bool IsTagType(uint32_t type)
@@ -21,7 +22,17 @@ bool IsTagType(uint32_t type)
     return type == FLVD_TAG_TYPE_AUDIO || type == FLVD_TAG_TYPE_VIDEO || type == FLVD_TAG_TYPE_SCRIPT;
 }
 
-Tag Parse(int64_t position, const uint8_t* bytes, uint32_t available)
+} // namespace
+
+uint32_t BigEndian(const uint8_t* bytes, uint32_t size)
+{
+    uint32_t value = 0;
+    for (uint32_t i = 0; i < size; ++i)
+        value = value << 8 | bytes[i];
+    return value;
+}
+
+Tag ParseTag(int64_t position, const uint8_t* bytes, uint32_t available)
 {
     constexpr uint32_t STREAM_ID_OFFSET = 8;
     Tag tag{};
@@ -35,16 +46,6 @@ Tag Parse(int64_t position, const uint8_t* bytes, uint32_t available)
     if (tag.size > 1 && available > TAG_HEADER_SIZE + 1)
         tag.packetType = bytes[TAG_HEADER_SIZE + 1];
     return tag;
-}
-
-} // namespace
-
-uint32_t BigEndian(const uint8_t* bytes, uint32_t size)
-{
-    uint32_t value = 0;
-    for (uint32_t i = 0; i < size; ++i)
-        value = value << 8 | bytes[i];
-    return value;
 }
 
 // AVC configuration and end of sequence and AAC configuration hold nothing to play.
@@ -82,7 +83,7 @@ std::optional<Tag> TagReader::At(int64_t position)
         bytes = Bytes(position, TAG_HEADER_SIZE);
     if (bytes == nullptr || !IsTagType(bytes[0]))
         return std::nullopt;
-    return Parse(position, bytes, available);
+    return ParseTag(position, bytes, available);
 }
 
 std::optional<Tag> TagReader::Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress)
@@ -177,21 +178,39 @@ std::string TagReader::ConfigFault(const Tag& tag)
     return "its AVC configuration is damaged";
 }
 
+TagReader::Numbered TagReader::First(flvdmx::Stream stream)
+{
+    constexpr int TAGS = 5000; // at the beginning of the file
+    std::optional<Tag> tag = At(int64_t{m_instance->data_offset} + BACK_POINTER_SIZE);
+    for (int i = 0; i < TAGS && tag; ++i) {
+        if (!tag->IsScript() && tag->Stream() == stream)
+            return {tag, i};
+        tag = At(tag->End());
+    }
+    return {};
+}
+
+std::optional<Tag> TagReader::FirstIfLate(flvdmx::Stream stream)
+{
+    const auto [tag, number] = First(stream);
+    return number >= TAGS_PROBED ? tag : std::nullopt;
+}
+
 std::string TagReader::FindReason(flvdmx::Stream stream)
 {
-    constexpr int TAGS = 1000; // at the beginning of the file
-    std::optional<Tag> tag = At(int64_t{m_instance->data_offset} + BACK_POINTER_SIZE);
-    for (int i = 0; i < TAGS && tag && (tag->IsScript() || tag->Stream() != stream); ++i)
-        tag = At(tag->End());
-    if (!tag || tag->IsScript() || tag->Stream() != stream)
+    const auto [tag, number] = First(stream);
+    if (!tag)
         return "";
+    if (number >= TAGS_PROBED)
+        return fmt::format("it begins at byte {}, after the first {} tags", tag->position, TAGS_PROBED);
     if (!tag->IsAvc() || tag->IsExtended())
         return fmt::format("it is {}", NameCodec(*tag));
     return tag->IsConfig() ? ConfigFault(*tag) : "its AVC stream begins without a configuration";
 }
 
-Losses::Losses(const Input& input)
-    : m_input(input), m_reader(input), m_end(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
+Losses::Losses(const Input& input, std::function<void(const Tag&)> script)
+    : m_input(input), m_script(std::move(script)), m_reader(input),
+      m_end(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
 {
 }
 
@@ -199,16 +218,25 @@ bool Losses::Take(const flvdmx::Frame& frame)
 {
     if (frame.position < 0)
         return false;
+    const int64_t before = m_bytes;
+    Inspect(m_end, frame.position);
+    m_end = EndOf(frame);
+    return m_bytes > before;
+}
+
+int64_t Losses::EndOf(const flvdmx::Frame& frame)
+{
+    if (!m_input.Has(frame.stream)) { // it was found after the open
+        const std::optional<Tag> tag = m_reader.At(frame.position);
+        return tag ? tag->End() : frame.position;
+    }
     Tag tag{}; // as its stream's are
     tag.position = frame.position;
     tag.type = frame.stream == flvdmx::Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
     tag.codec = static_cast<uint8_t>(tag.IsVideo() ? m_input.Instance().video_codec_filter
                                                    : m_input.Instance().audio_format_filter);
     tag.size = static_cast<uint32_t>(frame.data.size()) + tag.CodecHeaderSize();
-    const int64_t before = m_bytes;
-    Inspect(m_end, tag.position);
-    m_end = tag.End();
-    return m_bytes > before;
+    return tag.End();
 }
 
 // What is between two frames: mostly nothing, else configurations, script data, tags that are not played, or damage.
@@ -221,6 +249,8 @@ void Losses::Inspect(int64_t from, int64_t to)
             return;
         if (tag->IsFrame())
             Lose(tag->position, tag->End());
+        else if (m_script && tag->IsScript())
+            m_script(*tag);
         from = tag->End();
     }
 }

@@ -50,6 +50,9 @@ struct Tag {
     bool IsKeyframe() const { return IsVideo() && IsFrame() && (codec >> 4 == 1 || codec >> 4 == 4); }
 };
 
+/** @return the tag at `position`, of which the first `available` bytes are given: at least a tag header */
+Tag ParseTag(int64_t position, const uint8_t* bytes, uint32_t available);
+
 /** Reads tags and numbers anywhere in a file, with a reader of its own. */
 class TagReader {
 public:
@@ -76,6 +79,9 @@ public:
      *          is */
     std::string WhyNotPlayed(const Tag& tag);
 
+    /** @return the first tag of a stream that begins too late for players to find it */
+    std::optional<Tag> FirstIfLate(flvdmx::Stream stream);
+
     /** @return why no frame of that stream is delivered, from its first tag; empty when frames are, or when there is no
      *          such tag */
     const std::string& WhyNoStream(flvdmx::Stream stream);
@@ -85,6 +91,12 @@ private:
     std::string ExtendedCodec(const Tag& tag);
     std::string ConfigFault(const Tag& tag);
     std::string FindReason(flvdmx::Stream stream);
+
+    struct Numbered {
+        std::optional<Tag> tag;
+        int number; // of the tags before it
+    };
+    Numbered First(flvdmx::Stream stream);
 
     struct Closer {
         void operator()(fio_file_t* reader) const { __FLV_DMX__fioClose(reader); }
@@ -103,7 +115,9 @@ std::string VideoCodecName(flvdmx::VideoCodec codec);
 /** Watches for bytes that are left out between the frames of a file. */
 class Losses {
 public:
-    explicit Losses(const Input& input); /**< borrowed */
+    /** @param input borrowed
+     *  @param script called with each script tag between frames; may be empty */
+    explicit Losses(const Input& input, std::function<void(const Tag&)> script = {});
 
     /** Takes every frame of the file, in file order. @return true when bytes were left out before it */
     bool Take(const flvdmx::Frame& frame);
@@ -115,10 +129,12 @@ public:
     void Warn() const;
 
 private:
+    int64_t EndOf(const flvdmx::Frame& frame);
     void Inspect(int64_t from, int64_t to);
     void Lose(int64_t from, int64_t to);
 
     const Input& m_input;
+    const std::function<void(const Tag&)> m_script;
     TagReader m_reader;
     int64_t m_end;
     int64_t m_bytes = 0;
