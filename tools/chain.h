@@ -42,7 +42,7 @@ private:
 
     // What was last seen of a stream.
     struct Lane {
-        int64_t last = 0; // timestamp
+        int64_t last = 0;            // timestamp
         std::optional<int64_t> time; // continuing after jumps
         std::optional<Jump> odd;     // the next tag tells whether it is a jump
         std::vector<uint8_t> config;
@@ -70,8 +70,8 @@ private:
     const Progress m_progress;
     const int64_t m_first; // position of the first tag
     uint64_t m_tags = 0;
-    int64_t m_unlinkedEnd = -1;        // of the last tag without a valid back-pointer
-    std::string m_unlinkedCause;       // of the tags without one that follow each other
+    int64_t m_unlinkedEnd = -1;  // of the last tag without a valid back-pointer
+    std::string m_unlinkedCause; // of the tags without one that follow each other
     Times m_times;
     std::optional<Jump> m_jump{}; // the last one
     std::string m_jumpCause;

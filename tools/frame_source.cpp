@@ -60,7 +60,7 @@ Json FrameRecord::Object(uint64_t number) const
             {"position", position}, {"crc32", fmt::format("{:08x}", crc)}};
 }
 
-std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream)
+std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream, LateStreams late)
 {
     for (;;) {
         const flvdmx::result<flvdmx::Frame> frame = input.file.next_frame(stream);
@@ -68,7 +68,7 @@ std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream)
             throw FileError(input.name, frame.error());
         if (!frame)
             return std::nullopt;
-        if (input.Has(frame->stream)) // frames of a stream that the open did not find come without its codec
+        if (input.Has(frame->stream) || late == LateStreams::delivered)
             return *frame;
     }
 }

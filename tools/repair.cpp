@@ -82,8 +82,8 @@ int RunRepair(const RewriteOptions& options)
     remux.allFrames = true;
     remux.continuous = !options.keepTimes;
     remux.offsetMs = input.info.start_time.count();
-    const RemuxReport report = Write(
-        options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    const RemuxReport report =
+        Write(options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));
@@ -95,8 +95,7 @@ int RunRepair(const RewriteOptions& options)
 
 int RunIndex(const RewriteOptions& options)
 {
-    Write(options, Input(options.file).info.size,
-          [&](const TakeTag& take) { return CopyTags(options.file, take); });
+    Write(options, Input(options.file).info.size, [&](const TakeTag& take) { return CopyTags(options.file, take); });
     return DONE;
 }
 

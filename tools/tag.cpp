@@ -5,7 +5,6 @@
 #include <array>
 #include <cctype>
 #include <fstream>
-#include <optional>
 #include <vector>
 
 #include <fmt/core.h>
@@ -154,6 +153,14 @@ std::string CodecOf(const Tag& tag, std::string_view fourcc)
     const auto* const named =
         std::find_if(NAMES.begin(), NAMES.end(), [=](const auto& name) { return name[0] == fourcc; });
     return fmt::format("enhanced FLV ({}FourCC '{}')", named == NAMES.end() ? "" : (*named)[1], fourcc);
+}
+
+std::optional<Tag> FirstIfLate(const std::string& path, flvdmx::Stream stream)
+{
+    RawTags tags(path);
+    int number = 0;
+    const std::optional<Tag> first = tags.FindFirst(stream, number);
+    return number >= PROBED_TAGS ? first : std::nullopt;
 }
 
 std::string WhyNoStream(const std::string& path, flvdmx::Stream stream)

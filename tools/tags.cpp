@@ -139,8 +139,9 @@ std::string UndefinedCodec(const Input& input)
                : fmt::format("the {}, is not defined by FLV: its frames hold everything after the codec byte", codec);
 }
 
-Losses::Losses(const Input& input)
-    : m_input(input), m_reader(input), m_end(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
+Losses::Losses(const Input& input, std::function<void(const Tag&)> script)
+    : m_input(input), m_script(std::move(script)), m_reader(input),
+      m_end(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
 {
 }
 
@@ -148,16 +149,25 @@ bool Losses::Take(const flvdmx::Frame& frame)
 {
     if (frame.position < 0)
         return false;
+    const int64_t before = m_bytes;
+    Inspect(m_end, frame.position);
+    m_end = EndOf(frame);
+    return m_bytes > before;
+}
+
+int64_t Losses::EndOf(const flvdmx::Frame& frame)
+{
+    if (!m_input.Has(frame.stream)) { // it was found after the open
+        const std::optional<Tag> tag = m_reader.At(frame.position);
+        return tag ? tag->End() : frame.position;
+    }
     Tag tag{}; // as its stream's are
     tag.position = frame.position;
     tag.type = frame.stream == flvdmx::Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
     tag.codec = static_cast<uint8_t>(tag.IsVideo() ? m_input.Instance().video_codec_filter
                                                    : m_input.Instance().audio_format_filter);
     tag.size = static_cast<uint32_t>(frame.data.size()) + tag.CodecHeaderSize();
-    const int64_t before = m_bytes;
-    Inspect(m_end, tag.position);
-    m_end = tag.End();
-    return m_bytes > before;
+    return tag.End();
 }
 
 // What is between two frames: mostly nothing, else configurations, script data, tags that are not played, or damage.
@@ -170,6 +180,8 @@ void Losses::Inspect(int64_t from, int64_t to)
             return;
         if (tag->IsFrame() || (!tag->IsScript() && !m_input.Has(tag->Stream())))
             Lose(tag->position, tag->End());
+        else if (m_script && tag->IsScript())
+            m_script(*tag);
         from = tag->End();
     }
 }

@@ -71,7 +71,9 @@ std::string UndefinedCodec(const Input& input);
 /** Watches for bytes that are left out between the frames of a file. */
 class Losses {
 public:
-    explicit Losses(const Input& input); /**< borrowed */
+    /** @param input borrowed
+     *  @param script called with each script tag between frames; may be empty */
+    explicit Losses(const Input& input, std::function<void(const Tag&)> script = {});
 
     /** Takes every frame of the file, in file order. @return true when bytes were left out before it */
     bool Take(const flvdmx::Frame& frame);
@@ -89,10 +91,12 @@ private:
         std::string why{}; // of the first tag
     };
 
+    int64_t EndOf(const flvdmx::Frame& frame);
     void Inspect(int64_t from, int64_t to);
     void Lose(int64_t from, int64_t to);
 
     const Input& m_input;
+    const std::function<void(const Tag&)> m_script;
     TagReader m_reader;
     int64_t m_end;
     int64_t m_bytes = 0;

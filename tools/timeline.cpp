@@ -27,8 +27,8 @@ struct Point {
     uint32_t size;
     bool video;
     bool keyframe;
-    bool loss;    // bytes were left out before it
-    bool jump;    // the timestamps jump
+    bool loss; // bytes were left out before it
+    bool jump; // the timestamps jump
 };
 
 std::vector<Point> ReadPoints(Input& input, Timeline& timeline)

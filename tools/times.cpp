@@ -2,6 +2,7 @@
 #include "tools/times.h"
 
 #include <algorithm>
+#include <cstdlib>
 #include <utility>
 
 namespace tool {
@@ -12,17 +13,23 @@ constexpr int64_t JITTER_MS = 1000;
 constexpr int64_t LONGEST_STEP_MS = 1000;   // from the frame before an odd one
 constexpr int64_t SLOWEST_STEP_MS = 600000; // of a stream that has few frames, such as slides
 
+// The time of a timestamp that is nearest to `near`: timestamps have 32 bits.
+int64_t Place(int64_t near, int64_t timestamp, int64_t shift)
+{
+    return near + static_cast<int32_t>(static_cast<uint32_t>(timestamp + shift - near));
+}
+
 } // namespace
 
-// The time that is nearest to that of the last frame: timestamps have 32 bits.
-int64_t Times::Place(const Lane& lane, int64_t timestamp, int64_t shift)
+int64_t Times::Near(int64_t timestamp) const
 {
-    return lane.time + static_cast<int32_t>(static_cast<uint32_t>(timestamp + shift - lane.time));
+    const int64_t time = Place(m_time, timestamp, m_shift);
+    return std::abs(time - m_time) <= m_limit ? time : m_time;
 }
 
 bool Times::Fits(const Lane& lane, int64_t timestamp, int64_t shift) const
 {
-    const int64_t time = Place(lane, timestamp, shift);
+    const int64_t time = Place(lane.time, timestamp, shift);
     const int64_t reached = shift == m_shift ? std::max(lane.time, m_latest) : lane.time;
     return time >= lane.time - JITTER_MS && time <= reached + lane.limit;
 }
@@ -63,7 +70,7 @@ bool Times::IsSlow(Lane& lane, int64_t step) const
 Times::Step Times::Judge(Lane& lane, int64_t timestamp)
 {
     if (Fits(lane, timestamp, lane.shift)) {
-        const int64_t step = Place(lane, timestamp, lane.shift) - lane.time;
+        const int64_t step = Place(lane.time, timestamp, lane.shift) - lane.time;
         if (std::exchange(lane.tried, std::nullopt))
             return Step::alone;
         return step < 0 ? Step::back : step > m_limit ? Step::pause : Step::on;
@@ -72,7 +79,7 @@ Times::Step Times::Judge(Lane& lane, int64_t timestamp)
         lane.tried.reset();
         return Step::jump;
     }
-    const int64_t step = Place(lane, timestamp, lane.shift) - lane.time;
+    const int64_t step = Place(lane.time, timestamp, lane.shift) - lane.time;
     if (IsSlow(lane, step))
         return Step::pause;
     int64_t next = lane.time + lane.step;
@@ -89,7 +96,7 @@ Times::Step Times::Take(flvdmx::Stream stream, int64_t timestamp)
     if (!lane.started)
         lane = {true, timestamp + m_shift, m_limit, 0, m_shift};
     const Step step = Judge(lane, timestamp);
-    const int64_t time = step == Step::odd ? lane.time + lane.step : Place(lane, timestamp, lane.shift);
+    const int64_t time = step == Step::odd ? lane.time + lane.step : Place(lane.time, timestamp, lane.shift);
     if (step == Step::on && time > lane.time)
         lane.step = std::min(time - lane.time, LONGEST_STEP_MS);
     lane.time = m_time = std::max(lane.time, time);

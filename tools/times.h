@@ -37,6 +37,9 @@ public:
     /** Takes the timestamp, in ms from anywhere, of the next frame in the file. */
     Step Take(flvdmx::Stream stream, int64_t timestamp);
 
+    /** @return the time of something at this timestamp after the last frame: not further from it than the limit */
+    int64_t Near(int64_t timestamp) const;
+
     int64_t Time() const { return m_time; }     /**< of the last frame, in ms */
     int64_t Latest() const { return m_latest; } /**< the latest of all frames so far */
     uint64_t Jumps() const { return m_jumps; }  /**< of the recording: both streams together make one */
@@ -53,7 +56,6 @@ private:
         int64_t oddStep = 0;            // to the last frame, when it was odd
     };
 
-    static int64_t Place(const Lane& lane, int64_t timestamp, int64_t shift);
     bool Fits(const Lane& lane, int64_t timestamp, int64_t shift) const;
     Step Judge(Lane& lane, int64_t timestamp);
     bool Join(Lane& lane, int64_t timestamp);
