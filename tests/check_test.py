@@ -1,5 +1,6 @@
 """`flvdmx check`: a file with known faults gives exactly these findings."""
 import json
+import re
 import struct
 import subprocess
 
@@ -37,6 +38,13 @@ def start(number):
 def jump(number, tag):
     """What is found at a tag that another time was given to."""
     return "jump", start(number), "video" if tag[0] == 9 else "audio", time_of(tag)
+
+
+def members(value):
+    """Names in a JSON document, without those that come from the file or name kinds of findings."""
+    if isinstance(value, dict):
+        return set(value).union(*(members(v) for name, v in value.items() if name not in ("metadata", "counts")))
+    return set().union(*map(members, value)) if isinstance(value, list) else set()
 
 
 def put(*changes):
@@ -143,6 +151,21 @@ class Check(Case):
         other = config[:-5] + bytes([config[-5] ^ 1]) + config[-4:]
         found = self.check(HEADER + b"".join(TAGS[:90]) + shift(other, time_of(TAGS[90])) + b"".join(TAGS[90:]))
         self.assertEqual([(f["kind"], f["offset"]) for f in found["notes"]], [("configuration", start(90))])
+
+    def test_manual_has_every_member_of_the_documents(self):
+        manual = (DATA.parent.parent / "docs/man/flvdmx.1").read_text().split(".Sh JSON OUTPUT")[1].split("\n.Sh")[0]
+        documented = set(re.findall(r"\w+", " ".join(re.findall(r"^(?:\.It )?\.?Va (.*)$", manual, re.M))))
+        streams = [self.write("one.flv", HEADER + b"".join(t for t in TAGS if t[0] != kind)) for kind in (8, 9)]
+        bad = self.write("bad.flv", replace(INDEXED, POSITIONS + 14, struct.pack(">d", 5)) + JUNK)
+        found = set()
+        for text in ("info --scan", "check", "frames", "seek --separate-audio 1", "seek 99"):
+            command, *arguments = text.split()
+            files = [sample("avc_aac")] if command in ("frames", "seek") else [
+                *streams, bad, self.write("two.flv", AVC_BYTES + AVC_BYTES[13:]), "missing.flv"]
+            printed = run(command, "--json", *files, *arguments).stdout
+            found |= members([json.loads(line) for line in printed.splitlines()] if command == "frames"
+                             else json.loads(printed))
+        self.assertEqual(found, documented)
 
     def test_folders(self):
         root = self.write("b.flv", AVC_BYTES).parent
