@@ -110,14 +110,14 @@ std::string LineText(const Json& finding)
     const std::string more =
         count > 1 ? fmt::format("; {} of these, the last at byte {}", count, finding["last_offset"].get<int64_t>())
                   : "";
-    return fmt::format("  byte {:<12} {:<17} {}{}\n", finding["offset"].get<int64_t>(),
+    return fmt::format("  byte {:<12} {:<17}  {}{}\n", finding["offset"].get<int64_t>(),
                        finding["kind"].get<std::string>(), finding["text"].get<std::string>(), more);
 }
 
 std::string Text(const std::string& file, const Json& result)
 {
     const Json& findings = result["findings"];
-    std::string text = fmt::format("{}: {}; {}, {} bytes, {} of them not playable\n", Printable(file),
+    std::string text = fmt::format("{}: {}; {}, {} bytes, {} of them not playable\n", DisplayName(file),
                                    findings.empty() ? "ok" : CountsText(result["counts"]),
                                    Plural(result["tags"].get<uint64_t>(), "tag"), result["size"].get<int64_t>(),
                                    result["lost_bytes"].get<int64_t>());

@@ -247,7 +247,7 @@ void WarnOfRest(const Input& input, const Growth& growth)
 void PrintGrowing(const FramesOptions& options)
 {
     if (options.file == STANDARD_STREAM)
-        throw FileError(options.file, "standard input cannot be followed: name the file that is being written");
+        throw FileError(options.file, "cannot be followed: name the file that is being written");
     Growth growth(options.file, options.timeoutSeconds);
     Input input = OpenGrowing(options, growth);
     const uint32_t wanted = WantedStreams(options);

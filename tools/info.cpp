@@ -233,7 +233,7 @@ std::string InfoText(const Subject& subject)
                                              subject.metadata.size() == 1 ? "property" : "properties"));
     for (const flvdmx::Property& property : subject.metadata)
         listing.Line("  " + Printable(property.name), ValueText(property));
-    return Printable(input.name) + "\n" + listing.Text();
+    return DisplayName(input.name) + "\n" + listing.Text();
 }
 
 template <typename Value> Json OrNull(bool known, const Value& value)

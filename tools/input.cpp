@@ -34,11 +34,11 @@ int SeekableStandardInput()
     for (ssize_t got = 0; (got = read(STDIN_FILENO, block.data(), block.size())) > 0;) {
         total += static_cast<uint64_t>(got);
         if (total > STANDARD_INPUT_MAX)
-            throw FileError(STANDARD_STREAM, fmt::format("standard input is larger than the {} MiB that are kept in "
-                                                         "memory: write it to a file first",
+            throw FileError(STANDARD_STREAM, fmt::format("it is larger than the {} MiB that are kept in memory: "
+                                                         "write it to a file first",
                                                          STANDARD_INPUT_MAX >> 20));
         if (write(copy, block.data(), static_cast<size_t>(got)) != got)
-            throw FileError(STANDARD_STREAM, fmt::format("cannot copy standard input: {}", std::strerror(errno)));
+            throw FileError(STANDARD_STREAM, fmt::format("cannot be copied to memory: {}", std::strerror(errno)));
     }
     return copy;
 }

@@ -6,10 +6,10 @@
 #include <string>
 
 #include "flvdmx/flvdmx.hpp"
+#include "tools/report.h"
 
 namespace tool {
 
-constexpr const char* STANDARD_STREAM = "-";          /**< names standard input or standard output */
 constexpr uint64_t STANDARD_INPUT_MAX = 256ULL << 20; /**< bytes taken from a pipe */
 
 /** @return the functions with which all files are read */

@@ -328,7 +328,10 @@ std::string DashAdvice(const std::vector<std::string>& arguments)
 int Usage(const CLI::App& app, const CLI::ParseError& error, const std::vector<std::string>& arguments)
 {
     const std::vector<CLI::App*> commands = app.get_subcommands();
-    Tell(fmt::format("flvdmx: {}\n{}Try 'flvdmx {}--help'.\n", Printable(error.what()), DashAdvice(arguments),
+    std::string text = error.what();
+    if (commands.empty() && app.remaining_size() > 0)
+        text = fmt::format("'{}' is not a command or option", app.remaining().front());
+    Tell(fmt::format("flvdmx: {}\n{}Try 'flvdmx {}--help'.\n", Printable(text), DashAdvice(arguments),
                      commands.empty() ? "" : commands.front()->get_name() + " "));
     return WRONG_USE;
 }

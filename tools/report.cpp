@@ -50,10 +50,15 @@ void Tell(const std::string& text)
     std::fputs(text.c_str(), stderr);
 }
 
+std::string DisplayName(const std::string& file)
+{
+    return file == STANDARD_STREAM ? "standard input" : Printable(file);
+}
+
 void Complain(const std::string& file, std::string_view text)
 {
     std::fflush(stdout); // keeps the order of output and messages on a terminal
-    Tell(fmt::format("flvdmx: {}: {}\n", Printable(file), text));
+    Tell(fmt::format("flvdmx: {}: {}\n", DisplayName(file), text));
 }
 
 void Complain(const FileError& error)

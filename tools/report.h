@@ -48,6 +48,11 @@ void Flush();
 /** Prints the document and a line end. */
 void PrintJson(const Json& document, int indent = -1);
 
+constexpr const char* STANDARD_STREAM = "-"; /**< names standard input or standard output */
+
+/** @return the name of an input file for people, printable */
+std::string DisplayName(const std::string& file);
+
 /** Writes `flvdmx: FILE: TEXT` to standard error. */
 void Complain(const std::string& file, std::string_view text);
 
