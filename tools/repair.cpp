@@ -14,6 +14,8 @@
 #include "tools/progress.h"
 #include "tools/remux.h"
 #include "tools/report.h"
+#include "tools/scan.h"
+#include "tools/tags.h"
 #include "tools/text.h"
 
 namespace tool {
@@ -55,6 +57,8 @@ RemuxOptions CutOptions(const RewriteOptions& options)
 {
     RemuxOptions remux;
     Input input(options.file);
+    WarnOfRestarts(input);
+    WarnOfUnplayed(input);
     if (options.fromMs) {
         const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
         if (!from)
@@ -84,6 +88,8 @@ int RunRepair(const RewriteOptions& options)
     remux.offsetMs = input.info.start_time.count();
     const RemuxReport report =
         Write(options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    WarnOfUnplayed(input, (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
+                              (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));

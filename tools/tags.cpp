@@ -178,6 +178,15 @@ std::string TagReader::ConfigFault(const Tag& tag)
     return "its AVC configuration is damaged";
 }
 
+void WarnOfUnplayed(const Input& input, uint32_t streams)
+{
+    TagReader reader(input);
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
+        if (const std::string& why = reader.WhyNoStream(stream);
+            !why.empty() && (streams & static_cast<uint32_t>(stream)) != 0)
+            Complain(input.name, fmt::format("warning: the {} is not played: {}", StreamName(stream), why));
+}
+
 TagReader::Numbered TagReader::First(flvdmx::Stream stream)
 {
     constexpr int TAGS = 5000; // at the beginning of the file

@@ -109,6 +109,9 @@ private:
     std::optional<std::string> m_noAudio;
 };
 
+/** Tells on standard error which of these streams (FLVD_STREAM_* bits) the file has but are not played, and why. */
+void WarnOfUnplayed(const Input& input, uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
+
 /** @return name and CodecID of a video codec */
 std::string VideoCodecName(flvdmx::VideoCodec codec);
 
