@@ -144,7 +144,7 @@ private:
         if (any(Mark::Kind::gap))
             entries.emplace_back("gap", "no frames");
         if (any(Mark::Kind::damage))
-            entries.emplace_back("damage", fmt::format("damage, {} bytes left out", m_timeline.bytesLeftOut));
+            entries.emplace_back("damage", fmt::format("{} bytes left out", m_timeline.bytesLeftOut));
         if (any(Mark::Kind::jump))
             entries.emplace_back("jump", "timestamps jump");
         DrawLegend(y, entries);
