@@ -65,6 +65,7 @@ RemuxOptions CutOptions(const RewriteOptions& options)
             throw FileError(options.file, from.error());
         remux.fromMs = from->count();
     }
+    remux.continuous = !options.keepTimes;
     const int64_t start = input.info.start_time.count();
     remux.offsetMs = options.keepTimes ? start : -std::max<int64_t>(remux.fromMs, 0);
     if (options.toMs) {
