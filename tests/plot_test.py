@@ -52,7 +52,7 @@ class Plot(Case):
     def test_time_axis_fits_any_length(self):
         header, tags = split_tags(sample_bytes("avc_only"))
         frames = [tag for tag in tags if tag[0] == 9 and tag[12] < 2]
-        frames += frames[1:] * 50
+        frames += frames[1:] * 80
         for seconds, first, last in (
                 (1, "0.0 s", "1.0 s"), (9, "0 s", "9 s"), (50, "0 s", "50 s"), (300, "0:00", "5:00"),
                 (5400, "0:00:00", "1:30:00"), (10800, "0:00:00", "3:00:00"), (2000000, "0:00:00", None)):

@@ -158,8 +158,8 @@ void Chain::JudgeTime(const Tag& tag)
     Lane& lane = LaneOf(tag);
     const Times::Step step = m_times.Take(tag.Stream(), tag.timestamp);
     const Jump here = {tag, std::exchange(lane.last, tag.timestamp)};
+    const bool known = lane.odd.has_value();
     if (step == Times::Step::jump) {
-        const bool known = lane.odd.has_value();
         for (Lane* const each : {&m_video, &m_audio})
             if (const auto odd = std::exchange(each->odd, std::nullopt))
                 AddJump(*odd);
@@ -172,7 +172,7 @@ void Chain::JudgeTime(const Tag& tag)
     AddAlone(lane); // another tag follows, and no jump
     if (step == Times::Step::odd)
         lane.odd = here;
-    else if (step == Times::Step::back)
+    else if (step == Times::Step::back || (step == Times::Step::alone && !known))
         AddJump(here);
     else if (step == Times::Step::pause)
         m_findings.Note("pause", tag.position,

@@ -16,8 +16,10 @@
 #include "tools/input.h"
 #include "tools/progress.h"
 #include "tools/report.h"
+#include "tools/scan.h"
 #include "tools/tags.h"
 #include "tools/text.h"
+#include "tools/times.h"
 
 namespace tool {
 
@@ -84,6 +86,8 @@ public:
         m_progress.Show(m_number, frame.timeMs);
     }
 
+    bool Started() const { return m_started; }
+
     // There is no later frame: one that is exactly at the time sought may have waited for it.
     void Finish()
     {
@@ -114,7 +118,8 @@ private:
 
     void Show(const FrameRecord& frame)
     {
-        if (m_options.toMs && frame.timeMs > *m_options.toMs) {
+        m_times.Take(frame.stream, frame.timeMs);
+        if (m_options.toMs && m_times.Time() > *m_options.toMs) {
             m_open &= ~static_cast<uint32_t>(frame.stream);
             return;
         }
@@ -141,6 +146,7 @@ private:
     bool m_started;
     std::vector<FrameRecord> m_held;
     uint64_t m_number = 0;
+    Times m_times; // a single wrong time does not end the range
     Progress m_progress;
 };
 
@@ -157,7 +163,7 @@ uint32_t WantedStreams(const FramesOptions& options)
     return options.keyframes ? options.streams & FLVD_STREAM_VIDEO : options.streams;
 }
 
-// A file that cannot seek is read from its beginning: the printer waits for the time.
+// Where no seek gets through, as in much damage, the file is read from its beginning: the printer waits for the time.
 void SeekToStart(Input& input, int32_t ms)
 {
     const flvdmx::error error = input.file.seek(flvdmx::Milliseconds(ms), flvdmx::SeekMode::backward).error();
@@ -166,8 +172,6 @@ void SeekToStart(Input& input, int32_t ms)
             input.name,
             fmt::format("nothing is at {}: the last frame is at {}", FormatTime(ms), FormatTime(input.info.duration)),
             error);
-    if (error.kind() != flvdmx::Kind::none && error.code() != FLVD_ERR_NOT_SEEKABLE)
-        throw FileError(input.name, error);
 }
 
 // With two readers the frames come by time: what is between them is looked at in another pass, in file order.
@@ -194,14 +198,19 @@ void PrintComplete(const FramesOptions& options)
         throw FileError(options.file, fmt::format("the file has no {} stream{}", StreamName(wanted),
                                                   why.empty() ? "" : " that is played: " + why));
     }
+    WarnOfUnplayed(input);
+    if (options.fromMs || options.toMs)
+        WarnOfRestarts(input);
     if (options.fromMs)
         SeekToStart(input, *options.fromMs);
     input.file.accept_all_times();
     Losses losses(input);
     FrameSource source(input, streams, &losses);
     FramePrinter printer(options, streams);
+    ReadProgress progress(input.name, input.info.size);
     while (!printer.Done()) {
         const std::optional<FrameRecord> frame = source.Next();
+        progress.Hide(); // it shows only what takes long
         if (!frame)
             break;
         printer.Take(*frame);
@@ -253,12 +262,17 @@ void PrintGrowing(const FramesOptions& options)
     const uint32_t wanted = WantedStreams(options);
     FramePrinter printer(options, wanted & (TagReader(input).AnnouncedStreams() | input.Streams()));
     FrameSource source(input, wanted);
+    bool told = false;
     while (!printer.Done()) {
         if (const std::optional<FrameRecord> frame = source.Next()) {
             printer.Take(*frame);
-        } else if (growth.Wait()) {
-            source.Refresh();
         } else {
+            if (options.fromMs && !printer.Started() && !std::exchange(told, true))
+                Complain(input.name, fmt::format("note: waits for {}", FormatTime(*options.fromMs)));
+            if (growth.Wait()) {
+                source.Refresh();
+                continue;
+            }
             printer.Finish();
             WarnOfRest(input, growth);
             return;

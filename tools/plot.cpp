@@ -16,6 +16,7 @@
 #include "tools/output_file.h"
 #include "tools/report.h"
 #include "tools/svg.h"
+#include "tools/tags.h"
 #include "tools/text.h"
 #include "tools/timeline.h"
 
@@ -143,7 +144,7 @@ private:
         if (any(Mark::Kind::gap))
             entries.emplace_back("gap", "no frames");
         if (any(Mark::Kind::damage))
-            entries.emplace_back("damage", fmt::format("damage, {} bytes left out", m_timeline.bytesLeftOut));
+            entries.emplace_back("damage", fmt::format("{} bytes left out", m_timeline.bytesLeftOut));
         if (any(Mark::Kind::jump))
             entries.emplace_back("jump", "timestamps jump");
         DrawLegend(y, entries);
@@ -392,6 +393,7 @@ int RunPlot(const PlotOptions& options)
             throw FileError(options.out, "the drawing is SVG, not a picture of that kind: name it .svg");
     Input input(options.file);
     input.WarnIfCutShort();
+    WarnOfUnplayed(input);
     OutputFile file(options.out, options.file, options.force);
     input.file.accept_all_times();
     const Timeline timeline = ReadTimeline(input, COLUMNS);

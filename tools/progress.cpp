@@ -46,6 +46,12 @@ void Progress::Wipe()
     m_shown = false;
 }
 
+void Progress::Postpone(Clock::duration delay)
+{
+    if (m_visible)
+        m_next = Clock::now() + delay;
+}
+
 void Progress::ShowLine(const std::string& name, const std::string& text)
 {
     const size_t columns = TerminalColumns();
@@ -53,7 +59,7 @@ void Progress::ShowLine(const std::string& name, const std::string& text)
                stderr);
     std::fflush(stderr);
     m_shown = true;
-    m_next = Clock::now() + INTERVAL;
+    Postpone(INTERVAL);
 }
 
 void Progress::Show(uint64_t frames, int64_t timeMs)
@@ -86,6 +92,12 @@ ReadProgress::ReadProgress(const std::string& name, int64_t size, int passes)
 ReadProgress::~ReadProgress()
 {
     g_readProgress = nullptr;
+}
+
+void ReadProgress::Hide()
+{
+    Wipe();
+    Postpone(BAR_DELAY);
 }
 
 void ReadProgress::ShowRead(int64_t position)

@@ -28,6 +28,7 @@ protected:
 
     Progress(bool visible, Clock::duration delay) : m_visible(visible), m_next(Clock::now() + delay) {}
     bool IsDue() const { return m_visible && Clock::now() >= m_next; }
+    void Postpone(Clock::duration delay);
     void ShowLine(const std::string& name, const std::string& text); /**< the name is shortened to fit the terminal */
 
 private:
@@ -61,6 +62,9 @@ public:
     ReadProgress& operator=(const ReadProgress&) = delete;
 
     void NextPass() { m_pass += m_size; }
+
+    /** Makes room for output; the bar appears again when nothing has come for a second. */
+    void Hide();
 
     /** Shows that a file is being read at this position. */
     static void ShowRead(int64_t position);

@@ -99,7 +99,7 @@ public:
         if (m_options.toMs == std::numeric_limits<int64_t>::max())
             m_losses.Finish();
         m_report.jumps = m_times.Jumps();
-        m_report.bytesLeftOut = m_losses.Bytes();
+        m_report.bytesLeftOut += m_losses.Bytes();
         return m_report;
     }
 
@@ -135,6 +135,10 @@ private:
         }
         if (!IsWanted(frame.time.count()))
             return;
+        if (tag.IsAvc() && track.config.empty()) { // nothing decodes it
+            m_report.bytesLeftOut += tag.End() - tag.position;
+            return;
+        }
         int64_t time = frame.time.count() + m_options.offsetMs;
         if (m_options.continuous) {
             m_times.Take(frame.stream, time);

@@ -14,6 +14,8 @@
 #include "tools/progress.h"
 #include "tools/remux.h"
 #include "tools/report.h"
+#include "tools/scan.h"
+#include "tools/tags.h"
 #include "tools/text.h"
 
 namespace tool {
@@ -55,12 +57,15 @@ RemuxOptions CutOptions(const RewriteOptions& options)
 {
     RemuxOptions remux;
     Input input(options.file);
+    WarnOfRestarts(input);
+    WarnOfUnplayed(input);
     if (options.fromMs) {
         const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
         if (!from)
             throw FileError(options.file, from.error());
         remux.fromMs = from->count();
     }
+    remux.continuous = !options.keepTimes;
     const int64_t start = input.info.start_time.count();
     remux.offsetMs = options.keepTimes ? start : -std::max<int64_t>(remux.fromMs, 0);
     if (options.toMs) {
@@ -84,6 +89,8 @@ int RunRepair(const RewriteOptions& options)
     remux.offsetMs = input.info.start_time.count();
     const RemuxReport report =
         Write(options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    WarnOfUnplayed(input, (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
+                              (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));

@@ -5,6 +5,7 @@
 
 #include "tools/frame_source.h"
 #include "tools/progress.h"
+#include "tools/report.h"
 #include "tools/tags.h"
 #include "tools/times.h"
 
@@ -43,7 +44,7 @@ FileScan ScanFile(const std::string& name)
     return scan;
 }
 
-// The times of a recording that did not restart rise along the file, up to the last one.
+// The times of each stream of a recording that did not restart rise along the file, up to the last one.
 bool SeemsToRestart(const Input& input)
 {
     constexpr int64_t PLACES = 16;
@@ -53,17 +54,26 @@ bool SeemsToRestart(const Input& input)
     options.restarting_timestamps = true;
     const Input any(input.name, options);
     TagReader reader(any);
-    uint32_t latest = 0;
+    uint32_t video = 0; // the latest times
+    uint32_t audio = 0;
     for (int64_t i = 1; i < PLACES; ++i) {
         const int64_t place = input.info.size / PLACES * i;
         const std::optional<Tag> tag = reader.Find(place, place + NEAR);
         if (!tag || tag->IsScript())
             continue;
+        uint32_t& latest = tag->IsVideo() ? video : audio;
         if (tag->timestamp + JITTER_MS < latest || tag->timestamp > input.Instance().last_ts + JITTER_MS)
             return true;
         latest = std::max(latest, tag->timestamp);
     }
     return false;
+}
+
+void WarnOfRestarts(const Input& input)
+{
+    if (SeemsToRestart(input))
+        Complain(input.name, "warning: the timestamps jump, so a time may be found in the wrong part: 'flvdmx repair' "
+                             "makes them continuous");
 }
 
 } // namespace tool

@@ -28,6 +28,9 @@ FileScan ScanFile(const std::string& name);
 /** @return true when tags here and there in the file have times that only a restart explains; a few reads */
 bool SeemsToRestart(const Input& input);
 
+/** Tells on standard error when times name no single place in the file. */
+void WarnOfRestarts(const Input& input);
+
 } // namespace tool
 
 #endif

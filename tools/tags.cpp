@@ -127,6 +127,15 @@ std::string ConfigFault(const Input& input)
     return missing ? "the audio does not start with its AAC configuration, without which it cannot be decoded" : "";
 }
 
+void WarnOfUnplayed(const Input& input, uint32_t streams)
+{
+    TagReader reader(input);
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
+        if (const std::string& why = reader.WhyNoStream(stream);
+            !why.empty() && (streams & static_cast<uint32_t>(stream)) != 0)
+            Complain(input.name, fmt::format("warning: the {} is not played: {}", StreamName(stream), why));
+}
+
 std::string UndefinedCodec(const Input& input)
 {
     std::string codec;

@@ -68,6 +68,9 @@ std::string ConfigFault(const Input& input);
 /** @return a text about a codec of the input that FLV does not define; empty when it defines them */
 std::string UndefinedCodec(const Input& input);
 
+/** Tells on standard error which of these streams (FLVD_STREAM_* bits) the file has but are not played, and why. */
+void WarnOfUnplayed(const Input& input, uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
+
 /** Watches for bytes that are left out between the frames of a file. */
 class Losses {
 public:

@@ -4,6 +4,7 @@
 #include <algorithm>
 #include <cmath>
 #include <optional>
+#include <utility>
 
 #include "tools/frame_source.h"
 #include "tools/progress.h"
@@ -148,6 +149,21 @@ private:
     bool m_leadBreaks = true;
 };
 
+// Marks that would touch in the drawing become one. A jump stays a moment.
+void MergeMarks(std::vector<Mark>& marks, double distance)
+{
+    const auto order = [](const Mark& mark) { return std::make_pair(mark.kind, mark.from); };
+    std::sort(marks.begin(), marks.end(), [&](const Mark& a, const Mark& b) { return order(a) < order(b); });
+    std::vector<Mark> merged;
+    for (const Mark& mark : marks) {
+        if (merged.empty() || merged.back().kind != mark.kind || mark.from > merged.back().to + distance)
+            merged.push_back(mark);
+        else if (mark.kind != Mark::Kind::jump)
+            merged.back().to = std::max(merged.back().to, mark.to);
+    }
+    marks = std::move(merged);
+}
+
 } // namespace
 
 void Range::Take(double value)
@@ -175,6 +191,7 @@ Timeline ReadTimeline(Input& input, size_t columns)
     Gatherer gatherer(timeline);
     for (const Point& point : points)
         gatherer.Take(point);
+    MergeMarks(timeline.marks, timeline.duration / static_cast<double>(columns));
     return timeline;
 }
 

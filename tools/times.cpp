@@ -29,9 +29,11 @@ int64_t Times::Near(int64_t timestamp) const
 
 bool Times::Fits(const Lane& lane, int64_t timestamp, int64_t shift) const
 {
-    const int64_t time = Place(lane.time, timestamp, shift);
+    const int64_t time = Place(lane.placed, timestamp, shift);
     const int64_t reached = shift == m_shift ? std::max(lane.time, m_latest) : lane.time;
-    return time >= lane.time - JITTER_MS && time <= reached + lane.limit;
+    const bool wasAlone = shift == lane.shift && lane.placed - lane.before > JITTER_MS; // the last frame, too late
+    return time >= (wasAlone ? lane.before : lane.placed) - JITTER_MS && time >= lane.time - m_limit &&
+           time <= reached + lane.limit;
 }
 
 // Moves the lane to where the other one, or the odd frame before, has jumped to.
@@ -69,9 +71,9 @@ bool Times::IsSlow(Lane& lane, int64_t step) const
 
 Times::Step Times::Judge(Lane& lane, int64_t timestamp)
 {
+    const int64_t step = Place(lane.placed, timestamp, lane.shift) - lane.placed;
     if (Fits(lane, timestamp, lane.shift)) {
-        const int64_t step = Place(lane.time, timestamp, lane.shift) - lane.time;
-        if (std::exchange(lane.tried, std::nullopt))
+        if (std::exchange(lane.tried, std::nullopt) || step < -JITTER_MS)
             return Step::alone;
         return step < 0 ? Step::back : step > m_limit ? Step::pause : Step::on;
     }
@@ -79,7 +81,6 @@ Times::Step Times::Judge(Lane& lane, int64_t timestamp)
         lane.tried.reset();
         return Step::jump;
     }
-    const int64_t step = Place(lane.time, timestamp, lane.shift) - lane.time;
     if (IsSlow(lane, step))
         return Step::pause;
     int64_t next = lane.time + lane.step;
@@ -93,13 +94,24 @@ Times::Step Times::Judge(Lane& lane, int64_t timestamp)
 Times::Step Times::Take(flvdmx::Stream stream, int64_t timestamp)
 {
     Lane& lane = m_lanes.at(stream == flvdmx::Stream::video ? 0 : 1);
-    if (!lane.started)
-        lane = {true, timestamp + m_shift, m_limit, 0, m_shift};
+    if (!lane.started) {
+        const bool first = !m_lanes[0].started && !m_lanes[1].started;
+        if (first && timestamp > INT32_MAX) // soon to wrap around: starts at 0 instead
+            m_shift = -timestamp;
+        const int64_t time = timestamp + m_shift;
+        lane = {true, time, time, time, m_limit, 0, m_shift};
+    }
     const Step step = Judge(lane, timestamp);
-    const int64_t time = step == Step::odd ? lane.time + lane.step : Place(lane.time, timestamp, lane.shift);
-    if (step == Step::on && time > lane.time)
-        lane.step = std::min(time - lane.time, LONGEST_STEP_MS);
-    lane.time = m_time = std::max(lane.time, time);
+    if (step == Step::odd) {
+        lane.time += lane.step;
+    } else {
+        const int64_t placed = Place(lane.placed, timestamp, lane.shift);
+        if (step == Step::on && placed > lane.placed)
+            lane.step = std::min(placed - lane.placed, LONGEST_STEP_MS);
+        lane.before = std::exchange(lane.placed, placed);
+        lane.time = std::max(lane.time, placed);
+    }
+    m_time = lane.time;
     m_latest = std::max(m_latest, m_time);
     return step;
 }

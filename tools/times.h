@@ -27,7 +27,7 @@ public:
         back,  /**< a little too early */
         pause, /**< beyond the limit, but the other stream has been there, or all frames are as far apart */
         odd,   /**< jumps, or is alone with its time: the next frame tells */
-        alone, /**< it continues from the frame before the last one, which had a wrong time */
+        alone, /**< it continues from the frame before the last one, which alone had a wrong time */
         jump   /**< the stream has jumped, with this frame or with the odd one before it */
     };
 
@@ -49,6 +49,8 @@ private:
     struct Lane {
         bool started = false;
         int64_t time = 0;               // of the last frame
+        int64_t placed = 0;             // of the last frame that was not odd; less than `time` while that stands still
+        int64_t before = 0;             // the same of the one before it
         int64_t limit = 0;              // largest step forward
         int64_t step = 0;               // usual one
         int64_t shift = 0;              // of the last frame that was not odd
