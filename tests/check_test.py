@@ -109,11 +109,11 @@ class Check(Case):
         tags = split_tags(INDEXED)[1]
         delta = 13 + sum(map(len, tags[:next(i for i, t in enumerate(tags) if t[0] == 9 and t[11] >> 4 == 2)]))
         for array, number, value, words in (
-                (POSITIONS, 3, 9999, "leads to byte 9999, where no keyframe is"),
-                (POSITIONS, 2, delta, f"byte {delta}, where no keyframe is"), (POSITIONS, 1, -5, "byte -5, which"),
+                (POSITIONS, 3, 9999, "leads to byte 9999, where there is no keyframe"),
+                (POSITIONS, 2, delta, f"byte {delta}, where there is no keyframe"), (POSITIONS, 1, -5, "byte -5, which"),
                 (POSITIONS, 5, 1e9, "byte 1000000000, which the file does not have"),
-                (POSITIONS, 4, float("nan"), "byte nan"), (TIMES, 1, 1.5, "says 0:00:01.500, the keyframe at byte"),
-                (TIMES, 4, float("inf"), "says inf s"), (TIMES, 2, 1.2, None)):
+                (POSITIONS, 4, float("nan"), "byte nan"), (TIMES, 1, 1.5, "states 0:00:01.500, but the keyframe at byte"),
+                (TIMES, 4, float("inf"), "states inf s"), (TIMES, 2, 1.2, None)):
             with self.subTest(array=array, value=value):
                 found = self.check(replace(INDEXED, array + 4 + 9 * number + 1, struct.pack(">d", value)))["findings"]
                 self.assertEqual([(f["kind"], f["entry"]) for f in found], [("index", number + 1)] if words else [])

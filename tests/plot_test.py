@@ -97,7 +97,7 @@ class Plot(Case):
 
     def test_output(self):
         path = self.write("in.flv", sample_bytes("aac_only"))
-        self.tool("plot", path, "-o", "x.PNG", code=1, stderr=".*the drawing is SVG.*\n")
+        self.tool("plot", path, "-o", "x.PNG", code=1, stderr=".*the drawing is an SVG.*\n")
         drawing = self.tool("plot", path, "-o", "-")
         (path.parent / "out.svg").write_text("mine")
         self.tool("plot", path, "-o", path.parent / "out.svg", code=1, stderr=".*exists.*\n")

@@ -472,7 +472,7 @@ class Follow(Case):
     def test_growing_file(self):
         """Files that come whole, and writers that stop; side by side, since most wait for their timeout."""
         early = sum(f[1] <= 300 for f in AVC.frames)
-        broken = r"flvdmx: .*warning: the last \d+ bytes hold no whole frame\n"
+        broken = r"flvdmx: .*warning: the last \d+ bytes are not a complete frame\n"
         cases = [("avc_aac", None, "4", None, ""), ("avc_aac", None, "4 --separate-audio", None, ""),
                  ("h263_mp3", None, "4", None, ""), ("avc_aac_index", None, "4 --separate-audio", None, ""),
                  ("aac_only", None, "4", None, ""), ("truncated", None, "4", None, broken),

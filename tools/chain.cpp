@@ -176,7 +176,7 @@ void Chain::JudgeTime(const Tag& tag)
         AddJump(here);
     else if (step == Times::Step::pause)
         m_findings.Note("pause", tag.position,
-                        fmt::format("no {} from {} to {}", StreamName(tag.Stream()), FormatTime(here.from),
+                        fmt::format("no {} frames from {} to {}", StreamName(tag.Stream()), FormatTime(here.from),
                                     FormatTime(tag.timestamp)));
 }
 
@@ -203,7 +203,7 @@ void Chain::AddAlone(Lane& lane)
         return;
     const char* const stream = StreamName(odd->tag.Stream());
     m_findings.Add("jump", "alone", odd->tag.position,
-                   fmt::format("a single {} tag has the time {}, the one before it {}", stream,
+                   fmt::format("a single {} tag has the time {}, after one at {}", stream,
                                FormatTime(odd->tag.timestamp), FormatTime(odd->from)),
                    {{"stream", stream}, {"from_ms", odd->from}, {"to_ms", odd->tag.timestamp}});
 }
@@ -229,7 +229,7 @@ void Chain::JudgeGaps(const Tag& tag)
     if (std::abs(lead) > *m_limits.maxGapMs)
         m_findings.Add("interleaving", "all", tag.position,
                        fmt::format("audio is {} s {} video in the file", static_cast<double>(std::abs(lead)) / 1000,
-                                   lead > 0 ? "ahead of" : "after"));
+                                   lead > 0 ? "ahead of" : "behind"));
 }
 
 } // namespace tool

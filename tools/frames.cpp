@@ -170,7 +170,7 @@ void SeekToStart(Input& input, int32_t ms)
     if (error.kind() == flvdmx::Kind::miss)
         throw FileError(
             input.name,
-            fmt::format("nothing is at {}: the last frame is at {}", FormatTime(ms), FormatTime(input.info.duration)),
+            fmt::format("there is no frame at {}: the last one is at {}", FormatTime(ms), FormatTime(input.info.duration)),
             error);
 }
 
@@ -250,7 +250,7 @@ void WarnOfRest(const Input& input, const Growth& growth)
     const int64_t rest = growth.Size() - std::max(__FLV_DMX__fioTell64(instance.main_reader),
                                                   __FLV_DMX__fioTell64(instance.audio_reader));
     if (rest > 0)
-        Complain(input.name, fmt::format("warning: the last {} bytes hold no whole frame", rest));
+        Complain(input.name, fmt::format("warning: the last {} bytes are not a complete frame", rest));
 }
 
 void PrintGrowing(const FramesOptions& options)
@@ -268,7 +268,7 @@ void PrintGrowing(const FramesOptions& options)
             printer.Take(*frame);
         } else {
             if (options.fromMs && !printer.Started() && !std::exchange(told, true))
-                Complain(input.name, fmt::format("note: waits for {}", FormatTime(*options.fromMs)));
+                Complain(input.name, fmt::format("note: waiting for {}", FormatTime(*options.fromMs)));
             if (growth.Wait()) {
                 source.Refresh();
                 continue;

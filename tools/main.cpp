@@ -252,6 +252,7 @@ void AddCheck(CLI::App* command, CheckOptions& options)
         "Notes, which are not faults:\n"
         "  configuration      a codec configuration changes\n"
         "  codec              FLV does not define a codec of the file\n"
+        "  pause              a stream has no frames for longer than --jump, but the other one has\n"
         "The first 1000 findings of a file are listed; all are counted.\n\n"
         "Exit status: 0 no findings, 1 a file has findings or could not be read, 2 usage error.");
 }

@@ -144,7 +144,7 @@ private:
         if (any(Mark::Kind::gap))
             entries.emplace_back("gap", "no frames");
         if (any(Mark::Kind::damage))
-            entries.emplace_back("damage", fmt::format("{} bytes left out", m_timeline.bytesLeftOut));
+            entries.emplace_back("damage", fmt::format("{} bytes skipped", m_timeline.bytesLeftOut));
         if (any(Mark::Kind::jump))
             entries.emplace_back("jump", "timestamps jump");
         DrawLegend(y, entries);
@@ -390,7 +390,7 @@ int RunPlot(const PlotOptions& options)
                    [](unsigned char c) { return std::tolower(c); });
     for (const char* const picture : {".png", ".jpg", ".jpeg", ".gif", ".webp", ".bmp", ".pdf"})
         if (extension == picture)
-            throw FileError(options.out, "the drawing is SVG, not a picture of that kind: name it .svg");
+            throw FileError(options.out, "the drawing is an SVG file: use a name that ends in .svg");
     Input input(options.file);
     input.WarnIfCutShort();
     WarnOfUnplayed(input);

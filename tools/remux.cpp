@@ -34,7 +34,7 @@ public:
     {
         const bool readable = m_file != nullptr && position >= 0;
         if (!readable || pread(fileno(m_file.get()), bytes, size, position) != static_cast<ssize_t>(size))
-            throw FileError(m_name, "the file cannot be read");
+            throw FileError(m_name, "cannot be read");
     }
 
 private:
@@ -243,7 +243,7 @@ RemuxReport CopyTags(const std::string& file, const TakeTag& take)
         raw.Read(position + TAG_HEADER_SIZE, bytes.data(), bytes.size());
         if (BigEndian(&bytes[tag->size], BACK_POINTER_SIZE) != tag->size + TAG_HEADER_SIZE)
             throw FileError(file,
-                            fmt::format("the size after the tag at byte {} is wrong: use 'flvdmx repair'", position));
+                            fmt::format("the back-pointer of the tag at byte {} is wrong: use 'flvdmx repair'", position));
         if (position != metadata)
             take({static_cast<uint8_t>(tag->type),
                   tag->timestamp,

@@ -31,7 +31,7 @@ RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
     FlvLayout layout;
     const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); });
     if (report.videoFrames + report.audioFrames == 0)
-        throw FileError(options.file, "there is no frame to write");
+        throw FileError(options.file, "there are no frames to write");
     uint64_t written = 0;
     if (!options.dryRun) {
         OutputFile out(options.out, options.file, options.force);
@@ -96,7 +96,7 @@ int RunRepair(const RewriteOptions& options)
                          Plural(report.jumps, "place")));
     const int64_t leftOut = report.bytesLeftOut + input.Rest();
     if (leftOut != 0)
-        Tell(fmt::format("{}: {} left out\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
+        Tell(fmt::format("{}: {} skipped\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
     return DONE;
 }
 
