@@ -30,12 +30,12 @@ struct FramesOptions {
     Format format = Format::text;
     uint32_t streams = BOTH_STREAMS;                       /**< FLVD_STREAM_* bits wanted */
     bool keyframes = false;                                /**< only video keyframes */
-    uint64_t count = std::numeric_limits<uint64_t>::max(); /**< frames after which to stop */
+    uint64_t count = std::numeric_limits<uint64_t>::max(); /**< stop after this many frames */
     bool separateAudio = false;
     std::optional<int32_t> fromMs{};
     std::optional<int32_t> toMs{};
     bool follow = false;
-    double timeoutSeconds = 5; /**< following: time without growth after which to stop */
+    double timeoutSeconds = 5; /**< with follow: stop after this time without growth */
 };
 
 struct SeekOptions {

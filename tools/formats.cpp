@@ -103,7 +103,7 @@ public:
 
     std::string Configure(flvdmx::Bytes config) override
     {
-        if (config.empty()) // it may still come
+        if (config.empty()) // it may still follow
             return {};
         const AacConfig aac = ParseAacConfig(config);
         if (std::string refusal = Refusal(aac); !refusal.empty())

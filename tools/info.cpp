@@ -48,7 +48,7 @@ uint32_t IndexEntries(const Input& input)
     return index.times_offset != 0 && index.positions_offset != 0 ? index.entry_count : 0;
 }
 
-// Those between the frames, and those after the last tag.
+// Skipped between the frames, and after the last tag.
 uint64_t BytesSkipped(const Subject& subject)
 {
     return static_cast<uint64_t>(subject.scan->bytesLeftOut + subject.input.Rest());

@@ -41,7 +41,7 @@ void Flush()
 
 void PrintJson(const Json& document, int indent)
 {
-    // A file name may be invalid UTF-8, a JSON document may not.
+    // A file name may be invalid UTF-8; a JSON document must not.
     Print(document.dump(indent, ' ', false, Json::error_handler_t::replace) + "\n");
 }
 

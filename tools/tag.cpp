@@ -116,7 +116,7 @@ Tag Tag::Parse(int64_t position, const uint8_t* bytes, size_t available)
     return tag;
 }
 
-// AVC configuration and end of sequence and AAC configuration hold nothing to play.
+// Codec configurations and the end of an AVC sequence are not played.
 bool Tag::IsFrame() const
 {
     if ((!IsVideo() && !IsAudio()) || size < CodecHeaderSize())
@@ -171,8 +171,8 @@ std::string WhyNoStream(const std::string& path, flvdmx::Stream stream)
     return first ? Reason(tags, *first, number) : "";
 }
 
-// Without a stream every reason counts. When a stream was found but none of its frames, it is enhanced FLV, or damage
-// of which no more is known here.
+// If no stream was found, each has a reason. If one was found but none of its frames, the file is enhanced FLV, or
+// damaged in a way of which no more is known here.
 std::string WhyNothingIsPlayed(const std::string& path, int32_t code)
 {
     std::string text;

@@ -1,4 +1,4 @@
-// One tag: what its header says, and why a stream whose tags are there is not played.
+// One tag: its header, its codec, and why the stream that it belongs to may not be played.
 #ifndef FLVDMX_TOOLS_TAG_H
 #define FLVDMX_TOOLS_TAG_H
 
