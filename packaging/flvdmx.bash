@@ -17,8 +17,10 @@ _flvdmx() {
         [cut]="--help --dry-run --force --from --keep-times --output --to"
         [help]="--help"
     )
-    local command=""
-    [[ $cword -lt 2 ]] || command=${words[1]}
+    local command="" word
+    for word in "${words[@]:1:cword-1}"; do # --verbose may come first
+        [[ $word == -* ]] || { command=$word; break; }
+    done
     case $prev in
     --stream) COMPREPLY=($(compgen -W "video audio" -- "$cur")) ;;
     --mode) COMPREPLY=($(compgen -W "auto backward forward" -- "$cur")) ;;

@@ -20,7 +20,7 @@ def help_of(*command):
 
 
 def from_help():
-    commands = re.findall(r"^  (\w+)  ", help_of().split("Subcommands:")[1], re.M)
+    commands = re.findall(r"^  (\w+)  ", help_of().split("Commands:")[1], re.M)
     texts = {TOP: help_of(), **{command: help_of(command) for command in commands}}
     return {name: set(re.findall(r"^  (?:-\w,)?(--[\w-]+)", text, re.M)) for name, text in texts.items()}
 

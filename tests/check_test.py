@@ -1,5 +1,6 @@
 """`flvdmx check`: a file with known faults gives exactly these findings."""
 import json
+import re
 import struct
 import subprocess
 
@@ -37,6 +38,13 @@ def start(number):
 def jump(number, tag):
     """What is found at a tag that another time was given to."""
     return "jump", start(number), "video" if tag[0] == 9 else "audio", time_of(tag)
+
+
+def members(value):
+    """Names in a JSON document, without those that come from the file or name kinds of findings."""
+    if isinstance(value, dict):
+        return set(value).union(*(members(v) for name, v in value.items() if name not in ("metadata", "counts")))
+    return set().union(*map(members, value)) if isinstance(value, list) else set()
 
 
 def put(*changes):
@@ -101,11 +109,11 @@ class Check(Case):
         tags = split_tags(INDEXED)[1]
         delta = 13 + sum(map(len, tags[:next(i for i, t in enumerate(tags) if t[0] == 9 and t[11] >> 4 == 2)]))
         for array, number, value, words in (
-                (POSITIONS, 3, 9999, "leads to byte 9999, where no keyframe is"),
-                (POSITIONS, 2, delta, f"byte {delta}, where no keyframe is"), (POSITIONS, 1, -5, "byte -5, which"),
+                (POSITIONS, 3, 9999, "leads to byte 9999, where there is no keyframe"),
+                (POSITIONS, 2, delta, f"byte {delta}, where there is no keyframe"), (POSITIONS, 1, -5, "byte -5, which"),
                 (POSITIONS, 5, 1e9, "byte 1000000000, which the file does not have"),
-                (POSITIONS, 4, float("nan"), "byte nan"), (TIMES, 1, 1.5, "says 0:00:01.500, the keyframe at byte"),
-                (TIMES, 4, float("inf"), "says inf s"), (TIMES, 2, 1.2, None)):
+                (POSITIONS, 4, float("nan"), "byte nan"), (TIMES, 1, 1.5, "states 0:00:01.500, but the keyframe at byte"),
+                (TIMES, 4, float("inf"), "states inf s"), (TIMES, 2, 1.2, None)):
             with self.subTest(array=array, value=value):
                 found = self.check(replace(INDEXED, array + 4 + 9 * number + 1, struct.pack(">d", value)))["findings"]
                 self.assertEqual([(f["kind"], f["entry"]) for f in found], [("index", number + 1)] if words else [])
@@ -144,6 +152,21 @@ class Check(Case):
         found = self.check(HEADER + b"".join(TAGS[:90]) + shift(other, time_of(TAGS[90])) + b"".join(TAGS[90:]))
         self.assertEqual([(f["kind"], f["offset"]) for f in found["notes"]], [("configuration", start(90))])
 
+    def test_manual_has_every_member_of_the_documents(self):
+        manual = (DATA.parent.parent / "docs/man/flvdmx.1").read_text().split(".Sh JSON OUTPUT")[1].split("\n.Sh")[0]
+        documented = set(re.findall(r"\w+", " ".join(re.findall(r"^(?:\.It )?\.?Va (.*)$", manual, re.M))))
+        streams = [self.write("one.flv", HEADER + b"".join(t for t in TAGS if t[0] != kind)) for kind in (8, 9)]
+        bad = self.write("bad.flv", replace(INDEXED, POSITIONS + 14, struct.pack(">d", 5)) + JUNK)
+        found = set()
+        for text in ("info --scan", "check", "frames", "seek --separate-audio 1", "seek 99"):
+            command, *arguments = text.split()
+            files = [sample("avc_aac")] if command in ("frames", "seek") else [
+                *streams, bad, self.write("two.flv", AVC_BYTES + AVC_BYTES[13:]), "missing.flv"]
+            printed = run(command, "--json", *files, *arguments).stdout
+            found |= members([json.loads(line) for line in printed.splitlines()] if command == "frames"
+                             else json.loads(printed))
+        self.assertEqual(found, documented)
+
     def test_folders(self):
         root = self.write("b.flv", AVC_BYTES).parent
         (root / "sub").mkdir()
@@ -152,9 +175,9 @@ class Check(Case):
         result = run("check", "--json", root)
         self.assertEqual([d["file"] for d in json.loads(result.stdout)["files"]],
                          [f"{root}/b.flv", f"{root}/c.flv", f"{root}/sub/a"])
-        self.assertRegex(result.stderr, rf"{root}: note: skips 1 file that is not FLV\n.*c.flv: .*is empty\n\Z")
+        self.assertRegex(result.stderr, rf"{root}: note: skipped 1 file that is not FLV\n.*c.flv: .*is empty\n\Z")
         (root / "sub/a").unlink()
-        self.tool("check", root / "sub", code=1, stderr=".*no FLV file is in this folder\n")
+        self.tool("check", root / "sub", code=1, stderr=".*there is no FLV file in this folder\n")
 
     def test_jobs_say_the_same_as_one(self):
         files = [*map(sample, SAMPLES), "missing.flv", DATA / "make_samples.sh", self.write("ruined.flv", RUINED)] * 3
@@ -170,7 +193,7 @@ class Check(Case):
         ruined = documents[-1]  # not listed whole
         self.assertEqual((ruined["counts"], len(ruined["findings"]), ruined["unlisted"]), ({"gap": 1500}, 1000, 500))
         text = self.tool("check", sample("aac_only"), "--jobs", 9)
-        self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, 0 of them lost\n")
+        self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, 0 of them not playable\n")
 
     def test_jobs_end_when_nobody_reads(self):
         files = [self.write("ruined.flv", RUINED)] * 20

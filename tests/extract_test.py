@@ -86,9 +86,9 @@ class Extract(Case):
                     lengths = b"".join(len(unit).to_bytes(size, "big") + unit for unit in units)
                     made.append(retag(tag, tag[11:16] + lengths + damage.get(i, b"")))
                     wanted += b"".join(START + unit for unit in units)
-                stderr = ".*configuration is damaged; the one before.*\n" if 5 in changes else ""
+                stderr = ".*configuration is damaged; the previous one.*\n" if 5 in changes else ""
                 if damage:
-                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames?, .* at byte {place}, .*\n"
+                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames?, .* at byte {place}\n"
                 self.assertEqual(self.extract(b"".join(made), stderr=stderr).read_bytes(), wanted)
 
     def test_refused(self):
@@ -104,7 +104,7 @@ class Extract(Case):
         copy = self.write("copy.flv", sample_bytes("aac_only"))
         for command in ("extract", "plot"):
             for out, words in ((copy.parent / "none" / "out", "none/out: No such file"), ("/dev/full", "No space left"),
-                               (copy, "is the file to be read")):
+                               (copy, "is the input file")):
                 self.tool(command, copy, "-o", out, code=1, stderr=f".*{words}.*\n")
         self.assertEqual(copy.read_bytes(), sample_bytes("aac_only"))
         self.tool("extract", "--stream", "video", copy, "-o", copy.parent / "x", code=1, stderr=".+\n")
@@ -113,12 +113,12 @@ class Extract(Case):
         header, tags = split_tags(sample_bytes("avc_aac"))
         path = self.write("in.flv", header + b"".join(tag for tag in tags if tag[0] != 9 or tag[12] == 0))
         (path.parent / "out.aac").write_bytes(b"mine")
-        self.tool("extract", path, "-o", path.parent / "out", code=1, stderr=".*out.aac exists: --force overw.*\n")
+        self.tool("extract", path, "-o", path.parent / "out", code=1, stderr=".*out.aac exists: use --force.*\n")
         self.assertEqual((path.parent / "out.aac").read_bytes(), b"mine")
         said = self.tool("extract", "--force", path, "-o", path.parent / "out",
-                         stderr=".*note: the video stream has no frames: .*out.h264 is not written\n")
+                         stderr=".*note: there are no video frames to write: .*out.h264 is not created\n")
         self.assertIn("out.aac: 109 frames", said)
-        self.tool("extract", "--stream", "video", path, "-o", path.parent / "out", code=1, stderr=".*no frames.*\n")
+        self.tool("extract", "--stream", "video", path, "-o", path.parent / "out", code=1, stderr=".*no video frames.*\n")
         self.assertFalse((path.parent / "out.h264").exists())
 
     def test_standard_output_and_wav(self):

@@ -91,7 +91,7 @@ class Repair(Rewritten):
         path = self.write("in.flv", sample_bytes("avc_aac"))
         old = path.parent / "old.flv"
         old.write_bytes(b"old")
-        for options, words in (((path, "-o", old), "exists"), ((path, "-o", path, "--force"), "is the file to be read"),
+        for options, words in (((path, "-o", old), "exists"), ((path, "-o", path, "--force"), "is the input file"),
                                ((path, "-o", "/dev/full"), "No space left"),
                                ((self.write("x", b"FLV"), "-o", old, "--force"), "damaged or cut short")):
             self.tool("repair", *options, code=1, stderr=f".*{words}.*\n")

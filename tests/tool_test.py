@@ -21,7 +21,7 @@ from flv import retag, split_tags
 TOOL = os.environ["FLVDMX_TOOL"]
 DATA = pathlib.Path(os.environ["FLVDMX_TEST_DATA"])
 SAMPLES = sorted(path.stem for path in DATA.glob("*.flv"))
-WARNINGS = {"truncated": ".*no whole tag.*\n", "damaged": ".*hold no valid tag.*\n"}
+WARNINGS = {"truncated": ".*not a complete tag.*\n", "damaged": ".*without a valid tag.*\n"}
 CODECS = {"h264": "H.264 (AVC)", "flv1": "Sorenson H.263", "flashsv": "screen video", "aac": "AAC", "mp3": "MP3",
           "speex": "Speex", "pcm_s16le": "PCM, little-endian"}
 KIND, TIME = operator.itemgetter(0), operator.itemgetter(1)  # of a frame
@@ -73,6 +73,11 @@ def milliseconds(text):
     return round((int(hours) * 3600 + int(minutes) * 60 + float(seconds)) * 1000)
 
 
+# Profile, configuration, and the size that an independent prober reads: 4:4:4 with scaling lists; 4:2:0 in fields.
+SPS_CASES = (("High 4:4:4 Predictive", "01f4001effe1004567f4001e91b69a69a69a69a2112d34d34d34d34d34d34d34d34d34d34d34d34d34d34"
+              "d34d345a69a69a69a69a69a69a69a69a69a69a69a69a69a69a69a68da05821d21021001000668ebe3cb22c0", (350, 242)),
+             ("High", "0164001effe1002d6764001eadb4d34d34d34d108969a69a69a69a69a69a69a69a69a69a69a69a69a69a69a69a50e469a0"
+              "2d1272da01000668ebe3cb22c0", (712, 280)))
 TAGS_B = split_tags(sample_bytes("avc_bframes_aac"))[1]
 AVC, AVC_BYTES = Expected("avc_aac"), sample_bytes("avc_aac")
 HEADER, TAGS = split_tags(AVC_BYTES)
@@ -180,8 +185,7 @@ class Info(Case):
                     self.assertEqual(found[kind]["config"] or "", stream["extradata"])
                     same = {"video": (("width", "width"), ("height", "height")),
                             "audio": (("sample_rate", "rate"), ("channels", "channels"))}[kind]
-                    if name != "speex_only":  # a header byte has no word for 16000 Hz
-                        self.assertEqual([found[kind][a] for a, _ in same], [int(stream[b]) for _, b in same])
+                    self.assertEqual([found[kind][a] for a, _ in same], [int(stream[b]) for _, b in same])
 
     def test_text(self):
         text = self.tool("info", sample("avc_aac_index"), sample("mp3_only"))
@@ -226,27 +230,55 @@ class Info(Case):
         def late(tag):
             return retag(tag, bytes([tag[11] ^ 1]) + tag[12:-4]) if tag[0] == 8 and tag[5] > 3 else tag
 
+        def empty(tag):
+            return retag(tag, b"") if tag[0] == 8 and tag[5] > 3 else tag
+
+        def nonsense(tag):
+            return retag(tag, b"\xf7" + tag[12:-4]) if tag[0] == 9 and tag[5] > 3 else tag
+
         for change, words, scan in ((enhanced, "enhanced FLV \\(HEVC, FourCC 'hvc1'", ""),
-                                    (large, "parameter sets are larger than the 128 bytes", ""),
-                                    (late, "another header byte than the audio stream", None)):
+                                    (large, "parameter sets are larger than the supported 128 bytes", ""),
+                                    (late, "another codec byte than the audio stream", None),
+                                    (empty, "it is empty", None), (nonsense, "codec byte is invalid: 0xf7", None)):
             with self.subTest(words):
                 path = put(change)
                 if scan is not None:
                     self.tool("info", path, stderr=f".*the video is not played: .*{words}.*\n")
+                document = json.loads(self.tool("info", "--json", "--scan", path, stderr="(.*\n)?"))["files"][0]
                 [result] = json.loads(self.tool("check", "--json", path, code=1))["files"]
                 [finding] = result["findings"]  # one for all of them
                 self.assertRegex(finding["text"], words)
+                self.assertEqual((document["bytes_left_out"], "video" in document),
+                                 (result["lost_bytes"], scan is None))
                 self.assertEqual(finding["count"], sum(change(tag) != tag for tag in TAGS)
                                  if change is not large else sum(tag[0] == 9 for tag in TAGS))
 
+        video, audio = (b"".join(tag for tag in TAGS if tag[0] == kind) for kind in (9, 8))
+        for data, words, code in ((b"".join(enhanced(tag) for tag in TAGS if tag[0] != 8), "; video: it is enhanced", 1),
+                                  (video, "audio is not played: the file header announces it", 0),
+                                  (video * 2 + audio, "audio is not played: it starts after the first 102 tags", 0)):
+            self.tool("info", self.write("in.flv", HEADER + data), code=code, stderr=f"(.*\n)?.*{words}.*\n")
         other = put(lambda tag: retag(tag, bytes([tag[11] & 0xF0 | 12]) + tag[12:-4]) if tag[0] == 9 else tag)
-        self.assertRegex(self.tool("info", other), r"video +HEVC \(CodecID 12\)")
+        self.assertRegex(self.tool("info", other, stderr=".*is not defined by FLV.*\n"), r"video +HEVC \(CodecID 12\)")
 
-    def test_timestamps_that_start_again(self):
+    def test_facts_that_the_tag_headers_do_not_hold(self):
+        header, [script, *tags] = split_tags(sample_bytes("pcm_only"))
+        for byte, rate, size in ((0x70, 8000, 16), (0x80, 8000, 16), (0x40, 16000, 16), (0x50, 8000, 16),
+                                 (0x3c, 44100, 8), (0x3e, 44100, 16)):
+            data = header + script + b"".join(retag(tag, bytes([byte]) + tag[12:-4]) for tag in tags)
+            [found] = json.loads(self.tool("info", "--json", self.write("in.flv", data)))["files"]
+            self.assertEqual((found["audio"]["sample_rate"], found["audio"]["sample_size"]), (rate, size), hex(byte))
+        for profile, record, size in SPS_CASES:
+            path = self.write("in.flv", HEADER + TAGS[0] + retag(TAGS[1], TAGS[1][11:16] + bytes.fromhex(record))
+                              + b"".join(TAGS[2:]))
+            video = json.loads(self.tool("info", "--json", path, stderr="(.*cut short.*\n)?"))["files"][0]["video"]
+            self.assertEqual((video["profile"], video["width"], video["height"]), (profile, *size))
+
+    def test_timestamps_that_restart(self):
         last = max(f[1] for f in AVC.frames)
         early = [tag for tag in TAGS[1:] if int.from_bytes(tag[4:7], "big") < 1000]
         found = json.loads(self.tool("info", "--json", self.write("two.flv", AVC_BYTES + b"".join(early)),
-                                     stderr=".*timestamps start again: the last one is at 0:00:00.9.*\n"))["files"][0]
+                                     stderr=".*timestamps jump: the last one is 0:00:00.9.*\n"))["files"][0]
         self.assertLess(found["duration_ms"], 1000)
         self.assertAlmostEqual(found["played_duration_ms"], last + 1000, delta=60)
         self.assertEqual(found["timestamp_restarts"], 1)
@@ -314,7 +346,7 @@ class Failures(Case):
                 (folder, "Is a directory"),
                 (self.write("empty.flv", b""), "the file is empty"),
                 (self.write("tiny.flv", b"FLV\x01\x05"), "damaged or cut short (the file has 5 bytes)"),
-                (self.write("text.flv", b"no video here\n" * 9), "this is not an FLV file"),
+                (self.write("text.flv", b"no video here\n" * 9), "does not start with the signature"),
                 (self.write("bare.flv", header), "damaged or cut short (the file has 9 bytes)"),
                 (self.write("header.flv", header + bytes(4)), "audio stream was found"),
                 ("/dev/null", "a pipe or device")):
@@ -368,7 +400,7 @@ class Failures(Case):
         for arguments, words in ((["frames", "--stream", "all", "x"], "'all' is not one of: audio, video"),
                                  (["seek", "--mode", "up", "x", "1"], "not one of: auto, backward, forward"),
                                  (["help", "me"], "not one of: check, cut, extract"),
-                                 (["info", "-x.flv"], "begins with a dash goes after '--': flvdmx COMMAND -- -x.flv")):
+                                 (["info", "-x.flv"], "that begins with a dash: flvdmx COMMAND -- -x.flv")):
             self.assertIn(words, run(*arguments, cwd=folder).stderr)
         self.tool("info", "--", "-x.flv", cwd=folder)
 
@@ -440,7 +472,7 @@ class Follow(Case):
     def test_growing_file(self):
         """Files that come whole, and writers that stop; side by side, since most wait for their timeout."""
         early = sum(f[1] <= 300 for f in AVC.frames)
-        broken = r"flvdmx: .*warning: the last \d+ bytes hold no whole frame\n"
+        broken = r"flvdmx: .*warning: the last \d+ bytes are not a complete frame\n"
         cases = [("avc_aac", None, "4", None, ""), ("avc_aac", None, "4 --separate-audio", None, ""),
                  ("h263_mp3", None, "4", None, ""), ("avc_aac_index", None, "4 --separate-audio", None, ""),
                  ("aac_only", None, "4", None, ""), ("truncated", None, "4", None, broken),

@@ -13,7 +13,7 @@ namespace tool {
 
 Chain::Chain(const Input& input, TagReader& reader, Limits limits, Findings& findings, Progress progress)
     : m_reader(reader), m_limits(limits), m_findings(findings), m_progress(std::move(progress)),
-      m_first(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
+      m_first(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE), m_times(limits.jumpMs)
 {
 }
 
@@ -29,6 +29,10 @@ void Chain::Walk()
         m_progress(position);
         position = Step(position);
     }
+    AddAlone(m_video);
+    AddAlone(m_audio);
+    if (m_limits.maxGapMs && m_video.time)
+        JudgeKeyframes(m_reader.FileSize(), *m_video.time);
 }
 
 // One step costs one read for most tags: the back-pointer and the next header are side by side.
@@ -57,7 +61,7 @@ void Chain::JudgePlayed(const Tag& tag)
     if (why.empty())
         return;
     m_findings.Lose(tag.End() - tag.position);
-    m_findings.Add("passed_over", why, tag.position, fmt::format("tags from here on {}", why));
+    m_findings.Add("passed_over", why, tag.position, fmt::format("players skip this tag: {}", why));
 }
 
 bool Chain::IsChained(const Tag& tag)
@@ -152,42 +156,80 @@ void Chain::JudgeConfig(const Tag& tag)
 void Chain::JudgeTime(const Tag& tag)
 {
     Lane& lane = LaneOf(tag);
-    const int64_t step = lane.last ? tag.timestamp - *lane.last : 0;
-    if (step < 0 || step > m_limits.jumpMs)
-        AddJump(tag, *lane.last);
-    lane.last = lane.interleaved = tag.timestamp;
+    const Times::Step step = m_times.Take(tag.Stream(), tag.timestamp);
+    const Jump here = {tag, std::exchange(lane.last, tag.timestamp)};
+    const bool known = lane.odd.has_value();
+    if (step == Times::Step::jump) {
+        for (Lane* const each : {&m_video, &m_audio})
+            if (const auto odd = std::exchange(each->odd, std::nullopt))
+                AddJump(*odd);
+        if (!known)
+            AddJump(here);
+        return;
+    }
+    if (step == Times::Step::pause)
+        lane.odd.reset();
+    AddAlone(lane); // another tag follows, and no jump
+    if (step == Times::Step::odd)
+        lane.odd = here;
+    else if (step == Times::Step::back || (step == Times::Step::alone && !known))
+        AddJump(here);
+    else if (step == Times::Step::pause)
+        m_findings.Note("pause", tag.position,
+                        fmt::format("no {} frames from {} to {}", StreamName(tag.Stream()), FormatTime(here.from),
+                                    FormatTime(tag.timestamp)));
 }
 
 // Both streams jump where a recording was cut or started again: that is one finding.
-void Chain::AddJump(const Tag& tag, int64_t from)
+void Chain::AddJump(const Jump& jump)
 {
     constexpr int64_t TOGETHER_MS = 1000;
-    const int64_t to = tag.timestamp;
-    const bool same = m_jump && std::abs(m_jump->from - from) < TOGETHER_MS && std::abs(m_jump->to - to) < TOGETHER_MS;
-    m_jump = Jump{from, to, same ? m_jump->cause : std::to_string(tag.position)};
-    m_video.interleaved = m_audio.interleaved = m_keyframe = std::nullopt;
-    m_findings.Add("jump", m_jump->cause, tag.position,
-                   fmt::format("{} time jumps {} from {} to {}", StreamName(tag.Stream()),
-                               to < from ? "back" : "forward", FormatTime(from), FormatTime(to)),
-                   {{"stream", StreamName(tag.Stream())}, {"from_ms", from}, {"to_ms", to}});
+    const int64_t to = jump.tag.timestamp;
+    const bool same = m_jump && std::abs(m_jump->from - jump.from) < TOGETHER_MS &&
+                      std::abs(int64_t{m_jump->tag.timestamp} - to) < TOGETHER_MS;
+    m_jumpCause = same ? m_jumpCause : std::to_string(jump.tag.position);
+    m_jump = jump;
+    const char* const stream = StreamName(jump.tag.Stream());
+    m_findings.Add("jump", m_jumpCause, jump.tag.position,
+                   fmt::format("{} time jumps {} from {} to {}", stream, to < jump.from ? "back" : "forward",
+                               FormatTime(jump.from), FormatTime(to)),
+                   {{"stream", stream}, {"from_ms", jump.from}, {"to_ms", to}});
 }
 
+void Chain::AddAlone(Lane& lane)
+{
+    const std::optional<Jump> odd = std::exchange(lane.odd, std::nullopt);
+    if (!odd)
+        return;
+    const char* const stream = StreamName(odd->tag.Stream());
+    m_findings.Add("jump", "alone", odd->tag.position,
+                   fmt::format("a single {} tag has the time {}, after one at {}", stream,
+                               FormatTime(odd->tag.timestamp), FormatTime(odd->from)),
+                   {{"stream", stream}, {"from_ms", odd->from}, {"to_ms", odd->tag.timestamp}});
+}
+
+void Chain::JudgeKeyframes(int64_t position, int64_t time)
+{
+    if (m_keyframe && time - *m_keyframe > *m_limits.maxGapMs)
+        m_findings.Add("keyframe_distance", "all", position,
+                       fmt::format("no keyframe from {} to {}", FormatTime(*m_keyframe), FormatTime(time)));
+    m_keyframe = time;
+}
+
+// By times that continue after jumps.
 void Chain::JudgeGaps(const Tag& tag)
 {
-    if (tag.IsKeyframe()) {
-        if (m_keyframe && tag.timestamp - *m_keyframe > *m_limits.maxGapMs)
-            m_findings.Add(
-                "keyframe_distance", "all", tag.position,
-                fmt::format("no keyframe from {} to {}", FormatTime(*m_keyframe), FormatTime(tag.timestamp)));
-        m_keyframe = tag.timestamp;
-    }
-    if (!m_video.interleaved || !m_audio.interleaved)
+    const int64_t time = m_times.Time();
+    LaneOf(tag).time = time;
+    if (tag.IsVideo() && !tag.IsExtended() && (tag.IsKeyframe() || !m_keyframe))
+        JudgeKeyframes(tag.position, time);
+    if (!m_video.time || !m_audio.time)
         return;
-    const int64_t lead = *m_audio.interleaved - *m_video.interleaved;
+    const int64_t lead = *m_audio.time - *m_video.time;
     if (std::abs(lead) > *m_limits.maxGapMs)
         m_findings.Add("interleaving", "all", tag.position,
                        fmt::format("audio is {} s {} video in the file", static_cast<double>(std::abs(lead)) / 1000,
-                                   lead > 0 ? "ahead of" : "after"));
+                                   lead > 0 ? "ahead of" : "behind"));
 }
 
 } // namespace tool

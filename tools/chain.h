@@ -11,6 +11,7 @@
 #include "tools/findings.h"
 #include "tools/input.h"
 #include "tools/tags.h"
+#include "tools/times.h"
 
 namespace tool {
 
@@ -30,23 +31,21 @@ public:
     Chain(const Input& input, TagReader& reader, Limits limits, Findings& findings, Progress progress);
 
     void Walk();
-    uint64_t Tags() const
-    {
-        return m_tags;
-    } /**< tags with a valid header, lost ones of damaged stretches not counted */
+    /** Tags with a valid header, lost ones of damaged stretches not counted. */
+    uint64_t Tags() const { return m_tags; }
 
 private:
-    // What was last seen of a stream; times in ms as they are in the file.
-    struct Lane {
-        std::optional<int64_t> last;
-        std::optional<int64_t> interleaved; // the last time, none after a jump
-        std::vector<uint8_t> config;
+    struct Jump {
+        Tag tag;
+        int64_t from; // timestamp of the tag before it
     };
 
-    struct Jump {
-        int64_t from;
-        int64_t to;
-        std::string cause;
+    // What was last seen of a stream.
+    struct Lane {
+        int64_t last = 0;            // timestamp
+        std::optional<int64_t> time; // continuing after jumps
+        std::optional<Jump> odd;     // the next tag tells whether it is a jump
+        std::vector<uint8_t> config;
     };
 
     int64_t Step(int64_t position);
@@ -59,7 +58,9 @@ private:
     void Take(const Tag& tag);
     void JudgeConfig(const Tag& tag);
     void JudgeTime(const Tag& tag);
-    void AddJump(const Tag& tag, int64_t from);
+    void AddJump(const Jump& jump);
+    void AddAlone(Lane& lane);
+    void JudgeKeyframes(int64_t position, int64_t time);
     void JudgeGaps(const Tag& tag);
     Lane& LaneOf(const Tag& tag) { return tag.IsVideo() ? m_video : m_audio; }
 
@@ -69,10 +70,12 @@ private:
     const Progress m_progress;
     const int64_t m_first; // position of the first tag
     uint64_t m_tags = 0;
-    int64_t m_unlinkedEnd = -1;        // of the last tag without a valid back-pointer
-    std::string m_unlinkedCause;       // of the tags without one that follow each other
-    std::optional<Jump> m_jump{};      // the last one
-    std::optional<int64_t> m_keyframe; // time of the last one
+    int64_t m_unlinkedEnd = -1;  // of the last tag without a valid back-pointer
+    std::string m_unlinkedCause; // of the tags without one that follow each other
+    Times m_times;
+    std::optional<Jump> m_jump{}; // the last one
+    std::string m_jumpCause;
+    std::optional<int64_t> m_keyframe; // time of the last one, at first of the first video frame
     Lane m_video;
     Lane m_audio;
 };

@@ -1,4 +1,4 @@
-// `flvdmx check`: judges files.
+// `flvdmx check`: finds faults in files.
 #include <algorithm>
 #include <atomic>
 #include <filesystem>
@@ -32,7 +32,7 @@ namespace fs = std::filesystem;
 
 constexpr double MS_PER_SECOND = 1000;
 
-// A file on its way from opening to its result.
+// A file between its opening and its result.
 struct Subject {
     std::string name;
     std::optional<Input> input{};
@@ -40,8 +40,8 @@ struct Subject {
     std::optional<FileError> error{}; // why it is not open
 };
 
-// A file that cannot be played may still open as one that is growing, of which less is asked: then there is more to
-// say.
+// A file that cannot be played may still open as a growing file, which has to meet fewer conditions. Then its tags can
+// be checked.
 Subject Open(const std::string& name)
 {
     Subject subject{name};
@@ -60,7 +60,7 @@ Subject Open(const std::string& name)
     return subject;
 }
 
-Json Judge(Subject& subject, const CheckOptions& options, const Chain::Progress& progress)
+Json CheckTags(Subject& subject, const CheckOptions& options, const Chain::Progress& progress)
 {
     const Input input = std::move(*std::exchange(subject.input, std::nullopt)); // closed at the end
     Findings& findings = subject.findings;
@@ -71,8 +71,12 @@ Json Judge(Subject& subject, const CheckOptions& options, const Chain::Progress&
     Chain chain(input, reader, limits, findings, progress);
     chain.Walk();
     CheckIndex(input, reader, findings);
+    if (const std::string fault = ConfigFault(input); !fault.empty())
+        findings.Add("no_configuration", "", input.Instance().data_offset, fault);
+    if (const std::string note = UndefinedCodec(input); !note.empty())
+        findings.Note("codec", input.Instance().data_offset, note);
     if (input.Instance().file_shorter_than_meta != 0)
-        findings.Add("cut_short", "", reader.FileSize(), "the metadata announces more bytes than the file has");
+        findings.Add("cut_short", "", reader.FileSize(), "the metadata announces a larger file");
     Json object = {{"file", input.name},
                    {"size", reader.FileSize()},
                    {"tags", chain.Tags()},
@@ -85,7 +89,7 @@ Json Check(Subject& subject, const CheckOptions& options, const Chain::Progress&
 {
     try {
         if (!subject.error)
-            return Judge(subject, options, progress);
+            return CheckTags(subject, options, progress);
     } catch (const FileError& error) {
         subject.error = error;
     }
@@ -104,15 +108,16 @@ std::string LineText(const Json& finding)
 {
     const uint64_t count = finding.value("count", uint64_t{1});
     const std::string more =
-        count > 1 ? fmt::format("; {} in all, the last at byte {}", count, finding["last_offset"].get<int64_t>()) : "";
-    return fmt::format("  byte {:<12} {:<17} {}{}\n", finding["offset"].get<int64_t>(),
+        count > 1 ? fmt::format("; {} of these, the last at byte {}", count, finding["last_offset"].get<int64_t>())
+                  : "";
+    return fmt::format("  byte {:<12} {:<17}  {}{}\n", finding["offset"].get<int64_t>(),
                        finding["kind"].get<std::string>(), finding["text"].get<std::string>(), more);
 }
 
 std::string Text(const std::string& file, const Json& result)
 {
     const Json& findings = result["findings"];
-    std::string text = fmt::format("{}: {}; {}, {} bytes, {} of them lost\n", Printable(file),
+    std::string text = fmt::format("{}: {}; {}, {} bytes, {} of them not playable\n", DisplayName(file),
                                    findings.empty() ? "ok" : CountsText(result["counts"]),
                                    Plural(result["tags"].get<uint64_t>(), "tag"), result["size"].get<int64_t>(),
                                    result["lost_bytes"].get<int64_t>());
@@ -125,8 +130,9 @@ std::string Text(const std::string& file, const Json& result)
     return text;
 }
 
-// Checks files on several threads; results come in order. All files are opened first, since no open may run beside
-// other calls. What is thrown, such as for a pipe that nobody reads any more, ends the threads soon.
+// Checks files on several threads and returns the results in order. All files are opened first, since no open may run
+// at the same time as other calls. An exception, for instance because the output pipe was closed, ends the threads
+// soon.
 class Crew {
 public:
     Crew(std::vector<Subject> subjects, const CheckOptions& options) : m_subjects(std::move(subjects))
@@ -165,7 +171,7 @@ private:
     std::atomic<bool> m_stopped{false};
 };
 
-// Prints the results as they come, and gathers them for the document.
+// Prints the results as they come, or collects them for the JSON document.
 class Results {
 public:
     explicit Results(const CheckOptions& options) : m_options(options) {}
@@ -209,7 +215,7 @@ void CheckOneByOne(const std::vector<std::string>& files, const CheckOptions& op
     }
 }
 
-void CheckSideBySide(const std::vector<std::string>& files, const CheckOptions& options, Results& results)
+void CheckInParallel(const std::vector<std::string>& files, const CheckOptions& options, Results& results)
 {
     constexpr size_t OPEN_FILES = 64;
     ProgressBar progress("files", static_cast<int64_t>(files.size()));
@@ -229,7 +235,7 @@ void CheckSideBySide(const std::vector<std::string>& files, const CheckOptions& 
     }
 }
 
-// The files of a folder and the folders in it that are FLV by their first bytes, or by their name.
+// The files in a folder and below it that are FLV by their first bytes or their name.
 std::vector<std::string> FilesIn(const std::string& folder)
 {
     std::vector<std::string> files;
@@ -248,10 +254,10 @@ std::vector<std::string> FilesIn(const std::string& folder)
     if (failure)
         throw FileError(folder, fmt::format("cannot be read: {}", failure.message()));
     if (files.empty())
-        throw FileError(folder, "no FLV file is in this folder");
+        throw FileError(folder, "there is no FLV file in this folder");
     if (others > 0)
         Complain(folder,
-                 fmt::format("note: skips {} that {} not FLV", Plural(others, "file"), others == 1 ? "is" : "are"));
+                 fmt::format("note: skipped {} that {} not FLV", Plural(others, "file"), others == 1 ? "is" : "are"));
     std::sort(files.begin(), files.end());
     return files;
 }
@@ -279,7 +285,7 @@ int RunCheck(const CheckOptions& options)
     if (options.jobs == 1)
         CheckOneByOne(files, options, results);
     else
-        CheckSideBySide(files, options, results);
+        CheckInParallel(files, options, results);
     return results.Finish();
 }
 

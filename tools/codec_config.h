@@ -1,4 +1,4 @@
-// What codec configurations say.
+// Fields of codec configurations.
 #ifndef FLVDMX_TOOLS_CODEC_CONFIG_H
 #define FLVDMX_TOOLS_CODEC_CONFIG_H
 
@@ -11,27 +11,36 @@ namespace tool {
 
 /** An AudioSpecificConfig (ISO/IEC 14496-3). */
 struct AacConfig {
-    uint32_t objectType = 0;     /**< as it begins: 5 or 29 for HE-AAC that is signalled */
-    uint32_t coreObjectType = 0; /**< of the core of HE-AAC, else the same */
+    uint32_t objectType = 0;     /**< the first one: 5 or 29 for explicitly signalled HE-AAC */
+    uint32_t coreObjectType = 0; /**< of the core of HE-AAC, otherwise the same */
     uint32_t frequencyIndex = 0;
     uint32_t sampleRate = 0;       /**< Hz, of the core; 0 for a reserved index */
-    uint32_t outputSampleRate = 0; /**< Hz, of HE-AAC that is signalled; else the same */
+    uint32_t outputSampleRate = 0; /**< Hz, of explicitly signalled HE-AAC; otherwise the same */
     uint32_t channels = 0;         /**< channel configuration */
-    bool isShort = false;          /**< it ends before all that was there */
+    bool isShort = false;          /**< it ends before its last field */
 };
 
-constexpr uint32_t AAC_EXPLICIT_FREQUENCY = 15; /**< index before a sampling frequency of 24 bits */
-constexpr uint32_t AAC_FREQUENCIES = 13;        /**< indices with a meaning */
+constexpr uint32_t AAC_EXPLICIT_FREQUENCY = 15; /**< index that a frequency of 24 bits follows */
+constexpr uint32_t AAC_FREQUENCIES = 13;        /**< number of indices that stand for a frequency */
 
 AacConfig ParseAacConfig(flvdmx::Bytes config);
 
-/** @return such as "AAC LC"; "object type 42" for one without a name here */
+/** @return such as "AAC LC"; "object type 42" for one that is not known here */
 std::string AacObjectTypeName(uint32_t objectType);
 
-/** @return profile of an AVCDecoderConfigurationRecord, such as "High", "profile 44" for one without a name here */
+/** @return profile of an AVCDecoderConfigurationRecord, such as "High", "profile 44" for one that is not known here */
 std::string AvcProfileName(flvdmx::Bytes record);
 
-/** @return its level, such as "3.1" */
+/** Width and height in pixels; 0 when they are not known. */
+struct PictureSize {
+    uint32_t width = 0;
+    uint32_t height = 0;
+};
+
+/** @return size of the pictures after cropping, by the first sequence parameter set of the record */
+PictureSize AvcPictureSize(flvdmx::Bytes record);
+
+/** @return level of such a record, such as "3.1" */
 std::string AvcLevelName(flvdmx::Bytes record);
 
 } // namespace tool

@@ -1,5 +1,5 @@
-// The subcommands of the tool. Each returns the exit code, DONE or FAILED; what ends the work on its only file is
-// thrown as FileError.
+// The commands of the tool. Each returns the exit status, DONE or FAILED; a failure that ends the work on its only file
+// is thrown as FileError.
 #ifndef FLVDMX_TOOLS_COMMANDS_H
 #define FLVDMX_TOOLS_COMMANDS_H
 
@@ -13,7 +13,7 @@
 
 namespace tool {
 
-enum ExitCode { DONE = 0, FAILED = 1, WRONG_USE = 2 };
+enum ExitStatus { DONE = 0, FAILED = 1, WRONG_USE = 2 };
 
 constexpr uint32_t BOTH_STREAMS = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO;
 
@@ -29,13 +29,13 @@ struct FramesOptions {
     std::string file;
     Format format = Format::text;
     uint32_t streams = BOTH_STREAMS;                       /**< FLVD_STREAM_* bits wanted */
-    bool keyframes = false;                                /**< of video keyframes alone, no audio */
-    uint64_t count = std::numeric_limits<uint64_t>::max(); /**< frames after which to stop */
+    bool keyframes = false;                                /**< only video keyframes */
+    uint64_t count = std::numeric_limits<uint64_t>::max(); /**< stop after this many frames */
     bool separateAudio = false;
     std::optional<int32_t> fromMs{};
     std::optional<int32_t> toMs{};
     bool follow = false;
-    double timeoutSeconds = 5; /**< following: time without growth after which to stop */
+    double timeoutSeconds = 5; /**< with follow: stop after this time without growth */
 };
 
 struct SeekOptions {
@@ -44,14 +44,14 @@ struct SeekOptions {
     uint32_t direction = FLVD_SEEK_BACKWARD; /**< FLVD_SEEK_BACKWARD, _FORWARD, or 0: automatic */
     uint32_t mode = 0;                       /**< other FLVD_SEEK_* bits */
     uint64_t play = 0;                       /**< frames to read before the seek */
-    uint64_t count = 5;                      /**< frames to show from the landing place on */
+    uint64_t count = 5;                      /**< frames to show from where it landed */
     bool separateAudio = false;
     bool json = false;
 };
 
 struct ExtractOptions {
     std::string file;
-    std::string out;                 /**< file or base name, or a folder that exists */
+    std::string out;                 /**< file name or beginning of two file names, or an existing folder */
     uint32_t streams = BOTH_STREAMS; /**< FLVD_STREAM_* bits wanted */
     bool force = false;              /**< overwrite */
 };
@@ -59,9 +59,9 @@ struct ExtractOptions {
 struct CheckOptions {
     std::vector<std::string> files; /**< and folders */
     bool json = false;
-    uint32_t jobs = 1;                   /**< files that are checked at the same time */
-    double jumpSeconds = 10;             /**< largest step from one frame of a stream to the next that is no jump */
-    std::optional<double> maxGapSeconds; /**< largest distance of keyframes, and of audio and video in the file */
+    uint32_t jobs = 1;                   /**< files to check at the same time */
+    double jumpSeconds = 10;             /**< a larger step from one frame of a stream to the next is a jump */
+    std::optional<double> maxGapSeconds; /**< allowed between keyframes, and between audio and video in the file */
 };
 
 struct PlotOptions {
@@ -70,7 +70,7 @@ struct PlotOptions {
     bool force = false; /**< overwrite */
 };
 
-/** Of the commands that write a new FLV file. */
+/** Options of the commands that write a new FLV file. */
 struct RewriteOptions {
     std::string file;
     std::string out;

@@ -1,4 +1,4 @@
-// `flvdmx extract`: elementary streams as players take them.
+// `flvdmx extract`: writes elementary streams that players accept.
 #include <cstdint>
 #include <filesystem>
 #include <limits>
@@ -24,7 +24,7 @@ namespace tool {
 
 namespace {
 
-// One stream on its way into its file.
+// Writes one stream to its file.
 class StreamWriter {
 public:
     StreamWriter(const Input& input, flvdmx::Stream stream)
@@ -38,7 +38,7 @@ public:
 
     flvdmx::Stream Stream() const { return m_stream; }
 
-    // A folder takes files named as the input; otherwise two streams need two names.
+    // Files in a folder are named after the input; two streams need two names.
     void Open(const ExtractOptions& options, bool both)
     {
         const std::string base = m_file == STANDARD_STREAM ? "stdin" : std::filesystem::path(m_file).stem().string();
@@ -54,7 +54,7 @@ public:
         if (frame.config_changed())
             if (const std::string refusal = m_format->Configure(frame.new_config); !refusal.empty())
                 Complain(m_file,
-                         fmt::format("warning: before byte {}: {}; the one before is kept", frame.position, refusal));
+                         fmt::format("warning: before byte {}: {}; the previous one is used", frame.position, refusal));
         m_bytes.clear();
         if (const char* const fault = m_format->Convert(frame, m_bytes); fault != nullptr && m_faults++ == 0) {
             m_fault = fault;
@@ -67,21 +67,21 @@ public:
     // A stream without frames leaves no file. @return true when there is one
     bool Finish()
     {
+        if (m_faults > 0)
+            Complain(m_file, fmt::format("warning: skipped {} in {}, the first at byte {}", m_fault,
+                                         Plural(m_faults, "frame"), m_firstFault));
         const uint64_t written = m_out->Written() - m_format->Header(0).size();
         if (written == 0) {
-            Complain(m_file, fmt::format("note: the {} stream has no frames: {} is not written", StreamName(m_stream),
-                                         Printable(m_out->Path())));
+            Complain(m_file, fmt::format("note: there are no {} frames to write: {} is not created",
+                                         StreamName(m_stream), Printable(m_out->Path())));
             return false;
         }
         if (const std::vector<uint8_t> header = m_format->Header(written); !header.empty())
             m_out->Rewrite(header);
         m_out->Finish();
-        if (m_faults > 0)
-            Complain(m_file, fmt::format("warning: {} in {}, the first at byte {}, left out", m_fault,
-                                         Plural(m_faults, "frame"), m_firstFault));
         if (m_format->IsRaw())
-            Complain(m_file,
-                     fmt::format("note: the {} is written raw, one frame after the other", StreamName(m_stream)));
+            Complain(m_file, fmt::format("note: the {} is written raw: the bare frames, one after the other",
+                                         StreamName(m_stream)));
         if (!m_out->IsStandard())
             Print(fmt::format("{}: {}, {} bytes\n", Printable(m_out->Path()), Plural(m_frames, "frame"),
                               m_out->Written()));
@@ -89,7 +89,7 @@ public:
     }
 
 private:
-    // Until the size is known the header of the stream has the largest, as it stays in a pipe.
+    // The header states the largest size until the real one is known; in a pipe it cannot be corrected.
     void Open(const std::string& path, bool force)
     {
         m_out = std::make_unique<OutputFile>(path, m_file, force);
@@ -111,18 +111,21 @@ private:
 std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input& input)
 {
     std::vector<StreamWriter> writers;
-    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
-        if (const auto bit = static_cast<uint32_t>(stream); (options.streams & bit) != 0) {
-            if (input.Has(stream))
-                writers.emplace_back(input, stream);
-            else if (const std::string why = TagReader(input).WhyNoStream(stream); !why.empty())
-                Complain(input.name, fmt::format("note: the {} is left out: {}", StreamName(stream), why));
-        }
+    std::string missing;
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio}) {
+        if ((options.streams & static_cast<uint32_t>(stream)) == 0)
+            continue;
+        if (input.Has(stream))
+            writers.emplace_back(input, stream);
+        else if (const std::string why = TagReader(input).WhyNoStream(stream); !why.empty())
+            missing = " that is played: " + why;
+    }
     if (writers.empty())
-        throw FileError(input.name, fmt::format("the file has no {} stream",
-                                                StreamName(static_cast<flvdmx::Stream>(options.streams))));
+        throw FileError(input.name, fmt::format("the file has no {} stream{}",
+                                                StreamName(static_cast<flvdmx::Stream>(options.streams)), missing));
     if (options.out == STANDARD_STREAM && writers.size() > 1)
-        throw FileError(input.name, "standard output takes one stream: --stream video or --stream audio chooses it");
+        throw FileError(input.name,
+                        "standard output takes one stream: select it with --stream video or --stream audio");
     return writers;
 }
 
@@ -136,7 +139,7 @@ int RunExtract(const ExtractOptions& options)
     ProgressBar progress(options.file, input.Instance().data_end);
     for (StreamWriter& writer : writers)
         writer.Open(options, writers.size() > 1);
-    AcceptAllTimes(input);
+    input.file.accept_all_times();
     Losses losses(input);
     while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
         progress.ShowDone(frame->position);

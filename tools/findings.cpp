@@ -1,4 +1,4 @@
-// What was found wrong with a file.
+// What a check finds in a file.
 #include "tools/findings.h"
 
 namespace tool {

@@ -1,4 +1,4 @@
-// What was found wrong with a file.
+// What a check finds in a file.
 #ifndef FLVDMX_TOOLS_FINDINGS_H
 #define FLVDMX_TOOLS_FINDINGS_H
 
@@ -10,27 +10,26 @@
 
 namespace tool {
 
-/** One finding per cause, with a count. Keeps the first ones, so that a ruined file takes no more memory than a valid
- *  one. */
+/** One finding per cause, with a count. Only the first ones are kept, which bounds the memory for a ruined file. */
 class Findings {
 public:
     /**
-     * @param kind   word for the kind, such as "gap"
-     * @param cause  findings of one kind with the same cause are one; empty: this one is on its own
-     * @param offset where in the file
-     * @param text   for people
-     * @param more   members for programs
+     * @param kind   name of the kind, such as "gap"
+     * @param cause  findings of one kind with the same cause become one; empty: this one stands alone
+     * @param offset position in the file
+     * @param text   description for people
+     * @param more   further members for programs
      */
     void Add(const char* kind, const std::string& cause, int64_t offset, const std::string& text,
              const Json& more = Json::object());
 
-    /** Something worth knowing that is no fault. */
+    /** Adds something that is worth knowing but not a fault. */
     void Note(const char* kind, int64_t offset, const std::string& text);
 
-    /** Bytes that are not played. */
+    /** Counts bytes that are not played. */
     void Lose(int64_t bytes) { m_lost += bytes; }
 
-    /** Puts sound, lost_bytes, counts, findings, unlisted and notes into the object. */
+    /** Adds the members sound, lost_bytes, counts, findings, unlisted and notes. */
     void WriteTo(Json& object) const;
 
 private:
@@ -39,7 +38,7 @@ private:
     Json m_counts = Json::object();
     Json m_list = Json::array();
     Json m_notes = Json::array();
-    std::map<std::string, size_t> m_causes; // place in the list
+    std::map<std::string, size_t> m_causes; // index in the list
 };
 
 } // namespace tool

@@ -118,6 +118,12 @@ public:
         return !m_failed;
     }
 
+    bool MetadataName()
+    {
+        std::string name;
+        return Integer(1) == STRING && Key(name) && name == "onMetaData";
+    }
+
     bool SkipValue(int depth = 0)
     {
         if (depth > MAX_DEPTH)
@@ -177,12 +183,17 @@ private:
 
 } // namespace
 
+bool IsMetadata(Bytes payload)
+{
+    return ScriptReader(payload).MetadataName();
+}
+
 std::vector<ScriptProperty> ReadScriptProperties(Bytes payload)
 {
     std::vector<ScriptProperty> properties;
     ScriptReader reader(payload);
     std::string key;
-    if (reader.Integer(1) != STRING || !reader.Key(key) || key != "onMetaData")
+    if (!reader.MetadataName())
         return properties;
     const uint64_t marker = reader.Integer(1);
     if (marker != OBJECT && (marker != ECMA_ARRAY || !reader.Skip(4)))
@@ -209,8 +220,10 @@ void FlvLayout::Add(const NewTag& tag)
     m_hasAudio = m_hasAudio || tag.type == FLVD_TAG_TYPE_AUDIO;
     if (tag.keyframe)
         m_keyframes.push_back({tag.timestamp, m_size});
-    m_firstTimestamp = m_size == 0 ? tag.timestamp : std::min(m_firstTimestamp, tag.timestamp);
-    m_lastTimestamp = std::max(m_lastTimestamp, tag.timestamp);
+    if (tag.frame) {
+        m_firstTimestamp = std::min(m_firstTimestamp, tag.timestamp);
+        m_lastTimestamp = std::max(m_lastTimestamp, tag.timestamp);
+    }
     m_size += static_cast<int64_t>(TAG_HEADER_SIZE + tag.header.size() + tag.payload.size() + BACK_POINTER_SIZE);
 }
 

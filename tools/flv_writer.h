@@ -3,6 +3,7 @@
 #ifndef FLVDMX_TOOLS_FLV_WRITER_H
 #define FLVDMX_TOOLS_FLV_WRITER_H
 
+#include <algorithm>
 #include <cstdint>
 #include <string>
 #include <string_view>
@@ -19,6 +20,7 @@ struct NewTag {
     uint32_t timestamp = 0; /**< ms */
     flvdmx::Bytes header;   /**< codec header, or empty if `payload` includes it */
     flvdmx::Bytes payload;
+    bool frame = false;    /**< its time counts for the duration */
     bool keyframe = false; /**< listed in the index */
 };
 
@@ -31,6 +33,9 @@ struct ScriptProperty {
 /** @return the properties in the payload of an onMetaData tag, up to the first damaged one; none of other payloads */
 std::vector<ScriptProperty> ReadScriptProperties(flvdmx::Bytes payload);
 
+/** @return true for the payload of an onMetaData tag */
+bool IsMetadata(flvdmx::Bytes payload);
+
 /** @return a property with this number */
 ScriptProperty NumberProperty(std::string_view name, double value);
 
@@ -42,7 +47,8 @@ public:
 
     bool HasVideo() const { return m_hasVideo; }
     bool HasAudio() const { return m_hasAudio; }
-    uint32_t Duration() const { return m_lastTimestamp - m_firstTimestamp; } /**< ms */
+    /** @return ms */
+    uint32_t Duration() const { return m_lastTimestamp - std::min(m_firstTimestamp, m_lastTimestamp); }
     size_t Keyframes() const { return m_keyframes.size(); }
 
     /**
@@ -63,7 +69,7 @@ private:
 
     bool m_hasVideo = false;
     bool m_hasAudio = false;
-    uint32_t m_firstTimestamp = 0;
+    uint32_t m_firstTimestamp = UINT32_MAX;
     uint32_t m_lastTimestamp = 0;
     int64_t m_size = 0;
     std::vector<Keyframe> m_keyframes;

@@ -1,4 +1,4 @@
-// Frames as streams that players take.
+// Frames as streams that players accept.
 #include "tools/formats.h"
 
 #include <algorithm>
@@ -17,8 +17,6 @@ namespace tool {
 
 namespace {
 
-constexpr uint32_t SIXTEEN_BITS = 0x02; // SoundSize in the codec byte of audio tags
-
 using Buffer = std::vector<uint8_t>;
 
 void Append(Buffer& out, flvdmx::Bytes bytes)
@@ -32,7 +30,7 @@ void AppendLittleEndian(Buffer& out, uint32_t value, uint32_t size)
         out.push_back(static_cast<uint8_t>(value >> 8 * i));
 }
 
-// AVC as a byte stream (ISO/IEC 14496-10, annex B): start codes where the lengths were, and the parameter sets before
+// AVC as a byte stream (ISO/IEC 14496-10, annex B): start codes replace the lengths, and the parameter sets come before
 // the first frame and before the first keyframe after each change of the configuration.
 class AnnexB : public StreamFormat {
 public:
@@ -81,7 +79,7 @@ public:
 private:
     static constexpr std::array<uint8_t, 4> START_CODE = {0, 0, 0, 1};
 
-    // A start code takes two bytes more than the length of a parameter set, and no set is shorter than its length.
+    // A start code is two bytes longer than the length field of a parameter set, so the record at most doubles.
     static Buffer ParameterSets(flvdmx::Bytes record)
     {
         Buffer sets(2 * record.size());
@@ -97,14 +95,16 @@ private:
     bool m_pending = false; // the parameter sets have not been written
 };
 
-// AAC as an audio data transport stream (ISO/IEC 13818-7, 14496-3): a header before every frame. Of HE-AAC it describes
-// the core; decoders find the rest in the frames.
+// AAC as an audio data transport stream (ISO/IEC 13818-7, 14496-3): a header before every frame. For HE-AAC it
+// describes the core; decoders find the extension in the frames.
 class Adts : public StreamFormat {
 public:
     Adts() : StreamFormat("aac") {}
 
     std::string Configure(flvdmx::Bytes config) override
     {
+        if (config.empty()) // it may still follow
+            return {};
         const AacConfig aac = ParseAacConfig(config);
         if (std::string refusal = Refusal(aac); !refusal.empty())
             return refusal;
@@ -119,8 +119,10 @@ public:
         constexpr uint32_t MOST_BYTES = 0x1FFF; // 13 bits, header included
         if (frame.data.empty())
             return nullptr;
+        if (m_fixed == 0)
+            return "data without an AAC configuration";
         if (frame.data.size() > MOST_BYTES - HEADER_SIZE)
-            return "more data than ADTS takes";
+            return "data that is too long for ADTS";
         const uint32_t size = static_cast<uint32_t>(frame.data.size()) + HEADER_SIZE;
         const uint64_t header = uint64_t{m_fixed | size >> 11} << 24 | (size << 13 & 0xFFFFFF) | 0x1FFC;
         for (uint32_t shift = 8 * HEADER_SIZE; shift > 0; shift -= 8)
@@ -132,29 +134,29 @@ public:
 private:
     static std::string Refusal(const AacConfig& aac)
     {
-        constexpr uint32_t MOST_OBJECT_TYPE = 4; // 2 bits hold it less one
+        constexpr uint32_t MOST_OBJECT_TYPE = 4; // stored minus one, in 2 bits
         if (aac.frequencyIndex == AAC_EXPLICIT_FREQUENCY)
-            return "AAC with an explicit sampling frequency cannot be written as ADTS, which has a list of them";
+            return "AAC with an explicit sampling frequency cannot be written as ADTS";
         if (aac.isShort)
             return "the AAC configuration is cut short";
         if (aac.coreObjectType == 0 || aac.coreObjectType > MOST_OBJECT_TYPE)
-            return fmt::format("AAC of object type {} cannot be written as ADTS, which has types 1 to 4",
+            return fmt::format("AAC object type {} cannot be written as ADTS, which has types 1 to 4",
                                aac.coreObjectType);
         if (aac.frequencyIndex >= AAC_FREQUENCIES)
             return fmt::format("the AAC configuration has the reserved sampling frequency index {}",
                                aac.frequencyIndex);
         if (aac.channels == 0)
-            return "AAC of channel configuration 0 cannot be written as ADTS, which has no room for a channel list";
+            return "AAC channel configuration 0 cannot be written as ADTS, which has no room for a list of channels";
         if (aac.channels > 7)
-            return fmt::format("AAC of channel configuration {} cannot be written as ADTS, which has 1 to 7",
+            return fmt::format("AAC channel configuration {} cannot be written as ADTS, which has 1 to 7",
                                aac.channels);
         return {};
     }
 
-    uint32_t m_fixed = 0; // the first 32 bits without the size
+    uint32_t m_fixed = 0; // the first 32 bits without the size; 0 until there is a configuration
 };
 
-// PCM as RIFF/WAVE. What FLV calls the byte order of the machine that wrote it was little-endian nearly everywhere.
+// PCM as RIFF/WAVE. SoundFormat 0 has the byte order of the machine that wrote it, in practice little-endian.
 class Wav : public StreamFormat {
 public:
     Wav(const flvdmx::AudioInfo& audio, uint32_t bits)
@@ -164,10 +166,10 @@ public:
 
     Buffer Header(uint64_t bytes) const override
     {
-        constexpr uint32_t AFTER_SIZE = 36; // bytes of the header after the field of the whole size
+        constexpr uint32_t AFTER_SIZE = 36; // bytes of the header after the size of the file
         constexpr uint32_t FORMAT_SIZE = 16;
         constexpr uint32_t PCM = 1;
-        constexpr uint64_t MOST = std::numeric_limits<uint32_t>::max() - AFTER_SIZE; // longer ones play as far as that
+        constexpr uint64_t MOST = std::numeric_limits<uint32_t>::max() - AFTER_SIZE; // longer files play up to here
         const auto size = static_cast<uint32_t>(std::min(bytes, MOST));
         const uint32_t frame = m_channels * m_bits / 8;
         Buffer header;
@@ -218,6 +220,12 @@ const char* StreamFormat::Convert(const flvdmx::Frame& frame, Buffer& out)
     return nullptr;
 }
 
+uint32_t PcmSampleSize(const Input& input)
+{
+    constexpr uint32_t SIXTEEN_BITS = 0x02; // SoundSize in the codec byte of audio tags
+    return (input.Instance().audio_format_filter & SIXTEEN_BITS) != 0 ? 16 : 8;
+}
+
 std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream)
 {
     if (stream == flvdmx::Stream::video)
@@ -232,8 +240,7 @@ std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream
         return std::make_unique<StreamFormat>("mp3");
     case flvdmx::AudioCodec::pcm:
     case flvdmx::AudioCodec::pcm_little_endian:
-        return std::make_unique<Wav>(*input.info.audio,
-                                     (input.Instance().audio_format_filter & SIXTEEN_BITS) != 0 ? 16 : 8);
+        return std::make_unique<Wav>(*input.info.audio, PcmSampleSize(input));
     default:
         return std::make_unique<Raw>("audio");
     }

@@ -1,4 +1,4 @@
-// Frames as streams that players take.
+// Frames as streams that players accept.
 #ifndef FLVDMX_TOOLS_FORMATS_H
 #define FLVDMX_TOOLS_FORMATS_H
 
@@ -11,7 +11,7 @@
 
 namespace tool {
 
-/** How the frames of a codec become a stream. */
+/** Turns the frames of a codec into a stream. */
 class StreamFormat {
 public:
     explicit StreamFormat(std::string extension) : m_extension(std::move(extension)) {}
@@ -21,25 +21,33 @@ public:
 
     const std::string& Extension() const { return m_extension; }
 
-    /** Takes a codec configuration, valid for the frames after it. @return why that is not possible, the one before
-     *  staying valid; empty when it is */
+    /** Sets the codec configuration of the frames that follow. @return why that is not possible, in which case the
+     *  previous one stays in force; empty on success */
     virtual std::string Configure(flvdmx::Bytes config);
 
-    /** @return what the stream begins with, when it has so many bytes of frames */
+    /** @return the header of a stream whose frames have this many bytes */
     virtual std::vector<uint8_t> Header(uint64_t bytes) const;
 
-    /** Appends a frame to `out`. @return what was wrong with it, part of it being left out; null when nothing was */
+    /** Appends a frame to `out`. @return what had to be skipped of it; null when nothing had to be */
     virtual const char* Convert(const flvdmx::Frame& frame, std::vector<uint8_t>& out);
 
-    /** @return true when the frames are written as they are and no player takes them so */
+    /** @return true when the frames are written as they are, which no player accepts */
     virtual bool IsRaw() const { return false; }
 
 private:
     std::string m_extension;
 };
 
-/** @return the format for a stream that the input has: AVC as Annex B, AAC as ADTS, PCM as WAV, MP3 as it is, all else
- *          raw */
+/** @return true for a codec whose samples are not compressed */
+constexpr bool IsPcm(flvdmx::AudioCodec codec)
+{
+    return codec == flvdmx::AudioCodec::pcm || codec == flvdmx::AudioCodec::pcm_little_endian;
+}
+
+/** @return bits per sample of an input with PCM audio */
+uint32_t PcmSampleSize(const Input& input);
+
+/** @return the format for a stream of the input: AVC as Annex B, AAC as ADTS, PCM as WAV, MP3 as it is, others raw */
 std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream);
 
 } // namespace tool

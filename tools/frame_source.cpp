@@ -60,14 +60,17 @@ Json FrameRecord::Object(uint64_t number) const
             {"position", position}, {"crc32", fmt::format("{:08x}", crc)}};
 }
 
-std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream)
+std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream, LateStreams late)
 {
-    const flvdmx::result<flvdmx::Frame> frame = input.file.next_frame(stream);
-    if (frame)
-        return *frame;
-    if (frame.error().kind() == flvdmx::Kind::failed)
-        throw FileError(input.name, frame.error());
-    return std::nullopt;
+    for (;;) {
+        const flvdmx::result<flvdmx::Frame> frame = input.file.next_frame(stream);
+        if (frame.error().kind() == flvdmx::Kind::failed)
+            throw FileError(input.name, frame.error());
+        if (!frame)
+            return std::nullopt;
+        if (input.Has(frame->stream) || late == LateStreams::delivered)
+            return *frame;
+    }
 }
 
 FrameSource::FrameSource(Input& input, uint32_t streams, Losses* losses)

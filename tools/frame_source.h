@@ -70,8 +70,11 @@ private:
     Lane m_audio;
 };
 
+/** What becomes of the frames of a stream that starts too late for the open to find it. */
+enum class LateStreams { skipped, delivered };
+
 /** @return the next frame in the file, valid until the next call; nothing at the end. Throws FileError */
-std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream);
+std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream, LateStreams late = LateStreams::skipped);
 
 } // namespace tool
 

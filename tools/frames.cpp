@@ -16,8 +16,10 @@
 #include "tools/input.h"
 #include "tools/progress.h"
 #include "tools/report.h"
+#include "tools/scan.h"
 #include "tools/tags.h"
 #include "tools/text.h"
+#include "tools/times.h"
 
 namespace tool {
 
@@ -69,6 +71,8 @@ public:
     FramePrinter(const FramesOptions& options, uint32_t streams)
         : m_options(options), m_streams(streams), m_open(streams), m_started(!options.fromMs)
     {
+        if (options.format == Format::csv)
+            Print(FrameRecord::CSV_HEADING);
     }
 
     bool Done() const { return m_open == 0 || m_number >= m_options.count; }
@@ -81,6 +85,8 @@ public:
             Show(frame);
         m_progress.Show(m_number, frame.timeMs);
     }
+
+    bool Started() const { return m_started; }
 
     // There is no later frame: one that is exactly at the time sought may have waited for it.
     void Finish()
@@ -112,7 +118,8 @@ private:
 
     void Show(const FrameRecord& frame)
     {
-        if (m_options.toMs && frame.timeMs > *m_options.toMs) {
+        m_times.Take(frame.stream, frame.timeMs);
+        if (m_options.toMs && m_times.Time() > *m_options.toMs) {
             m_open &= ~static_cast<uint32_t>(frame.stream);
             return;
         }
@@ -124,7 +131,7 @@ private:
             PrintJson(frame.Object(m_number));
             break;
         case Format::csv:
-            Print((m_number == 1 ? FrameRecord::CSV_HEADING : "") + frame.Csv(m_number));
+            Print(frame.Csv(m_number));
             break;
         case Format::text:
             Print((m_number == 1 ? FrameRecord::HEADING : "") + frame.Line(m_number));
@@ -139,6 +146,7 @@ private:
     bool m_started;
     std::vector<FrameRecord> m_held;
     uint64_t m_number = 0;
+    Times m_times; // a single wrong time does not end the range
     Progress m_progress;
 };
 
@@ -155,17 +163,15 @@ uint32_t WantedStreams(const FramesOptions& options)
     return options.keyframes ? options.streams & FLVD_STREAM_VIDEO : options.streams;
 }
 
-// A file that cannot seek is read from its beginning: the printer waits for the time.
+// Where no seek gets through, as in much damage, the file is read from its beginning: the printer waits for the time.
 void SeekToStart(Input& input, int32_t ms)
 {
     const flvdmx::error error = input.file.seek(flvdmx::Milliseconds(ms), flvdmx::SeekMode::backward).error();
     if (error.kind() == flvdmx::Kind::miss)
         throw FileError(
             input.name,
-            fmt::format("nothing is at {}: the last frame is at {}", FormatTime(ms), FormatTime(input.info.duration)),
+            fmt::format("there is no frame at {}: the last one is at {}", FormatTime(ms), FormatTime(input.info.duration)),
             error);
-    if (error.kind() != flvdmx::Kind::none && error.code() != FLVD_ERR_NOT_SEEKABLE)
-        throw FileError(input.name, error);
 }
 
 // With two readers the frames come by time: what is between them is looked at in another pass, in file order.
@@ -192,14 +198,19 @@ void PrintComplete(const FramesOptions& options)
         throw FileError(options.file, fmt::format("the file has no {} stream{}", StreamName(wanted),
                                                   why.empty() ? "" : " that is played: " + why));
     }
+    WarnOfUnplayed(input);
+    if (options.fromMs || options.toMs)
+        WarnOfRestarts(input);
     if (options.fromMs)
         SeekToStart(input, *options.fromMs);
-    AcceptAllTimes(input);
+    input.file.accept_all_times();
     Losses losses(input);
     FrameSource source(input, streams, &losses);
     FramePrinter printer(options, streams);
+    ReadProgress progress(input.name, input.info.size);
     while (!printer.Done()) {
         const std::optional<FrameRecord> frame = source.Next();
+        progress.Hide(); // it shows only what takes long
         if (!frame)
             break;
         printer.Take(*frame);
@@ -213,22 +224,6 @@ void PrintComplete(const FramesOptions& options)
     losses.Warn();
 }
 
-// FLAGS of the file header (FLV file format, version 10.1, annex E.2): the streams that it promises.
-uint32_t AnnouncedStreams(const Input& input)
-{
-    constexpr uint32_t FLAGS_OFFSET = 4;
-    constexpr uint8_t VIDEO_FLAG = 0x01;
-    constexpr uint8_t AUDIO_FLAG = 0x04;
-    TagReader reader(input);
-    const uint8_t* const flags = reader.Bytes(FLAGS_OFFSET, 1);
-    if (flags == nullptr)
-        return 0;
-    uint32_t streams = 0;
-    streams |= (*flags & VIDEO_FLAG) != 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0;
-    streams |= (*flags & AUDIO_FLAG) != 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0;
-    return streams;
-}
-
 // Opens as soon as the file is there and holds enough. With two readers a stream that was not found at the open is
 // never played, so that open waits for all streams that the file header promises.
 Input OpenGrowing(const FramesOptions& options, Growth& growth)
@@ -239,7 +234,7 @@ Input OpenGrowing(const FramesOptions& options, Growth& growth)
         const flvdmx::error error = file.error();
         if (file) {
             Input input(options.file, std::move(*file));
-            const bool complete = (AnnouncedStreams(input) & ~input.Streams()) == 0;
+            const bool complete = (TagReader(input).AnnouncedStreams() & ~input.Streams()) == 0;
             if (complete || !options.separateAudio || !growth.Wait())
                 return input;
             continue;
@@ -255,24 +250,29 @@ void WarnOfRest(const Input& input, const Growth& growth)
     const int64_t rest = growth.Size() - std::max(__FLV_DMX__fioTell64(instance.main_reader),
                                                   __FLV_DMX__fioTell64(instance.audio_reader));
     if (rest > 0)
-        Complain(input.name, fmt::format("warning: the last {} bytes hold no whole frame", rest));
+        Complain(input.name, fmt::format("warning: the last {} bytes are not a complete frame", rest));
 }
 
 void PrintGrowing(const FramesOptions& options)
 {
     if (options.file == STANDARD_STREAM)
-        throw FileError(options.file, "standard input cannot be followed: name the file that is being written");
+        throw FileError(options.file, "cannot be followed: name the file that is being written");
     Growth growth(options.file, options.timeoutSeconds);
     Input input = OpenGrowing(options, growth);
     const uint32_t wanted = WantedStreams(options);
-    FramePrinter printer(options, wanted & (AnnouncedStreams(input) | input.Streams()));
+    FramePrinter printer(options, wanted & (TagReader(input).AnnouncedStreams() | input.Streams()));
     FrameSource source(input, wanted);
+    bool told = false;
     while (!printer.Done()) {
         if (const std::optional<FrameRecord> frame = source.Next()) {
             printer.Take(*frame);
-        } else if (growth.Wait()) {
-            source.Refresh();
         } else {
+            if (options.fromMs && !printer.Started() && !std::exchange(told, true))
+                Complain(input.name, fmt::format("note: waiting for {}", FormatTime(*options.fromMs)));
+            if (growth.Wait()) {
+                source.Refresh();
+                continue;
+            }
             printer.Finish();
             WarnOfRest(input, growth);
             return;

@@ -57,9 +57,9 @@ std::optional<Fault> Judge(TagReader& reader, double seconds, double position)
     const std::optional<Tag> tag = reader.At(static_cast<int64_t>(position));
     // The configuration may be there instead of the first keyframe.
     if (!tag || !(tag->IsKeyframe() || (tag->IsAvc() && tag->IsConfig())))
-        return Fault{"place", fmt::format("leads to byte {:.15g}, where no keyframe is", position)};
+        return Fault{"place", fmt::format("leads to byte {:.15g}, where there is no keyframe", position)};
     if (!(std::abs(seconds * 1000 - tag->timestamp) <= MOST_DIFFERENCE_MS))
-        return Fault{"time", fmt::format("says {}, the keyframe at byte {:.15g} has {}", TimeText(seconds), position,
+        return Fault{"time", fmt::format("states {}, but the keyframe at byte {:.15g} has {}", TimeText(seconds), position,
                                          FormatTime(tag->timestamp))};
     return std::nullopt;
 }

@@ -1,4 +1,4 @@
-// `flvdmx info`: what is in each file, as aligned text or as one JSON document.
+// `flvdmx info`: shows what is in each file, as aligned text or as one JSON document.
 #include <algorithm>
 #include <array>
 #include <cmath>
@@ -13,6 +13,7 @@
 
 #include "tools/codec_config.h"
 #include "tools/commands.h"
+#include "tools/formats.h"
 #include "tools/input.h"
 #include "tools/report.h"
 #include "tools/scan.h"
@@ -23,13 +24,13 @@ namespace tool {
 
 namespace {
 
-// A file and what was found out about it.
+// A file and its description.
 struct Subject {
     const Input& input;
-    flvdmx::Metadata metadata;
-    std::optional<FileScan> scan;
-    std::string noVideo; // why there is none, though the file has some
-    std::string noAudio;
+    flvdmx::Metadata metadata{};
+    std::optional<FileScan> scan{};
+    std::string noVideo{}; // why none is played, though the file has some or announces it
+    std::string noAudio{};
 };
 
 // Kilobits per second over the whole file: bits per millisecond.
@@ -40,11 +41,17 @@ uint64_t DataRate(const Subject& subject)
     return duration.count() <= 0 ? 0 : bits / static_cast<uint64_t>(duration.count());
 }
 
-// The count is raised before the arrays are met, so without both arrays it says nothing.
+// The library counts entries before it has found the arrays. Without both of them the count means nothing.
 uint32_t IndexEntries(const Input& input)
 {
     const flvd_keyframe_index_t& index = input.Instance().keyframe_index;
     return index.times_offset != 0 && index.positions_offset != 0 ? index.entry_count : 0;
+}
+
+// Skipped between the frames, and after the last tag.
+uint64_t BytesSkipped(const Subject& subject)
+{
+    return static_cast<uint64_t>(subject.scan->bytesLeftOut + subject.input.Rest());
 }
 
 const char* SeekMethodName(flvdmx::SeekMethod method)
@@ -55,49 +62,60 @@ const char* SeekMethodName(flvdmx::SeekMethod method)
 
 const char* SeekMethodText(flvdmx::SeekMethod method)
 {
-    constexpr std::array TEXTS = {"none, seeking is not possible", "by the keyframe index", "by scanning"};
+    constexpr std::array TEXTS = {"none: seeking is not possible", "by the keyframe index", "by scanning"};
     return TEXTS[std::min<size_t>(static_cast<size_t>(method), TEXTS.size() - 1)];
 }
 
-std::string CodecName(flvdmx::VideoCodec codec)
-{
-    const std::string name = flvdmx::name(codec);
-    return name == "unknown" ? VideoCodecName(codec) : name;
-}
-
-std::string CodecName(flvdmx::AudioCodec codec)
-{
-    const std::string name = flvdmx::name(codec);
-    return name == "unknown" ? fmt::format("unknown ({})", static_cast<uint32_t>(codec)) : name;
-}
-
-// What the tag headers say; AAC and MP3 have a rate of their own, the others theirs from here.
+// What the codec byte of the audio tags says. AAC and MP3 have a rate of their own.
 uint32_t HeaderSampleRate(const Input& input)
 {
     constexpr std::array<uint32_t, 4> RATES = {5500, 11025, 22050, 44100};
     return RATES[input.Instance().audio_format_filter >> 2 & 3];
 }
 
-// The last keyframe as the file tells it, or as it was found.
+// The codec byte cannot express the rates of codecs that have only one.
+uint32_t SampleRate(const flvdmx::AudioInfo& audio)
+{
+    switch (audio.codec) {
+    case flvdmx::AudioCodec::speex:
+    case flvdmx::AudioCodec::nellymoser_16khz:
+        return 16000;
+    case flvdmx::AudioCodec::nellymoser_8khz:
+    case flvdmx::AudioCodec::a_law:
+    case flvdmx::AudioCodec::mu_law:
+        return 8000;
+    default:
+        return audio.sample_rate;
+    }
+}
+
+// The library reads no chroma format for some profiles, and then a wrong size.
+PictureSize SizeOf(const flvdmx::VideoInfo& video)
+{
+    const PictureSize size = AvcPictureSize(video.config);
+    return size.width != 0 ? size : PictureSize{video.width, video.height};
+}
+
+// The last keyframe that was found, otherwise the one that the file states.
 std::optional<flvdmx::Milliseconds> LastKeyframe(const Subject& subject)
 {
     if (subject.scan)
         return subject.scan->lastKeyframe;
-    const flvdmx::Milliseconds told = subject.input.info.video->last_keyframe;
-    return told.count() != 0 ? std::optional(told) : std::nullopt;
+    const flvdmx::Milliseconds stated = subject.input.info.video->last_keyframe;
+    return stated.count() != 0 ? std::optional(stated) : std::nullopt;
 }
 
-// Collects `name  value` lines; a value that the file does not tell is left out.
+// Collects `name  value` lines, without values that are not known.
 class Listing {
 public:
     void Line(std::string_view name, std::string_view value)
     {
         fmt::format_to(std::back_inserter(m_text), "  {:<23} {}\n", name, value);
     }
-    void Number(std::string_view name, double value, std::string_view unit)
+    void Quantity(std::string_view name, double value, std::string_view unit)
     {
         if (value != 0)
-            Line(name, fmt::format("{:.7g} {}", value, unit));
+            Line(name, fmt::format("{} {}", Number(value), unit));
     }
     void Config(const std::vector<uint8_t>& config)
     {
@@ -123,17 +141,19 @@ void ListVideo(Listing& listing, const Subject& subject, const flvdmx::VideoInfo
     if (!video.config.empty())
         listing.Line("  profile",
                      fmt::format("{}, level {}", AvcProfileName(video.config), AvcLevelName(video.config)));
-    if (video.width != 0 || video.height != 0)
-        listing.Line("  picture size", fmt::format("{} x {}", video.width, video.height));
-    listing.Number("  frame rate", video.frame_rate, "frames/s");
+    const PictureSize size = SizeOf(video);
+    if (size.width != 0 || size.height != 0)
+        listing.Line("  picture size", fmt::format("{} x {}", size.width, size.height));
+    listing.Quantity("  frame rate", video.frame_rate, "frames/s");
     if (const auto last = LastKeyframe(subject))
         listing.Line("  last keyframe", FormatTime(*last));
     if (subject.scan) {
         listing.Line("  frames",
                      fmt::format("{}, {}", subject.scan->videoFrames, Plural(subject.scan->keyframes, "keyframe")));
-        listing.Line("  keyframe distance",
-                     fmt::format("{:.3g} s on average, {:.3g} s at most", subject.scan->AverageDistanceMs() / 1000,
-                                 static_cast<double>(subject.scan->longestDistance.count()) / 1000));
+        if (subject.scan->keyframes > 1)
+            listing.Line("  keyframe distance",
+                         fmt::format("{} s on average, {} s at most", Number(subject.scan->averageDistanceMs / 1000),
+                                     Number(static_cast<double>(subject.scan->longestDistanceMs) / 1000)));
     }
     listing.Config(video.config);
 }
@@ -145,20 +165,22 @@ void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo
         const AacConfig aac = ParseAacConfig(audio.config);
         listing.Line("  object type", fmt::format("{} ({})", aac.objectType, AacObjectTypeName(aac.objectType)));
         if (aac.outputSampleRate != aac.sampleRate)
-            listing.Number("  output rate", aac.outputSampleRate, "Hz");
+            listing.Quantity("  output rate", aac.outputSampleRate, "Hz");
     }
     const uint32_t header = HeaderSampleRate(subject.input);
-    listing.Line("  sample rate", header == audio.sample_rate
-                                      ? fmt::format("{} Hz", audio.sample_rate)
-                                      : fmt::format("{} Hz (the tag headers say {} Hz)", audio.sample_rate, header));
+    const uint32_t rate = SampleRate(audio);
+    listing.Line("  sample rate", header == rate ? fmt::format("{} Hz", rate)
+                                                 : fmt::format("{} Hz (the tag headers say {} Hz)", rate, header));
+    if (IsPcm(audio.codec))
+        listing.Line("  sample size", fmt::format("{} bits", PcmSampleSize(subject.input)));
     listing.Line("  channels", std::to_string(audio.channels));
-    listing.Number("  data rate", audio.data_rate, "kbit/s");
+    listing.Quantity("  data rate", audio.data_rate, "kbit/s");
     if (subject.scan)
         listing.Line("  frames", std::to_string(subject.scan->audioFrames));
     listing.Config(audio.config);
 }
 
-// Dates as ISO 8601 has them; one that no calendar has is null.
+// Dates in ISO 8601 format; null for one that no calendar has.
 struct ToJson {
     Json operator()(const flvdmx::Date& date) const
     {
@@ -179,7 +201,7 @@ Json ValueOf(const flvdmx::Property& property)
 std::string ValueText(const flvdmx::Property& property)
 {
     if (const auto* const number = std::get_if<double>(&property.value))
-        return fmt::format("{:.10g}", *number);
+        return Number(*number, 10);
     const Json value = ValueOf(property);
     return value.is_string() ? Printable(value.get<std::string>()) : value.dump();
 }
@@ -192,16 +214,16 @@ std::string InfoText(const Subject& subject)
     listing.Line("size", fmt::format("{} bytes", input.info.size));
     listing.Line("streams", StreamsText(input));
     listing.Line("duration", input.info.duration.count() != 0 ? FormatTime(input.info.duration) : "unknown");
-    if (subject.scan && subject.scan->restarts > 0)
-        listing.Line("played duration", fmt::format("{}, timestamps start again {}", FormatTime(subject.scan->played),
-                                                    Plural(subject.scan->restarts, "time")));
+    if (subject.scan && subject.scan->jumps > 0)
+        listing.Line("played duration", fmt::format("{}, timestamps jump {}", FormatTime(subject.scan->played),
+                                                    Plural(subject.scan->jumps, "time")));
     listing.Line("first timestamp", FormatTime(input.info.start_time));
-    listing.Number("data rate", static_cast<double>(DataRate(subject)), "kbit/s");
+    listing.Quantity("data rate", static_cast<double>(DataRate(subject)), "kbit/s");
     listing.Line("seek method", SeekMethodText(input.info.seek_method));
     const uint32_t entries = IndexEntries(input);
     listing.Line("keyframe index", entries == 0 ? "none" : fmt::format("{} entries", entries));
     if (subject.scan)
-        listing.Line("bytes left out", std::to_string(subject.scan->bytesLeftOut));
+        listing.Line("skipped", Plural(BytesSkipped(subject), "byte"));
     if (input.info.video)
         ListVideo(listing, subject, *input.info.video);
     if (input.info.audio)
@@ -211,7 +233,7 @@ std::string InfoText(const Subject& subject)
                                              subject.metadata.size() == 1 ? "property" : "properties"));
     for (const flvdmx::Property& property : subject.metadata)
         listing.Line("  " + Printable(property.name), ValueText(property));
-    return Printable(input.name) + "\n" + listing.Text();
+    return DisplayName(input.name) + "\n" + listing.Text();
 }
 
 template <typename Value> Json OrNull(bool known, const Value& value)
@@ -223,10 +245,11 @@ Json VideoObject(const Subject& subject, const flvdmx::VideoInfo& video)
 {
     const auto last = LastKeyframe(subject);
     const bool avc = !video.config.empty();
+    const PictureSize size = SizeOf(video);
     Json object = {{"codec", CodecName(video.codec)},
                    {"fourcc", OrNull(!video.fourcc.empty(), video.fourcc)},
-                   {"width", video.width},
-                   {"height", video.height},
+                   {"width", size.width},
+                   {"height", size.height},
                    {"frame_rate", video.frame_rate},
                    {"last_keyframe_ms", last ? Json(last->count()) : Json()},
                    {"profile", OrNull(avc, AvcProfileName(video.config))},
@@ -235,17 +258,21 @@ Json VideoObject(const Subject& subject, const flvdmx::VideoInfo& video)
     if (subject.scan) {
         object["frames"] = subject.scan->videoFrames;
         object["keyframes"] = subject.scan->keyframes;
-        object["keyframe_distance_ms"] = {{"average", subject.scan->AverageDistanceMs()},
-                                          {"longest", subject.scan->longestDistance.count()}};
+        const bool known = subject.scan->keyframes > 1;
+        object["keyframe_distance_ms"] = {{"average", OrNull(known, subject.scan->averageDistanceMs)},
+                                          {"longest", OrNull(known, subject.scan->longestDistanceMs)}};
     }
     return object;
 }
 
 Json AudioObject(const Subject& subject, const flvdmx::AudioInfo& audio)
 {
-    Json object = {{"codec", CodecName(audio.codec)},  {"format_tag", audio.format_tag},
-                   {"sample_rate", audio.sample_rate}, {"header_sample_rate", HeaderSampleRate(subject.input)},
-                   {"sample_size", audio.sample_size}, {"channels", audio.channels},
+    Json object = {{"codec", CodecName(audio.codec)},
+                   {"format_tag", audio.format_tag},
+                   {"sample_rate", SampleRate(audio)},
+                   {"header_sample_rate", HeaderSampleRate(subject.input)},
+                   {"sample_size", IsPcm(audio.codec) ? PcmSampleSize(subject.input) : audio.sample_size},
+                   {"channels", audio.channels},
                    {"data_rate_kbit", audio.data_rate}};
     if (!audio.config.empty()) {
         const AacConfig aac = ParseAacConfig(audio.config);
@@ -273,8 +300,8 @@ Json InfoObject(const Subject& subject)
                    {"bytes_behind_last_tag", input.Rest()}};
     if (subject.scan) {
         object["played_duration_ms"] = subject.scan->played.count();
-        object["timestamp_restarts"] = subject.scan->restarts;
-        object["bytes_left_out"] = subject.scan->bytesLeftOut;
+        object["timestamp_restarts"] = subject.scan->jumps;
+        object["bytes_left_out"] = BytesSkipped(subject);
     }
     if (input.info.video)
         object["video"] = VideoObject(subject, *input.info.video);
@@ -295,26 +322,38 @@ void Warn(const Subject& subject)
 {
     const Input& input = subject.input;
     input.WarnIfCutShort();
-    if (subject.scan && subject.scan->restarts > 0)
-        Complain(input.name, fmt::format("warning: the timestamps start again: the last one is at {}, {} are "
-                                         "played in all",
+    if (subject.scan && subject.scan->jumps > 0)
+        Complain(input.name, fmt::format("warning: the timestamps jump: the last one is {}, but the frames play for {}",
                                          FormatTime(input.info.duration), FormatTime(subject.scan->played)));
     for (const auto& [stream, why] : {std::pair("video", subject.noVideo), std::pair("audio", subject.noAudio)})
         if (!why.empty())
             Complain(input.name, fmt::format("warning: the {} is not played: {}", stream, why));
+    if (const std::string fault = ConfigFault(input); !fault.empty())
+        Complain(input.name, "warning: " + fault);
+    if (const std::string note = UndefinedCodec(input); !note.empty())
+        Complain(input.name, "note: " + note);
+}
+
+// Why a stream without frames has none. When its tags were not found, the file header may still announce it.
+std::string WhyNoStream(TagReader& reader, flvdmx::Stream stream, const Input& input)
+{
+    std::string why = reader.WhyNoStream(stream);
+    if (why.empty() && (reader.AnnouncedStreams() & ~input.Streams() & static_cast<uint32_t>(stream)) != 0)
+        why = "the file header announces it, but no tag of it was found";
+    return why;
 }
 
 Json Inspect(const std::string& name, const InfoOptions& options, bool first)
 {
     Input input(name);
-    Subject subject{input, {}, {}, {}, {}};
+    Subject subject{input};
     if (const auto metadata = input.file.metadata(); metadata)
         subject.metadata = *metadata;
     if (options.scan || SeemsToRestart(input))
         subject.scan = ScanFile(name);
     TagReader reader(input);
-    subject.noVideo = reader.WhyNoStream(flvdmx::Stream::video);
-    subject.noAudio = reader.WhyNoStream(flvdmx::Stream::audio);
+    subject.noVideo = WhyNoStream(reader, flvdmx::Stream::video, input);
+    subject.noAudio = WhyNoStream(reader, flvdmx::Stream::audio, input);
     Warn(subject);
     if (!options.json)
         Print((first ? "" : "\n") + InfoText(subject));

@@ -1,4 +1,4 @@
-// A file that is read.
+// A file to read.
 #include "tools/input.h"
 
 #include <array>
@@ -14,13 +14,15 @@
 #include <unistd.h>
 
 #include "flvdmx/posix_host.h"
+#include "tools/progress.h"
 #include "tools/report.h"
+#include "tools/tag.h"
 
 namespace tool {
 
 namespace {
 
-// Standard input as something that can be read at any place: itself when it is a file, else a copy in memory.
+// Standard input as a seekable descriptor: itself if it is a file, otherwise a copy in memory.
 int SeekableStandardInput()
 {
     struct stat status {};
@@ -32,34 +34,53 @@ int SeekableStandardInput()
     for (ssize_t got = 0; (got = read(STDIN_FILENO, block.data(), block.size())) > 0;) {
         total += static_cast<uint64_t>(got);
         if (total > STANDARD_INPUT_MAX)
-            throw FileError(STANDARD_STREAM, fmt::format("standard input has more than the {} MiB that are kept in "
-                                                         "memory: write it to a file first",
+            throw FileError(STANDARD_STREAM, fmt::format("it is larger than the {} MiB that are kept in memory: "
+                                                         "write it to a file first",
                                                          STANDARD_INPUT_MAX >> 20));
         if (write(copy, block.data(), static_cast<size_t>(got)) != got)
-            throw FileError(STANDARD_STREAM, fmt::format("cannot keep standard input: {}", std::strerror(errno)));
+            throw FileError(STANDARD_STREAM, fmt::format("cannot be copied to memory: {}", std::strerror(errno)));
     }
     return copy;
 }
 
-// The library says only that there is no valid header; the file itself tells the user more.
+// The library reports only that there is no valid header. A look at the file tells the user more.
 std::string HeaderFailureText(const std::string& path)
 {
     std::error_code failure;
     const auto size = std::filesystem::file_size(path, failure);
     if (failure)
-        return "no FLV file header";
+        return "not an FLV file";
     if (size == 0)
-        return "no FLV file header: the file is empty";
+        return "not an FLV file: the file is empty";
     if (HasSignature(path))
         return fmt::format("the FLV file header is damaged or cut short (the file has {} bytes)", size);
-    return "no FLV file header: this is not an FLV file";
+    return "not an FLV file: it does not start with the signature FLV";
+}
+
+const flvd_init_t& PosixFunctions()
+{
+    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
+    return host.functions();
+}
+
+uint32_t ReadAndShow(void* buffer, uint32_t size, uint32_t count, void* handle)
+{
+    ReadProgress::ShowRead(PosixFunctions().file_tell64(handle));
+    return PosixFunctions().file_read(buffer, size, count, handle);
+}
+
+flvdmx::Host MakeHost()
+{
+    flvd_init_t functions = PosixFunctions();
+    functions.file_read = ReadAndShow;
+    return flvdmx::Host(functions);
 }
 
 } // namespace
 
 const flvdmx::Host& Host()
 {
-    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
+    static const flvdmx::Host host = MakeHost();
     return host;
 }
 
@@ -80,9 +101,9 @@ std::string PathOf(const std::string& name)
     struct stat status {};
     const bool special = stat(name.c_str(), &status) == 0 && !S_ISREG(status.st_mode) && !S_ISBLK(status.st_mode) &&
                          !S_ISDIR(status.st_mode);
-    if (special) // a pipe that nobody writes to would not even open
+    if (special) // opening a pipe without a writer would block
         throw FileError(name,
-                        "cannot be opened: a pipe or device cannot be read at any place; 'flvdmx COMMAND - <FILE' "
+                        "cannot be opened: a pipe or device is not seekable; 'flvdmx COMMAND - <FILE' "
                         "reads a pipe into memory",
                         {flvdmx::Kind::failed, FLVD_ERR_OPEN_MAIN, 0});
     return name;
@@ -92,13 +113,18 @@ std::string OpenFailureText(const std::string& path, const flvdmx::error& error)
 {
     if (error.code() == FLVD_ERR_OPEN_MAIN || error.code() == FLVD_ERR_OPEN_AUDIO)
         return fmt::format("cannot be opened: {}",
-                           error.system_error() != 0 ? std::strerror(error.system_error()) : "no memory");
-    return error.code() == FLVD_ERR_FILE_HEADER ? HeaderFailureText(path) : error.text();
+                           error.system_error() != 0 ? std::strerror(error.system_error()) : "out of memory");
+    if (error.code() == FLVD_ERR_FILE_HEADER)
+        return HeaderFailureText(path);
+    const std::string why = WhyNothingIsPlayed(path, error.code());
+    return why.empty() ? error.text() : why;
 }
 
 Input::Input(const std::string& file_name, flvdmx::File&& opened)
     : name(file_name), file(std::move(opened)), info(file.info())
 {
+    if (info.video && (Instance().video_codec_filter & EXTENDED_HEADER) != 0) // enhanced FLV: no frame is delivered
+        info.video.reset();
 }
 
 Input::Input(const std::string& file_name, const flvdmx::Options& options) : name(file_name)
@@ -107,8 +133,7 @@ Input::Input(const std::string& file_name, const flvdmx::Options& options) : nam
     flvdmx::result<flvdmx::File> opened = flvdmx::File::open(path, Host(), options);
     if (!opened)
         throw FileError(name, OpenFailureText(path, opened.error()), opened.error());
-    file = std::move(*opened);
-    info = file.info();
+    *this = Input(name, std::move(*opened));
 }
 
 uint32_t Input::Streams() const
@@ -124,9 +149,9 @@ int64_t Input::Rest() const
 void Input::WarnIfCutShort() const
 {
     if (Instance().file_shorter_than_meta != 0)
-        Complain(name, "warning: the file is cut short: its metadata announces more bytes than it has");
+        Complain(name, "warning: the file is cut short: its metadata announces a larger file");
     if (Rest() > 0)
-        Complain(name, fmt::format("warning: the last {} bytes hold no whole tag and are not played", Rest()));
+        Complain(name, fmt::format("warning: the last {} bytes are not a complete tag and are not played", Rest()));
 }
 
 } // namespace tool

@@ -1,4 +1,4 @@
-// A file that is read: opened with words for what goes wrong.
+// A file to read.
 #ifndef FLVDMX_TOOLS_INPUT_H
 #define FLVDMX_TOOLS_INPUT_H
 
@@ -6,20 +6,20 @@
 #include <string>
 
 #include "flvdmx/flvdmx.hpp"
+#include "tools/report.h"
 
 namespace tool {
 
-constexpr const char* STANDARD_STREAM = "-";          /**< names standard input or standard output */
 constexpr uint64_t STANDARD_INPUT_MAX = 256ULL << 20; /**< bytes taken from a pipe */
 
 /** @return the functions with which all files are read */
 const flvdmx::Host& Host();
 
-/** @return the path to open for what the user named; for "-" one of what standard input holds. Throws FileError for
- * what cannot be read at any place */
+/** @return the path of the file that the user named; for "-", one that leads to standard input or a copy of it. Throws
+ *          FileError for a file that is not seekable */
 std::string PathOf(const std::string& name);
 
-/** @return true when the file begins as FLV files do */
+/** @return true if the file starts with the signature of FLV files */
 bool HasSignature(const std::string& path);
 
 /** An open file. */
@@ -36,20 +36,14 @@ struct Input {
     uint32_t Streams() const; /**< FLVD_STREAM_* bits of the streams found */
     bool Has(flvdmx::Stream stream) const { return (Streams() & static_cast<uint32_t>(stream)) != 0; }
 
-    /** Bytes after the last whole tag of a complete file. */
+    /** @return bytes after the last complete tag of a complete file */
     int64_t Rest() const;
 
-    /** Tells on standard error what of a complete file cannot be played because its end is missing. */
+    /** Warns on standard error if the end of a complete file is missing. */
     void WarnIfCutShort() const;
 };
 
-/** From now on frames may have any time, as with Options::restarting_timestamps; no seek may follow. */
-inline void AcceptAllTimes(Input& input)
-{
-    input.file.instance()->last_ts = 0;
-}
-
-/** @return what to tell of a file that could not be opened */
+/** @return why a file could not be opened, in words */
 std::string OpenFailureText(const std::string& path, const flvdmx::error& error);
 
 } // namespace tool

@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <functional>
 #include <map>
+#include <memory>
 #include <string>
 #include <system_error>
 #include <utility>
@@ -29,18 +30,19 @@ namespace {
 
 constexpr const char* TIME_HELP = "TIME is seconds (12.5) or [HH:]MM:SS[.FRACTION].";
 
-// What CLI11 shows when a value is refused; an empty text accepts it.
+// Validators return what is wrong with a value; an empty text accepts it.
 const CLI::Validator IS_TIME(
     [](const std::string& text) {
-        return ParseTime(text) ? std::string() : fmt::format("'{}' is no time: seconds or [HH:]MM:SS[.FRACTION]", text);
+        return ParseTime(text) ? std::string()
+                               : fmt::format("'{}' is not a time: write seconds or [HH:]MM:SS[.FRACTION]", text);
     },
     "", "time");
 
-// Signs are refused, which the conversion to an unsigned number lets pass.
+// Rejects signs, which the conversion to an unsigned number accepts.
 const CLI::Validator IS_COUNT(
     [](const std::string& text) {
         const bool digits = text.find_first_not_of("0123456789") == std::string::npos;
-        return digits ? std::string() : fmt::format("'{}' is no number of frames", text);
+        return digits ? std::string() : fmt::format("'{}' is not a number from 0 on", text);
     },
     "", "count");
 
@@ -50,12 +52,23 @@ const CLI::Validator IS_SECONDS(
     [](const std::string& text) {
         double seconds = -1;
         const bool valid = CLI::detail::lexical_cast(text, seconds) && seconds >= 0 && seconds <= MOST_SECONDS;
-        return valid ? std::string() : fmt::format("'{}' is no number of seconds", text);
+        return valid ? std::string() : fmt::format("'{}' is not a number of seconds", text);
     },
     "", "seconds");
 
-const CLI::Validator IS_NAME([](const std::string& text) { return std::string(text.empty() ? "no name" : ""); }, "",
+const CLI::Validator IS_NAME([](const std::string& text) { return text.empty() ? "the name is empty" : ""; }, "",
                              "name");
+
+void AddFile(CLI::App* command, std::string& file)
+{
+    command->add_option("FILE", file, "FLV file; - is standard input")->required()->type_name("");
+}
+
+void AddOutput(CLI::App* command, std::string& out, bool& force, const char* help)
+{
+    command->add_option("-o,--output", out, help)->required()->check(IS_NAME)->type_name("OUT");
+    command->add_flag("--force", force, "Overwrite an existing file");
+}
 
 CLI::Option* AddTime(CLI::App* command, const char* name, const std::function<void(int32_t)>& take, const char* help)
 {
@@ -88,13 +101,12 @@ CLI::Option* AddChoice(CLI::App* command, const char* name, const Choices<Value>
 
 const Choices<uint32_t> STREAMS = {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}};
 
-void AddInfo(CLI::App& app, InfoOptions& options)
+void AddInfo(CLI::App* command, InfoOptions& options)
 {
-    CLI::App* const command = app.add_subcommand("info", "Show what is in each file");
     command->add_option("FILE", options.files, "FLV files; - is standard input")->required()->type_name("");
     command->add_flag("--json", options.json, "Print one JSON document");
     command->add_flag("--scan", options.scan,
-                      "Read the whole file: count frames and what is left out, measure keyframe distances");
+                      "Read the whole file: count frames and skipped bytes,\nand measure keyframe distances");
     command->footer("  flvdmx info clip.flv\n"
                     "  flvdmx info --scan --json *.flv\n"
                     "  curl http://host/clip.flv | flvdmx info -");
@@ -103,7 +115,7 @@ void AddInfo(CLI::App& app, InfoOptions& options)
 CLI::Option* AddFollow(CLI::App* command, FramesOptions& options)
 {
     command->add_flag("--follow", options.follow,
-                      "The file is still being written, or not there yet: wait for more and print it as it comes");
+                      "The file is still being written, or does not exist yet: print\nframes as they come");
     return command
         ->add_option("--timeout", options.timeoutSeconds,
                      "With --follow: stop when the file has not grown for S seconds (default 5)")
@@ -111,26 +123,26 @@ CLI::Option* AddFollow(CLI::App* command, FramesOptions& options)
         ->type_name("S");
 }
 
-void AddFrames(CLI::App& app, FramesOptions& options)
+void AddFrames(CLI::App* command, FramesOptions& options)
 {
-    CLI::App* const command = app.add_subcommand("frames", "List the frames, one per line");
-    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
+    AddFile(command, options.file);
     CLI::Option* const json = command->add_flag_callback(
         "--json", [&options] { options.format = Format::json; }, "Print one JSON object per line");
     command
         ->add_flag_callback(
-            "--csv", [&options] { options.format = Format::csv; }, "Print comma-separated values after a line of names")
+            "--csv", [&options] { options.format = Format::csv; },
+            "Print comma-separated values, with column names on the first line")
         ->excludes(json);
-    command->add_flag("--keyframes", options.keyframes, "List only the keyframes of the video");
+    command->add_flag("--keyframes", options.keyframes, "List only video keyframes");
     AddChoice(command, "--stream", STREAMS, options.streams, "List only this stream: video or audio");
     AddCount(command, "--count", options.count, "Stop after N frames");
     AddTime(
         command, "--from", [&options](int32_t ms) { options.fromMs = ms; },
         "Begin at the keyframe at or before TIME; audio alone begins at TIME");
     AddTime(
-        command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "Leave out frames later than TIME");
+        command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "Omit frames later than TIME");
     command->add_flag("--separate-audio", options.separateAudio,
-                      "Read audio with a reader of its own; the streams are merged by time");
+                      "Use a separate audio reader; the streams are merged by time");
     const CLI::Option* const timeout = AddFollow(command, options);
     command->callback([&options, timeout] {
         if (timeout->count() != 0 && !options.follow)
@@ -138,42 +150,43 @@ void AddFrames(CLI::App& app, FramesOptions& options)
         if (options.keyframes && options.streams == FLVD_STREAM_AUDIO)
             throw CLI::ValidationError("--keyframes", "these are frames of the video");
     });
-    command->footer(fmt::format("Each line holds number, stream, whether it is a keyframe of the video, time, time to\n"
-                                "show it, size in bytes, place in the file, and CRC-32 of the bytes.\n{}\n\n"
-                                "  flvdmx frames clip.flv\n"
-                                "  flvdmx frames --stream video --from 1:30 --to 1:35 clip.flv\n"
-                                "  flvdmx frames --keyframes --csv clip.flv >keyframes.csv\n"
-                                "  flvdmx frames --follow --timeout 10 recording.flv",
-                                TIME_HELP));
+    command->footer(
+        fmt::format("Each line holds number, stream, whether it is a video keyframe, time, presentation time, size in\n"
+                    "bytes, position in the file, and CRC-32 of the bytes.\n{}\n\n"
+                    "  flvdmx frames clip.flv\n"
+                    "  flvdmx frames --stream video --from 1:30 --to 1:35 clip.flv\n"
+                    "  flvdmx frames --keyframes --csv clip.flv >keyframes.csv\n"
+                    "  flvdmx frames --follow --timeout 10 recording.flv",
+                    TIME_HELP));
 }
 
 void AddSeekModes(CLI::App* command, SeekOptions& options)
 {
     const Choices<uint32_t> modes = {{"backward", FLVD_SEEK_BACKWARD}, {"forward", FLVD_SEEK_FORWARD}, {"auto", 0}};
     AddChoice(command, "--mode", modes, options.direction,
-              "Land on the keyframe at or before TIME (backward, the default) or at or after it (forward); "
-              "auto: forward, unless TIME is before the current position");
+              "Land on the keyframe at or before TIME (backward, the default)\n"
+              "or at or after it (forward); auto: forward, unless TIME is\n"
+              "before the current position");
     const auto addBit = [&](const char* name, uint32_t bit, const char* help) {
         command->add_flag_callback(
             name, [&options, bit] { options.mode |= bit; }, help);
     };
     addBit("--relative", FLVD_SEEK_RELATIVE, "TIME is an offset from the current position and may be negative");
-    addBit("--end-on-miss", FLVD_SEEK_TO_END_ON_MISS, "Go to the end of the file when there is nothing to land on");
-    addBit("--retry-backward", FLVD_SEEK_RETRY_BACKWARD, "Try backward when there is nothing to land on");
+    addBit("--end-on-miss", FLVD_SEEK_TO_END_ON_MISS, "Go to the end of the file after a miss");
+    addBit("--retry-backward", FLVD_SEEK_RETRY_BACKWARD, "Try backward after a miss");
 }
 
-void AddSeek(CLI::App& app, SeekOptions& options)
+void AddSeek(CLI::App* command, SeekOptions& options)
 {
-    CLI::App* const command = app.add_subcommand("seek", "Seek, show the landing place and the frames from there on");
-    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
+    AddFile(command, options.file);
     AddTime(
         command, "TIME", [&options](int32_t ms) { options.timeMs = ms; }, "Where to seek to")
         ->required()
         ->type_name("");
     AddSeekModes(command, options);
     AddCount(command, "--play", options.play, "Read N frames before the seek (default 0)");
-    AddCount(command, "--count", options.count, "Show N frames from the landing place on (default 5)");
-    command->add_flag("--separate-audio", options.separateAudio, "Read audio with a reader of its own");
+    AddCount(command, "--count", options.count, "Show N frames from there (default 5)");
+    command->add_flag("--separate-audio", options.separateAudio, "Use a separate audio reader");
     command->add_flag("--json", options.json, "Print one JSON document");
     command->footer(fmt::format("{}\n\n"
                                 "  flvdmx seek clip.flv 12.5\n"
@@ -186,92 +199,82 @@ void AddSeek(CLI::App& app, SeekOptions& options)
     });
 }
 
-void AddExtract(CLI::App& app, ExtractOptions& options)
+void AddExtract(CLI::App* command, ExtractOptions& options)
 {
-    CLI::App* const command = app.add_subcommand("extract", "Write the streams to files that players take");
-    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
-    command->add_option("-o,--output", options.out, "Where to write; - is standard output")
-        ->required()
-        ->check(IS_NAME)
-        ->type_name("OUT");
+    AddFile(command, options.file);
+    AddOutput(command, options.out, options.force, "Where to write; - is standard output");
     AddChoice(command, "--stream", STREAMS, options.streams, "Write only this stream: video or audio");
-    command->add_flag("--force", options.force, "Overwrite files that exist");
-    command->footer(
-        "OUT is the file to write when there is one stream, or --stream chooses one. Of two streams it is the\n"
-        "beginning of the names: OUT.h264 and OUT.aac, for instance. A folder that exists takes files\n"
-        "named as FILE. Extensions: h264 (Annex B), aac (ADTS), mp3, wav (PCM); video and audio for all else,\n"
-        "which is written raw.\n\n"
-        "  flvdmx extract clip.flv -o clip\n"
-        "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
-        "  flvdmx extract --stream video clip.flv -o - | player -");
+    command->footer("If the file has one stream, or --stream selects one, OUT is the name of the file to write. Two\n"
+                    "streams are written to OUT.EXTENSION each, such as OUT.h264 and OUT.aac. If OUT is an existing\n"
+                    "folder, the files in it are named after FILE.\n"
+                    "Extensions: h264 (AVC as Annex B), aac (ADTS), mp3, wav (PCM). Other codecs are written raw,\n"
+                    "one frame after the other, with the extension video or audio.\n\n"
+                    "  flvdmx extract clip.flv -o clip\n"
+                    "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
+                    "  flvdmx extract --stream video clip.flv -o - | player -");
 }
 
-void AddCheck(CLI::App& app, CheckOptions& options)
+void AddCheck(CLI::App* command, CheckOptions& options)
 {
-    CLI::App* const command = app.add_subcommand("check", "Judge files: damage, timestamps, keyframe index");
-    command->add_option("FILE", options.files, "FLV files, and folders of them; - is standard input")
+    command->add_option("FILE", options.files, "FLV files, or folders of them; - is standard input")
         ->required()
         ->type_name("");
     command->add_flag("--json", options.json, "Print one JSON document");
-    command->add_option("--jobs", options.jobs, "Check N files at the same time (default 1)")
-        ->check(CLI::Range(1, 256))
+    command->add_option("--jobs", options.jobs, "Check up to N files at the same time, at most 256 (default 1)")
+        ->check(CLI::Range(1, 256).description(""))
         ->type_name("N");
     command
-        ->add_option("--jump", options.jumpSeconds, "Report steps forward in time of more than S seconds (default 10)")
+        ->add_option("--jump", options.jumpSeconds,
+                     "Report times that jump forward by more than S seconds (default 10)")
         ->check(IS_SECONDS)
         ->type_name("S");
     command
         ->add_option("--max-gap", options.maxGapSeconds,
-                     "Report keyframes more than S seconds apart, and audio and video of which one is more than S "
-                     "seconds ahead in the file")
+                     "Report keyframes that are more than S seconds apart, and audio\n"
+                     "and video that are more than S seconds apart in the file")
         ->check(IS_SECONDS)
         ->type_name("S");
-    command->footer("What is found, one line per cause:\n"
-                    "  gap                bytes that belong to no tag\n"
-                    "  cut_short          the end of the last tag, or of what the metadata announces, is missing\n"
-                    "  back_pointer       the size after a tag is wrong\n"
-                    "  no_back_pointer    there is none\n"
-                    "  passed_over        tags that a player leaves out: of another codec, too late, too short\n"
-                    "  jump               time runs back, or forward by more than --jump, within a stream\n"
-                    "  index              an entry leads to no keyframe, or its time is wrong by more than a second\n"
-                    "  keyframe_distance  keyframes are more than --max-gap apart\n"
-                    "  interleaving       audio and video are more than --max-gap apart in the file\n"
-                    "  not_playable       the file cannot be opened for playing\n"
-                    "  configuration      a codec configuration changes: listed, but no fault\n"
-                    "The first 1000 findings of a file are listed, all are counted.\n\n"
-                    "Exit codes: 0 all files are ok, 1 something was found or a file could not be read.");
+    command->footer(
+        "Findings, one line per cause:\n"
+        "  gap                bytes that belong to no tag\n"
+        "  cut_short          the end of the last tag, or of the data that the metadata announces, is missing\n"
+        "  back_pointer       the back-pointer of a tag is wrong\n"
+        "  no_back_pointer    the back-pointer of a tag is missing\n"
+        "  passed_over        tags that players skip: of a stream or codec that is not played, later than\n"
+        "                     the last timestamp, empty or too short\n"
+        "  jump               time jumps back, or forward by more than --jump, within a stream\n"
+        "  index              an entry leads to no keyframe, or its time is wrong by more than a second\n"
+        "  keyframe_distance  keyframes are more than --max-gap apart\n"
+        "  interleaving       audio and video at the same position in the file are more than --max-gap\n"
+        "                     apart in time\n"
+        "  no_configuration   AAC audio starts without its configuration\n"
+        "  not_playable       the file cannot be opened for playing\n"
+        "Notes, which are not faults:\n"
+        "  configuration      a codec configuration changes\n"
+        "  codec              FLV does not define a codec of the file\n"
+        "  pause              a stream has no frames for longer than --jump, but the other one has\n"
+        "The first 1000 findings of a file are listed; all are counted.\n\n"
+        "Exit status: 0 no findings, 1 a file has findings or could not be read, 2 usage error.");
 }
 
-void AddPlot(CLI::App& app, PlotOptions& options)
+void AddPlot(CLI::App* command, PlotOptions& options)
 {
-    CLI::App* const command = app.add_subcommand("plot", "Draw bit rate, keyframes and interleaving over time");
-    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
-    command->add_option("-o,--output", options.out, "SVG file to write; - is standard output")
-        ->required()
-        ->check(IS_NAME)
-        ->type_name("OUT");
-    command->add_flag("--force", options.force, "Overwrite a file that exists");
+    AddFile(command, options.file);
+    AddOutput(command, options.out, options.force, "SVG file to write; - is standard output");
     command->footer("The manual page explains the drawing.\n\n"
                     "  flvdmx plot clip.flv -o clip.svg");
 }
 
-CLI::App* AddRewrite(CLI::App& app, const char* name, const char* help, RewriteOptions& options)
+void AddRewrite(CLI::App* command, RewriteOptions& options)
 {
-    CLI::App* const command = app.add_subcommand(name, help);
-    command->add_option("FILE", options.file, "FLV file; - is standard input")->required()->type_name("");
-    command->add_option("-o,--output", options.out, "FLV file to write; - is standard output")
-        ->required()
-        ->check(IS_NAME)
-        ->type_name("OUT");
-    command->add_flag("--force", options.force, "Overwrite a file that exists");
+    AddFile(command, options.file);
+    AddOutput(command, options.out, options.force, "FLV file to write; - is standard output");
     command->add_flag("--dry-run", options.dryRun, "Say what would be written, and write nothing");
-    return command;
 }
 
-void AddRepair(CLI::App& app, RewriteOptions& options)
+void AddRepair(CLI::App* command, RewriteOptions& options)
 {
-    CLI::App* const command =
-        AddRewrite(app, "repair", "Write a valid file from everything that can be played", options);
+    AddRewrite(command, options);
     command->add_flag("--keep-times", options.keepTimes, "Leave timestamps that restart or jump as they are");
     command->footer("Frames and codec configurations are kept, damage and other bytes are dropped. The metadata gets\n"
                     "a new duration, file size and keyframe index. Timestamps that go back by more than a second or\n"
@@ -279,16 +282,16 @@ void AddRepair(CLI::App& app, RewriteOptions& options)
                     "  flvdmx repair recording.flv -o repaired.flv");
 }
 
-void AddIndex(CLI::App& app, RewriteOptions& options)
+void AddIndex(CLI::App* command, RewriteOptions& options)
 {
-    AddRewrite(app, "index", "Copy an undamaged file and give it a keyframe index", options)
-        ->footer("All tags but the metadata are copied as they are.\n\n"
-                 "  flvdmx index recording.flv -o seekable.flv");
+    AddRewrite(command, options);
+    command->footer("All tags but the metadata are copied as they are.\n\n"
+                    "  flvdmx index recording.flv -o seekable.flv");
 }
 
-void AddCut(CLI::App& app, RewriteOptions& options)
+void AddCut(CLI::App* command, RewriteOptions& options)
 {
-    CLI::App* const command = AddRewrite(app, "cut", "Write a part of a file, with an index of its own", options);
+    AddRewrite(command, options);
     AddTime(
         command, "--from", [&options](int32_t ms) { options.fromMs = ms; }, "Begin at the keyframe at or before TIME");
     AddTime(
@@ -299,26 +302,26 @@ void AddCut(CLI::App& app, RewriteOptions& options)
                                 TIME_HELP));
 }
 
-// CLI11 takes `-5` for an option. After a blank it is a value, and ParseTime passes over blanks.
+// CLI11 mistakes `-5` for an option. After a space it is a value, and ParseTime skips spaces.
 std::vector<std::string> Arguments(int argc, char** argv)
 {
     std::vector<std::string> arguments(argv + 1, argv + argc);
     for (std::string& text : arguments) {
-        if (text == "--") // names only from here on
+        if (text == "--") // only names follow
             break;
         if (!text.empty() && text.front() == '-' && ParseTime(text))
             text.insert(0, 1, ' ');
     }
-    return {arguments.rbegin(), arguments.rend()}; // as CLI11 wants them
+    return {arguments.rbegin(), arguments.rend()}; // CLI11 expects them in reverse
 }
 
-// What the user typed may be the name of a file that looks like an option.
+// For a file name that looks like an option.
 std::string DashAdvice(const std::vector<std::string>& arguments)
 {
     std::error_code failure;
     for (const std::string& text : arguments)
         if (text.size() > 1 && text.front() == '-' && std::filesystem::exists(text, failure))
-            return fmt::format("A file name that begins with a dash goes after '--': flvdmx COMMAND -- {}\n",
+            return fmt::format("Put '--' before a file name that begins with a dash: flvdmx COMMAND -- {}\n",
                                Printable(text));
     return "";
 }
@@ -326,13 +329,16 @@ std::string DashAdvice(const std::vector<std::string>& arguments)
 int Usage(const CLI::App& app, const CLI::ParseError& error, const std::vector<std::string>& arguments)
 {
     const std::vector<CLI::App*> commands = app.get_subcommands();
-    Tell(fmt::format("flvdmx: {}\n{}Try 'flvdmx {}--help'.\n", Printable(error.what()), DashAdvice(arguments),
+    std::string text = error.what();
+    if (commands.empty() && app.remaining_size() > 0)
+        text = fmt::format("'{}' is not a command or option", app.remaining().front());
+    Tell(fmt::format("flvdmx: {}\n{}Try 'flvdmx {}--help'.\n", Printable(text), DashAdvice(arguments),
                      commands.empty() ? "" : commands.front()->get_name() + " "));
     return WRONG_USE;
 }
 
-// A file that is opened must not take the number of a standard stream that was closed: it would get the messages. Where
-// output should go nothing can be written, so that it is noticed.
+// Otherwise a file that is opened could get the number of a closed standard stream, and then the messages. The
+// replacement of standard output is not writable, so that writing fails and is noticed.
 void OccupyStandardStreams()
 {
     for (int descriptor = STDIN_FILENO; descriptor <= STDERR_FILENO; ++descriptor)
@@ -340,43 +346,72 @@ void OccupyStandardStreams()
             open("/dev/null", descriptor == STDERR_FILENO ? O_RDWR | O_CLOEXEC : O_RDONLY | O_CLOEXEC);
 }
 
-void AddHelp(CLI::App& app, std::string& topic)
+// The commands, and what runs each.
+class Commands {
+public:
+    explicit Commands(CLI::App& app) : m_app(app) {}
+
+    template <typename Options>
+    void Add(const char* name, const char* help, void (*describe)(CLI::App*, Options&), int (*execute)(const Options&))
+    {
+        const auto options = std::make_shared<Options>();
+        describe(m_app.add_subcommand(name, help)->group("Commands"), *options);
+        m_names[name] = name;
+        m_run[name] = [execute, options] { return execute(*options); };
+    }
+
+    void AddHelp()
+    {
+        CLI::App* const command = m_app.add_subcommand("help", "Print help, or help for a command")->group("Commands");
+        m_names["help"] = "help";
+        AddChoice(command, "COMMAND", m_names, m_topic, "A command")->type_name("");
+        m_run["help"] = [this] {
+            Print(m_topic.empty() ? m_app.get_formatter()->make_help(&m_app, "flvdmx", CLI::AppFormatMode::Normal)
+                                  : m_app.get_subcommand(m_topic)->help("flvdmx"));
+            return DONE;
+        };
+    }
+
+    int Run() const { return m_run.at(m_app.get_subcommands().front()->get_name())(); }
+
+private:
+    CLI::App& m_app;
+    Choices<std::string> m_names;
+    std::map<std::string, std::function<int()>> m_run;
+    std::string m_topic;
+};
+
+void SetLabels(CLI::App& app)
 {
-    CLI::App* const command = app.add_subcommand("help", "Print help; of a command, the command's");
-    Choices<std::string> names;
-    for (const CLI::App* const known : app.get_subcommands([](CLI::App*) { return true; }))
-        names[known->get_name()] = known->get_name();
-    AddChoice(command, "COMMAND", names, topic, "Command to explain")->type_name("");
+    for (const auto& [label, text] :
+         {std::pair("SUBCOMMAND", "COMMAND"), {"Positionals", "Arguments"}, {"REQUIRED", "(required)"}})
+        app.get_formatter()->label(label, text);
 }
 
 int Run(int argc, char** argv)
 {
-    CLI::App app("Shows what is in FLV files, checks, repairs and cuts them.", "flvdmx");
-    app.set_version_flag("-V,--version", "flvdmx " FLVDMX_VERSION);
-    app.add_flag_callback("--verbose", ShowCodes, "Tell the library's code and line of a failure")->trigger_on_parse();
+    CLI::App app("Inspects, checks, repairs and demultiplexes FLV files.", "flvdmx");
+    SetLabels(app);
+    app.set_help_flag("-h,--help", "Print help");
+    app.set_version_flag("-V,--version", "flvdmx " FLVDMX_VERSION, "Print the version");
+    app.add_flag_callback("--verbose", ShowCodes,
+                          "With any command: also print the library's error code and line number\nof a failure")
+        ->trigger_on_parse();
     app.fallthrough();
-    app.footer("Exit codes: 0 done, 1 a file could not be handled or something was found wrong, 2 wrong use.");
-    app.require_subcommand(0, 1); // none is told below, after what CLI11 has to say of unknown words
-    InfoOptions info;
-    FramesOptions frames;
-    SeekOptions seek;
-    ExtractOptions extract;
-    CheckOptions check;
-    PlotOptions plot;
-    RewriteOptions repair;
-    RewriteOptions index;
-    RewriteOptions cut;
-    std::string topic;
-    AddInfo(app, info);
-    AddFrames(app, frames);
-    AddSeek(app, seek);
-    AddExtract(app, extract);
-    AddCheck(app, check);
-    AddPlot(app, plot);
-    AddRepair(app, repair);
-    AddIndex(app, index);
-    AddCut(app, cut);
-    AddHelp(app, topic);
+    app.footer("Exit status: 0 done, 1 a file could not be read, written or played, or check found something,\n"
+               "2 usage error. 'flvdmx help COMMAND' explains a command.");
+    app.require_subcommand(0, 1); // none is reported below, after CLI11 has rejected unknown words
+    Commands commands(app);
+    commands.Add("info", "Show what is in each file", AddInfo, RunInfo);
+    commands.Add("frames", "List the frames, one per line", AddFrames, RunFrames);
+    commands.Add("seek", "Seek, and show the position reached and the frames from there", AddSeek, RunSeek);
+    commands.Add("extract", "Write the streams to files that players accept", AddExtract, RunExtract);
+    commands.Add("check", "Find damage, jumping timestamps and a wrong keyframe index", AddCheck, RunCheck);
+    commands.Add("plot", "Draw bit rate, keyframes and interleaving over time", AddPlot, RunPlot);
+    commands.Add("repair", "Write a valid file from everything that can be played", AddRepair, RunRepair);
+    commands.Add("index", "Copy an undamaged file and give it a keyframe index", AddIndex, RunIndex);
+    commands.Add("cut", "Write a part of a file, with an index of its own", AddCut, RunCut);
+    commands.AddHelp();
     try {
         app.parse(Arguments(argc, argv));
         if (app.get_subcommands().empty())
@@ -385,35 +420,20 @@ int Run(int argc, char** argv)
     } catch (const CLI::CallForHelp&) {
         Print(app.help());
         return DONE;
-    } catch (const CLI::CallForVersion&) {
-        Print("flvdmx " FLVDMX_VERSION "\n");
+    } catch (const CLI::CallForVersion& version) {
+        Print(std::string(version.what()) + "\n");
         return DONE;
     } catch (const CLI::ParseError& error) {
         return Usage(app, error, {argv + 1, argv + argc});
     }
-    const std::map<std::string, std::function<int()>> commands = {
-        {"info", [&] { return RunInfo(info); }},
-        {"frames", [&] { return RunFrames(frames); }},
-        {"seek", [&] { return RunSeek(seek); }},
-        {"extract", [&] { return RunExtract(extract); }},
-        {"check", [&] { return RunCheck(check); }},
-        {"plot", [&] { return RunPlot(plot); }},
-        {"repair", [&] { return RunRepair(repair); }},
-        {"index", [&] { return RunIndex(index); }},
-        {"cut", [&] { return RunCut(cut); }},
-        {"help", [&] {
-             Print(topic.empty() ? app.get_formatter()->make_help(&app, "flvdmx", CLI::AppFormatMode::Normal)
-                                 : app.get_subcommand(topic)->help("flvdmx"));
-             return DONE;
-         }}};
-    return commands.at(app.get_subcommands().front()->get_name())();
+    return commands.Run();
 }
 
 } // namespace
 
 } // namespace tool
 
-// The one place where failures end. A reader that has seen enough, such as `head`, closes the pipe: that is none.
+// All failures end here. A reader such as `head` closes the pipe when it has seen enough, which is not a failure.
 int main(int argc, char** argv)
 {
     std::signal(SIGPIPE, SIG_IGN);

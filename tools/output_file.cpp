@@ -1,4 +1,4 @@
-// A file that is written.
+// A file to write.
 #include "tools/output_file.h"
 
 #include <array>
@@ -23,9 +23,9 @@ namespace tool {
 
 namespace {
 
-constexpr mode_t NEW_FILE_MODE = 0666; // less what the process masks
+constexpr mode_t NEW_FILE_MODE = 0666; // before the umask
 
-// Names of files that are not finished: one per stream.
+// Names of unfinished files: at most one per stream.
 std::array<std::atomic<const char*>, 2> g_unfinished{};
 
 void RemoveUnfinished(int signal)
@@ -41,7 +41,7 @@ int Remember(const char* path)
 {
     for (const int signal : {SIGINT, SIGTERM, SIGHUP})
         if (std::signal(signal, RemoveUnfinished) == SIG_IGN)
-            std::signal(signal, SIG_IGN); // as `nohup` wants it
+            std::signal(signal, SIG_IGN); // stay ignored under `nohup`
     for (size_t slot = 0; slot < g_unfinished.size(); ++slot) {
         const char* none = nullptr;
         if (g_unfinished[slot].compare_exchange_strong(none, path))
@@ -62,7 +62,7 @@ bool IsSpecial(const std::string& path)
     return stat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode);
 }
 
-// Makes a file whose name the last six letters of `path` complete. Null when that fails.
+// Creates a file with a unique name by replacing the last six characters of `path`. Null on failure.
 std::FILE* CreateTemporary(std::string& path)
 {
     const int descriptor = mkostemp(path.data(), O_CLOEXEC);
@@ -84,14 +84,14 @@ OutputFile::OutputFile(std::string path, const std::string& input, bool force) :
     }
     std::error_code failure;
     if (std::filesystem::equivalent(m_path, PathOf(input), failure))
-        throw FileError(input, fmt::format("{} is the file to be read, it is not overwritten", Printable(m_path)));
+        throw FileError(input, fmt::format("{} is the input file: it is not overwritten", Printable(m_path)));
     if (IsSpecial(m_path)) {
         m_file = std::fopen(m_path.c_str(), "wb");
     } else {
         if (!force && std::filesystem::exists(m_path, failure))
-            throw FileError(input, fmt::format("{} exists: --force overwrites it", Printable(m_path)));
+            throw FileError(input, fmt::format("{} exists: use --force to overwrite it", Printable(m_path)));
         m_temporary = m_path + ".XXXXXX";
-        m_slot = Remember(m_temporary.c_str()); // before the file is there: a signal may come at once
+        m_slot = Remember(m_temporary.c_str()); // before the file exists: a signal may come at once
         m_file = CreateTemporary(m_temporary);
     }
     if (m_file == nullptr) {

@@ -1,4 +1,4 @@
-// A file that is written, whole or not at all.
+// A file to write, completely or not at all.
 #ifndef FLVDMX_TOOLS_OUTPUT_FILE_H
 #define FLVDMX_TOOLS_OUTPUT_FILE_H
 
@@ -11,13 +11,13 @@
 
 namespace tool {
 
-/** A file on its way, or standard output; every failure is thrown as FileError. One that is not finished is removed,
- * also when the user interrupts the program. */
+/** A file that is being written, or standard output. Failures are thrown as FileError. An unfinished file is removed,
+ *  even after an interruption. */
 class OutputFile {
 public:
     /**
-     * Creates a file that Finish() gives the name `path`; "-" is standard output. A file that exists is refused without
-     * `force`, the file `input` always.
+     * Creates a temporary file, which Finish() renames to `path`; "-" is standard output. An existing file is not
+     * overwritten without `force`, and the file `input` never is.
      */
     OutputFile(std::string path, const std::string& input, bool force);
     ~OutputFile();
@@ -27,10 +27,10 @@ public:
     void Write(const void* data, size_t size);
     void Write(std::string_view text) { Write(text.data(), text.size()); }
 
-    /** Replaces the first bytes where that is possible, which it is not in a pipe. */
+    /** Replaces the first bytes if the file is seekable, which a pipe is not. */
     void Rewrite(flvdmx::Bytes beginning);
 
-    /** Keeps the file. Must be called at the end: a full disk may not show earlier. */
+    /** Completes the file. Must be called at the end: some errors, such as a full disk, may appear only then. */
     void Finish();
 
     uint64_t Written() const { return m_written; } /**< bytes */
@@ -42,9 +42,9 @@ private:
 
     const std::string m_path;
     const std::string m_input;
-    std::string m_temporary; // the name until it is finished
+    std::string m_temporary; // its name until it is finished
     std::FILE* m_file = nullptr;
-    int m_slot = -1; // of its name in the list of what is removed
+    int m_slot = -1; // of its name in the list of unfinished files
     uint64_t m_written = 0;
 };
 

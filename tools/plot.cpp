@@ -16,6 +16,7 @@
 #include "tools/output_file.h"
 #include "tools/report.h"
 #include "tools/svg.h"
+#include "tools/tags.h"
 #include "tools/text.h"
 #include "tools/timeline.h"
 
@@ -48,7 +49,7 @@ constexpr const char* STYLE =
     ".dots{stroke-dasharray:5 4}.keyframe{stroke:#b3304a}.lead{fill:#5b8c3a;fill-opacity:.35;stroke:#5b8c3a}"
     ".gap{stroke:#8a8a8a;fill:#8a8a8a;fill-opacity:.2;stroke-width:.5}"
     ".damage{stroke:#d02020;fill:#d02020;fill-opacity:.2}"
-    ".restart{stroke:#7a3fb0;stroke-width:1.4;stroke-dasharray:2 3}";
+    ".jump{stroke:#7a3fb0;stroke-width:1.4;stroke-dasharray:2 3}";
 
 struct Unit {
     double size;
@@ -75,7 +76,7 @@ std::string Amount(const std::vector<Unit>& units, double value)
 
 const char* ClassOf(Mark::Kind kind)
 {
-    return kind == Mark::Kind::gap ? "gap" : kind == Mark::Kind::damage ? "damage" : "restart";
+    return kind == Mark::Kind::gap ? "gap" : kind == Mark::Kind::damage ? "damage" : "jump";
 }
 
 class Plot {
@@ -143,9 +144,9 @@ private:
         if (any(Mark::Kind::gap))
             entries.emplace_back("gap", "no frames");
         if (any(Mark::Kind::damage))
-            entries.emplace_back("damage", fmt::format("damage, {} bytes left out", m_timeline.bytesLeftOut));
-        if (any(Mark::Kind::restart))
-            entries.emplace_back("restart", "timestamps start again");
+            entries.emplace_back("damage", fmt::format("{} bytes skipped", m_timeline.bytesLeftOut));
+        if (any(Mark::Kind::jump))
+            entries.emplace_back("jump", "timestamps jump");
         DrawLegend(y, entries);
     }
 
@@ -153,13 +154,13 @@ private:
     void DrawMarks(double top, double bottom)
     {
         constexpr double LEAST_WIDTH = 1;
-        for (const Mark::Kind kind : {Mark::Kind::gap, Mark::Kind::damage, Mark::Kind::restart}) {
+        for (const Mark::Kind kind : {Mark::Kind::gap, Mark::Kind::damage, Mark::Kind::jump}) {
             std::string path;
             for (const Mark& mark : m_timeline.marks) {
                 const double x = m_time.At(mark.from);
                 if (mark.kind != kind)
                     continue;
-                if (kind == Mark::Kind::restart)
+                if (kind == Mark::Kind::jump)
                     path += fmt::format("M{:.1f} {}V{}", x, top, bottom);
                 else
                     path += fmt::format("M{:.1f} {}V{}h{:.1f}V{}Z", x, top, bottom,
@@ -389,11 +390,12 @@ int RunPlot(const PlotOptions& options)
                    [](unsigned char c) { return std::tolower(c); });
     for (const char* const picture : {".png", ".jpg", ".jpeg", ".gif", ".webp", ".bmp", ".pdf"})
         if (extension == picture)
-            throw FileError(options.out, "the drawing is SVG, not a picture of that kind: name it .svg");
+            throw FileError(options.out, "the drawing is an SVG file: use a name that ends in .svg");
     Input input(options.file);
     input.WarnIfCutShort();
+    WarnOfUnplayed(input);
     OutputFile file(options.out, options.file, options.force);
-    AcceptAllTimes(input);
+    input.file.accept_all_times();
     const Timeline timeline = ReadTimeline(input, COLUMNS);
     file.Write(Plot(input, timeline).Draw());
     file.Finish();

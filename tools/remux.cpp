@@ -15,58 +15,15 @@
 #include "tools/input.h"
 #include "tools/report.h"
 #include "tools/tags.h"
+#include "tools/times.h"
 
 namespace tool {
 
 namespace {
 
-// A step back of up to a second is jitter: the time stands still. A larger one, or a gap of more than ten seconds, is a
-// recording that started again, or a damaged timestamp.
-constexpr int64_t JITTER_MS = 1000;
-constexpr int64_t GAP_MS = 10000;
-constexpr int64_t LONGEST_FRAME_MS = 1000;
-
-constexpr uint32_t SCRIPT_DATA_MAX = 1 << 20; // bytes
-constexpr int TAGS_BEFORE_METADATA = 102;     // as far as players look
-constexpr size_t MOST_CODEC_BYTES = 5;
-constexpr uint8_t AVC_KEYFRAME = 0x17; // FrameType 1, CodecID 7
-
-// Makes the times of both streams continuous.
-class Continuity {
-public:
-    int64_t Next(flvdmx::Stream stream, int64_t time)
-    {
-        Lane& lane = m_lanes.at(stream == flvdmx::Stream::video ? 0 : 1);
-        if (lane.isEmpty) {
-            lane = {false, time + m_shift, 0};
-            return lane.last;
-        }
-        const int64_t step = time + m_shift - lane.last;
-        if (step < -JITTER_MS || step > GAP_MS) {
-            m_shift = std::max(After(m_lanes[0]), After(m_lanes[1])) - time;
-            ++m_breaks;
-        } else if (step > 0) {
-            lane.step = std::min(step, LONGEST_FRAME_MS);
-        }
-        lane.last = std::max(lane.last, time + m_shift);
-        return lane.last;
-    }
-
-    uint64_t Breaks() const { return m_breaks; }
-
-private:
-    struct Lane {
-        bool isEmpty = true;
-        int64_t last = 0; // time of its last frame
-        int64_t step = 0; // from the frame before that one
-    };
-
-    static int64_t After(const Lane& lane) { return lane.isEmpty ? 0 : lane.last + lane.step; }
-
-    std::array<Lane, 2> m_lanes;
-    int64_t m_shift = 0;
-    uint64_t m_breaks = 0;
-};
+constexpr uint32_t SCRIPT_DATA_MAX = 1 << 20;                            // bytes
+constexpr int TAGS_BEFORE_METADATA = 102;                                // as far as players look
+constexpr size_t SMALLEST_TAG = TAG_HEADER_SIZE + 1 + BACK_POINTER_SIZE; // of a frame; has all codec bytes
 
 // Bytes anywhere in a file. The codec's bytes before a frame are not delivered with it.
 class RawFile {
@@ -77,7 +34,7 @@ public:
     {
         const bool readable = m_file != nullptr && position >= 0;
         if (!readable || pread(fileno(m_file.get()), bytes, size, position) != static_cast<ssize_t>(size))
-            throw FileError(m_name, "the file cannot be read");
+            throw FileError(m_name, "cannot be read");
     }
 
 private:
@@ -90,13 +47,19 @@ private:
 
 // A stream of the file.
 struct Track {
-    uint8_t type = 0;
-    size_t codecBytes = 1;              // before each frame
-    std::vector<uint8_t> configBytes{}; // before each configuration
-    std::vector<uint8_t> config{};      // in force; empty for codecs without one
-    bool isPresent = false;
+    uint8_t type;
+    std::vector<uint8_t> config{};       // in force; empty for codecs without one
+    std::vector<uint8_t> configHeader{}; // codec bytes before it
     bool hasEnded = false;
 };
+
+// An AVC configuration is a keyframe by its FrameType.
+std::vector<uint8_t> ConfigHeader(uint32_t tagType, uint8_t codec)
+{
+    constexpr uint8_t AVC_KEYFRAME = 0x17;
+    return tagType == FLVD_TAG_TYPE_VIDEO ? std::vector<uint8_t>{AVC_KEYFRAME, 0, 0, 0, 0}
+                                          : std::vector<uint8_t>{codec, 0};
+}
 
 flvdmx::Options OpenOptions(const RemuxOptions& options)
 {
@@ -109,71 +72,110 @@ class Remuxer {
 public:
     Remuxer(const std::string& file, const RemuxOptions& options, const TakeTag& take)
         : m_options(options), m_take(take), m_input(file, OpenOptions(options)), m_raw(file),
-          m_losses(m_input), m_video{FLVD_TAG_TYPE_VIDEO}, m_audio{FLVD_TAG_TYPE_AUDIO}
+          m_losses(m_input, [this](const Tag& tag) { TakeScript(tag); })
     {
-        const flvdmx::Info& info = m_input.info;
-        m_video.isPresent = info.video.has_value();
-        m_audio.isPresent = info.audio.has_value();
-        if (info.video && info.video->codec == flvdmx::VideoCodec::avc) {
-            m_video.codecBytes = MOST_CODEC_BYTES;
-            m_video.configBytes = {AVC_KEYFRAME, 0, 0, 0, 0};
-            m_video.config = info.video->config;
-        }
-        if (info.audio && info.audio->codec == flvdmx::AudioCodec::aac) {
-            m_audio.codecBytes = 2;
-            m_audio.configBytes = {static_cast<uint8_t>(m_input.Instance().audio_format_filter), 0};
-            m_audio.config = info.audio->config;
-        }
+        if (m_input.info.video)
+            m_video.config = m_input.info.video->config;
+        if (m_input.info.audio)
+            m_audio.config = m_input.info.audio->config;
+        m_video.configHeader = ConfigHeader(m_video.type, 0);
+        m_audio.configHeader = ConfigHeader(m_audio.type, static_cast<uint8_t>(m_input.Instance().audio_format_filter));
+        FindLateConfig(m_video, flvdmx::Stream::video);
+        FindLateConfig(m_audio, flvdmx::Stream::audio);
     }
 
-    RemuxReport Run(const std::function<void(int64_t)>& progress)
+    RemuxReport Run()
     {
-        while (const std::optional<flvdmx::Frame> frame = NextFrame(m_input, flvdmx::Stream::any)) {
+        while (const std::optional<flvdmx::Frame> frame =
+                   NextFrame(m_input, flvdmx::Stream::any, LateStreams::delivered)) {
             Track& track = frame->stream == flvdmx::Stream::video ? m_video : m_audio;
             m_losses.Take(*frame);
-            if (frame->config_changed())
-                track.config.assign(frame->new_config.begin(), frame->new_config.end());
-            const int64_t time = frame->time.count();
-            track.hasEnded = track.hasEnded || time >= m_options.toMs;
-            if (HasEnded(m_video) && HasEnded(m_audio))
+            track.hasEnded = track.hasEnded || frame->time.count() >= m_options.toMs;
+            if ((m_video.hasEnded || !m_input.Has(flvdmx::Stream::video)) &&
+                (m_audio.hasEnded || !m_input.Has(flvdmx::Stream::audio)))
                 break;
-            if (time >= m_options.fromMs && time < m_options.toMs)
-                Take(*frame, track);
-            progress(frame->position);
+            Take(*frame, track);
         }
         if (m_options.toMs == std::numeric_limits<int64_t>::max())
             m_losses.Finish();
-        m_report.breaks = m_continuity.Breaks();
-        m_report.bytesLeftOut = m_losses.Bytes();
+        m_report.jumps = m_times.Jumps();
+        m_report.bytesLeftOut += m_losses.Bytes();
         return m_report;
     }
 
 private:
-    static bool HasEnded(const Track& track) { return track.hasEnded || !track.isPresent; }
-
-    void Take(const flvdmx::Frame& frame, const Track& track)
+    // The first configuration of a stream that begins late is moved to the beginning, where players look for it.
+    void FindLateConfig(Track& track, flvdmx::Stream stream)
     {
-        int64_t time = frame.time.count() + m_options.offsetMs;
-        if (m_options.continuous)
-            time = m_continuity.Next(frame.stream, time);
-        const auto timestamp = static_cast<uint32_t>(std::max<int64_t>(time, 0)); // 32 bits, wrapping
-        if (m_report.videoFrames + m_report.audioFrames == 0) {
-            PutConfig(m_video, timestamp);
-            PutConfig(m_audio, timestamp);
-        } else if (frame.config_changed()) {
-            PutConfig(track, timestamp);
+        const std::optional<Tag> tag = m_input.Has(stream) ? std::nullopt : FirstIfLate(PathOf(m_input.name), stream);
+        if (!tag || !tag->IsConfig() || tag->size > SCRIPT_DATA_MAX)
+            return;
+        track.config.resize(tag->size - std::min(tag->size, tag->CodecHeaderSize()));
+        m_raw.Read(tag->position + TAG_HEADER_SIZE + tag->CodecHeaderSize(), track.config.data(), track.config.size());
+        track.configHeader = ConfigHeader(track.type, tag->codec);
+    }
+
+    bool IsWanted(int64_t time) const { return time >= m_options.fromMs && time < m_options.toMs; }
+
+    static uint32_t Timestamp(int64_t time) // 32 bits, wrapping
+    {
+        return static_cast<uint32_t>(std::max<int64_t>(time, 0));
+    }
+
+    void Take(const flvdmx::Frame& frame, Track& track)
+    {
+        std::array<uint8_t, SMALLEST_TAG> header{};
+        m_raw.Read(frame.position, header.data(), header.size());
+        const Tag tag = Tag::Parse(frame.position, header.data(), header.size());
+        const bool repeated = frame.config_changed() && std::equal(track.config.begin(), track.config.end(),
+                                                                   frame.new_config.begin(), frame.new_config.end());
+        if (frame.config_changed()) {
+            track.config.assign(frame.new_config.begin(), frame.new_config.end());
+            track.configHeader = ConfigHeader(track.type, tag.codec);
         }
-        const bool isVideo = track.type == FLVD_TAG_TYPE_VIDEO;
-        ++(isVideo ? m_report.videoFrames : m_report.audioFrames);
-        std::array<uint8_t, MOST_CODEC_BYTES> codecBytes{};
-        m_raw.Read(frame.position + TAG_HEADER_SIZE, codecBytes.data(), track.codecBytes);
-        m_take({track.type, timestamp, {codecBytes.data(), track.codecBytes}, frame.data, isVideo && frame.keyframe});
+        if (!IsWanted(frame.time.count()))
+            return;
+        if (tag.IsAvc() && track.config.empty()) { // nothing decodes it
+            m_report.bytesLeftOut += tag.End() - tag.position;
+            return;
+        }
+        int64_t time = frame.time.count() + m_options.offsetMs;
+        if (m_options.continuous) {
+            m_times.Take(frame.stream, time);
+            time = m_times.Time();
+        }
+        if (m_report.videoFrames + m_report.audioFrames == 0) {
+            PutConfig(m_video, Timestamp(time));
+            PutConfig(m_audio, Timestamp(time));
+        } else if (frame.config_changed() && !repeated) {
+            PutConfig(track, Timestamp(time));
+        }
+        ++(tag.IsVideo() ? m_report.videoFrames : m_report.audioFrames);
+        m_take({track.type,
+                Timestamp(time),
+                {header.data() + TAG_HEADER_SIZE, tag.CodecHeaderSize()},
+                frame.data,
+                true,
+                tag.IsKeyframe()});
+    }
+
+    // Cue points and texts are kept; the metadata is made anew.
+    void TakeScript(const Tag& tag)
+    {
+        const int64_t time = int64_t{tag.timestamp} - m_input.info.start_time.count();
+        std::vector<uint8_t> payload(tag.size);
+        m_raw.Read(tag.position + TAG_HEADER_SIZE, payload.data(), payload.size());
+        if (!IsWanted(time) || IsMetadata(payload))
+            return;
+        const bool follows = m_options.continuous && m_report.videoFrames + m_report.audioFrames != 0;
+        const int64_t placed = time + m_options.offsetMs;
+        m_take({FLVD_TAG_TYPE_SCRIPT, Timestamp(follows ? m_times.Near(placed) : placed), {}, payload});
     }
 
     void PutConfig(const Track& track, uint32_t timestamp) const
     {
         if (!track.config.empty())
-            m_take({track.type, timestamp, track.configBytes, track.config, false});
+            m_take({track.type, timestamp, track.configHeader, track.config});
     }
 
     const RemuxOptions m_options;
@@ -181,9 +183,9 @@ private:
     Input m_input;
     const RawFile m_raw;
     Losses m_losses;
-    Track m_video;
-    Track m_audio;
-    Continuity m_continuity;
+    Track m_video{FLVD_TAG_TYPE_VIDEO};
+    Track m_audio{FLVD_TAG_TYPE_AUDIO};
+    Times m_times;
     RemuxReport m_report;
 };
 
@@ -220,13 +222,12 @@ Metadata FindMetadata(const Input& input)
 
 } // namespace
 
-RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take,
-                  const std::function<void(int64_t)>& progress)
+RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take)
 {
-    return Remuxer(file, options, take).Run(progress);
+    return Remuxer(file, options, take).Run();
 }
 
-RemuxReport CopyTags(const std::string& file, const TakeTag& take, const std::function<void(int64_t)>& progress)
+RemuxReport CopyTags(const std::string& file, const TakeTag& take)
 {
     const Input input(file);
     const RawFile raw(file);
@@ -234,7 +235,7 @@ RemuxReport CopyTags(const std::string& file, const TakeTag& take, const std::fu
     TagReader reader(input);
     RemuxReport report;
     std::vector<uint8_t> bytes; // payload and back-pointer
-    for (int64_t position = FirstTag(input); position < reader.FileSize(); progress(position)) {
+    for (int64_t position = FirstTag(input); position < reader.FileSize();) {
         const std::optional<Tag> tag = reader.At(position);
         if (!tag || tag->End() > reader.FileSize())
             throw FileError(file, fmt::format("the file is damaged at byte {}: use 'flvdmx repair'", position));
@@ -242,9 +243,14 @@ RemuxReport CopyTags(const std::string& file, const TakeTag& take, const std::fu
         raw.Read(position + TAG_HEADER_SIZE, bytes.data(), bytes.size());
         if (BigEndian(&bytes[tag->size], BACK_POINTER_SIZE) != tag->size + TAG_HEADER_SIZE)
             throw FileError(file,
-                            fmt::format("the size after the tag at byte {} is wrong: use 'flvdmx repair'", position));
+                            fmt::format("the back-pointer of the tag at byte {} is wrong: use 'flvdmx repair'", position));
         if (position != metadata)
-            take({static_cast<uint8_t>(tag->type), tag->timestamp, {}, {bytes.data(), tag->size}, tag->IsKeyframe()});
+            take({static_cast<uint8_t>(tag->type),
+                  tag->timestamp,
+                  {},
+                  {bytes.data(), tag->size},
+                  tag->IsFrame(),
+                  tag->IsKeyframe()});
         report.videoFrames += tag->IsVideo() && tag->IsFrame() ? 1U : 0U;
         report.audioFrames += tag->IsAudio() && tag->IsFrame() ? 1U : 0U;
         position = tag->End();

@@ -15,7 +15,7 @@ namespace tool {
 /** Which frames to take, and how to make their timestamps. Times count from the file's first timestamp. */
 struct RemuxOptions {
     bool allFrames = false;                               /**< also those later than the file's last timestamp */
-    bool continuous = false;                              /**< close gaps and restarts of the timestamps */
+    bool continuous = false;                              /**< make the timestamps continue after jumps */
     int64_t offsetMs = 0;                                 /**< added to each time */
     int64_t fromMs = std::numeric_limits<int64_t>::min(); /**< first time to take */
     int64_t toMs = std::numeric_limits<int64_t>::max();   /**< first time not to take */
@@ -25,7 +25,7 @@ struct RemuxOptions {
 struct RemuxReport {
     uint64_t videoFrames = 0;
     uint64_t audioFrames = 0;
-    uint64_t breaks = 0;      /**< restarts and gaps of the timestamps that were closed */
+    uint64_t jumps = 0;       /**< of the timestamps, when they were made continuous */
     int64_t bytesLeftOut = 0; /**< between and after the frames, in bytes of the file */
 };
 
@@ -35,19 +35,14 @@ using TakeTag = std::function<void(const NewTag&)>;
 /**
  * Plays a file and makes a tag of each frame, and of each configuration before the first frame that needs it. Calls
  * with the same arguments make the same tags. Throws FileError.
- *
- * @param progress called with the position in the file
  */
-RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take,
-                  const std::function<void(int64_t)>& progress);
+RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take);
 
 /**
  * Reads the tags of an undamaged file as they are, all but the onMetaData whose properties MetadataOf() returns. Throws
  * FileError, also for a damaged file.
- *
- * @param progress called with the position in the file
  */
-RemuxReport CopyTags(const std::string& file, const TakeTag& take, const std::function<void(int64_t)>& progress);
+RemuxReport CopyTags(const std::string& file, const TakeTag& take);
 
 /** @return the properties of the first onMetaData of a file; what it lacks of picture size and codecs is added */
 std::vector<ScriptProperty> MetadataOf(const std::string& file);

@@ -14,30 +14,31 @@
 #include "tools/progress.h"
 #include "tools/remux.h"
 #include "tools/report.h"
+#include "tools/scan.h"
+#include "tools/tags.h"
 #include "tools/text.h"
 
 namespace tool {
 
 namespace {
 
-using Pass = std::function<RemuxReport(const TakeTag& take, const std::function<void(int64_t)>& progress)>;
+using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
 // Runs a pass that measures and, unless it is a rehearsal, one that writes.
 RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
 {
-    ProgressBar progress(options.file, 2 * size);
+    ReadProgress progress(options.file, size, options.dryRun ? 1 : 2);
     FlvLayout layout;
-    const RemuxReport report =
-        pass([&](const NewTag& tag) { layout.Add(tag); }, [&](int64_t position) { progress.ShowDone(position); });
+    const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); });
     if (report.videoFrames + report.audioFrames == 0)
-        throw FileError(options.file, "there is no frame to write");
+        throw FileError(options.file, "there are no frames to write");
     uint64_t written = 0;
     if (!options.dryRun) {
         OutputFile out(options.out, options.file, options.force);
         const std::vector<uint8_t> beginning = layout.Beginning(MetadataOf(options.file));
         out.Write(beginning.data(), beginning.size());
-        pass([&](const NewTag& tag) { WriteTag(out, tag); },
-             [&](int64_t position) { progress.ShowDone(size + position); });
+        progress.NextPass();
+        pass([&](const NewTag& tag) { WriteTag(out, tag); });
         out.Finish();
         written = out.Written();
     }
@@ -56,12 +57,15 @@ RemuxOptions CutOptions(const RewriteOptions& options)
 {
     RemuxOptions remux;
     Input input(options.file);
+    WarnOfRestarts(input);
+    WarnOfUnplayed(input);
     if (options.fromMs) {
         const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
         if (!from)
             throw FileError(options.file, from.error());
         remux.fromMs = from->count();
     }
+    remux.continuous = !options.keepTimes;
     const int64_t start = input.info.start_time.count();
     remux.offsetMs = options.keepTimes ? start : -std::max<int64_t>(remux.fromMs, 0);
     if (options.toMs) {
@@ -83,22 +87,22 @@ int RunRepair(const RewriteOptions& options)
     remux.allFrames = true;
     remux.continuous = !options.keepTimes;
     remux.offsetMs = input.info.start_time.count();
-    const RemuxReport report = Write(options, input.info.size, [&](const auto& take, const auto& progress) {
-        return Remux(options.file, remux, take, progress);
-    });
-    if (report.breaks != 0)
+    const RemuxReport report =
+        Write(options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    WarnOfUnplayed(input, (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
+                              (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
+    if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
-                         Plural(report.breaks, "place")));
+                         Plural(report.jumps, "place")));
     const int64_t leftOut = report.bytesLeftOut + input.Rest();
     if (leftOut != 0)
-        Tell(fmt::format("{}: {} left out\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
+        Tell(fmt::format("{}: {} skipped\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
     return DONE;
 }
 
 int RunIndex(const RewriteOptions& options)
 {
-    Write(options, Input(options.file).info.size,
-          [&](const auto& take, const auto& progress) { return CopyTags(options.file, take, progress); });
+    Write(options, Input(options.file).info.size, [&](const TakeTag& take) { return CopyTags(options.file, take); });
     return DONE;
 }
 
@@ -106,7 +110,7 @@ int RunCut(const RewriteOptions& options)
 {
     const RemuxOptions remux = CutOptions(options);
     Write(options, Input(options.file).info.size,
-          [&](const auto& take, const auto& progress) { return Remux(options.file, remux, take, progress); });
+          [&](const TakeTag& take) { return Remux(options.file, remux, take); });
     return DONE;
 }
 

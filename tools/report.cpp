@@ -1,4 +1,4 @@
-// What all subcommands print.
+// What all commands print.
 #include "tools/report.h"
 
 #include <cerrno>
@@ -41,7 +41,7 @@ void Flush()
 
 void PrintJson(const Json& document, int indent)
 {
-    // A file name need not be UTF-8, the document has to be.
+    // A file name may be invalid UTF-8; a JSON document must not.
     Print(document.dump(indent, ' ', false, Json::error_handler_t::replace) + "\n");
 }
 
@@ -50,10 +50,15 @@ void Tell(const std::string& text)
     std::fputs(text.c_str(), stderr);
 }
 
+std::string DisplayName(const std::string& file)
+{
+    return file == STANDARD_STREAM ? "standard input" : Printable(file);
+}
+
 void Complain(const std::string& file, std::string_view text)
 {
-    std::fflush(stdout); // what came before is to stand before it on a terminal
-    Tell(fmt::format("flvdmx: {}: {}\n", Printable(file), text));
+    std::fflush(stdout); // keeps the order of output and messages on a terminal
+    Tell(fmt::format("flvdmx: {}: {}\n", DisplayName(file), text));
 }
 
 void Complain(const FileError& error)

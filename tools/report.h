@@ -1,4 +1,4 @@
-// What all subcommands print: documents, errors and warnings.
+// What all commands print: documents, errors and warnings.
 #ifndef FLVDMX_TOOLS_REPORT_H
 #define FLVDMX_TOOLS_REPORT_H
 
@@ -14,36 +14,44 @@ namespace tool {
 
 using Json = nlohmann::ordered_json;
 
-/** Ends the work on a file; what() says why in words, without the file's name. */
+/** Ends the work on a file; what() says why, without the file's name. */
 class FileError : public std::runtime_error {
 public:
     FileError(const std::string& file, const std::string& text, const flvdmx::error& error = {})
         : std::runtime_error(text), m_file(file), m_error(error)
     {
     }
-    /** The library's failure in its own words. */
+    /** Uses the library's text for its failure. */
     FileError(const std::string& file, const flvdmx::error& error) : FileError(file, error.text(), error) {}
 
-    const std::string& File() const { return m_file; }     /**< as the user named it */
-    const flvdmx::error& Cause() const { return m_error; } /**< the library's failure; of Kind::none without one */
-    Json Object() const;                                   /**< message, code and line */
+    const std::string& File() const { return m_file; } /**< as the user named it */
+    const flvdmx::error& Cause() const
+    {
+        return m_error;
+    }                    /**< the library's failure, Kind::none if it is another one */
+    Json Object() const; /**< message, code and line */
 
 private:
     std::string m_file;
     flvdmx::error m_error;
 };
 
-/** From now on messages tell the library's code and line as well. */
+/** From now on, messages include the library's error code and line number. */
 void ShowCodes();
 
-/** Writes to standard output; throws std::system_error when it cannot, as to a pipe that nobody reads any more. */
+/** Writes to standard output; throws std::system_error on failure, for instance when the reader has closed the pipe. */
 void Print(std::string_view text);
 
-/** Hands on at once what was written; throws as Print does. */
+/** Flushes standard output; throws as Print does. */
 void Flush();
 
-/** Writes the document and a line end. */
+/** Prints the document and a line end. */
 void PrintJson(const Json& document, int indent = -1);
+
+constexpr const char* STANDARD_STREAM = "-"; /**< names standard input or standard output */
+
+/** @return the name of an input file for people, printable */
+std::string DisplayName(const std::string& file);
 
 /** Writes `flvdmx: FILE: TEXT` to standard error. */
 void Complain(const std::string& file, std::string_view text);
@@ -51,7 +59,7 @@ void Complain(const std::string& file, std::string_view text);
 /** Writes the error to standard error. */
 void Complain(const FileError& error);
 
-/** Writes to standard error; when that fails there is nobody to tell. */
+/** Writes to standard error. A failure is ignored: there is nowhere to report it. */
 void Tell(const std::string& text);
 
 /** @return "video" or "audio" */

@@ -5,14 +5,11 @@
 
 #include "tools/frame_source.h"
 #include "tools/progress.h"
+#include "tools/report.h"
 #include "tools/tags.h"
+#include "tools/times.h"
 
 namespace tool {
-
-double FileScan::AverageDistanceMs() const
-{
-    return keyframes < 2 ? 0 : static_cast<double>(allDistances.count()) / static_cast<double>(keyframes - 1);
-}
 
 FileScan ScanFile(const std::string& name)
 {
@@ -20,33 +17,34 @@ FileScan ScanFile(const std::string& name)
     options.restarting_timestamps = true;
     Input input(name, options);
     FileScan scan;
-    Takes takes;
+    Times times;
     Losses losses(input);
-    ProgressBar progress(name, input.info.size);
-    flvdmx::Milliseconds keyframe{}; // the last one
+    const ReadProgress progress(name, input.info.size);
+    int64_t first = 0; // keyframes
+    int64_t last = 0;
     while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
-        progress.ShowDone(frame->position);
         losses.Take(*frame);
+        times.Take(frame->stream, frame->time.count());
         const bool video = frame->stream == flvdmx::Stream::video;
-        const flvdmx::Milliseconds time = takes.Continue(*frame);
         ++(video ? scan.videoFrames : scan.audioFrames);
         if (!video || !frame->keyframe)
             continue;
-        if (scan.keyframes++ > 0) {
-            scan.longestDistance = std::max(scan.longestDistance, time - keyframe);
-            scan.allDistances += time - keyframe;
-        }
+        if (scan.keyframes++ == 0)
+            first = last = times.Time();
+        scan.longestDistanceMs = std::max(scan.longestDistanceMs, times.Time() - last);
         scan.lastKeyframe = frame->time;
-        keyframe = time;
+        last = times.Time();
     }
     losses.Finish();
+    if (scan.keyframes > 1)
+        scan.averageDistanceMs = static_cast<double>(last - first) / static_cast<double>(scan.keyframes - 1);
     scan.bytesLeftOut = losses.Bytes();
-    scan.played = takes.Played();
-    scan.restarts = takes.Restarts();
+    scan.played = flvdmx::Milliseconds(times.Latest());
+    scan.jumps = times.Jumps();
     return scan;
 }
 
-// The times of a recording that did not restart rise along the file, up to the last one.
+// The times of each stream of a recording that did not restart rise along the file, up to the last one.
 bool SeemsToRestart(const Input& input)
 {
     constexpr int64_t PLACES = 16;
@@ -56,17 +54,26 @@ bool SeemsToRestart(const Input& input)
     options.restarting_timestamps = true;
     const Input any(input.name, options);
     TagReader reader(any);
-    uint32_t latest = 0;
+    uint32_t video = 0; // the latest times
+    uint32_t audio = 0;
     for (int64_t i = 1; i < PLACES; ++i) {
         const int64_t place = input.info.size / PLACES * i;
         const std::optional<Tag> tag = reader.Find(place, place + NEAR);
         if (!tag || tag->IsScript())
             continue;
+        uint32_t& latest = tag->IsVideo() ? video : audio;
         if (tag->timestamp + JITTER_MS < latest || tag->timestamp > input.Instance().last_ts + JITTER_MS)
             return true;
         latest = std::max(latest, tag->timestamp);
     }
     return false;
+}
+
+void WarnOfRestarts(const Input& input)
+{
+    if (SeemsToRestart(input))
+        Complain(input.name, "warning: the timestamps jump, so a time may be found in the wrong part: 'flvdmx repair' "
+                             "makes them continuous");
 }
 
 } // namespace tool

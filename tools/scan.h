@@ -15,14 +15,11 @@ struct FileScan {
     uint64_t audioFrames = 0;
     uint64_t keyframes = 0;                             /**< of video */
     std::optional<flvdmx::Milliseconds> lastKeyframe{}; /**< from the first timestamp */
-    flvdmx::Milliseconds longestDistance{};             /**< of one keyframe to the next */
-    flvdmx::Milliseconds allDistances{};                /**< their sum */
-    flvdmx::Milliseconds played{};                      /**< duration, times going on where they start again */
-    uint64_t restarts = 0;                              /**< of the timestamps */
+    int64_t longestDistanceMs = 0;                      /**< of one keyframe to the next */
+    double averageDistanceMs = 0;                       /**< the same; both 0 for fewer than two keyframes */
+    flvdmx::Milliseconds played{};                      /**< duration, times continuing after jumps */
+    uint64_t jumps = 0;                                 /**< of the timestamps */
     int64_t bytesLeftOut = 0;
-
-    /** @return average distance of the keyframes, 0 for fewer than two */
-    double AverageDistanceMs() const;
 };
 
 /** Plays the whole file. */
@@ -30,6 +27,9 @@ FileScan ScanFile(const std::string& name);
 
 /** @return true when tags here and there in the file have times that only a restart explains; a few reads */
 bool SeemsToRestart(const Input& input);
+
+/** Tells on standard error when times name no single place in the file. */
+void WarnOfRestarts(const Input& input);
 
 } // namespace tool
 

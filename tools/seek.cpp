@@ -12,6 +12,8 @@
 #include "tools/frame_source.h"
 #include "tools/input.h"
 #include "tools/report.h"
+#include "tools/scan.h"
+#include "tools/tags.h"
 #include "tools/text.h"
 
 namespace tool {
@@ -193,6 +195,8 @@ int RunSeek(const SeekOptions& options)
     open.separate_audio_reader = options.separateAudio;
     Input input(options.file, open);
     input.WarnIfCutShort();
+    WarnOfUnplayed(input);
+    WarnOfRestarts(input);
     Play(input, options.play);
     const int64_t current = CurrentTime(input);
     const auto mode = static_cast<SeekMode>(options.mode | options.direction);
@@ -200,7 +204,10 @@ int RunSeek(const SeekOptions& options)
     if (reached.error().kind() == flvdmx::Kind::miss)
         throw Miss(options, input, options.timeMs + (IsRelative(options) ? current : 0), current, reached.error());
     if (!reached)
-        throw FileError(input.name, reached.error());
+        throw FileError(input.name,
+                        fmt::format("{}: 'flvdmx frames --from' reads across damage, 'flvdmx repair' removes it",
+                                    reached.error().text()),
+                        reached.error());
     const Landing landing = Look(input, *reached, options.count);
     if (options.json)
         PrintObject(options, landing);

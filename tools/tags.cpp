@@ -16,44 +16,7 @@ namespace {
 constexpr uint32_t READER_CACHE = 4096; // more would bypass the window that the host reads ahead
 constexpr uint32_t BYTES_WITH_CODEC = TAG_HEADER_SIZE + 2;
 
-bool IsTagType(uint32_t type)
-{
-    return type == FLVD_TAG_TYPE_AUDIO || type == FLVD_TAG_TYPE_VIDEO || type == FLVD_TAG_TYPE_SCRIPT;
-}
-
-Tag Parse(int64_t position, const uint8_t* bytes, uint32_t available)
-{
-    constexpr uint32_t STREAM_ID_OFFSET = 8;
-    Tag tag{};
-    tag.position = position;
-    tag.type = bytes[0];
-    tag.size = BigEndian(bytes + 1, 3);
-    tag.timestamp = BigEndian(bytes + 4, 3) | static_cast<uint32_t>(bytes[7]) << 24;
-    tag.streamId = BigEndian(bytes + STREAM_ID_OFFSET, 3);
-    if (tag.size > 0 && available > TAG_HEADER_SIZE)
-        tag.codec = bytes[TAG_HEADER_SIZE];
-    if (tag.size > 1 && available > TAG_HEADER_SIZE + 1)
-        tag.packetType = bytes[TAG_HEADER_SIZE + 1];
-    return tag;
-}
-
 } // namespace
-
-uint32_t BigEndian(const uint8_t* bytes, uint32_t size)
-{
-    uint32_t value = 0;
-    for (uint32_t i = 0; i < size; ++i)
-        value = value << 8 | bytes[i];
-    return value;
-}
-
-// AVC configuration and end of sequence and AAC configuration hold nothing to play.
-bool Tag::IsFrame() const
-{
-    if ((!IsVideo() && !IsAudio()) || size < CodecHeaderSize())
-        return false;
-    return !IsConfig() && !(IsAvc() && packetType == 2);
-}
 
 TagReader::TagReader(const Input& input)
     : m_input(input), m_instance(input.file.instance()),
@@ -80,9 +43,10 @@ std::optional<Tag> TagReader::At(int64_t position)
     const uint32_t available = bytes != nullptr ? BYTES_WITH_CODEC : TAG_HEADER_SIZE;
     if (bytes == nullptr)
         bytes = Bytes(position, TAG_HEADER_SIZE);
-    if (bytes == nullptr || !IsTagType(bytes[0]))
+    if (bytes == nullptr)
         return std::nullopt;
-    return Parse(position, bytes, available);
+    const Tag tag = Tag::Parse(position, bytes, available);
+    return tag.HasKnownType() ? std::optional(tag) : std::nullopt;
 }
 
 std::optional<Tag> TagReader::Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress)
@@ -105,31 +69,16 @@ std::optional<Tag> TagReader::Find(int64_t from, int64_t end, const std::functio
     }
 }
 
-// CodecID 12 and 13 belong to no standard, but encoders have written them for years.
-std::string VideoCodecName(flvdmx::VideoCodec codec)
+// FLAGS of the file header (FLV file format, version 10.1, annex E.2).
+uint32_t TagReader::AnnouncedStreams()
 {
-    const auto id = static_cast<uint32_t>(codec);
-    return fmt::format("{} (CodecID {})", id == 12 ? "HEVC" : id == 13 ? "AV1" : flvdmx::name(codec), id);
-}
-
-std::string TagReader::ExtendedCodec(const Tag& tag)
-{
-    const uint8_t* const bytes = Bytes(tag.position + TAG_HEADER_SIZE + 1, 4);
-    const std::string_view fourcc(reinterpret_cast<const char*>(bytes), bytes != nullptr ? 4 : 0);
-    const char* const name = fourcc == "hvc1"   ? "HEVC, "
-                             : fourcc == "av01" ? "AV1, "
-                             : fourcc == "vp09" ? "VP9, "
-                             : fourcc == "avc1" ? "AVC, "
-                                                : "";
-    return fmt::format("enhanced FLV ({}FourCC '{}')", name, Printable(fourcc));
-}
-
-std::string TagReader::NameCodec(const Tag& tag)
-{
-    if (tag.IsExtended())
-        return ExtendedCodec(tag);
-    return tag.IsVideo() ? VideoCodecName(tag.VideoCodec())
-                         : fmt::format("{} (SoundFormat {})", flvdmx::name(tag.AudioCodec()), tag.codec >> 4);
+    constexpr uint32_t FLAGS_OFFSET = 4;
+    constexpr uint8_t VIDEO_FLAG = 0x01;
+    constexpr uint8_t AUDIO_FLAG = 0x04;
+    const uint8_t* const bytes = Bytes(FLAGS_OFFSET, 1);
+    const uint8_t flags = bytes != nullptr ? *bytes : 0;
+    return ((flags & VIDEO_FLAG) != 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
+           ((flags & AUDIO_FLAG) != 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0);
 }
 
 std::string TagReader::WhyNotPlayed(const Tag& tag)
@@ -138,60 +87,70 @@ std::string TagReader::WhyNotPlayed(const Tag& tag)
         return "";
     const char* const stream = StreamName(tag.Stream());
     const std::string& none = WhyNoStream(tag.Stream());
-    if (!none.empty() || !m_input.Has(tag.Stream()))
-        return fmt::format("are {} that is not played{}{}", stream, none.empty() ? "" : ": ", none);
-    const bool sameCodec = tag.IsVideo()
-                               ? tag.VideoCodec() == m_input.info.video->codec && tag.codec >> 4 <= MOST_FRAME_TYPE
-                               : tag.AudioCodec() == m_input.info.audio->codec;
-    if (!sameCodec)
-        return fmt::format("are of another codec than the {} stream: {}", stream, NameCodec(tag));
+    if (!m_input.Has(tag.Stream()))
+        return fmt::format("the {} is not played{}{}", stream, none.empty() ? "" : ": ", none);
+    return tag.size == 0 ? "it is empty" : WhyNotInStream(tag);
+}
+
+std::string TagReader::WhyNotInStream(const Tag& tag)
+{
+    const char* const stream = StreamName(tag.Stream());
+    const uint8_t* const bytes = Bytes(tag.position + TAG_HEADER_SIZE + 1, FOURCC_SIZE);
+    const std::string_view fourcc(reinterpret_cast<const char*>(bytes), bytes != nullptr ? FOURCC_SIZE : 0);
+    const bool sameCodec =
+        tag.IsVideo() ? tag.VideoCodec() == m_input.info.video->codec : tag.AudioCodec() == m_input.info.audio->codec;
+    if (tag.IsVideo() && tag.codec >> 4 > MOST_FRAME_TYPE && !IsEnhanced(tag, fourcc))
+        return fmt::format("its codec byte is invalid: 0x{:02x}", tag.codec);
+    if (!sameCodec || tag.IsExtended())
+        return fmt::format("it has another codec than the {} stream: {}", stream, CodecOf(tag, fourcc));
     if (tag.IsAudio() && tag.codec != m_instance->audio_format_filter)
-        return fmt::format("have another header byte than the audio stream: 0x{:02x} instead of 0x{:02x}", tag.codec,
+        return fmt::format("it has another codec byte than the audio stream: 0x{:02x} instead of 0x{:02x}", tag.codec,
                            m_instance->audio_format_filter & 0xFF);
     if (m_instance->last_ts != 0 && tag.timestamp > m_instance->last_ts)
-        return "are later than the last ones of the file";
-    return tag.size < tag.CodecHeaderSize() ? "are too short for a frame" : "";
+        return "it is later than the last timestamp of the file";
+    return tag.size < tag.CodecHeaderSize() ? "it is too short for a frame" : "";
 }
 
 const std::string& TagReader::WhyNoStream(flvdmx::Stream stream)
 {
-    const bool video = stream == flvdmx::Stream::video;
-    std::optional<std::string>& reason = video ? m_noVideo : m_noAudio;
-    const bool played = m_input.Has(stream) && !(video && (m_instance->video_codec_filter & EXTENDED_HEADER) != 0);
+    std::optional<std::string>& reason = stream == flvdmx::Stream::video ? m_noVideo : m_noAudio;
     if (!reason)
-        reason = played ? "" : FindReason(stream);
+        reason = m_input.Has(stream) ? "" : tool::WhyNoStream(PathOf(m_input.name), stream);
     return *reason;
 }
 
-// An AVC configuration that the library does not take.
-std::string TagReader::ConfigFault(const Tag& tag)
+// Without its AVC configuration a stream is not found at all.
+std::string ConfigFault(const Input& input)
 {
-    constexpr uint32_t MOST_SET_BYTES = 128;
-    constexpr uint32_t SETS_OFFSET = 6; // of the first set's length in the record
-    const uint8_t* const record = Bytes(tag.position + TAG_HEADER_SIZE + tag.CodecHeaderSize(), SETS_OFFSET + 2);
-    if (record == nullptr || tag.size < tag.CodecHeaderSize() + SETS_OFFSET + 2)
-        return "its AVC configuration is cut short";
-    const uint32_t size = BigEndian(record + SETS_OFFSET, 2);
-    if (size > MOST_SET_BYTES || tag.size > MOST_SET_BYTES + tag.CodecHeaderSize())
-        return fmt::format("its AVC parameter sets are larger than the {} bytes that are supported", MOST_SET_BYTES);
-    return "its AVC configuration is damaged";
+    const bool missing =
+        input.info.audio && input.info.audio->codec == flvdmx::AudioCodec::aac && input.info.audio->config.empty();
+    return missing ? "the audio does not start with its AAC configuration, without which it cannot be decoded" : "";
 }
 
-std::string TagReader::FindReason(flvdmx::Stream stream)
+void WarnOfUnplayed(const Input& input, uint32_t streams)
 {
-    constexpr int TAGS = 1000; // at the beginning of the file
-    std::optional<Tag> tag = At(int64_t{m_instance->data_offset} + BACK_POINTER_SIZE);
-    for (int i = 0; i < TAGS && tag && (tag->IsScript() || tag->Stream() != stream); ++i)
-        tag = At(tag->End());
-    if (!tag || tag->IsScript() || tag->Stream() != stream)
-        return "";
-    if (!tag->IsAvc() || tag->IsExtended())
-        return fmt::format("it is {}", NameCodec(*tag));
-    return tag->IsConfig() ? ConfigFault(*tag) : "its AVC stream begins without a configuration";
+    TagReader reader(input);
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
+        if (const std::string& why = reader.WhyNoStream(stream);
+            !why.empty() && (streams & static_cast<uint32_t>(stream)) != 0)
+            Complain(input.name, fmt::format("warning: the {} is not played: {}", StreamName(stream), why));
 }
 
-Losses::Losses(const Input& input)
-    : m_input(input), m_reader(input), m_end(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
+std::string UndefinedCodec(const Input& input)
+{
+    std::string codec;
+    if (input.info.video && flvdmx::name(input.info.video->codec) == std::string("unknown"))
+        codec = "video's codec, " + CodecName(input.info.video->codec);
+    else if (input.info.audio && flvdmx::name(input.info.audio->codec) == std::string("unknown"))
+        codec = "audio's codec, " + CodecName(input.info.audio->codec);
+    return codec.empty()
+               ? codec
+               : fmt::format("the {}, is not defined by FLV: its frames hold everything after the codec byte", codec);
+}
+
+Losses::Losses(const Input& input, std::function<void(const Tag&)> script)
+    : m_input(input), m_script(std::move(script)), m_reader(input),
+      m_end(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE)
 {
 }
 
@@ -199,16 +158,25 @@ bool Losses::Take(const flvdmx::Frame& frame)
 {
     if (frame.position < 0)
         return false;
+    const int64_t before = m_bytes;
+    Inspect(m_end, frame.position);
+    m_end = EndOf(frame);
+    return m_bytes > before;
+}
+
+int64_t Losses::EndOf(const flvdmx::Frame& frame)
+{
+    if (!m_input.Has(frame.stream)) { // it was found after the open
+        const std::optional<Tag> tag = m_reader.At(frame.position);
+        return tag ? tag->End() : frame.position;
+    }
     Tag tag{}; // as its stream's are
     tag.position = frame.position;
     tag.type = frame.stream == flvdmx::Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
     tag.codec = static_cast<uint8_t>(tag.IsVideo() ? m_input.Instance().video_codec_filter
                                                    : m_input.Instance().audio_format_filter);
     tag.size = static_cast<uint32_t>(frame.data.size()) + tag.CodecHeaderSize();
-    const int64_t before = m_bytes;
-    Inspect(m_end, tag.position);
-    m_end = tag.End();
-    return m_bytes > before;
+    return tag.End();
 }
 
 // What is between two frames: mostly nothing, else configurations, script data, tags that are not played, or damage.
@@ -219,45 +187,39 @@ void Losses::Inspect(int64_t from, int64_t to)
         Lose(from, tag ? tag->position : to);
         if (!tag)
             return;
-        if (tag->IsFrame())
+        if (tag->IsFrame() || (!tag->IsScript() && !m_input.Has(tag->Stream())))
             Lose(tag->position, tag->End());
+        else if (m_script && tag->IsScript())
+            m_script(*tag);
         from = tag->End();
     }
 }
 
 void Losses::Lose(int64_t from, int64_t to)
 {
-    if (from >= to)
-        return;
-    if (m_bytes == 0)
-        m_first = from;
-    m_bytes += to - from;
-    if (m_why.empty())
-        if (const std::optional<Tag> tag = m_reader.At(from); tag && tag->streamId == 0 && tag->End() <= to)
-            m_why = m_reader.WhyNotPlayed(*tag);
+    m_bytes += std::max<int64_t>(to - from, 0);
+    while (from < to) {
+        const std::optional<Tag> tag = m_reader.At(from);
+        const bool whole = tag && tag->streamId == 0 && tag->End() <= to;
+        const std::string why = whole ? m_reader.WhyNotPlayed(*tag) : "";
+        const int64_t end = why.empty() ? to : tag->End();
+        Loss& loss = why.empty() ? m_damage : m_unplayed;
+        if (loss.bytes == 0)
+            loss = {0, from, why};
+        loss.bytes += end - from;
+        from = end;
+    }
 }
 
 void Losses::Warn() const
 {
-    if (m_bytes == 0)
-        return;
-    const std::string why = m_why.empty() ? "hold no valid tag of the streams and are left out"
-                                          : fmt::format("are left out: tags from there on {}", m_why);
-    Complain(m_input.name, fmt::format("warning: {} bytes, the first at byte {}, {}", m_bytes, m_first, why));
-}
-
-flvdmx::Milliseconds Takes::Continue(const flvdmx::Frame& frame)
-{
-    constexpr flvdmx::Milliseconds JITTER{1000};
-    Lane& lane = frame.stream == flvdmx::Stream::video ? m_video : m_audio;
-    if (frame.time + JITTER < lane.last) {
-        if (++lane.take == m_offsets.size())
-            m_offsets.push_back(m_latest - frame.time);
-    }
-    lane.last = frame.time;
-    const flvdmx::Milliseconds time = frame.time + m_offsets[lane.take];
-    m_latest = std::max(m_latest, time);
-    return time;
+    if (m_damage.bytes > 0)
+        Complain(m_input.name, fmt::format("warning: skipped {} without a valid tag, the first at byte {}",
+                                           Plural(static_cast<uint64_t>(m_damage.bytes), "byte"), m_damage.first));
+    if (m_unplayed.bytes > 0)
+        Complain(m_input.name, fmt::format("warning: skipped {} of tags, the first at byte {}: {}",
+                                           Plural(static_cast<uint64_t>(m_unplayed.bytes), "byte"), m_unplayed.first,
+                                           m_unplayed.why));
 }
 
 } // namespace tool

@@ -11,44 +11,9 @@
 
 #include "flvdmx/layers.h"
 #include "tools/input.h"
+#include "tools/tag.h"
 
 namespace tool {
-
-constexpr uint32_t TAG_HEADER_SIZE = 11;
-constexpr uint32_t BACK_POINTER_SIZE = 4;
-constexpr uint32_t CODEC_ID_MASK = 0x0F;
-constexpr uint8_t EXTENDED_HEADER = 0x80; /**< in the codec byte of enhanced FLV, before a FourCC */
-constexpr uint32_t MOST_FRAME_TYPE = 5;   /**< FrameType of video */
-
-/** @return the number in the `size` bytes at `bytes`, most significant first */
-uint32_t BigEndian(const uint8_t* bytes, uint32_t size);
-
-/** A tag header and the first two payload bytes, 0 where the payload is shorter. */
-struct Tag {
-    int64_t position;
-    uint32_t type; /**< FLVD_TAG_TYPE_* */
-    uint32_t size; /**< payload bytes */
-    uint32_t timestamp;
-    uint32_t streamId;
-    uint8_t codec;
-    uint8_t packetType;
-
-    int64_t DataEnd() const { return position + TAG_HEADER_SIZE + size; }
-    int64_t End() const { return DataEnd() + BACK_POINTER_SIZE; } /**< after the back-pointer */
-    bool IsVideo() const { return type == FLVD_TAG_TYPE_VIDEO; }
-    bool IsAudio() const { return type == FLVD_TAG_TYPE_AUDIO; }
-    bool IsScript() const { return type == FLVD_TAG_TYPE_SCRIPT; }
-    flvdmx::VideoCodec VideoCodec() const { return static_cast<flvdmx::VideoCodec>(codec & CODEC_ID_MASK); }
-    flvdmx::AudioCodec AudioCodec() const { return static_cast<flvdmx::AudioCodec>(codec >> 4); }
-    bool IsExtended() const { return IsVideo() && (codec & EXTENDED_HEADER) != 0; } /**< enhanced FLV */
-    bool IsAvc() const { return IsVideo() && VideoCodec() == flvdmx::VideoCodec::avc; }
-    bool IsAac() const { return IsAudio() && AudioCodec() == flvdmx::AudioCodec::aac; }
-    flvdmx::Stream Stream() const { return IsVideo() ? flvdmx::Stream::video : flvdmx::Stream::audio; }
-    uint32_t CodecHeaderSize() const { return IsAvc() ? 5 : IsAac() ? 2 : 1; } /**< bytes before the frame */
-    bool IsConfig() const { return (IsAvc() || IsAac()) && packetType == 0; }
-    bool IsFrame() const; /**< a tag that is played */
-    bool IsKeyframe() const { return IsVideo() && IsFrame() && (codec >> 4 == 1 || codec >> 4 == 4); }
-};
 
 /** Reads tags and numbers anywhere in a file, with a reader of its own. */
 class TagReader {
@@ -72,19 +37,19 @@ public:
      */
     std::optional<Tag> Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress = {});
 
-    /** @return why a tag with nothing wrong about it is not played, such as "are too short for a frame"; empty when it
-     *          is */
+    /** @return FLVD_STREAM_* bits of the streams that the file header announces */
+    uint32_t AnnouncedStreams();
+
+    /** @return why a tag with nothing wrong about it is not played, such as "it is too short for a frame"; empty when
+     * it is */
     std::string WhyNotPlayed(const Tag& tag);
 
-    /** @return why no frame of that stream is delivered, from its first tag; empty when frames are, or when there is no
-     *          such tag */
+    /** @return why no frame of that stream is delivered, from its first tag; empty when the input has the stream, or
+     * when no such tag was found */
     const std::string& WhyNoStream(flvdmx::Stream stream);
 
 private:
-    std::string NameCodec(const Tag& tag);
-    std::string ExtendedCodec(const Tag& tag);
-    std::string ConfigFault(const Tag& tag);
-    std::string FindReason(flvdmx::Stream stream);
+    std::string WhyNotInStream(const Tag& tag);
 
     struct Closer {
         void operator()(fio_file_t* reader) const { __FLV_DMX__fioClose(reader); }
@@ -97,13 +62,21 @@ private:
     std::optional<std::string> m_noAudio;
 };
 
-/** @return name and CodecID of a video codec */
-std::string VideoCodecName(flvdmx::VideoCodec codec);
+/** @return what is wrong with the codec configurations with which the input starts; empty when nothing is */
+std::string ConfigFault(const Input& input);
+
+/** @return a text about a codec of the input that FLV does not define; empty when it defines them */
+std::string UndefinedCodec(const Input& input);
+
+/** Tells on standard error which of these streams (FLVD_STREAM_* bits) the file has but are not played, and why. */
+void WarnOfUnplayed(const Input& input, uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
 
 /** Watches for bytes that are left out between the frames of a file. */
 class Losses {
 public:
-    explicit Losses(const Input& input); /**< borrowed */
+    /** @param input borrowed
+     *  @param script called with each script tag between frames; may be empty */
+    explicit Losses(const Input& input, std::function<void(const Tag&)> script = {});
 
     /** Takes every frame of the file, in file order. @return true when bytes were left out before it */
     bool Take(const flvdmx::Frame& frame);
@@ -115,38 +88,23 @@ public:
     void Warn() const;
 
 private:
+    struct Loss {
+        int64_t bytes = 0;
+        int64_t first = 0; // position
+        std::string why{}; // of the first tag
+    };
+
+    int64_t EndOf(const flvdmx::Frame& frame);
     void Inspect(int64_t from, int64_t to);
     void Lose(int64_t from, int64_t to);
 
     const Input& m_input;
+    const std::function<void(const Tag&)> m_script;
     TagReader m_reader;
     int64_t m_end;
     int64_t m_bytes = 0;
-    int64_t m_first = 0;
-    std::string m_why; // of the first tag that is valid and left out
-};
-
-/**
- * Times that go on where a recording starts again from 0: a stream's time that goes back by more than a second begins
- * another take, which comes after the latest time so far.
- */
-class Takes {
-public:
-    /** @return the time of a frame, taken in file order */
-    flvdmx::Milliseconds Continue(const flvdmx::Frame& frame);
-
-    size_t Restarts() const { return m_offsets.size() - 1; }
-    flvdmx::Milliseconds Played() const { return m_latest; } /**< the latest time returned */
-
-private:
-    struct Lane {
-        size_t take = 0;
-        flvdmx::Milliseconds last{};
-    };
-    Lane m_video;
-    Lane m_audio;
-    std::vector<flvdmx::Milliseconds> m_offsets{flvdmx::Milliseconds(0)}; // of each take
-    flvdmx::Milliseconds m_latest{};
+    Loss m_damage;   // bytes of no valid tag
+    Loss m_unplayed; // tags without a fault that are not played
 };
 
 } // namespace tool

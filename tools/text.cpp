@@ -2,6 +2,7 @@
 #include "tools/text.h"
 
 #include <algorithm>
+#include <cmath>
 #include <iterator>
 #include <limits>
 
@@ -20,7 +21,7 @@ bool IsDigit(char c)
     return c >= '0' && c <= '9';
 }
 
-// Takes the digits that `text` begins with: at least one, of a value that can still be a time.
+// Takes the digits at the start of `text`: at least one, and a value that fits a time.
 std::optional<int64_t> TakeNumber(std::string_view& text)
 {
     int64_t value = 0;
@@ -49,7 +50,7 @@ std::optional<int64_t> ParseFraction(std::string_view digits)
     return (tenths + 5) / 10;
 }
 
-// Takes `SECONDS` or `[HH:]MM:SS`; after a colon only 0 to 59 make sense.
+// Takes `SECONDS` or `[HH:]MM:SS`; after a colon only 0 to 59 are valid.
 std::optional<int64_t> TakeSeconds(std::string_view& text)
 {
     std::optional<int64_t> seconds = TakeNumber(text);
@@ -63,7 +64,7 @@ std::optional<int64_t> TakeSeconds(std::string_view& text)
     return seconds;
 }
 
-// The bytes of the UTF-8 character that `text` begins with; 0 when it begins with none, or with one that XML forbids.
+// Size of the UTF-8 character at the start of `text`; 0 when there is none, or one that XML forbids.
 size_t CharacterSize(std::string_view text)
 {
     const auto byte = [text](size_t i) { return i < text.size() ? static_cast<unsigned char>(text[i]) : 0U; };
@@ -87,7 +88,7 @@ bool IsControl(std::string_view character)
     return first < ' ' || first == 0x7F || c1;
 }
 
-// Characters of East Asia take two columns; some that take one are counted so, which leaves a line shorter.
+// East Asian characters take two columns. Some that take one are counted as two, so that a line may get shorter.
 size_t ColumnsOf(std::string_view text)
 {
     size_t columns = 0;
@@ -123,7 +124,7 @@ std::optional<int32_t> ParseTime(std::string_view text)
 
 std::string FormatTime(int64_t milliseconds)
 {
-    const int64_t size = milliseconds < 0 ? -milliseconds : milliseconds; // far from the limits: 33 bits
+    const int64_t size = milliseconds < 0 ? -milliseconds : milliseconds; // at most 33 bits
     const int64_t seconds = size / MS_PER_SECOND;
     return fmt::format("{}{}:{:02}:{:02}.{:03}", milliseconds < 0 ? "-" : "", seconds / SIXTY / SIXTY,
                        seconds / SIXTY % SIXTY, seconds % SIXTY, size % MS_PER_SECOND);
@@ -132,6 +133,16 @@ std::string FormatTime(int64_t milliseconds)
 std::string Plural(uint64_t count, const char* noun)
 {
     return fmt::format("{} {}{}", count, noun, count == 1 ? "" : "s");
+}
+
+std::string Number(double value, int decimals)
+{
+    constexpr double MOST = 1e18;
+    if (!(std::abs(value) < MOST))
+        return fmt::format("{:g}", value);
+    const std::string text = fmt::format("{:.{}f}", value, decimals);
+    const size_t last = text.find_last_not_of('0');
+    return text.substr(0, text[last] == '.' ? last : last + 1);
 }
 
 std::string Hex(flvdmx::Bytes bytes)

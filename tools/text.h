@@ -1,4 +1,4 @@
-// Text for people: times as they write and read them, names that may hold anything.
+// Text for people: times, numbers, and names that may contain anything.
 #ifndef FLVDMX_TOOLS_TEXT_H
 #define FLVDMX_TOOLS_TEXT_H
 
@@ -12,13 +12,13 @@
 namespace tool {
 
 /**
- * Reads `SECONDS[.FRACTION]` or `[HH:]MM:SS[.FRACTION]`, either after blanks and a sign.
+ * Reads `SECONDS[.FRACTION]` or `[HH:]MM:SS[.FRACTION]`, either after spaces and a sign.
  *
- * @return milliseconds, rounded to the nearest; nothing when the text is no time or does not fit 32 bits
+ * @return milliseconds, rounded to the nearest; nothing when the text is not a time or does not fit 32 bits
  */
 std::optional<int32_t> ParseTime(std::string_view text);
 
-/** @return the time as `H:MM:SS.mmm`, a negative one with a minus before it */
+/** @return the time as `H:MM:SS.mmm`, after a minus if it is negative */
 std::string FormatTime(int64_t milliseconds);
 
 /** The same. */
@@ -30,14 +30,18 @@ inline std::string FormatTime(flvdmx::Milliseconds time)
 /** @return `1 frame`, `2 frames` */
 std::string Plural(uint64_t count, const char* noun);
 
+/** @return the number with at most `decimals` decimals, at least 1, and no trailing zeros; with an exponent only from
+ * 1e18 on */
+std::string Number(double value, int decimals = 3);
+
 /** @return the bytes as hexadecimal digits */
 std::string Hex(flvdmx::Bytes bytes);
 
-/** @return the text as valid UTF-8 for a terminal or a drawing: control characters and whatever is no character in it
+/** @return the text as valid UTF-8 for a terminal or a drawing; the bytes of control characters and invalid sequences
  *          become \xNN */
 std::string Printable(std::string_view text);
 
-/** @return a printable text that takes no more than that many columns: its middle may be replaced by "..." */
+/** @return a printable text that fits into that many columns, its middle replaced by "..." if needed */
 std::string Shorten(std::string_view printable, size_t columns);
 
 } // namespace tool

@@ -4,11 +4,13 @@
 #include <algorithm>
 #include <cmath>
 #include <optional>
+#include <utility>
 
 #include "tools/frame_source.h"
 #include "tools/progress.h"
 #include "tools/svg.h"
 #include "tools/tags.h"
+#include "tools/times.h"
 
 namespace tool {
 
@@ -26,29 +28,29 @@ struct Point {
     uint32_t size;
     bool video;
     bool keyframe;
-    bool loss;    // bytes were left out before it
-    bool restart; // the timestamps start again with it
+    bool loss; // bytes were left out before it
+    bool jump; // the timestamps jump
 };
 
 std::vector<Point> ReadPoints(Input& input, Timeline& timeline)
 {
     std::vector<Point> points;
-    Takes takes;
+    Times times;
     Losses losses(input);
-    ProgressBar progress(input.name, input.info.size);
+    ReadProgress progress(input.name, input.info.size);
     while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
-        progress.ShowDone(frame->position);
-        const size_t restarts = takes.Restarts();
+        const uint64_t jumps = times.Jumps();
         const bool loss = losses.Take(*frame);
-        const auto time = static_cast<double>(takes.Continue(*frame).count()) / MS_PER_SECOND;
+        times.Take(frame->stream, frame->time.count());
+        const auto time = static_cast<double>(times.Time()) / MS_PER_SECOND;
         const bool video = frame->stream == flvdmx::Stream::video;
         points.push_back({time, static_cast<double>(frame->position), static_cast<uint32_t>(frame->data.size()), video,
-                          video && frame->keyframe, loss, takes.Restarts() > restarts});
+                          video && frame->keyframe, loss, times.Jumps() > jumps});
     }
     progress.Wipe();
     losses.Finish();
     losses.Warn();
-    timeline.durationMs = takes.Played().count();
+    timeline.durationMs = times.Latest();
     timeline.bytesLeftOut = losses.Bytes();
     return points;
 }
@@ -118,13 +120,13 @@ private:
     {
         const double latest = std::max(m_video.last.value_or(0), m_audio.last.value_or(0));
         const bool gap = lane.last && point.time - *lane.last > LongestStep(m_timeline, stream);
-        if (point.restart)
-            m_timeline.marks.push_back({Mark::Kind::restart, point.time, point.time});
+        if (point.jump)
+            m_timeline.marks.push_back({Mark::Kind::jump, point.time, point.time});
         if (point.loss)
             m_timeline.marks.push_back({Mark::Kind::damage, std::min(latest, point.time), point.time});
         else if (gap)
             m_timeline.marks.push_back({Mark::Kind::gap, *lane.last, point.time});
-        if (!point.restart && !point.loss && !gap)
+        if (!point.jump && !point.loss && !gap)
             return;
         lane.breaks = m_leadBreaks = true;
         if (!gap)
@@ -146,6 +148,21 @@ private:
     double m_lead = 0;
     bool m_leadBreaks = true;
 };
+
+// Marks that would touch in the drawing become one. A jump stays a moment.
+void MergeMarks(std::vector<Mark>& marks, double distance)
+{
+    const auto order = [](const Mark& mark) { return std::make_pair(mark.kind, mark.from); };
+    std::sort(marks.begin(), marks.end(), [&](const Mark& a, const Mark& b) { return order(a) < order(b); });
+    std::vector<Mark> merged;
+    for (const Mark& mark : marks) {
+        if (merged.empty() || merged.back().kind != mark.kind || mark.from > merged.back().to + distance)
+            merged.push_back(mark);
+        else if (mark.kind != Mark::Kind::jump)
+            merged.back().to = std::max(merged.back().to, mark.to);
+    }
+    marks = std::move(merged);
+}
 
 } // namespace
 
@@ -174,6 +191,7 @@ Timeline ReadTimeline(Input& input, size_t columns)
     Gatherer gatherer(timeline);
     for (const Point& point : points)
         gatherer.Take(point);
+    MergeMarks(timeline.marks, timeline.duration / static_cast<double>(columns));
     return timeline;
 }
 

@@ -29,12 +29,12 @@ struct StreamTimeline {
 
 /** A stretch of time in which something is missing, or a moment. */
 struct Mark {
-    enum class Kind { gap, damage, restart } kind;
+    enum class Kind { gap, damage, jump } kind;
     double from;
     double to;
 };
 
-/** Times in seconds from the first timestamp, going on where timestamps start again; intervals, the last one with the
+/** Times in seconds from the first timestamp, continuing after jumps; intervals, the last one with the
  *  rest, and columns divide the duration. */
 struct Timeline {
     int64_t durationMs;

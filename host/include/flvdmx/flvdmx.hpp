@@ -540,6 +540,18 @@ public:
         }
     }
 
+    /**
+     * Delivers all frames from now on, as if the file had been opened with Options::restarting_timestamps, and refuses
+     * seeks. No effect if nothing is open.
+     */
+    void accept_all_times()
+    {
+        if (m_instance == nullptr)
+            return;
+        m_instance->last_ts = 0; // no ceiling: all timestamps are valid; a seek would take it for the end of the file
+        m_instance->seek_method = FLVD_SEEK_NONE;
+    }
+
     /** The remaining frames, for range-for. Ends at the first request that fails; last_error() says why. */
     inline FrameRange frames(Stream stream = Stream::any) &;
 
@@ -833,13 +845,6 @@ private:
                        bits_if(options.growing, FLVD_OPT_PROGRESSIVE) |
                        bits_if(options.index_in_memory, FLVD_OPT_INDEX_IN_MEMORY);
         return init;
-    }
-
-    // Without a last timestamp all timestamps are valid. Seeks would treat 0 as the end of the file.
-    void accept_all_times()
-    {
-        m_instance->last_ts = 0;
-        m_instance->seek_method = FLVD_SEEK_NONE;
     }
 
     /* Failures. */
