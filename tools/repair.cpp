@@ -94,9 +94,9 @@ int RunRepair(const RewriteOptions& options)
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));
-    const int64_t leftOut = report.bytesLeftOut + input.Rest();
-    if (leftOut != 0)
-        Tell(fmt::format("{}: {} left out\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
+    if (report.bytesLeftOut != 0)
+        Tell(fmt::format("{}: {} left out\n", Printable(options.file),
+                         Plural(static_cast<uint64_t>(report.bytesLeftOut), "byte")));
     return DONE;
 }
 
