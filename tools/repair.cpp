@@ -27,20 +27,22 @@ using Pass = std::function<RemuxReport(const TakeTag& take)>;
 // Runs a pass that measures and, unless it is a rehearsal, one that writes.
 RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
 {
+    std::optional<OutputFile> out; // first of all: what cannot be written is refused at once
+    if (!options.dryRun)
+        out.emplace(options.out, options.file, options.force);
     ReadProgress progress(options.file, size, options.dryRun ? 1 : 2);
     FlvLayout layout;
     const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); });
     if (report.videoFrames + report.audioFrames == 0)
         throw FileError(options.file, "there is no frame to write");
     uint64_t written = 0;
-    if (!options.dryRun) {
-        OutputFile out(options.out, options.file, options.force);
+    if (out) {
         const std::vector<uint8_t> beginning = layout.Beginning(MetadataOf(options.file));
-        out.Write(beginning.data(), beginning.size());
+        out->Write(beginning.data(), beginning.size());
         progress.NextPass();
-        pass([&](const NewTag& tag) { WriteTag(out, tag); });
-        out.Finish();
-        written = out.Written();
+        pass([&](const NewTag& tag) { WriteTag(*out, tag); });
+        out->Finish();
+        written = out->Written();
     }
     progress.Wipe();
     if (options.out == STANDARD_STREAM && !options.dryRun)
