@@ -25,12 +25,12 @@ namespace {
 using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
 // Runs a pass that measures and, unless it is a rehearsal, one that writes.
-RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
+RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& pass)
 {
     std::optional<OutputFile> out; // first of all: what cannot be written is refused at once
     if (!options.dryRun)
         out.emplace(options.out, options.file, options.force);
-    ReadProgress progress(options.file, size, options.dryRun ? 1 : 2);
+    ReadProgress progress(options.file, inputSize, options.dryRun ? 1 : 2);
     FlvLayout layout;
     const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); });
     if (report.videoFrames + report.audioFrames == 0)
@@ -40,7 +40,13 @@ RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
         const std::vector<uint8_t> beginning = layout.Beginning(MetadataOf(options.file));
         out->Write(beginning.data(), beginning.size());
         progress.NextPass();
-        pass([&](const NewTag& tag) { WriteTag(*out, tag); });
+        const uint64_t size = beginning.size() + layout.Size();
+        pass([&](const NewTag& tag) {
+            if (out->Written() < size) // a file that is still being written has more tags by now
+                WriteTag(*out, tag);
+        });
+        if (out->Written() != size)
+            throw FileError(options.file, "the file has changed while it was read");
         out->Finish();
         written = out->Written();
     }
