@@ -224,10 +224,10 @@ void FlvLayout::Add(const NewTag& tag)
         m_firstTimestamp = std::min(m_firstTimestamp, tag.timestamp);
         m_lastTimestamp = std::max(m_lastTimestamp, tag.timestamp);
     }
-    m_size += static_cast<int64_t>(TAG_HEADER_SIZE + tag.header.size() + tag.payload.size() + BACK_POINTER_SIZE);
+    m_size += TAG_HEADER_SIZE + tag.header.size() + tag.payload.size() + BACK_POINTER_SIZE;
 }
 
-ScriptProperty FlvLayout::Index(int64_t firstTag) const
+ScriptProperty FlvLayout::Index(uint64_t firstTag) const
 {
     const size_t step = (m_keyframes.size() + INDEX_MAX - 1) / INDEX_MAX;
     const size_t count = (m_keyframes.size() + step - 1) / step;
@@ -248,7 +248,7 @@ ScriptProperty FlvLayout::Index(int64_t firstTag) const
     return index;
 }
 
-std::vector<uint8_t> FlvLayout::ScriptPayload(const std::vector<ScriptProperty>& properties, int64_t firstTag) const
+std::vector<uint8_t> FlvLayout::ScriptPayload(const std::vector<ScriptProperty>& properties, uint64_t firstTag) const
 {
     std::vector<ScriptProperty> all;
     std::copy_if(properties.begin(), properties.end(), std::back_inserter(all), [](const ScriptProperty& property) {
@@ -280,7 +280,7 @@ std::vector<uint8_t> FlvLayout::Beginning(const std::vector<ScriptProperty>& pro
     PutInteger(out, FILE_HEADER_SIZE, 4);
     PutInteger(out, 0, BACK_POINTER_SIZE);                   // PreviousTagSize0
     const size_t size = ScriptPayload(properties, 0).size(); // the same for all positions
-    const auto firstTag = static_cast<int64_t>(out.size() + TAG_HEADER_SIZE + size + BACK_POINTER_SIZE);
+    const uint64_t firstTag = out.size() + TAG_HEADER_SIZE + size + BACK_POINTER_SIZE;
     Put(out, TagHeader(FLVD_TAG_TYPE_SCRIPT, size, 0));
     Put(out, ScriptPayload(properties, firstTag));
     PutInteger(out, TAG_HEADER_SIZE + size, BACK_POINTER_SIZE);

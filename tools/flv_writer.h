@@ -50,6 +50,7 @@ public:
     /** @return ms */
     uint32_t Duration() const { return m_lastTimestamp - std::min(m_firstTimestamp, m_lastTimestamp); }
     size_t Keyframes() const { return m_keyframes.size(); }
+    uint64_t Size() const { return m_size; } /**< bytes of the tags */
 
     /**
      * @return the file header and the onMetaData tag with `properties`. Properties that depend on the tags replace
@@ -61,17 +62,17 @@ public:
 private:
     struct Keyframe {
         uint32_t timestamp;
-        int64_t offset; // from the first tag after onMetaData
+        uint64_t offset; // from the first tag after onMetaData
     };
 
-    std::vector<uint8_t> ScriptPayload(const std::vector<ScriptProperty>& properties, int64_t firstTag) const;
-    ScriptProperty Index(int64_t firstTag) const;
+    std::vector<uint8_t> ScriptPayload(const std::vector<ScriptProperty>& properties, uint64_t firstTag) const;
+    ScriptProperty Index(uint64_t firstTag) const;
 
     bool m_hasVideo = false;
     bool m_hasAudio = false;
     uint32_t m_firstTimestamp = UINT32_MAX;
     uint32_t m_lastTimestamp = 0;
-    int64_t m_size = 0;
+    uint64_t m_size = 0;
     std::vector<Keyframe> m_keyframes;
 };
 

@@ -96,8 +96,10 @@ public:
                 break;
             Take(*frame, track);
         }
-        if (m_options.toMs == std::numeric_limits<int64_t>::max())
+        if (m_options.toMs == std::numeric_limits<int64_t>::max()) {
             m_losses.Finish();
+            m_report.bytesLeftOut += m_losses.Rest();
+        }
         m_report.jumps = m_times.Jumps();
         m_report.bytesLeftOut += m_losses.Bytes();
         return m_report;

@@ -25,22 +25,30 @@ namespace {
 using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
 // Runs a pass that measures and, unless it is a rehearsal, one that writes.
-RemuxReport Write(const RewriteOptions& options, int64_t size, const Pass& pass)
+RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& pass)
 {
-    ReadProgress progress(options.file, size, options.dryRun ? 1 : 2);
+    std::optional<OutputFile> out; // first of all: what cannot be written is refused at once
+    if (!options.dryRun)
+        out.emplace(options.out, options.file, options.force);
+    ReadProgress progress(options.file, inputSize, options.dryRun ? 1 : 2);
     FlvLayout layout;
     const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); });
     if (report.videoFrames + report.audioFrames == 0)
         throw FileError(options.file, "there are no frames to write");
     uint64_t written = 0;
-    if (!options.dryRun) {
-        OutputFile out(options.out, options.file, options.force);
+    if (out) {
         const std::vector<uint8_t> beginning = layout.Beginning(MetadataOf(options.file));
-        out.Write(beginning.data(), beginning.size());
+        out->Write(beginning.data(), beginning.size());
         progress.NextPass();
-        pass([&](const NewTag& tag) { WriteTag(out, tag); });
-        out.Finish();
-        written = out.Written();
+        const uint64_t size = beginning.size() + layout.Size();
+        pass([&](const NewTag& tag) {
+            if (out->Written() < size) // a file that is still being written has more tags by now
+                WriteTag(*out, tag);
+        });
+        if (out->Written() != size)
+            throw FileError(options.file, "the file changed while it was read");
+        out->Finish();
+        written = out->Written();
     }
     progress.Wipe();
     if (options.out == STANDARD_STREAM && !options.dryRun)
@@ -94,9 +102,9 @@ int RunRepair(const RewriteOptions& options)
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));
-    const int64_t leftOut = report.bytesLeftOut + input.Rest();
-    if (leftOut != 0)
-        Tell(fmt::format("{}: {} skipped\n", Printable(options.file), Plural(static_cast<uint64_t>(leftOut), "byte")));
+    if (report.bytesLeftOut != 0)
+        Tell(fmt::format("{}: {} skipped\n", Printable(options.file),
+                         Plural(static_cast<uint64_t>(report.bytesLeftOut), "byte")));
     return DONE;
 }
 

@@ -2,6 +2,7 @@
 #ifndef FLVDMX_TOOLS_TAGS_H
 #define FLVDMX_TOOLS_TAGS_H
 
+#include <algorithm>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -84,6 +85,11 @@ public:
     void Finish() { Inspect(m_end, m_input.Instance().data_end); }
 
     int64_t Bytes() const { return m_bytes; } /**< left out so far */
+    /** @return bytes after the last frame and the end of the valid data */
+    int64_t Rest() const
+    {
+        return std::max(m_input.info.size - std::max(m_end, m_input.Instance().data_end), int64_t{0});
+    }
     /** Tells on standard error what was left out. */
     void Warn() const;
 
