@@ -348,10 +348,10 @@ TEST(Interface, KnowsConfigurationsThatItHasPassed)
 }
 
 // A stream that starts after the tags that an open examines is missing from the information, but its frames are
-// complete.
+// complete. Before its first one come more tags without a frame than one request skips.
 TEST(Interface, DescribesFramesOfAStreamThatBeginsLate)
 {
-    const std::string letters = "a" + std::string(120, '2') + "A12";
+    const std::string letters = "a" + std::string(120, '2') + std::string(120, 'A') + "12";
     const Flv flv = ConfigFile(letters);
     const Memory memory(flv.bytes);
     auto file = memory.open();
