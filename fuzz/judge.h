@@ -92,10 +92,7 @@ private:
 
 /** Copies the bytes; reading them all lets a sanitizer find invalid memory. */
 Bytes copy_of(const void* begin, size_t size);
-template <class Record> Bytes bytes_of(const Record& record)
-{
-    return copy_of(&record, sizeof record);
-}
+inline const auto bytes_of = [](const auto& record) { return copy_of(&record, sizeof record); };
 
 /** A tag parsed from the bytes of a file, independently of the library. */
 struct FileTag {

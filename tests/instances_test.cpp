@@ -91,6 +91,11 @@ TEST(Instances, RefusesWhatItCannotServe)
     const flvd_frame_request_t no_buffer{nullptr, 100000, 0};
     flvd_ctx_t* ctx = user.ctx();
     EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_GET_FRAME, &ctx, &no_buffer, &frame), -2); // no frame fits
+
+    FakeHost empty(Bytes{});
+    const flvd_init_t empty_init = empty.init();
+    EXPECT_EQ(QVX_FLV_DMX(FLVD_OP_OPEN, &live, &empty_init, &info), -1);
+    EXPECT_EQ(live, nullptr); // also replaces the handle of an open instance
 }
 
 } // namespace

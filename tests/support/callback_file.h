@@ -15,8 +15,6 @@ struct CallbackFile : flvd_callback_file_t {
         flvd_callback_host_add(this);
     }
     ~CallbackFile() { flvd_callback_host_remove(this); }
-    CallbackFile(const CallbackFile&) = delete;
-    CallbackFile& operator=(const CallbackFile&) = delete;
 
     const char* const data;
     uint64_t size; /**< may change: the file grows */

@@ -21,10 +21,7 @@ using Bytes = std::vector<uint8_t>;
 
 /** The low `bytes` bytes of `value`. */
 Bytes BigEndian(uint64_t value, int bytes);
-inline void Append(Bytes& out, const Bytes& more)
-{
-    out.insert(out.end(), more.begin(), more.end());
-}
+inline const auto Append = [](Bytes& out, const Bytes& more) { out.insert(out.end(), more.begin(), more.end()); };
 Bytes Concat(const std::vector<Bytes>& parts);
 /** Pseudo-random bytes, the same for the same seed, without 8, 9 and 18: no tag header can start in them. */
 Bytes Noise(size_t size, uint32_t seed = 1);

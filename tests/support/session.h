@@ -53,10 +53,7 @@ struct FailureSite {
 };
 /** All failure sites, in the order of the enumeration. */
 const std::vector<FailureSite>& FailureSites();
-inline const FailureSite& At(Site site)
-{
-    return FailureSites().at(static_cast<size_t>(site));
-}
+inline const auto At = [](Site site) -> const FailureSite& { return FailureSites().at(static_cast<size_t>(site)); };
 bool IsListed(Op op, int32_t rc, int32_t code, int32_t line);
 
 struct OpenOptions {
