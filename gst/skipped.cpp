@@ -20,8 +20,7 @@ uint32_t big_endian_24(const uint8_t* bytes)
 
 bool is_late(const RawTag& tag, const flvdmx::File& file)
 {
-    const uint32_t last = file.instance()->last_ts; // 0: any time is valid
-    return last != 0 && tag.stream != flvdmx::Stream::any && tag.timestamp > last;
+    return tag.stream != flvdmx::Stream::any && tag.timestamp > file.instance()->last_ts;
 }
 
 } // namespace
@@ -52,6 +51,8 @@ std::optional<RawTag> read_tag(Source& source, int64_t position)
 
 bool is_before_restart(Source& source, int64_t position, const flvdmx::File& file)
 {
+    if (file.instance()->last_ts == 0) // any time is valid
+        return false;
     std::optional<RawTag> tag;
     bool late = false;
     for (int i = 0; i < examined_tags && (tag = read_tag(source, position)); ++i, position = tag->end) {

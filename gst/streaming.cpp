@@ -136,7 +136,8 @@ GstFlowReturn Streaming::push_frame()
         return flow;
     Output& output = output_of(frame->stream);
     if (output.pad() == nullptr) {
-        warn_of_skipped(frame->position);
+        if (!warned_of(frame->stream))
+            warn_of_skipped(frame->position);
         return GST_FLOW_OK;
     }
     if (frame->config_changed())
@@ -203,8 +204,10 @@ bool Streaming::goes_back(int64_t position)
 void Streaming::warn_of_skipped(int64_t position)
 {
     std::optional<RawTag> tag;
+    if (m_warned[0] && m_warned[1])
+        return;
     for (int i = 0; i < examined_tags && (tag = read_tag(m_source, position)); ++i, position = tag->end) {
-        bool& warned = m_warned[tag->stream == flvdmx::Stream::video ? 0 : 1];
+        bool& warned = warned_of(tag->stream);
         const std::string reason = warned ? "" : reason_to_skip(*tag, m_file, m_info);
         if (reason.empty())
             continue;

@@ -74,7 +74,9 @@ private:
     void push_segment();
     void push_to_all(GstEvent* event) const;
     bool has_output() const { return m_outputs[0].pad() != nullptr || m_outputs[1].pad() != nullptr; }
-    Output& output_of(flvdmx::Stream stream) { return m_outputs[stream == flvdmx::Stream::video ? 0 : 1]; }
+    static size_t index_of(flvdmx::Stream stream) { return stream == flvdmx::Stream::video ? 0 : 1; }
+    Output& output_of(flvdmx::Stream stream) { return m_outputs[index_of(stream)]; }
+    bool& warned_of(flvdmx::Stream stream) { return m_warned[index_of(stream)]; }
 
     /* Any thread. */
     static gboolean handle_event(GstPad* pad, GstObject* parent, GstEvent* event);
