@@ -168,10 +168,10 @@ void SeekToStart(Input& input, int32_t ms)
 {
     const flvdmx::error error = input.file.seek(flvdmx::Milliseconds(ms), flvdmx::SeekMode::backward).error();
     if (error.kind() == flvdmx::Kind::miss)
-        throw FileError(
-            input.name,
-            fmt::format("there is no frame at {}: the last one is at {}", FormatTime(ms), FormatTime(input.info.duration)),
-            error);
+        throw FileError(input.name,
+                        fmt::format("there is no frame at {}: the last one is at {}", FormatTime(ms),
+                                    FormatTime(input.info.duration)),
+                        error);
 }
 
 // With two readers the frames come by time: what is between them is looked at in another pass, in file order.

@@ -59,8 +59,8 @@ std::optional<Fault> Judge(TagReader& reader, double seconds, double position)
     if (!tag || !(tag->IsKeyframe() || (tag->IsAvc() && tag->IsConfig())))
         return Fault{"place", fmt::format("leads to byte {:.15g}, where there is no keyframe", position)};
     if (!(std::abs(seconds * 1000 - tag->timestamp) <= MOST_DIFFERENCE_MS))
-        return Fault{"time", fmt::format("states {}, but the keyframe at byte {:.15g} has {}", TimeText(seconds), position,
-                                         FormatTime(tag->timestamp))};
+        return Fault{"time", fmt::format("states {}, but the keyframe at byte {:.15g} has {}", TimeText(seconds),
+                                         position, FormatTime(tag->timestamp))};
     return std::nullopt;
 }
 

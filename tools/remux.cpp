@@ -244,8 +244,8 @@ RemuxReport CopyTags(const std::string& file, const TakeTag& take)
         bytes.resize(size_t{tag->size} + BACK_POINTER_SIZE);
         raw.Read(position + TAG_HEADER_SIZE, bytes.data(), bytes.size());
         if (BigEndian(&bytes[tag->size], BACK_POINTER_SIZE) != tag->size + TAG_HEADER_SIZE)
-            throw FileError(file,
-                            fmt::format("the back-pointer of the tag at byte {} is wrong: use 'flvdmx repair'", position));
+            throw FileError(
+                file, fmt::format("the back-pointer of the tag at byte {} is wrong: use 'flvdmx repair'", position));
         if (position != metadata)
             take({static_cast<uint8_t>(tag->type),
                   tag->timestamp,

@@ -1,4 +1,4 @@
-// What only a look at all frames of a file tells.
+// What only shows when all frames of a file are read.
 #include "tools/scan.h"
 
 #include <algorithm>
@@ -48,7 +48,7 @@ FileScan ScanFile(const std::string& name)
 bool SeemsToRestart(const Input& input)
 {
     constexpr int64_t PLACES = 16;
-    constexpr int64_t NEAR = 1 << 20; // bytes: a place inside a larger tag tells nothing
+    constexpr int64_t NEAR = 1 << 20; // bytes; nothing is found inside a larger tag
     constexpr uint32_t JITTER_MS = 2000;
     flvdmx::Options options;
     options.restarting_timestamps = true;

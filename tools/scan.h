@@ -1,4 +1,4 @@
-// What only a look at all frames of a file tells.
+// What only shows when all frames of a file are read.
 #ifndef FLVDMX_TOOLS_SCAN_H
 #define FLVDMX_TOOLS_SCAN_H
 
@@ -25,10 +25,10 @@ struct FileScan {
 /** Plays the whole file. */
 FileScan ScanFile(const std::string& name);
 
-/** @return true when tags here and there in the file have times that only a restart explains; a few reads */
+/** @return true if samples of the tags in the file have times that only a restart explains; takes a few reads */
 bool SeemsToRestart(const Input& input);
 
-/** Tells on standard error when times name no single place in the file. */
+/** Warns on standard error if a time does not stand for a single position in the file. */
 void WarnOfRestarts(const Input& input);
 
 } // namespace tool

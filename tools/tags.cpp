@@ -1,4 +1,4 @@
-// The tags of a file as they are there.
+// The tags of a file as they are.
 #include "tools/tags.h"
 
 #include <algorithm>
@@ -179,7 +179,8 @@ int64_t Losses::EndOf(const flvdmx::Frame& frame)
     return tag.End();
 }
 
-// What is between two frames: mostly nothing, else configurations, script data, tags that are not played, or damage.
+// Usually there is nothing between two frames; otherwise configurations, script data, tags that are not played, or
+// damage.
 void Losses::Inspect(int64_t from, int64_t to)
 {
     while (from < to) {

@@ -1,4 +1,4 @@
-// The tags of a file as they are there, for what playing does not tell: damage, and tags that are not played.
+// The tags of a file as they are, for what playing does not show: damage, and tags that are not played.
 #ifndef FLVDMX_TOOLS_TAGS_H
 #define FLVDMX_TOOLS_TAGS_H
 
@@ -16,10 +16,10 @@
 
 namespace tool {
 
-/** Reads tags and numbers anywhere in a file, with a reader of its own. */
+/** Reads tags and bytes at any position of a file, with a separate reader. */
 class TagReader {
 public:
-    /** @param input borrowed; it is played on meanwhile as if nothing happened */
+    /** @param input borrowed; its own position does not change */
     explicit TagReader(const Input& input);
 
     int64_t FileSize() const { return m_fileSize; }
@@ -27,14 +27,14 @@ public:
     /** @return `size` bytes at `position`, valid until the next call; null when not all of them are there */
     const uint8_t* Bytes(int64_t position, uint32_t size);
 
-    /** @return what stands at `position` when it has the type of a tag and is not cut in its header */
+    /** @return the tag at `position`; nothing if its type is unknown or its header cut short */
     std::optional<Tag> At(int64_t position);
 
     /**
      * Finds the first valid tag of the file's streams at or after `from`, however much damage is before it. One
      * search of the library covers a bounded stretch; the next follows while the reader advances before `end`.
      *
-     * @param progress called with the place that each search without a tag has reached
+     * @param progress called with the position that each search without a tag has reached
      */
     std::optional<Tag> Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress = {});
 
@@ -59,38 +59,38 @@ private:
     flvd_ctx_t* const m_instance;
     const std::unique_ptr<fio_file_t, Closer> m_reader;
     int64_t m_fileSize = 0;
-    std::optional<std::string> m_noVideo; // the reasons, once they were sought
+    std::optional<std::string> m_noVideo; // the reasons, once they have been determined
     std::optional<std::string> m_noAudio;
 };
 
-/** @return what is wrong with the codec configurations with which the input starts; empty when nothing is */
+/** @return what is wrong with the first codec configurations of the input; empty if nothing is */
 std::string ConfigFault(const Input& input);
 
-/** @return a text about a codec of the input that FLV does not define; empty when it defines them */
+/** @return a text about a codec of the input that FLV does not define; empty if it defines all */
 std::string UndefinedCodec(const Input& input);
 
-/** Tells on standard error which of these streams (FLVD_STREAM_* bits) the file has but are not played, and why. */
+/** Warns on standard error which of these streams (FLVD_STREAM_* bits) the file has but are not played, and why. */
 void WarnOfUnplayed(const Input& input, uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
 
-/** Watches for bytes that are left out between the frames of a file. */
+/** Finds the bytes that are skipped between the frames of a file. */
 class Losses {
 public:
     /** @param input borrowed
      *  @param script called with each script tag between frames; may be empty */
     explicit Losses(const Input& input, std::function<void(const Tag&)> script = {});
 
-    /** Takes every frame of the file, in file order. @return true when bytes were left out before it */
+    /** Takes every frame of the file, in file order. @return true if bytes were skipped before it */
     bool Take(const flvdmx::Frame& frame);
     /** After the last frame. */
     void Finish() { Inspect(m_end, m_input.Instance().data_end); }
 
-    int64_t Bytes() const { return m_bytes; } /**< left out so far */
+    int64_t Bytes() const { return m_bytes; } /**< skipped so far */
     /** @return bytes after the last frame and the end of the valid data */
     int64_t Rest() const
     {
         return std::max(m_input.info.size - std::max(m_end, m_input.Instance().data_end), int64_t{0});
     }
-    /** Tells on standard error what was left out. */
+    /** Warns on standard error what was skipped. */
     void Warn() const;
 
 private:

@@ -28,7 +28,7 @@ struct Point {
     uint32_t size;
     bool video;
     bool keyframe;
-    bool loss; // bytes were left out before it
+    bool loss; // bytes were skipped before it
     bool jump; // the timestamps jump
 };
 

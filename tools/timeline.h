@@ -51,7 +51,7 @@ struct Timeline {
     bool IsMissing(double from, double to) const;
 };
 
-/** Reads the whole file, and tells on standard error what is left out. Takes a few bytes of memory per frame. */
+/** Reads the whole file, and warns on standard error what is skipped. Takes a few bytes of memory per frame. */
 Timeline ReadTimeline(Input& input, size_t columns);
 
 } // namespace tool
