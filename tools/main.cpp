@@ -238,6 +238,7 @@ void AddCheck(CLI::App& app, CheckOptions& options)
                     "  interleaving       audio and video are more than --max-gap apart in the file\n"
                     "  not_playable       the file cannot be opened for playing\n"
                     "  configuration      a codec configuration changes: listed, but no fault\n"
+                  "  pause              one stream stops for longer than --jump, the other continues: no fault\n"
                     "The first 1000 findings of a file are listed, all are counted.\n\n"
                     "Exit codes: 0 all files are ok, 1 something was found or a file could not be read.");
 }
@@ -273,9 +274,9 @@ void AddRepair(CLI::App& app, RewriteOptions& options)
     CLI::App* const command =
         AddRewrite(app, "repair", "Write a valid file from everything that can be played", options);
     command->add_flag("--keep-times", options.keepTimes, "Leave timestamps that restart or jump as they are");
-    command->footer("Frames and codec configurations are kept, damage and other bytes are dropped. The metadata gets\n"
-                    "a new duration, file size and keyframe index. Timestamps that go back by more than a second or\n"
-                    "forward by more than ten are made continuous.\n\n"
+    command->footer("Frames, codec configurations and cue points are kept, damage and other bytes are dropped. The\n"
+                    "metadata gets a new duration, file size and keyframe index. Timestamps that go back by more than\n"
+                    "a second or forward by more than ten are made continuous, single wrong ones replaced.\n\n"
                     "  flvdmx repair recording.flv -o repaired.flv");
 }
 
