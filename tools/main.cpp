@@ -238,7 +238,7 @@ void AddCheck(CLI::App& app, CheckOptions& options)
                     "  interleaving       audio and video are more than --max-gap apart in the file\n"
                     "  not_playable       the file cannot be opened for playing\n"
                     "  configuration      a codec configuration changes: listed, but no fault\n"
-                  "  pause              one stream stops for longer than --jump, the other continues: no fault\n"
+                    "  pause              one stream stops for longer than --jump, the other continues: no fault\n"
                     "The first 1000 findings of a file are listed, all are counted.\n\n"
                     "Exit codes: 0 all files are ok, 1 something was found or a file could not be read.");
 }
