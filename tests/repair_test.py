@@ -61,6 +61,7 @@ class Repair(Rewritten):
                 ("restart", TAGS + media, 2 * last + 23),
                 ("gap", TAGS + [at(tag, time_of(tag) + 100_000) for tag in media], 2 * last + 23),
                 ("wrong", TAGS[:50] + [at(TAGS[50], 900_000)] + TAGS[51:], last),
+                ("wraps", [TAGS[0]] + [at(tag, (time_of(tag) - 1000) % 2**32) for tag in media], last),
                 ("jitter", TAGS[:50] + [at(TAGS[50], time_of(TAGS[50]) - 200)] + TAGS[51:], last)):
             path = self.write("in.flv", HEADER + b"".join(tags))
             with self.subTest(name=name):
@@ -77,14 +78,21 @@ class Repair(Rewritten):
                   b"\0\x08duration\0\x7f\xef" + bytes(6) + b"\0\0\x09")
         config = next(tag for tag in TAGS if tag[0] == 9)
         changed = retag(config, config[11:14] + bytes(2) + config[16:17] + b"\x4d" + config[18:-4])
-        tags = [retag(TAGS[0], script)] + TAGS[1:90] + [changed] + TAGS[90:]
+        cue = retag(TAGS[0], b"\2\0\x0aonCuePoint\5")
+        tags = [retag(TAGS[0], script)] + TAGS[1:60] + [cue] + TAGS[60:90] + [changed] + TAGS[90:]
         out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(tags)))
         data = out.read_bytes()
         self.assertIn(b"\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09", data)
-        self.assertEqual(data.count(b"duration"), 1)
+        self.assertEqual((data.count(b"duration"), data.count(b"onCuePoint")), (1, 1))
         for kind in (8, 9):  # a configuration comes before the first frame that needs it
             self.assertEqual([tag[11:] for tag in split_tags(data)[1] if tag[0] == kind],
                              [tag[11:] for tag in tags if tag[0] == kind and tag[12] != 2])  # 2: end of sequence
+
+    def test_late_audio(self):
+        """A stream that begins after the tags in which players look is found in the new file."""
+        media = [at(tag, time_of(tag) + 2600 * i) for i in range(3) for tag in TAGS[1:] if tag[0] == 9 or i == 2]
+        out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(media)))
+        self.assertEqual(sum(f[0] == "audio" for f in self.frames(out)), 109)
 
     def test_output(self):
         """Nothing but a finished file has the name."""

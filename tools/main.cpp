@@ -242,9 +242,10 @@ void AddCheck(CLI::App* command, CheckOptions& options)
         "  no_back_pointer    the back-pointer of a tag is missing\n"
         "  passed_over        tags that players skip: of a stream or codec that is not played, later than\n"
         "                     the last timestamp, empty or too short\n"
-        "  jump               time jumps back, or forward by more than --jump, within a stream\n"
+        "  jump               time jumps back, or forward by more than --jump, within a stream;\n"
+        "                     or a single tag has a wrong time\n"
         "  index              an entry leads to no keyframe, or its time is wrong by more than a second\n"
-        "  keyframe_distance  keyframes are more than --max-gap apart\n"
+        "  keyframe_distance  keyframes, or the last one and the end, are more than --max-gap apart\n"
         "  interleaving       audio and video at the same position in the file are more than --max-gap\n"
         "                     apart in time\n"
         "  no_configuration   AAC audio starts without its configuration\n"
@@ -276,9 +277,9 @@ void AddRepair(CLI::App* command, RewriteOptions& options)
 {
     AddRewrite(command, options);
     command->add_flag("--keep-times", options.keepTimes, "Leave timestamps that restart or jump as they are");
-    command->footer("Frames and codec configurations are kept, damage and other bytes are dropped. The metadata gets\n"
-                    "a new duration, file size and keyframe index. Timestamps that go back by more than a second or\n"
-                    "forward by more than ten are made continuous.\n\n"
+    command->footer("Frames, codec configurations and cue points are kept, damage and other bytes are dropped. The\n"
+                    "metadata gets a new duration, file size and keyframe index. Timestamps that go back by more than\n"
+                    "a second or forward by more than ten are made continuous, single wrong ones replaced.\n\n"
                     "  flvdmx repair recording.flv -o repaired.flv");
 }
 
