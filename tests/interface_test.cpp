@@ -467,6 +467,27 @@ TEST(Interface, DeliversAllFramesOfRestartingTimestamps)
     EXPECT_EQ(Times(file->frames()), std::vector<int64_t>({0, 500, 1000, 1500, 20, 100}));
     EXPECT_TRUE(plain->seek(50ms));
     EXPECT_EQ(file->seek(50ms).error().code(), FLVD_ERR_NOT_SEEKABLE);
+
+    auto late = memory.open(); // finds out while it plays
+    EXPECT_EQ((*late->next_frame()).time, 0ms);
+    late->accept_restart(late->position());
+    EXPECT_EQ(Times(late->frames()), std::vector<int64_t>({500, 1000, 1500, 20, 100}));
+    EXPECT_EQ(late->seek(50ms).error().code(), FLVD_ERR_NOT_SEEKABLE);
+}
+
+TEST(Interface, ScansWhereTheIndexIsWrong)
+{
+    const Flv chain = MakeChain({.index = true, .hook = [](auto& times, auto&) {
+                                     for (auto& time : times)
+                                         time += 5;
+                                 }});
+    const auto [time, position] = ExpectedKeyframes(chain.tags)[2];
+    const Memory memory(chain.bytes);
+    auto file = memory.open();
+    EXPECT_EQ(file->seek(std::chrono::milliseconds(time)).error().kind(), Kind::failed);
+    file->ignore_index();
+    EXPECT_EQ((*file->seek(std::chrono::milliseconds(time))).count(), time);
+    EXPECT_EQ(file->position(), position);
 }
 
 // From the index as it is, in the file and in memory; without one by a scan, which continues after damage until the
