@@ -113,6 +113,48 @@ void SkipPictureOrder(Bits& bits)
         bits.TakeExpGolomb(); // offset_for_ref_frame
 }
 
+// Size after cropping by the first sequence parameter set (ISO/IEC 14496-10, 7.3.2.1.1) of the record.
+PictureSize AvcPictureSize(flvdmx::Bytes record)
+{
+    constexpr size_t SET_LENGTH = 6;            // offset of the length of the first set
+    constexpr uint32_t MOST_MACROBLOCKS = 1024; // of a side; more comes from damage
+    constexpr std::array<uint32_t, 13> WITH_CHROMA_FORMAT = {44,  83,  86,  100, 110, 118, 122,
+                                                             128, 134, 135, 138, 139, 244};
+    const size_t length = size_t{record[SET_LENGTH]} << 8 | record[SET_LENGTH + 1];
+    if (length == 0 || record.size() < SET_LENGTH + 2 || length > record.size() - SET_LENGTH - 2)
+        return {};
+    const std::vector<uint8_t> payload = RemovePrevention({record.data() + SET_LENGTH + 2, length});
+    Bits bits({payload.data(), payload.size()});
+    bits.Take(8); // NAL unit header
+    const uint32_t profile = bits.Take(8);
+    bits.Take(16);        // constraints, level_idc
+    bits.TakeExpGolomb(); // seq_parameter_set_id
+    const bool high =
+        std::find(WITH_CHROMA_FORMAT.begin(), WITH_CHROMA_FORMAT.end(), profile) != WITH_CHROMA_FORMAT.end();
+    const uint32_t chroma = high ? TakeChromaFormat(bits) : 1;
+    bits.TakeExpGolomb(); // log2_max_frame_num_minus4
+    SkipPictureOrder(bits);
+    bits.TakeExpGolomb(); // max_num_ref_frames
+    bits.Take(1);         // gaps_in_frame_num_value_allowed_flag
+    const uint32_t columns = bits.TakeExpGolomb() + 1;
+    const uint32_t rows = bits.TakeExpGolomb() + 1;
+    const uint32_t fields = bits.Take(1) != 0 ? 1 : 2; // frame_mbs_only_flag
+    bits.Take(fields);                                 // mb_adaptive_frame_field_flag, direct_8x8_inference_flag
+    uint32_t width = columns * 16;
+    uint32_t height = rows * 16 * fields;
+    if (bits.Take(1) != 0) { // frame_cropping_flag: left, right, top, bottom
+        const uint32_t unit = chroma == 1 || chroma == 2 ? 2 : 1;
+        width -= bits.TakeExpGolomb() * unit;
+        width -= bits.TakeExpGolomb() * unit;
+        const uint32_t lines = (chroma == 1 ? 2 : 1) * fields;
+        height -= bits.TakeExpGolomb() * lines;
+        height -= bits.TakeExpGolomb() * lines;
+    }
+    const bool plausible = std::max(columns, rows) <= MOST_MACROBLOCKS && width - 1 < columns * 16 &&
+                           height - 1 < rows * 16 * fields && !bits.AreShort();
+    return plausible ? PictureSize{width, height} : PictureSize{};
+}
+
 } // namespace
 
 AacConfig ParseAacConfig(flvdmx::Bytes config)
@@ -174,46 +216,10 @@ std::string AvcProfileName(flvdmx::Bytes record)
     }
 }
 
-// seq_parameter_set_data of ISO/IEC 14496-10, 7.3.2.1.1, as far as the cropping.
-PictureSize AvcPictureSize(flvdmx::Bytes record)
+PictureSize PictureSizeOf(const flvdmx::VideoInfo& video)
 {
-    constexpr size_t SET_LENGTH = 6;            // offset of the length of the first set
-    constexpr uint32_t MOST_MACROBLOCKS = 1024; // of a side; more comes from damage
-    constexpr std::array<uint32_t, 13> WITH_CHROMA_FORMAT = {44,  83,  86,  100, 110, 118, 122,
-                                                             128, 134, 135, 138, 139, 244};
-    const size_t length = size_t{record[SET_LENGTH]} << 8 | record[SET_LENGTH + 1];
-    if (length == 0 || record.size() < SET_LENGTH + 2 || length > record.size() - SET_LENGTH - 2)
-        return {};
-    const std::vector<uint8_t> payload = RemovePrevention({record.data() + SET_LENGTH + 2, length});
-    Bits bits({payload.data(), payload.size()});
-    bits.Take(8); // NAL unit header
-    const uint32_t profile = bits.Take(8);
-    bits.Take(16);        // constraints, level_idc
-    bits.TakeExpGolomb(); // seq_parameter_set_id
-    const bool high =
-        std::find(WITH_CHROMA_FORMAT.begin(), WITH_CHROMA_FORMAT.end(), profile) != WITH_CHROMA_FORMAT.end();
-    const uint32_t chroma = high ? TakeChromaFormat(bits) : 1;
-    bits.TakeExpGolomb(); // log2_max_frame_num_minus4
-    SkipPictureOrder(bits);
-    bits.TakeExpGolomb(); // max_num_ref_frames
-    bits.Take(1);         // gaps_in_frame_num_value_allowed_flag
-    const uint32_t columns = bits.TakeExpGolomb() + 1;
-    const uint32_t rows = bits.TakeExpGolomb() + 1;
-    const uint32_t fields = bits.Take(1) != 0 ? 1 : 2; // frame_mbs_only_flag
-    bits.Take(fields);                                 // mb_adaptive_frame_field_flag, direct_8x8_inference_flag
-    uint32_t width = columns * 16;
-    uint32_t height = rows * 16 * fields;
-    if (bits.Take(1) != 0) { // frame_cropping_flag: left, right, top, bottom
-        const uint32_t unit = chroma == 1 || chroma == 2 ? 2 : 1;
-        width -= bits.TakeExpGolomb() * unit;
-        width -= bits.TakeExpGolomb() * unit;
-        const uint32_t lines = (chroma == 1 ? 2 : 1) * fields;
-        height -= bits.TakeExpGolomb() * lines;
-        height -= bits.TakeExpGolomb() * lines;
-    }
-    const bool plausible = std::max(columns, rows) <= MOST_MACROBLOCKS && width - 1 < columns * 16 &&
-                           height - 1 < rows * 16 * fields && !bits.AreShort();
-    return plausible ? PictureSize{width, height} : PictureSize{};
+    const PictureSize size = AvcPictureSize(video.config);
+    return size.width != 0 ? size : PictureSize{video.width, video.height};
 }
 
 std::string AvcLevelName(flvdmx::Bytes record)

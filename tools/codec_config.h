@@ -5,7 +5,7 @@
 #include <cstdint>
 #include <string>
 
-#include "flvdmx/result.hpp"
+#include "flvdmx/flvdmx.hpp"
 
 namespace tool {
 
@@ -37,8 +37,8 @@ struct PictureSize {
     uint32_t height = 0;
 };
 
-/** @return size of the pictures after cropping, by the first sequence parameter set of the record */
-PictureSize AvcPictureSize(flvdmx::Bytes record);
+/** @return size after cropping. The library reads no chroma format for some AVC profiles and then has a wrong size. */
+PictureSize PictureSizeOf(const flvdmx::VideoInfo& video);
 
 /** @return level of such a record, such as "3.1" */
 std::string AvcLevelName(flvdmx::Bytes record);

@@ -40,8 +40,10 @@ enum : uint8_t {
 };
 constexpr int MAX_DEPTH = 16;
 
-constexpr std::array<std::string_view, 5> RENEWED = {"duration", "filesize", "lasttimestamp", "lastkeyframetimestamp",
-                                                     "keyframes"};
+// Properties that are written anew, and others that describe the old file.
+constexpr std::array<std::string_view, 11> DROPPED = {
+    "duration", "filesize",  "lasttimestamp", "lastkeyframetimestamp", "keyframes",   "lastkeyframelocation",
+    "datasize", "videosize", "audiosize",     "hasKeyframes",          "canSeekToEnd"};
 
 void Put(Buffer& out, const Buffer& bytes)
 {
@@ -118,10 +120,12 @@ public:
         return !m_failed;
     }
 
+    // Live servers store the command that set the metadata before the name.
     bool MetadataName()
     {
         std::string name;
-        return Integer(1) == STRING && Key(name) && name == "onMetaData";
+        const auto next = [&] { return Integer(1) == STRING && Key(name); };
+        return next() && (name != "@setDataFrame" || next()) && name == "onMetaData";
     }
 
     bool SkipValue(int depth = 0)
@@ -252,7 +256,7 @@ std::vector<uint8_t> FlvLayout::ScriptPayload(const std::vector<ScriptProperty>&
 {
     std::vector<ScriptProperty> all;
     std::copy_if(properties.begin(), properties.end(), std::back_inserter(all), [](const ScriptProperty& property) {
-        return std::find(RENEWED.begin(), RENEWED.end(), property.name) == RENEWED.end();
+        return std::find(DROPPED.begin(), DROPPED.end(), property.name) == DROPPED.end();
     });
     all.push_back(NumberProperty("duration", Duration() / MS_PER_SECOND));
     all.push_back(NumberProperty("filesize", static_cast<double>(firstTag + m_size)));

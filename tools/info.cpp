@@ -89,13 +89,6 @@ uint32_t SampleRate(const flvdmx::AudioInfo& audio)
     }
 }
 
-// The library reads no chroma format for some profiles, and then a wrong size.
-PictureSize SizeOf(const flvdmx::VideoInfo& video)
-{
-    const PictureSize size = AvcPictureSize(video.config);
-    return size.width != 0 ? size : PictureSize{video.width, video.height};
-}
-
 // The last keyframe that was found, otherwise the one that the file states.
 std::optional<flvdmx::Milliseconds> LastKeyframe(const Subject& subject)
 {
@@ -141,7 +134,7 @@ void ListVideo(Listing& listing, const Subject& subject, const flvdmx::VideoInfo
     if (!video.config.empty())
         listing.Line("  profile",
                      fmt::format("{}, level {}", AvcProfileName(video.config), AvcLevelName(video.config)));
-    const PictureSize size = SizeOf(video);
+    const PictureSize size = PictureSizeOf(video);
     if (size.width != 0 || size.height != 0)
         listing.Line("  picture size", fmt::format("{} x {}", size.width, size.height));
     listing.Quantity("  frame rate", video.frame_rate, "frames/s");
@@ -245,7 +238,7 @@ Json VideoObject(const Subject& subject, const flvdmx::VideoInfo& video)
 {
     const auto last = LastKeyframe(subject);
     const bool avc = !video.config.empty();
-    const PictureSize size = SizeOf(video);
+    const PictureSize size = PictureSizeOf(video);
     Json object = {{"codec", CodecName(video.codec)},
                    {"fourcc", OrNull(!video.fourcc.empty(), video.fourcc)},
                    {"width", size.width},

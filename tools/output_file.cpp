@@ -24,6 +24,7 @@ namespace tool {
 namespace {
 
 constexpr mode_t NEW_FILE_MODE = 0666; // before the umask
+constexpr mode_t PERMISSIONS = 0777;
 
 // Names of unfinished files: at most one per stream.
 std::array<std::atomic<const char*>, 2> g_unfinished{};
@@ -62,15 +63,32 @@ bool IsSpecial(const std::string& path)
     return stat(path.c_str(), &status) == 0 && !S_ISREG(status.st_mode);
 }
 
+// The file that a symbolic link leads to, so that the link stays when the file is replaced.
+std::string Target(const std::string& path)
+{
+    std::error_code failure;
+    const std::filesystem::path target = std::filesystem::canonical(path, failure);
+    return failure ? path : target.string();
+}
+
+// Those of the file that exists, or of a new one.
+mode_t PermissionsOf(const std::string& path)
+{
+    struct stat status {};
+    if (stat(path.c_str(), &status) == 0)
+        return status.st_mode & PERMISSIONS;
+    const mode_t mask = umask(0);
+    umask(mask);
+    return NEW_FILE_MODE & ~mask;
+}
+
 // Creates a file with a unique name by replacing the last six characters of `path`. Null on failure.
-std::FILE* CreateTemporary(std::string& path)
+std::FILE* CreateTemporary(std::string& path, mode_t permissions)
 {
     const int descriptor = mkostemp(path.data(), O_CLOEXEC);
     if (descriptor < 0)
         return nullptr;
-    const mode_t mask = umask(0);
-    umask(mask);
-    fchmod(descriptor, NEW_FILE_MODE & ~mask);
+    fchmod(descriptor, permissions);
     return fdopen(descriptor, "wb");
 }
 
@@ -90,9 +108,10 @@ OutputFile::OutputFile(std::string path, const std::string& input, bool force) :
     } else {
         if (!force && std::filesystem::exists(m_path, failure))
             throw FileError(input, fmt::format("{} exists: use --force to overwrite it", Printable(m_path)));
-        m_temporary = m_path + ".XXXXXX";
+        m_target = Target(m_path);
+        m_temporary = m_target + ".XXXXXX";
         m_slot = Remember(m_temporary.c_str()); // before the file exists: a signal may come at once
-        m_file = CreateTemporary(m_temporary);
+        m_file = CreateTemporary(m_temporary, PermissionsOf(m_target));
     }
     if (m_file == nullptr) {
         Forget(m_slot);
@@ -118,7 +137,10 @@ void OutputFile::Write(const void* data, size_t size)
 
 void OutputFile::Rewrite(flvdmx::Bytes beginning)
 {
-    if (std::fseek(m_file, 0, SEEK_SET) == 0 && std::fwrite(beginning.data(), 1, beginning.size(), m_file) == 0)
+    if (std::fflush(m_file) != 0) // fseek would report this failure as "not seekable"
+        Fail();
+    if (std::fseek(m_file, 0, SEEK_SET) == 0 &&
+        std::fwrite(beginning.data(), 1, beginning.size(), m_file) != beginning.size())
         Fail();
 }
 
@@ -128,7 +150,7 @@ void OutputFile::Finish()
         return Flush();
     if (std::fclose(std::exchange(m_file, nullptr)) != 0)
         Fail();
-    if (!m_temporary.empty() && std::rename(m_temporary.c_str(), m_path.c_str()) != 0)
+    if (!m_temporary.empty() && std::rename(m_temporary.c_str(), m_target.c_str()) != 0)
         Fail();
     Forget(std::exchange(m_slot, -1));
 }

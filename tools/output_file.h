@@ -42,6 +42,7 @@ private:
 
     const std::string m_path;
     const std::string m_input;
+    std::string m_target;    // the file's own name, if m_path is a symbolic link
     std::string m_temporary; // its name until it is finished
     std::FILE* m_file = nullptr;
     int m_slot = -1; // of its name in the list of unfinished files

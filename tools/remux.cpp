@@ -11,6 +11,7 @@
 #include <fmt/core.h>
 #include <unistd.h>
 
+#include "tools/codec_config.h"
 #include "tools/frame_source.h"
 #include "tools/input.h"
 #include "tools/report.h"
@@ -270,8 +271,9 @@ std::vector<ScriptProperty> MetadataOf(const std::string& file)
             properties.push_back(NumberProperty(name, value));
     };
     if (input.info.video) {
-        add("width", input.info.video->width);
-        add("height", input.info.video->height);
+        const PictureSize size = PictureSizeOf(*input.info.video);
+        add("width", size.width);
+        add("height", size.height);
         add("videocodecid", static_cast<double>(input.info.video->codec));
     }
     if (input.info.audio)
