@@ -325,7 +325,7 @@ private:
 
     void DrawPositions(double top)
     {
-        const Axis values = DrawFrame(top, LARGE, "Interleaving: place in the file", BYTE_UNITS, 0,
+        const Axis values = DrawFrame(top, LARGE, "Interleaving: position in the file", BYTE_UNITS, 0,
                                       static_cast<double>(m_input.Instance().data_end));
         DrawPosition(values, m_timeline.video, "video");
         DrawPosition(values, m_timeline.audio, "audio dots");
