@@ -109,7 +109,7 @@ class Check(Case):
         tags = split_tags(INDEXED)[1]
         delta = 13 + sum(map(len, tags[:next(i for i, t in enumerate(tags) if t[0] == 9 and t[11] >> 4 == 2)]))
         for array, number, value, words in (
-                (POSITIONS, 3, 9999, "leads to byte 9999, where there is no keyframe"),
+                (POSITIONS, 3, 9999, "points to byte 9999, where there is no keyframe"),
                 (POSITIONS, 2, delta, f"byte {delta}, where there is no keyframe"), (POSITIONS, 1, -5, "byte -5, which"),
                 (POSITIONS, 5, 1e9, "byte 1000000000, which the file does not have"),
                 (POSITIONS, 4, float("nan"), "byte nan"), (TIMES, 1, 1.5, "states 0:00:01.500, but the keyframe at byte"),

@@ -204,14 +204,15 @@ void AddExtract(CLI::App* command, ExtractOptions& options)
     AddFile(command, options.file);
     AddOutput(command, options.out, options.force, "Where to write; - is standard output");
     AddChoice(command, "--stream", STREAMS, options.streams, "Write only this stream: video or audio");
-    command->footer("If the file has one stream, or --stream selects one, OUT is the name of the file to write. Two\n"
-                    "streams are written to two files OUT.EXTENSION, such as OUT.h264 and OUT.aac. If OUT is an existing\n"
-                    "folder, the files in it are named after FILE.\n"
-                    "Extensions: h264 (AVC as Annex B), aac (ADTS), mp3, wav (PCM). Other codecs are written raw,\n"
-                    "one frame after the other, with the extension video or audio.\n\n"
-                    "  flvdmx extract clip.flv -o clip\n"
-                    "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
-                    "  flvdmx extract --stream video clip.flv -o - | player -");
+    command->footer(
+        "If the file has one stream, or --stream selects one, OUT is the name of the file to write. Two\n"
+        "streams are written to two files OUT.EXTENSION, such as OUT.h264 and OUT.aac. If OUT is an existing\n"
+        "folder, the files in it are named after FILE.\n"
+        "Extensions: h264 (AVC as Annex B), aac (ADTS), mp3, wav (PCM). Other codecs are written raw,\n"
+        "one frame after the other, with the extension video or audio.\n\n"
+        "  flvdmx extract clip.flv -o clip\n"
+        "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
+        "  flvdmx extract --stream video clip.flv -o - | player -");
 }
 
 void AddCheck(CLI::App* command, CheckOptions& options)
