@@ -236,8 +236,8 @@ TEST(Playing, WarnsOfWhatIsLeftOut)
         const char* text;
     } cases[] = {
         {{g_avc, Nalu(0), g_aac, Raw(0), h263, h263, Raw(80)}, "from H.264 (AVC) to Sorenson H.263"},
-        {{Pcm(0), Pcm(20), pcm_stereo, pcm_stereo}, "its sample rate, size or channels change"},
-        {{g_aac, Nalu(0), Raw(0), Nalu(40), Raw(23)}, "no AVC configuration"},
+        {{Pcm(0), Pcm(20), pcm_stereo, pcm_stereo}, "its sample rate, sample size or channels change"},
+        {{g_aac, Nalu(0), Raw(0), Nalu(40), Raw(23)}, "no usable AVC configuration"},
         {{g_aac, Raw(0), {8, 23, AacConfig({0xFF})}, Raw(23)}, "is damaged and not used"},
         {{g_avc, Nalu(0), Raw(0), Nalu(40)}, "the audio cannot be decoded"},
     };
@@ -372,8 +372,8 @@ TEST(Playing, RefusesWithReason)
         {"filesrc location=" + configs.path() + " ! flvdmxdemux ! fakesink", "has no frames"},
         {"appsrc stream-type=random-access format=bytes ! flvdmxdemux ! fakesink", "size of the file"},
         {"filesrc location=" + g_data + "script_data.txt ! flvdmxdemux ! fakesink", "FLVD_ERR_FILE_HEADER"},
-        {"filesrc location=" + unknown.path() + " ! flvdmxdemux ! fakesink", "no stream of a codec"},
-        {"filesrc location=" + g_data + "avc_aac.flv ! queue ! flvdmxdemux ! fakesink", "can be pulled"},
+        {"filesrc location=" + unknown.path() + " ! flvdmxdemux ! fakesink", "no stream has a known codec"},
+        {"filesrc location=" + g_data + "avc_aac.flv ! queue ! flvdmxdemux ! fakesink", "supports pull mode"},
     };
     for (const auto& [description, text] : cases) {
         Pipeline pipeline(description);
