@@ -23,7 +23,7 @@ import zlib
 HERE = pathlib.Path(__file__).resolve().parent
 SAMPLES = sorted(HERE.glob("*.flv"))
 TAG_HEADER, BACK_POINTER = 11, 4
-KINDS, CODEC_BYTES = {8: "audio", 9: "video"}, {(9, 7): 5, (8, 10): 2}  # in front of the frame; else 1
+KINDS, CODEC_BYTES = {8: "audio", 9: "video"}, {(9, 7): 5, (8, 10): 2}  # before the frame; otherwise 1
 BROKEN = ["truncated", "damaged"]
 DEMUXERS = {"h264": ["-f", "h264"], "aac": ["-f", "aac"], "mp3": ["-f", "mp3"],
             "pcm_s16le": ["-f", "s16le", "-ar", "11025", "-ac", "1"]}
@@ -36,7 +36,7 @@ def probe(path):
 
 
 def all_tags(data):
-    """Each tag with its back-pointer, by the chain alone: {offset: bytes}."""
+    """Each tag with its back-pointer, following only the sizes: {offset: bytes}."""
     tags, pos = {}, 13
     while pos < len(data):
         tags[pos] = data[pos:pos + TAG_HEADER + int.from_bytes(data[pos + 1:pos + 4], "big") + BACK_POINTER]
@@ -57,7 +57,7 @@ def media_tags(data):
 
 
 def kept_tags(path):
-    """The whole tags of a sample without those that its damage or end has touched: {offset: bytes}."""
+    """The complete tags of a sample, without those affected by damage or a missing end: {offset: bytes}."""
     data = path.read_bytes()
     whole = all_tags((HERE / "avc_aac.flv").read_bytes() if path.stem in BROKEN else data)
     return {pos: tag for pos, tag in whole.items() if data[pos:pos + len(tag)] == tag}
