@@ -118,8 +118,7 @@ private:
     std::mutex m_flush_mutex; // held while a flush begins or ends
     unsigned m_flushes = 0;   // number begun
 
-    std::atomic<guint32> m_last_seek =
-        GST_SEQNUM_INVALID; // every sink of a pipeline sends the same seek: only the first counts
+    std::atomic<guint32> m_last_seek = GST_SEQNUM_INVALID; // each sink of a pipeline sends the same seek
 };
 
 } // namespace flvdmx_gst

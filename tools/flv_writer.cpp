@@ -20,8 +20,7 @@ using flvdmx::Bytes;
 constexpr size_t FILE_HEADER_SIZE = 9;
 constexpr uint8_t HAS_AUDIO = 4; // TypeFlags
 constexpr uint8_t HAS_VIDEO = 1;
-constexpr size_t INDEX_MAX =
-    65536; // entries; if there are more keyframes, only every second, third and so on is listed
+constexpr size_t INDEX_MAX = 65536; // entries; with more keyframes, every nth one is listed
 constexpr double MS_PER_SECOND = 1000;
 
 // AMF0 type markers.
