@@ -70,8 +70,8 @@ enum class Breach : uint8_t {
 class Host : public FakeHost {
 public:
     explicit Host(Bytes file);
-    /** Commits these breaches (bits 1 << Breach) until `patience` calls or KiB read are used up; then its calls fail.
-     */
+    /** Breaks the contract in these ways (bits 1 << Breach) until `patience` calls or KiB read are used up; after that,
+     *  its calls fail. */
     void break_contract(uint32_t breaches, uint64_t patience)
     {
         std::tie(m_breaches, m_patience) = std::tie(breaches, patience);
