@@ -12,9 +12,8 @@ using namespace flvd_fuzz;
 namespace {
 
 constexpr uint32_t MAX_COMMANDS = 64, MAX_PLAYED = 24; // MAX_PLAYED: frames requested after the commands
-constexpr uint64_t PATIENCE =
-    2000; // for most hosts that break the contract, as they can use up whole budgets, which is slow
-constexpr uint64_t BUDGETS = 30'000'000; // host calls allowed if such a host never gives up
+constexpr uint64_t PATIENCE = 2000;      // usual bound for a host that breaks its contract, which can be very slow
+constexpr uint64_t BUDGETS = 30'000'000; // host calls allowed without that bound
 constexpr int32_t UNTOUCHED = 0x5A;
 constexpr std::array<uint32_t, 8> CACHES = {0, 1024, 1, 1500, 65536, 4096, 16000, 0xFFFFFFFF};
 

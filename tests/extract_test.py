@@ -86,9 +86,9 @@ class Extract(Case):
                     lengths = b"".join(len(unit).to_bytes(size, "big") + unit for unit in units)
                     made.append(retag(tag, tag[11:16] + lengths + damage.get(i, b"")))
                     wanted += b"".join(START + unit for unit in units)
-                stderr = ".*configuration is damaged; the previous one.*\n" if 5 in changes else ""
+                stderr = ".*configuration is damaged; the previous configuration.*\n" if 5 in changes else ""
                 if damage:
-                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames?, .* at byte {place}\n"
+                    stderr = f".*NAL units that exceed their frame in {len(damage)} frames?, .* at byte {place}\n"
                 self.assertEqual(self.extract(b"".join(made), stderr=stderr).read_bytes(), wanted)
 
     def test_rejected(self):
@@ -128,7 +128,7 @@ class Extract(Case):
         with wave.open(str(out)) as sound:
             self.assertEqual(sound.getparams()[:3], (1, 2, 11025))
             self.assertEqual(sound.readframes(1 << 20), data[44:])
-        self.tool("extract", sample("avc_aac"), "-o", "-", code=1, stderr=".*takes one stream.*\n")
+        self.tool("extract", sample("avc_aac"), "-o", "-", code=1, stderr=".*takes only one stream.*\n")
 
     def test_nothing_is_left_after_an_interruption(self):
         folder = self.write("any", b"").parent

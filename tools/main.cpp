@@ -28,7 +28,7 @@ namespace tool {
 
 namespace {
 
-constexpr const char* TIME_HELP = "TIME is seconds (12.5) or [HH:]MM:SS[.FRACTION].";
+constexpr const char* TIME_HELP = "TIME is a number of seconds (12.5) or [HH:]MM:SS[.FRACTION].";
 
 // Validators return what is wrong with a value; an empty text accepts it.
 const CLI::Validator IS_TIME(
@@ -242,7 +242,7 @@ void AddCheck(CLI::App* command, CheckOptions& options)
         "  back_pointer       the back-pointer of a tag is wrong\n"
         "  no_back_pointer    the back-pointer of a tag is missing\n"
         "  passed_over        tags that players skip: they belong to a stream or codec that is not played, are\n"
-        "                     later than the last timestamp, empty or too short\n"
+        "                     later than the last timestamp, or are empty or too short\n"
         "  jump               time jumps back, or forward by more than --jump, within a stream;\n"
         "                     or a single tag has a wrong time\n"
         "  index              an entry does not point to a keyframe, or its time is wrong by more than a second\n"
@@ -287,7 +287,7 @@ void AddRepair(CLI::App* command, RewriteOptions& options)
 void AddIndex(CLI::App* command, RewriteOptions& options)
 {
     AddRewrite(command, options);
-    command->footer("All tags but the metadata are copied as they are.\n\n"
+    command->footer("All tags except the metadata are copied unchanged.\n\n"
                     "  flvdmx index recording.flv -o seekable.flv");
 }
 
@@ -412,7 +412,7 @@ int Run(int argc, char** argv)
     commands.Add("plot", "Draw bit rate, keyframes and interleaving over time", AddPlot, RunPlot);
     commands.Add("repair", "Write a valid file from everything that can be played", AddRepair, RunRepair);
     commands.Add("index", "Copy an undamaged file and give it a keyframe index", AddIndex, RunIndex);
-    commands.Add("cut", "Write a part of a file, with its own index", AddCut, RunCut);
+    commands.Add("cut", "Write part of a file, with its own index", AddCut, RunCut);
     commands.AddHelp();
     try {
         app.parse(Arguments(argc, argv));
