@@ -14,7 +14,7 @@ namespace {
 
 constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20;
-constexpr uint64_t REQUEST_CHECKS = 16384, REQUEST_TURNS = 102; // CHECKS may fail in all turns of a request together
+constexpr uint64_t REQUEST_CHECKS = 16384, REQUEST_TURNS = 102; // per request: failed checks in total, turns
 constexpr uint64_t MOST_CALLS = 100000;                         // of one request, on the worst file that we know
 constexpr uint64_t TAIL_CURSORS = MIB + 256;                    // positions tried in the search for the last tag
 constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000;        // of valid files; the cache does not hold BIG

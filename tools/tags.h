@@ -85,7 +85,7 @@ public:
     void Finish() { Inspect(m_end, m_input.Instance().data_end); }
 
     int64_t Bytes() const { return m_bytes; } /**< skipped so far */
-    /** @return the number of bytes after the last frame and after the end of the valid data, whichever is later */
+    /** @return the number of bytes after the last frame or the end of the valid data, whichever is later */
     int64_t Rest() const
     {
         return std::max(m_input.info.size - std::max(m_end, m_input.Instance().data_end), int64_t{0});
