@@ -128,13 +128,13 @@ TEST(StreamProbe, DescribesTheFirstTag)
         uint8_t type = 9;
     } rows[] = {
         {.what = "128 bytes of parameter sets", .tags = {parameters(128)}, .described = "H264 320x240 131"},
-        {.what = "one more", .tags = {parameters(129)}, .described = " 0x0 132"},
+        {.what = "129 bytes", .tags = {parameters(129)}, .described = " 0x0 132"},
         {.what = "damaged, then too large: the first stays", .tags = {damaged, large}, .described = " 0x0 9"},
-        {.what = "then an empty one", .tags = {damaged, large, {0x17, 0}}, .described = " 0x0 0"},
+        {.what = "too large, then empty", .tags = {damaged, large, {0x17, 0}}, .described = " 0x0 0"},
         {.what = "damaged, then valid", .tags = {damaged, g_avc.data}, .described = "H264 320x240 23"},
         {.what = "AAC", .tags = {AacConfig({0x11, 0x90})}, .described = "43712 48000x2 0 2", .type = 8}, // 0xAAC0
         {.what = "AAC, empty", .tags = {AacConfig({})}, .described = "43712 96000x0 0 0", .type = 8},
-        {.what = "AAC, none", .tags = {AacRaw(Noise(20), 0xAA)}, .described = "43712 22050x1 0 0", .type = 8},
+        {.what = "AAC, missing", .tags = {AacRaw(Noise(20), 0xAA)}, .described = "43712 22050x1 0 0", .type = 8},
         {.what = "MP3", .tags = {AudioData(SOUND_MP3, Mp3Frame())}, .described = "85 44100x2 128 0", .type = 8},
         {.what = "8 kHz, II", .tags = {{0xEE, 0xFF, 0xFD, 0x90, 0xC4}}, .described = "85 44100x1 160 0", .type = 8},
         {.what = "PCM, 5.5 kHz", .tags = {AudioData(0x32, Noise(20))}, .described = "0 5500x1 0 0", .type = 8},

@@ -1,4 +1,4 @@
-"""`flvdmx extract`: the hashes are of output that an independent decoder decoded to the same pictures and sound."""
+"""`flvdmx extract`: hashes of output that an independent decoder has decoded to the same pictures and samples."""
 import fcntl
 import hashlib
 import os

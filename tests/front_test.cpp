@@ -150,12 +150,12 @@ TEST(Failures, OfDelivery)
     const auto configs = [](size_t n) { return Repeat(n, g_avc, {Nalu(0)}, 1).bytes; };
     const Row rows[] = {
         // each also in a growing file
-        {.what = "end", .file = g_chain.bytes, .site = FRAME_END, .before = frames},
+        {.what = "end of the data", .file = g_chain.bytes, .site = FRAME_END, .before = frames},
         {.what = "within the budget", .file = configs(BUDGET - 1), .time = 0},
         {.what = "beyond it", .file = configs(BUDGET), .site = FRAME_END, .time = 0},
-        {.what = "no room for AVC", .file = large(g_avc, Nalu), .open = Buffer(1000), .site = VIDEO_NO_ROOM},
-        {.what = "for AAC", .file = large(g_aac, Raw), .open = Buffer(1000), .site = AAC_NO_ROOM},
-        {.what = "for PCM", .file = large(Pcm(0), Pcm), .open = Buffer(1000), .site = AUDIO_NO_ROOM, .before = 1},
+        {.what = "AVC: no room", .file = large(g_avc, Nalu), .open = Buffer(1000), .site = VIDEO_NO_ROOM},
+        {.what = "AAC: no room", .file = large(g_aac, Raw), .open = Buffer(1000), .site = AAC_NO_ROOM},
+        {.what = "PCM: no room", .file = large(Pcm(0), Pcm), .open = Buffer(1000), .site = AUDIO_NO_ROOM, .before = 1},
         {.what = "information", .file = audio, .open = {SEPARATE, true}, .site = FRAME_INFO_ONLY, .stream = AUDIO},
         {.what = "no video", .file = audio, .open = {SEPARATE}, .site = FRAME_NO_VIDEO, .stream = VIDEO},
         {.what = "no audio", .file = video, .open = {SEPARATE}, .site = FRAME_NO_AUDIO, .stream = AUDIO},

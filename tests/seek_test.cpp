@@ -280,7 +280,7 @@ TEST(Seek, ReportsTheTimeReachedOrTheFailure)
         int64_t at = HERE;        // where the reader stands afterwards; HERE: not checked
         int64_t left = INT32_MAX; // bytes left from the times on; NONE: nothing can be read
     } rows[] = {
-        {.what = "for information", .flv = scan, .open = INFO, .to = 100, .site = SEEK_INFO_ONLY},
+        {.what = "opened for information", .flv = scan, .open = INFO, .to = 100, .site = SEEK_INFO_ONLY},
         {.what = "growing: no index", .flv = scan, .open = GROWING, .to = 100, .site = SEEK_NOT_SEEKABLE},
         {.what = "growing: no video", .flv = audio, .open = GROWING, .to = 100, .site = SEEK_NOT_SEEKABLE},
         {.what = "growing: audio", .flv = index, .open = GROWING, .stream = AUDIO, .to = 900, .rc = -1},

@@ -83,7 +83,7 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
     } rows[] = {
         {.what = "at the last time", .taken = STANDING | BACKWARD, .last_ts = 5000},
         {.what = "before it", .taken = ALL, .last_ts = 5001},
-        {.what = "after it", .taken = NONE, .last_ts = 4999},
+        {.what = "after the last time", .taken = NONE, .last_ts = 4999},
         {.what = "no time known", .taken = ALL, .timestamp = UINT32_MAX - 1},
         {.what = "the largest time", .taken = STANDING | BACKWARD, .timestamp = UINT32_MAX},
         {.what = "as large as all data", .taken = BACKWARD, .data_end = 5},

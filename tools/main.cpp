@@ -403,7 +403,7 @@ int Run(int argc, char** argv)
     app.fallthrough();
     app.footer("Exit status: 0 done, 1 a file could not be read, written or played, or check found something,\n"
                "2 usage error. 'flvdmx help COMMAND' explains a command.");
-    app.require_subcommand(0, 1); // none is reported below, after CLI11 has rejected unknown words
+    app.require_subcommand(0, 1); // a missing command is reported below, after CLI11 has rejected unknown words
     Commands commands(app);
     commands.Add("info", "Show what is in each file", AddInfo, RunInfo);
     commands.Add("frames", "List the frames, one per line", AddFrames, RunFrames);

@@ -6,11 +6,11 @@ stream  kind= codec= width= height= rate= channels= extradata=
 packet  kind= pos= dts= pts= size= crc= key=   in file order; pos is the tag's start, dts the tag's timestamp in ms
 
 Every packet is compared with the tag at its position, so that no change by the prober goes unnoticed. The truncated
-and the damaged sample are expected to give the packets of avc_aac.flv whose tags are whole and untouched.
+and the damaged sample must deliver the packets of avc_aac.flv whose tags are complete and undamaged.
 
-With the program of the tool as argument, expected/extract.txt is written too: `NAME video|audio SHA-256` of the streams
-that it extracts. Streams with a demuxer of their own must first have been decoded to the same pictures and samples as
-the sample file, of a broken one its tags that are kept; the others must be its frames one behind the other.
+With the tool's program as argument, also writes expected/extract.txt: `NAME video|audio SHA-256` of the streams that
+the tool extracts. First, streams in formats that ffmpeg reads must decode to the same pictures and samples as the
+sample file (if that is damaged, as its complete tags); the others must consist of its frames, one after the other.
 """
 import hashlib
 import json
@@ -79,7 +79,7 @@ def packet_line(packet, tag):
             f"key={key}")
 
 
-def sound_file(path):
+def undamaged_file(path):
     tags, found = media_tags(path.read_bytes()), probe(path)
     assert [int(p["pos"]) for p in found["packets"]] == list(tags), path
     duration = round(float(found["format"].get("duration", 0)) * 1000)
@@ -111,7 +111,7 @@ def extracted(tool, path, folder):
 def main():
     for path in SAMPLES:
         broken = path.stem in BROKEN
-        duration, streams, packets = sound_file(HERE / "avc_aac.flv" if broken else path)
+        duration, streams, packets = undamaged_file(HERE / "avc_aac.flv" if broken else path)
         lines = [f"file size={path.stat().st_size} duration_ms={0 if broken else duration}", *streams,
                  *(packets[pos] for pos in kept_tags(path) if pos in packets)]
         (HERE / "expected" / f"{path.stem}.txt").write_text("\n".join(lines) + "\n")
