@@ -1,5 +1,5 @@
-// Frames per second of GStreamer pipelines that only demultiplex, with our element and with the framework's own beside
-// it: flvdmx-gst-bench FOLDER. Prints a JSON array.
+// Frames per second of GStreamer pipelines that only demultiplex, with our element and with the framework's own:
+// flvdmx-gst-bench FOLDER. Prints a JSON array.
 
 #include <gst/gst.h>
 
@@ -34,7 +34,7 @@ bool WaitFor(GstElement* pipeline, GstMessageType type)
     return is_wanted;
 }
 
-// Opening and the first frame count as well.
+// The time includes opening and the first frame.
 bool Play(const std::string& path, const char* demuxer, const char* before)
 {
     const std::string sink = "fakesink sync=false async=false name=";

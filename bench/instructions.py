@@ -11,7 +11,7 @@ import sys
 
 import flv
 
-BOUNDS = {"small frame": 260, "large frame": 450, "small frame, added by flvdmx.hpp": 160, "open": 8600}  # a more expensive change must be noticed
+BOUNDS = {"small frame": 260, "large frame": 450, "small frame, added by flvdmx.hpp": 160, "open": 8600}  # a more expensive change must fail
 SMALL_FRAMES, SMALL_SIZE = 4000, 90
 LARGE_FRAMES, LARGE_SIZE = 400, 9000  # larger than the cache
 

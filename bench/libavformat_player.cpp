@@ -32,7 +32,7 @@ public:
         m_context->flags |= AVFMT_FLAG_NOPARSE | AVFMT_FLAG_NOFILLIN;
         m_context->probesize = LEAST_PROBE;
         m_context->max_analyze_duration = LEAST_ANALYSIS;
-        static const AVInputFormat* const format = av_find_input_format("flv"); // given, so that it need not probe
+        static const AVInputFormat* const format = av_find_input_format("flv"); // explicit, so that it does not probe
         return avformat_open_input(&m_context, path.c_str(), format, nullptr) == 0 && learn();
     }
     void close() override { avformat_close_input(&m_context); }
@@ -51,7 +51,7 @@ public:
         if (av_seek_frame(m_context, stream, time_ms, AVSEEK_FLAG_BACKWARD) < 0)
             return 0;
         int size = 0;
-        while (size == 0 && av_read_frame(m_context, m_packet) == 0) { // audio may come before the picture
+        while (size == 0 && av_read_frame(m_context, m_packet) == 0) { // audio may come before the video frame
             size = m_packet->stream_index == stream ? m_packet->size : 0;
             av_packet_unref(m_packet);
         }

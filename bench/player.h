@@ -1,4 +1,4 @@
-/* What the bench compares: something that opens a file, plays it and seeks in it. */
+/* What the bench compares: players that open a file, play it and seek in it. */
 #pragma once
 
 #include <cstdint>

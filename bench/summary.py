@@ -31,7 +31,7 @@ def run(*command):
 
 
 class Pipelines:
-    """Seconds per frame in GStreamer, a list by rounds for each medium and demuxer; empty when it was not built."""
+    """Seconds per frame in GStreamer, a list by rounds for each medium and demuxer; empty if it was not built."""
 
     def __init__(self, programs, media, rounds):
         self.times, self.frames = {}, {}
@@ -82,7 +82,7 @@ def row(what, goal, measured, met):
 
 
 def measured(what, value):
-    """A row without a goal, because the operation's host calls decide it, not the way the library makes them."""
+    """A row without a goal, because the operation's host calls decide it, not the way in which the library makes them."""
     return f"| {what} | | {value} | |"
 
 
@@ -202,7 +202,7 @@ def machine():
 
 
 def put(path, mark, text):
-    """Replaces the text between the marks."""
+    """Replaces the text between the markers."""
     before, begin, rest = path.read_text().partition(f"<!-- {mark} -->\n")
     _, end, after = rest.partition(f"<!-- end of {mark} -->\n")
     if not begin or not end:

@@ -1,7 +1,7 @@
 /*
  * Copies the frames of one stream to a file, one after the other: copy_frames FILE video|audio OUTPUT
  *
- * What comes out are bare frames: an MP3 stream plays as it is, AAC and AVC need their configuration as well.
+ * The output consists of bare frames: an MP3 stream can be played, AAC and AVC also need their configuration.
  */
 #include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
@@ -15,7 +15,7 @@
 /* Copies up to the end of the data. Returns 0, or -1 after printing a message. */
 static int copy_stream(flvd_ctx_t* instance, uint32_t stream, FILE* output)
 {
-    const flvd_frame_request_t request = {NULL, 0, 0}; /* whatever comes next: the file has one reader */
+    const flvd_frame_request_t request = {NULL, 0, 0}; /* the next frame of any stream: the file has one reader */
     flvd_frame_t frame;
     unsigned long frames = 0;
     unsigned long bytes = 0;
@@ -52,7 +52,7 @@ int main(int argc, char** argv)
         return 2;
     }
     stream = strcmp(argv[2], "video") == 0 ? FLVD_STREAM_VIDEO : FLVD_STREAM_AUDIO;
-    flvd_posix_host_fill(&init); /* the fastest for playing a whole file */
+    flvd_posix_host_fill(&init); /* the fastest host for playing a complete file */
     init.file_name = argv[1];
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &instance, &init, &info) != 0) {
         fprintf(stderr, "copy_frames: %s: %s (line %" PRId32 ")\n", argv[1], flvd_error_text(g_flvd_lLastError),

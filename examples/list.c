@@ -1,4 +1,4 @@
-/* Opens a file and lists what is in it: list FILE */
+/* Opens a file and lists its contents: list FILE */
 #include "flvdmx/error_text.h"
 #include "flvdmx/flvdmx.h"
 #include "flvdmx/stdio_host.h"
@@ -37,7 +37,7 @@ int main(int argc, char** argv)
         return 2;
     }
     flvd_stdio_host_fill(&init);
-    init.file_name = argv[1]; /* must live until the close, as argv does */
+    init.file_name = argv[1]; /* must stay valid until the file is closed, as argv does */
     if (QVX_FLV_DMX(FLVD_OP_OPEN, &instance, &init, &info) != 0) {
         fprintf(stderr, "list: %s: %s (line %" PRId32 ")\n", argv[1], flvd_error_text(g_flvd_lLastError),
                 g_flvd_lErrorLine);

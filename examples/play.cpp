@@ -1,5 +1,5 @@
-// Plays a file or URI through GStreamer, with flvdmxdemux for FLV files: play FILE [SINK], SINK an element for picture
-// and sound, such as fakesink.
+// Plays a file or URI through GStreamer, with flvdmxdemux for FLV files: play FILE [SINK]. SINK is an element for video
+// and audio output, such as fakesink.
 #include <gst/gst.h>
 
 #include <cstdio>
@@ -9,7 +9,7 @@ static void prefer(const char* name)
 {
     GstPluginFeature* const feature = gst_registry_lookup_feature(gst_registry_get(), name);
     if (feature == nullptr)
-        return (void)std::fprintf(stderr, "play: there is no %s; another demuxer plays the file\n", name);
+        return (void)std::fprintf(stderr, "play: %s is not installed; another demuxer will play the file\n", name);
     gst_plugin_feature_set_rank(feature, GST_RANK_PRIMARY + 1);
     gst_object_unref(feature);
 }
@@ -50,7 +50,7 @@ int main(int argc, char** argv)
     prefer("flvdmxdemux");
     GstElement* const player = gst_element_factory_make("playbin3", nullptr);
     if (player == nullptr)
-        return std::fputs("play: there is no playbin3; install gstreamer1.0-plugins-base\n", stderr), 1;
+        return std::fputs("play: playbin3 is missing; install gstreamer1.0-plugins-base\n", stderr), 1;
     gchar* const uri = make_uri(argv[1]);
     g_object_set(player, "uri", uri, nullptr);
     g_free(uri);

@@ -1,6 +1,6 @@
 // Checks codec headers against a second implementation: audio headers, AVC records, picture headers.
 
-#include "judge.h"
+#include "harness.h"
 
 #include <cstring>
 
@@ -38,7 +38,7 @@ void run_audio(Input& input)
     require(bytes_of(info) == Bytes(sizeof info), "parsing an audio header changed other fields");
 }
 
-// The record's parameter sets with start codes; empty when the record ends too early.
+// The record's parameter sets with start codes; empty if the record ends too early.
 Bytes parameter_sets(const Bytes& record)
 {
     Bytes sets;
@@ -57,12 +57,12 @@ Bytes parameter_sets(const Bytes& record)
     return sets;
 }
 
-void judge_picture(int32_t codec, const Bytes& data)
+void check_picture(int32_t codec, const Bytes& data)
 {
     flvd_video_info_t info{};
     const int32_t rc = FLVD_ParseVideoHeader(codec, data.data(), static_cast<int32_t>(data.size()), &info);
     const bool known = codec == 2 || codec == 4 || codec == 5 || codec == 7;
-    require(rc == -1 || (rc == 0 && known && data.size() >= 8), "found a picture header where there can be none");
+    require(rc == -1 || (rc == 0 && known && data.size() >= 8), "found a picture header in data that has none");
     if (rc == 0)
         info.width = info.height = 0;
     if (rc == 0 && codec == 7)
@@ -83,8 +83,8 @@ void run_avc(Input& input)
             "wrong size of the parameter sets");
     out.resize(static_cast<size_t>(written));
     require(written == 0 || out == expected, "wrong parameter sets");
-    judge_picture(codec, record);
-    judge_picture(7, out);
+    check_picture(codec, record);
+    check_picture(7, out);
 }
 
 const Target g_audio("audio", run_audio), g_avc("avc", run_avc);

@@ -1,8 +1,9 @@
-// Checks tag navigation against a second implementation over a plain array: every call must give the same result, tag
-// and position. The host is honest; the description of the file comes from the input. The second implementation has no
-// cache and no budgets, because no input is long enough for 1 MiB without a tag or for 16,384 failed checks.
+// Checks tag navigation against a second implementation over a plain array: every call must have the same result, tag
+// and position. The host keeps its contract; the description of the file comes from the input. The second
+// implementation has no cache and no budgets, because no input is long enough for 1 MiB without a tag or for 16,384
+// failed checks.
 
-#include "judge.h"
+#include "harness.h"
 
 using namespace flvd_fuzz;
 
@@ -11,7 +12,7 @@ namespace {
 constexpr uint32_t ANY_CODEC = 0xFFFF;
 constexpr int64_t BEYOND = 64; // how far past the end of the file a reader may be moved
 constexpr flvd_tag_info_t UNTOUCHED = {0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A, 0x5A5A5A5A};
-constexpr int32_t UNKNOWN = 1; // a seek before the start of the file was requested: what follows is not defined
+constexpr int32_t UNKNOWN = 1; // a seek before the start of the file was requested: the result is not defined
 
 struct Found {
     int32_t rc = FLVD_ERR_END_OF_DATA;
@@ -48,22 +49,22 @@ public:
             __FLV_DMX__fioSetCacheReadSize(m_reader, bits);
             return;
         case 2:
-            return judge_find(from, bits * 64);
+            return check_find(from, bits * 64);
         case 3:
-            return judge(FLVD_MoveToPrevTag(&m_ctx, m_reader, &info, wanted, nullptr), info, previous(from, wanted));
+            return check(FLVD_MoveToPrevTag(&m_ctx, m_reader, &info, wanted, nullptr), info, previous(from, wanted));
         case 4:
         case 5:
-            return judge(FLVD_MoveToNextTag(&m_ctx, m_reader, &info, wanted, nullptr), info, next(from, wanted));
+            return check(FLVD_MoveToNextTag(&m_ctx, m_reader, &info, wanted, nullptr), info, next(from, wanted));
         default:
             const int32_t verify = code % 8 == 6 ? 1 : 0;
             const int64_t begin = from == m_ctx.data_offset ? from + 4 : from;
-            return judge(FLVD_GetCurrTagInfo(&m_ctx, m_reader, &info, wanted, verify), info,
+            return check(FLVD_GetCurrTagInfo(&m_ctx, m_reader, &info, wanted, verify), info,
                          search(begin, wanted, verify != 0));
         }
     }
 
 private:
-    void judge(int32_t rc, const flvd_tag_info_t& info, const Found& expected)
+    void check(int32_t rc, const flvd_tag_info_t& info, const Found& expected)
     {
         if (expected.rc == UNKNOWN)
             return;
@@ -73,7 +74,7 @@ private:
         require(bytes_of(info) == bytes_of(rc == 0 ? described : UNTOUCHED), "wrong record");
         require(rc != 0 || m_host.position(m_reader) == expected.position, "wrong position");
     }
-    void judge_find(int64_t from, uint32_t limit)
+    void check_find(int64_t from, uint32_t limit)
     {
         const int32_t rc = FLVD_FindNextTag(&m_ctx, m_reader, limit);
         const int64_t there = scan(from);
@@ -130,7 +131,7 @@ private:
         return {FLVD_ERR_AT_FIRST_TAG, 0, {}};
     }
 
-    // 0 when the file ends before it.
+    // 0 if the file ends before it.
     uint32_t back_pointer(int64_t at) const { return at + 4 <= m_host.visible() ? read_be(m_file.data() + at, 4) : 0; }
     uint32_t ceiling() const { return m_ctx.last_ts != 0 ? m_ctx.last_ts : UINT32_MAX; }
     bool of_stream(const FileTag& tag) const

@@ -1,7 +1,7 @@
 // Checks the cached file and its bit reader against a plain array and a bit position: they must agree for any cache,
 // read size and order of calls.
 
-#include "judge.h"
+#include "harness.h"
 
 using namespace flvd_fuzz;
 

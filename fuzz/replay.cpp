@@ -1,7 +1,7 @@
 // With FLVDMX_FUZZ_TARGET, the libFuzzer program of that target. Without it, a program that runs the files of folders
 // through the target named on the command line.
 
-#include "judge.h"
+#include "harness.h"
 
 #include <cstdio>
 #include <filesystem>

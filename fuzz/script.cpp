@@ -1,14 +1,14 @@
 // Script data: the input's payload is parsed as script data in the middle of a file. It is parsed twice, with different
 // cache sizes, because the size of the cache must not matter.
 
-#include "judge.h"
+#include "harness.h"
 
 namespace flvd_fuzz {
 namespace {
 
 constexpr size_t START = 24; // file position of the payload
 
-// What parsing a payload sets in an instance that is in the state in which probing meets the script tag.
+// What parsing a payload sets in an instance in the state of a probe that reaches the script tag.
 Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length)
 {
     const flvd_init_t init = host.init(options, 0, 0);
@@ -20,7 +20,7 @@ Bytes outcome(Host& host, uint32_t options, uint32_t cache_size, uint32_t length
     __FLV_DMX__fioSeek64(ctx.cur_reader, START, FIO_SEEK_SET);
     host.begin(2000 + 30 * host.contents().size());
     const int32_t rc = FLVD_ReadMetadata(&ctx, length);
-    require(rc == 0 || rc == -1, "a result that parsing of metadata does not have");
+    require(rc == 0 || rc == -1, "a result that parsing metadata cannot have");
     require(host.position(ctx.cur_reader) == int64_t{START} + length, "the reader is not after the payload");
 
     const auto& [index, arrays] = std::tie(ctx.keyframe_index, ctx.keyframe_arrays);

@@ -28,7 +28,7 @@ constexpr VideoCaps video_table[] = {
 
 struct AudioCaps {
     AudioCodec codec;
-    uint32_t sample_rate; // the codec's, whatever the tag header says; 0: as told
+    uint32_t sample_rate; // the codec's own; 0: as the tag header states
     uint32_t channels;    // likewise
     const char* caps;
 };
@@ -38,7 +38,7 @@ constexpr const char* pcm_caps = "audio/x-raw, format=(string){ U8, S16LE }, lay
 constexpr const char* mp3_caps = "audio/mpeg, mpegversion=(int)1, layer=(int)3, parsed=(boolean)true";
 
 constexpr AudioCaps audio_table[] = {
-    {AudioCodec::pcm, 0, 0, pcm_caps}, // nearly all that was ever written is little-endian
+    {AudioCodec::pcm, 0, 0, pcm_caps}, // in practice little-endian
     {AudioCodec::adpcm, 0, 0, "audio/x-adpcm, layout=(string)swf"},
     {AudioCodec::mp3, 0, 0, mp3_caps},
     {AudioCodec::pcm_little_endian, 0, 0, pcm_caps},
@@ -88,7 +88,7 @@ void set_number(GstCaps* caps, const char* field, uint32_t value)
         gst_caps_set_simple(caps, field, G_TYPE_INT, static_cast<gint>(value), nullptr);
 }
 
-// The metadata has 29.97 for 30000/1001.
+// The metadata states 29.97 for 30000/1001.
 void set_frame_rate(GstCaps* caps, double rate)
 {
     gint numerator = 0;
@@ -100,8 +100,9 @@ void set_frame_rate(GstCaps* caps, double rate)
     gst_caps_set_simple(caps, "framerate", GST_TYPE_FRACTION, numerator, denominator, nullptr);
 }
 
-// The stream header of Speex (The Speex Codec Manual, section 8): FLV leaves it out, since all its Speex is wideband,
-// mono, one frame of 320 samples per packet. A comment with a vendor alone follows, as in a Vorbis stream.
+// The stream header of Speex (The Speex Codec Manual, section 8). FLV omits it, since all its Speex audio is wideband
+// and mono, with one frame of 320 samples per packet. A comment follows that names only the vendor, as in a Vorbis
+// stream.
 void set_speex_header(GstCaps* caps)
 {
     constexpr std::array<uint8_t, 80> header = {
@@ -148,9 +149,9 @@ GstCaps* audio_template_caps()
 
 GstCaps* make_caps(const flvdmx::VideoInfo& info)
 {
-    constexpr size_t profile_offset = 1; // of an AVCDecoderConfigurationRecord: as in the parameter set
+    constexpr size_t profile_offset = 1; // in an AVCDecoderConfigurationRecord
     constexpr size_t profile_size = 3;
-    constexpr uint8_t high_444 = 244; // the library misreads the picture size of this profile
+    constexpr uint8_t high_444 = 244; // the library reads a wrong picture size for this profile
     const VideoCaps* const row = find_row(video_table, info.codec);
     const bool is_avc = info.codec == VideoCodec::avc;
     if (row == nullptr || (is_avc && info.config.size() < profile_offset + profile_size))

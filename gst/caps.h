@@ -1,5 +1,5 @@
 /*
- * What decoders call the streams of an FLV file.
+ * Caps for the streams of an FLV file.
  */
 #pragma once
 
@@ -13,8 +13,8 @@ namespace flvdmx_gst {
 GstCaps* video_template_caps();
 GstCaps* audio_template_caps();
 
-/** The stream's caps, owned by the caller; null for a codec that no decoder takes, or without the configuration that
- *  decoders need. */
+/** The stream's caps, owned by the caller. Null for a codec that no decoder accepts, or if the configuration that
+ *  decoders need is missing. */
 GstCaps* make_caps(const flvdmx::VideoInfo& info);
 GstCaps* make_caps(const flvdmx::AudioInfo& info);
 

@@ -24,11 +24,11 @@ bool set_config(flvdmx::VideoInfo& info, flvdmx::Bytes config)
                                                       static_cast<int32_t>(sets.size()));
     flvd_video_info_t picture{};
     {
-        const std::lock_guard<OpenLock> lock(open_lock); // the parser is one for the process
+        const std::lock_guard<OpenLock> lock(open_lock); // the parser is shared by the whole process
         FLVD_ParseVideoHeader(static_cast<int32_t>(info.codec), sets.data(), size, &picture);
     }
     info.config.assign(config.begin(), config.end());
-    info.width = picture.width; // 0 when it cannot be read
+    info.width = picture.width; // 0 if it cannot be read
     info.height = picture.height;
     return true;
 }

@@ -1,5 +1,5 @@
 /*
- * Codec configurations that a file brings after its beginning.
+ * Codec configurations that follow the first frames of a file.
  */
 #pragma once
 
@@ -7,8 +7,8 @@
 
 namespace flvdmx_gst {
 
-/** Describes the stream by another configuration. False when that is damaged, and the description stays as it was.
- *  Takes the lock for opens. */
+/** Updates the description of the stream for another configuration. Returns false and changes nothing if that is
+ *  damaged. Takes the lock for opens. */
 bool set_config(flvdmx::VideoInfo& info, flvdmx::Bytes config);
 bool set_config(flvdmx::AudioInfo& info, flvdmx::Bytes config);
 

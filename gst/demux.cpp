@@ -1,4 +1,4 @@
-// The element as the framework sees it. What it does is in Streaming.
+// The element's class and pads. Streaming does the work.
 
 #include "demux.h"
 
@@ -35,8 +35,8 @@ static flvdmx_gst::Streaming& streaming_of(gpointer element)
 static gboolean refuse_push(gpointer element)
 {
     GST_ELEMENT_ERROR(element, STREAM, DEMUX, (nullptr),
-                      ("flvdmxdemux reads at any position: it needs a source that can be pulled and is seekable, such "
-                       "as filesrc or a download buffer"));
+                      ("flvdmxdemux reads at any position: it needs a seekable source that supports pull mode, such as "
+                       "filesrc or a download buffer"));
     return FALSE;
 }
 
@@ -55,7 +55,7 @@ static gboolean activate_sink(GstPad* sink, GstObject*)
     return gst_pad_activate_mode(sink, can_pull(sink) ? GST_PAD_MODE_PULL : GST_PAD_MODE_PUSH, TRUE);
 }
 
-// An element that is not linked yet starts in push mode; it is refused when data comes.
+// An element that is not linked yet starts in push mode, which fails as soon as data arrives.
 static gboolean activate_sink_mode(GstPad* sink, GstObject* element, GstPadMode mode, gboolean active)
 {
     if (mode == GST_PAD_MODE_PULL)
@@ -110,5 +110,5 @@ static void flvdmx_demux_class_init(FlvdmxDemuxClass* klass)
     add_template(element_class, "video", flvdmx_gst::video_template_caps());
     add_template(element_class, "audio", flvdmx_gst::audio_template_caps());
     gst_element_class_set_static_metadata(element_class, "FLV demultiplexer", "Codec/Demuxer",
-                                          "Plays FLV files, also damaged ones", "the flvdmx authors");
+                                          "Plays FLV files, even damaged ones", "the flvdmx authors");
 }

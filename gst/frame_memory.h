@@ -1,5 +1,5 @@
 /*
- * The memory of one buffer, into which the library writes a frame.
+ * The buffer into which the library writes a frame.
  */
 #pragma once
 
@@ -22,7 +22,7 @@ public:
         gst_clear_buffer(&m_buffer);
     }
 
-    /** Makes a buffer and maps it. Null when there is no memory. */
+    /** Makes a buffer and maps it. Returns null if there is no memory. */
     uint8_t* allocate(size_t size)
     {
         m_buffer = gst_buffer_new_allocate(nullptr, size, nullptr);
@@ -31,7 +31,7 @@ public:
         return m_map.data;
     }
 
-    /** A buffer with the frame, owned by the caller: usually the one that it was written to. */
+    /** Returns a buffer with the frame, owned by the caller: usually the one that the library wrote to. */
     GstBuffer* take(const flvdmx::Bytes& frame)
     {
         const bool is_there = frame.data() == m_map.data;

@@ -1,9 +1,9 @@
 /*
- * The one rule of the library for threads: no file is opened beside any other call, because an open writes the tables
- * of host functions and the globals of errors. Opens take the lock exclusively, all other calls share it.
+ * The library's one rule for threads: no file is opened at the same time as any other call, because an open writes the
+ * tables of host functions and the global error variables. Opens take the lock exclusively, all other calls share it.
  *
- * While a call waits for its source, it touches none of these, and every open writes the same tables. It therefore
- * releases the lock until the source has answered, so that a source that blocks stops nobody else.
+ * While a call waits for its source, it uses none of these, and every open writes the same tables. Such a call
+ * therefore releases the lock until the source has answered, so that a source that blocks does not stop other elements.
  */
 #pragma once
 
@@ -33,7 +33,7 @@ public:
         m_lock.unlock();
     }
 
-    // Lets a waiting open go first: elements that play without a pause would always leave one of them inside.
+    // Lets a waiting open go first. Otherwise, elements that play without a pause could hold the lock forever.
     void lock_shared()
     {
         if (m_waiting != 0)
@@ -47,8 +47,8 @@ public:
         m_lock.unlock_shared();
     }
 
-    /** Releases what the thread holds, and takes it again at its end. A thread that holds the lock exclusively is in
-     *  File::open(), whose mutex it releases as well. */
+    /** Releases the thread's lock during its lifetime. A thread that holds the lock exclusively is in File::open(),
+     *  whose mutex is released as well. */
     class Pause {
     public:
         Pause();
@@ -66,7 +66,7 @@ public:
 private:
     using Held = Pause::Held;
 
-    std::mutex m_gate; // held by an open that waits
+    std::mutex m_gate; // held by a waiting open
     std::shared_mutex m_lock;
     std::atomic<int> m_waiting = 0;
     inline static thread_local Held s_held = Held::not_at_all;

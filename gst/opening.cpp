@@ -1,4 +1,4 @@
-// Opening a file: what is in it, its pads and what they announce first.
+// Opens a file, creates the pads for its streams and pushes their first events.
 
 #include "streaming.h"
 
@@ -17,9 +17,9 @@ namespace {
 
 constexpr uint32_t cache_size = 16384;
 constexpr int back_pointer_size = 4;              // before the first tag
-constexpr int64_t frame_size_max = (1 << 24) - 1; // the format's own limit
+constexpr int64_t frame_size_max = (1 << 24) - 1; // the limit of the format
 
-// How far a configuration is searched for that does not come before the first frames.
+// Limits of the search for a configuration that does not come before the first frames.
 constexpr flvdmx::Milliseconds config_search_time{10'000};
 constexpr int config_search_frames = 1000;
 
@@ -50,14 +50,14 @@ GstFlowReturn Streaming::open_file()
     const int64_t size = m_source.size();
     if (size < 0) {
         GST_ELEMENT_ERROR(m_element, STREAM, DEMUX, (nullptr),
-                          ("the source does not know the size of the file in bytes, which flvdmxdemux needs"));
-        return flow_told;
+                          ("the source does not report the size of the file in bytes, which flvdmxdemux needs"));
+        return flow_reported;
     }
     flvdmx::Options options;
     options.cache_size = cache_size;
     options.index_in_memory = true;
     options.buffer_size = static_cast<uint32_t>(std::clamp<int64_t>(size, 1, frame_size_max));
-    m_spare.reset(new uint8_t[options.buffer_size]); // takes memory when it is written to
+    m_spare.reset(new uint8_t[options.buffer_size]); // needs no memory until it is written to
     options.buffer = m_spare.get();
     flvdmx::error error;
     {
@@ -70,7 +70,7 @@ GstFlowReturn Streaming::open_file()
         const std::shared_lock<OpenLock> lock(open_lock);
         m_metadata = *m_file.metadata();
     }
-    if (m_source.flow() != GST_FLOW_OK) { // the library may have taken what it read for a shorter file
+    if (m_source.flow() != GST_FLOW_OK) { // the library may have mistaken the failure for the end of the file
         close_file();
         return source_failed();
     }
@@ -85,7 +85,7 @@ GstFlowReturn Streaming::open_file()
     return GST_FLOW_OK;
 }
 
-// Some AAC streams bring their configuration after their first frames. Reads ahead for it, and opens the file again.
+// In some AAC streams, the configuration follows the first frames. Reads ahead to find it, then reopens the file.
 GstFlowReturn Streaming::find_config()
 {
     flvdmx::AudioInfo found = *m_info.audio;
@@ -112,7 +112,7 @@ void Streaming::close_file()
     m_file.close();
 }
 
-// Announces the streams that decoders can take, once there is a first frame: players wait for a pad that brings none.
+// Adds pads for the streams that decoders accept. Called once there is a first frame, as players wait for every pad.
 GstFlowReturn Streaming::expose()
 {
     if (m_info.video)
@@ -120,8 +120,8 @@ GstFlowReturn Streaming::expose()
     if (m_info.audio)
         add_output(1, OwnedCaps(make_caps(*m_info.audio)));
     if (!has_output()) {
-        GST_ELEMENT_ERROR(m_element, STREAM, CODEC_NOT_FOUND, (nullptr), ("no stream of a codec that is known"));
-        return flow_told;
+        GST_ELEMENT_ERROR(m_element, STREAM, CODEC_NOT_FOUND, (nullptr), ("no stream has a known codec"));
+        return flow_reported;
     }
     const guint group = group_id(m_sink);
     for (Output& output : m_outputs)

@@ -7,9 +7,9 @@ namespace flvdmx_gst {
 
 namespace {
 
-// How far a stream is behind the other one when a gap is announced. Files interleave their streams by less than the
-// second. Sinks that wait for their first buffer stop the whole pipeline: there, queues may hold little more than the
-// first.
+// How far a stream must lag behind the other one before a gap is announced. `gap_min` is more than the usual distance
+// of interleaved streams. A sink that waits for its first buffer blocks the whole pipeline, whose queues may hold less:
+// it gets a gap after `first_gap_min`.
 constexpr GstClockTime gap_min = 500 * GST_MSECOND;
 constexpr GstClockTime first_gap_min = 100 * GST_MSECOND;
 

@@ -1,5 +1,5 @@
 /*
- * One stream on its way downstream: a source pad of the element and what flows over it.
+ * The output of one stream: a source pad of the element, and what is pushed from it.
  */
 #pragma once
 
@@ -14,10 +14,10 @@ namespace flvdmx_gst {
 struct CapsDeleter {
     void operator()(GstCaps* caps) const { gst_caps_unref(caps); }
 };
-/** Caps that somebody owns. */
+/** Caps that are released at the end. */
 using OwnedCaps = std::unique_ptr<GstCaps, CapsDeleter>;
 
-/** As buffers have it; none when it is negative. */
+/** The time for a buffer; GST_CLOCK_TIME_NONE if it is negative. */
 inline GstClockTime to_clock_time(flvdmx::Milliseconds time)
 {
     return time.count() >= 0 ? static_cast<GstClockTime>(time.count()) * GST_MSECOND : GST_CLOCK_TIME_NONE;
@@ -26,26 +26,26 @@ inline GstClockTime to_clock_time(flvdmx::Milliseconds time)
 /** Used under the stream lock. */
 class Output {
 public:
-    /** Nothing flows. */
+    /** An output without a pad. */
     Output() = default;
-    /** Makes an active pad from the element's template of that name; it is the element's once it was added. */
+    /** Makes an active pad from the element's template of that name. The element owns it after it has been added. */
     Output(GstElement* element, const char* name, OwnedCaps caps);
 
-    GstPad* pad() const { return m_pad; }          /**< null when nothing flows */
-    GstCaps* caps() const { return m_caps.get(); } /**< in force */
+    GstPad* pad() const { return m_pad; }          /**< null for an output without a pad */
+    GstCaps* caps() const { return m_caps.get(); } /**< the current ones */
 
-    /** The events that come before all others. */
+    /** Pushes the events that come before all others. */
     void start(GstElement* element, guint group);
-    /** Announces other caps, unless they are the same. */
+    /** Announces the caps if they differ from the current ones. */
     void change_caps(OwnedCaps caps);
-    /** Pushes a frame that is to be decoded at `time` and whose bytes are in the buffer, which it takes. */
+    /** Pushes a frame that is to be decoded at `time`. Takes ownership of the buffer, which holds the frame's bytes. */
     GstFlowReturn push(GstBuffer* buffer, const flvdmx::Frame& frame, flvdmx::Milliseconds time);
 
-    /** What comes next does not follow what came before, and begins at about `time`. */
+    /** Call it after a seek: the next buffer is discontinuous and begins at about `time`. */
     void jump(GstClockTime time);
-    /** The next buffer comes after damage. */
+    /** Marks the next buffer as discontinuous, after damage. */
     void mark_damage() { m_discontinuity = true; }
-    /** The file has reached `time`: tells a sink that waits for a stream without frames. */
+    /** Call it when the file has reached `time`: announces a gap if the stream lags too far behind. */
     void reach(GstClockTime time);
 
 private:
@@ -53,7 +53,7 @@ private:
     OwnedCaps m_caps;
     GstClockTime m_reached = 0; // by the last buffer or gap
     bool m_discontinuity = true;
-    bool m_waits = true; // a sink that has received nothing since the start or a jump
+    bool m_waits = true; // the sink has received nothing since the start or a jump
 };
 
 } // namespace flvdmx_gst

@@ -1,4 +1,4 @@
-// Seeks and queries of the source pads, which come from any thread.
+// Seeks and queries of the source pads, which arrive from any thread.
 
 #include "streaming.h"
 
@@ -11,7 +11,7 @@ namespace flvdmx_gst {
 
 namespace {
 
-// Pushes an event over all source pads, also while the streaming thread is busy.
+// Pushes an event from all source pads, even while the streaming thread is busy.
 void push_downstream(GstElement* element, GstEvent* event)
 {
     const auto push = [](GstElement*, GstPad* pad, gpointer shared) -> gboolean {
@@ -73,7 +73,7 @@ bool Streaming::seek(GstEvent* event)
                                             stop_type, static_cast<guint64>(stop), nullptr) != FALSE &&
                         seek_file(segment, flags);
     if (!sought && m_source.flow() == GST_FLOW_FLUSHING)
-        return false; // the next seek is waiting, or the end
+        return false; // interrupted by a later seek or by stopping
     if (sought) {
         m_sequence = sequence;
         m_timeline.jump(flvdmx::Milliseconds(m_position / GST_MSECOND));
@@ -85,7 +85,7 @@ bool Streaming::seek(GstEvent* event)
     return sought;
 }
 
-// Moves the file to where the segment starts, and with KEY_UNIT the segment to where that led.
+// Moves the reader to the start of the segment; with KEY_UNIT, also moves the segment to the keyframe reached.
 bool Streaming::seek_file(GstSegment& segment, GstSeekFlags flags)
 {
     constexpr auto to_end = flvdmx::SeekMode::backward | flvdmx::SeekMode::to_end_on_miss;
@@ -106,7 +106,7 @@ bool Streaming::seek_file(GstSegment& segment, GstSeekFlags flags)
     return true;
 }
 
-// After the last keyframe, SNAP_AFTER leads to that one, as there is something to play.
+// SNAP_AFTER goes to the last keyframe if there is none after the target, so that there is something to play.
 flvdmx::result<flvdmx::Milliseconds> Streaming::go_to_keyframe(flvdmx::Milliseconds target, GstSeekFlags flags)
 {
     const bool snaps = (flags & GST_SEEK_FLAG_KEY_UNIT) != 0;
@@ -121,7 +121,7 @@ flvdmx::result<flvdmx::Milliseconds> Streaming::go_to_keyframe(flvdmx::Milliseco
     return before_is_nearer ? go_to(target, flvdmx::SeekMode::backward) : after;
 }
 
-// An index that counts from another start, or is of another file, leads nowhere.
+// If the index turns out to be wrong, seeks without it.
 flvdmx::result<flvdmx::Milliseconds> Streaming::go_to(flvdmx::Milliseconds target, flvdmx::SeekMode mode)
 {
     const auto reached = m_file.seek(target, mode);
@@ -131,7 +131,7 @@ flvdmx::result<flvdmx::Milliseconds> Streaming::go_to(flvdmx::Milliseconds targe
     return m_file.seek(target, mode);
 }
 
-// Plays on from where the file stands, which after a seek that failed is where it was.
+// Continues from the position of the reader. A failed seek has not changed it.
 void Streaming::restart()
 {
     m_next_tag = -1;
@@ -148,7 +148,7 @@ void Streaming::restart()
     start_task();
 }
 
-// Makes the streaming thread leave what it waits for. The flushes of two seeks may overlap: the later one ends both.
+// Interrupts the streaming thread if it waits. The flushes of two seeks may overlap: the later one ends both.
 unsigned Streaming::begin_flush(guint32 sequence)
 {
     const std::lock_guard<std::mutex> lock(m_flush_mutex);
@@ -159,7 +159,7 @@ unsigned Streaming::begin_flush(guint32 sequence)
     return ++m_flushes;
 }
 
-// False when another flush has begun since.
+// Returns false if another flush has begun since.
 bool Streaming::end_flush(unsigned number, guint32 sequence)
 {
     const std::lock_guard<std::mutex> lock(m_flush_mutex);

@@ -1,4 +1,4 @@
-// Tags (FLV file format, version 10.1, annex E.4.1) as they lie in the file, whatever the library thinks of them.
+// Tags (FLV file format, version 10.1, annex E.4.1), read without the library, which may have skipped them.
 
 #include "skipped.h"
 
@@ -72,16 +72,16 @@ std::string reason_to_skip(const RawTag& tag, const flvdmx::File& file, const fl
     const bool video = tag.stream == flvdmx::Stream::video;
     const char* const codec = video ? flvdmx::name(tag.video_codec()) : flvdmx::name(tag.audio_codec());
     if (video && !info.video && tag.video_codec() == flvdmx::VideoCodec::avc)
-        return "the video is left out: no AVC configuration that can be used comes with its first tags";
+        return "the video is not played: its first tags contain no usable AVC configuration";
     if (video ? !info.video : !info.audio)
-        return (video ? "the video"s : "the audio"s) + " is left out: the first tags of the file have none (" + codec +
-               ")";
+        return (video ? "the video"s : "the audio"s) +
+               " is not played: none was found among the first tags of the file (" + codec + ")";
     if (video && tag.video_codec() != info.video->codec)
-        return "video is left out: its codec changes from "s + flvdmx::name(info.video->codec) + " to " + codec;
+        return "video is not played: its codec changes from "s + flvdmx::name(info.video->codec) + " to " + codec;
     if (!video && tag.audio_codec() != info.audio->codec)
-        return "audio is left out: its codec changes from "s + flvdmx::name(info.audio->codec) + " to " + codec;
+        return "audio is not played: its codec changes from "s + flvdmx::name(info.audio->codec) + " to " + codec;
     if (!video && tag.codec_byte != (file.instance()->audio_format_filter & 0xFF))
-        return "audio is left out: its sample rate, size or channels change";
+        return "audio is not played: its sample rate, sample size or channels change";
     return "";
 }
 

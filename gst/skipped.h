@@ -1,5 +1,5 @@
 /*
- * What lies where the library skipped tags: valid tags that it does not deliver, or damage.
+ * What the library has skipped: valid tags that it does not deliver, or damage.
  */
 #pragma once
 
@@ -24,17 +24,17 @@ struct RawTag {
     flvdmx::AudioCodec audio_codec() const { return static_cast<flvdmx::AudioCodec>(codec_byte >> 4); }
 };
 
-/** Reads the tag at a position; none when its header and its back-pointer do not agree. */
+/** Reads the tag at a position. Returns nothing if its header and its back-pointer do not agree. */
 std::optional<RawTag> read_tag(Source& source, int64_t position);
 
-/** How many tags are examined: those that are skipped may come after some that carry no frame. */
+/** Number of tags to examine: tags without frames may come before the skipped ones. */
 constexpr int examined_tags = 8;
 
-/** True when two tags in a row, of the first ones at a position, are later than what the library takes for the end of
- *  the file: then the timestamps start again somewhere after them. */
+/** True if, among the first tags at a position, two in a row are later than the last timestamp of the file as the
+ *  library knows it: then the timestamps restart somewhere after them. */
 bool is_before_restart(Source& source, int64_t position, const flvdmx::File& file);
 
-/** Why the file's description rules out the tag, as a sentence; "" when it does not. */
+/** Returns why the tag does not match the file's description, as a sentence; "" if it does. */
 std::string reason_to_skip(const RawTag& tag, const flvdmx::File& file, const flvdmx::Info& info);
 
 } // namespace flvdmx_gst

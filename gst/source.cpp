@@ -1,5 +1,5 @@
-// Playing reads in the order of the file, in large pieces: they go straight to where the library wants them. Opening
-// and seeking make many small reads, often backward: a window answers them.
+// Playing reads the file in order and in large blocks, which are read directly into the library's memory. Opening and
+// seeking make many small reads, often backward, which are served from a window.
 
 #include "source.h"
 
@@ -71,7 +71,7 @@ uint32_t Source::read_window(int64_t position, uint8_t* destination, uint32_t si
     return got;
 }
 
-// A peer may bring less than was requested, although only the end of the file should make it so.
+// A peer may return less than requested, although it should do so only at the end of the file.
 uint32_t Source::pull(int64_t position, uint8_t* destination, uint32_t size)
 {
     const OpenLock::Pause pause;
@@ -81,8 +81,8 @@ uint32_t Source::pull(int64_t position, uint8_t* destination, uint32_t size)
     return got;
 }
 
-// The peer fills a buffer that is made of the destination. Near the end of the file it would not say how much it
-// filled.
+// The peer fills a buffer that wraps the destination. It would not report a short read at the end of the file, so
+// the request is limited to the file's size.
 uint32_t Source::pull_once(int64_t position, uint8_t* destination, uint32_t size)
 {
     if (position >= m_size)

@@ -1,5 +1,5 @@
 /*
- * What the element reads: the peer of its sink pad, as a file of the callback host.
+ * The file that the element reads: the peer of its sink pad, wrapped for the callback host.
  */
 #pragma once
 
@@ -13,7 +13,7 @@
 
 namespace flvdmx_gst {
 
-/** Used by one thread at a time, which may hold the lock for opens: it is released while the peer is busy. */
+/** Used by one thread at a time, which may hold the lock for opens: that is released while the peer is busy. */
 class Source {
 public:
     /** Reads through a sink pad in pull mode. */
@@ -22,20 +22,20 @@ public:
     Source(const Source&) = delete;
     Source& operator=(const Source&) = delete;
 
-    /** The name by which the library opens it. */
+    /** The name under which the library opens it. */
     const char* name() const { return m_file.name; }
 
-    /** Why the last read brought nothing: GST_FLOW_OK when it did, or when the file had ended. The library takes
-     *  every such read for the end of the file. */
+    /** Why the last read returned nothing: GST_FLOW_OK if it did return bytes, or at the end of the file. The library
+     *  treats every empty read as the end of the file. */
     GstFlowReturn flow() const { return m_flow; }
-    /** Forgets a failure, after which nothing more is read. Call it before the library reads again. */
+    /** Clears a failure. Until then, all reads return nothing, so call it before the library reads again. */
     void clear_flow() { m_flow = GST_FLOW_OK; }
-    /** Forgets what was read: the peer may have another file now. */
+    /** Discards the window: the peer may have another file now. */
     void reset();
 
-    /** Bytes; -1 when the peer cannot tell. */
+    /** In bytes; -1 if the peer does not know it. */
     int64_t size() const;
-    /** Reads so many bytes; false when there are fewer. */
+    /** Reads exactly `size` bytes; false if there are fewer. */
     bool read_all(int64_t position, uint8_t* destination, size_t size);
 
 private:
@@ -47,8 +47,8 @@ private:
     GstPad* const m_pad;
     flvd_callback_file_t m_file;
     GstFlowReturn m_flow = GST_FLOW_OK;
-    int64_t m_size = 0;     // bytes, as of the last time that it mattered
-    int64_t m_read_end = 0; // where the last read from outside the window ended
+    int64_t m_size = 0;     // bytes, updated when a read starts at or after it
+    int64_t m_read_end = 0; // end of the last read that bypassed the window
     std::unique_ptr<uint8_t[]> m_window;
     int64_t m_window_start = 0;
     uint32_t m_window_size = 0;

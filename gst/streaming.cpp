@@ -1,4 +1,4 @@
-// The task of the sink pad and the frames that it pushes. Opening is in opening.cpp, seeks and queries in seeking.cpp.
+// The task of the sink pad, which pushes frames. For opening see opening.cpp, for seeks and queries seeking.cpp.
 
 #include "streaming.h"
 
@@ -16,9 +16,9 @@ namespace flvdmx_gst {
 
 namespace {
 
-constexpr GstClockTime interleave_max = 500 * GST_MSECOND; // how far one stream may be ahead of the other in a file
+constexpr GstClockTime interleave_max = 500 * GST_MSECOND; // how far one stream may be ahead of the other
 
-// FLV puts a byte of its own before the frames, which decoders do not expect.
+// FLV adds a byte before VP6 frames that decoders do not expect.
 bool is_vp6(flvdmx::VideoCodec codec)
 {
     return codec == flvdmx::VideoCodec::vp6 || codec == flvdmx::VideoCodec::vp6_alpha;
@@ -40,7 +40,7 @@ Streaming::~Streaming()
 bool Streaming::activate(bool active)
 {
     {
-        const StreamLock lock(m_sink); // a seek that is running does not start the task again
+        const StreamLock lock(m_sink); // so that a seek in another thread does not restart the task
         m_active = active;
     }
     return active ? start_task() : gst_pad_stop_task(m_sink) != FALSE;
@@ -81,20 +81,20 @@ void Streaming::loop()
 
 void Streaming::stop(GstFlowReturn flow)
 {
-    GST_INFO_OBJECT(m_element, "stops: %s", gst_flow_get_name(flow));
+    GST_INFO_OBJECT(m_element, "stopping: %s", gst_flow_get_name(flow));
     gst_pad_pause_task(m_sink);
     if (flow == GST_FLOW_FLUSHING)
-        return; // whoever flushes says what comes next
+        return; // the thread that flushes restarts or stops the task
     if (flow == GST_FLOW_EOS && has_output())
         return finish();
     if (flow == GST_FLOW_EOS)
         GST_ELEMENT_ERROR(m_element, STREAM, DEMUX, (nullptr), ("the file has no frames"));
-    else if (flow != flow_told)
+    else if (flow != flow_reported)
         GST_ELEMENT_FLOW_ERROR(m_element, flow);
     push_to_all(gst_event_new_eos());
 }
 
-// The end of the segment, which is that of the file unless a seek has set another.
+// Ends the segment, at the end of the file or where a seek has set it.
 void Streaming::finish()
 {
     push_segment();
@@ -158,7 +158,7 @@ GstFlowReturn Streaming::push_to(Output& output, GstBuffer* buffer, const flvdmx
         return ended ? GST_FLOW_EOS : gst_flow_combiner_update_pad_flow(m_combiner.get(), output.pad(), GST_FLOW_EOS);
     }
     const size_t own_bytes = frame.stream == flvdmx::Stream::video && is_vp6(m_info.video->codec) ? 1 : 0;
-    if (frame.data.size() <= own_bytes) { // decoders take an empty buffer for a failure, or for the end
+    if (frame.data.size() <= own_bytes) { // decoders mistake an empty buffer for a failure or the end
         gst_buffer_unref(buffer);
         return GST_FLOW_OK;
     }
@@ -170,9 +170,9 @@ GstFlowReturn Streaming::push_to(Output& output, GstBuffer* buffer, const flvdmx
     return gst_flow_combiner_update_pad_flow(m_combiner.get(), output.pad(), flow);
 }
 
-// The library went on elsewhere than after the frame before: over tags that carry no frame, over tags that it does not
-// deliver, or over damage; `position` is that of the next frame, -1 at the end. True when the file goes back to read
-// what was skipped.
+// Called when the library did not continue right after the previous frame: it skipped tags without frames, tags that it
+// does not deliver, or damage. `position` is that of the next frame, -1 at the end. Returns true if the reader goes
+// back to read what was skipped.
 bool Streaming::goes_back(int64_t position)
 {
     bool whole = true;
@@ -183,7 +183,7 @@ bool Streaming::goes_back(int64_t position)
     if (whole && position >= 0)
         return false;
     if (is_before_restart(m_source, m_next_tag, m_file)) {
-        GST_INFO_OBJECT(m_element, "the timestamps start again after byte %" G_GINT64_FORMAT, m_next_tag);
+        GST_INFO_OBJECT(m_element, "the timestamps restart after byte %" G_GINT64_FORMAT, m_next_tag);
         m_seekable = false;
         m_file.accept_restart(m_next_tag);
         if (!has_output())
@@ -200,7 +200,7 @@ bool Streaming::goes_back(int64_t position)
     return false;
 }
 
-// Says once per stream why its tags are left out.
+// Warns once per stream why its tags are not played.
 void Streaming::warn_of_skipped(int64_t position)
 {
     std::optional<RawTag> tag;
@@ -217,7 +217,7 @@ void Streaming::warn_of_skipped(int64_t position)
     }
 }
 
-// The timestamps have started again: what is left of the file comes after what has been played.
+// Extends the duration after a restart of the timestamps: the rest of the file comes after what has been played.
 void Streaming::lengthen()
 {
     const flvdmx::Milliseconds offset = m_timeline.offset();
@@ -243,20 +243,20 @@ void Streaming::announce_config(const flvdmx::Frame& frame)
         output_of(frame.stream).change_caps(std::move(caps));
 }
 
-// The source has brought no bytes. Whoever flushes says what comes next.
+// Handles a failure of the source. A flush is not an error: the thread that flushes restarts or stops the task.
 GstFlowReturn Streaming::source_failed()
 {
     const GstFlowReturn flow = m_source.flow();
     if (flow == GST_FLOW_FLUSHING)
         return flow;
     GST_ELEMENT_ERROR(m_element, RESOURCE, READ, (nullptr), ("the source failed: %s", gst_flow_get_name(flow)));
-    return flow_told;
+    return flow_reported;
 }
 
 GstFlowReturn Streaming::file_failed(const flvdmx::error& error)
 {
     GST_ELEMENT_ERROR(m_element, STREAM, DEMUX, (nullptr), ("%s (%s)", error.text(), error.name()));
-    return flow_told;
+    return flow_reported;
 }
 
 void Streaming::push_segment()

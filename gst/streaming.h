@@ -1,6 +1,6 @@
 /*
- * What the element does: it opens the file, pushes its frames and seeks. The task of the sink pad runs loop(); seeks
- * come from any thread and take the stream lock of the sink pad, which the task holds while it runs.
+ * The work of the element: opens the file, pushes its frames and seeks. The task of the sink pad runs loop(). Seeks
+ * arrive from any thread and take the stream lock of the sink pad, which the task holds while it runs.
  */
 #pragma once
 
@@ -24,7 +24,7 @@ GST_DEBUG_CATEGORY_EXTERN(flvdmx_debug);
 
 namespace flvdmx_gst {
 
-/** Keeps the streaming thread of a pad from running, or waits for it to end its turn. */
+/** Keeps the streaming thread of a pad from running; first waits for it to return from loop(). */
 class StreamLock {
 public:
     explicit StreamLock(GstPad* pad) : m_pad(pad) { GST_PAD_STREAM_LOCK(m_pad); }
@@ -38,7 +38,7 @@ private:
 
 class Streaming {
 public:
-    /** Of an element, which outlives it, and its sink pad. */
+    /** For an element, which must outlive it, and its sink pad. */
     Streaming(GstElement* element, GstPad* sink);
     ~Streaming();
     Streaming(const Streaming&) = delete;
@@ -46,13 +46,13 @@ public:
 
     /** Starts or stops the task of the sink pad. */
     bool activate(bool active);
-    /** Removes the pads and closes the file. The task is stopped. */
+    /** Removes the pads and closes the file. The task must be stopped. */
     void close();
 
 private:
     bool start_task();
 
-    /* The streaming thread. */
+    /* Called by the streaming thread. */
     void loop();
     void stop(GstFlowReturn flow);
     void finish();
@@ -78,7 +78,7 @@ private:
     Output& output_of(flvdmx::Stream stream) { return m_outputs[index_of(stream)]; }
     bool& warned_of(flvdmx::Stream stream) { return m_warned[index_of(stream)]; }
 
-    /* Any thread. */
+    /* Called by any thread. */
     static gboolean handle_event(GstPad* pad, GstObject* parent, GstEvent* event);
     static gboolean handle_query(GstPad* pad, GstObject* parent, GstQuery* query);
     bool seek(GstEvent* event);
@@ -90,35 +90,35 @@ private:
     bool end_flush(unsigned number, guint32 sequence);
     bool answer(GstQuery* query) const;
 
-    static constexpr GstFlowReturn flow_told = GST_FLOW_CUSTOM_ERROR; // a failure whose message was posted
+    static constexpr GstFlowReturn flow_reported = GST_FLOW_CUSTOM_ERROR; // a failure whose message was posted
 
     GstElement* const m_element;
     GstPad* const m_sink;
     Source m_source;
     std::unique_ptr<GstFlowCombiner, void (*)(GstFlowCombiner*)> m_combiner;
 
-    /* Under the stream lock. */
+    /* Protected by the stream lock. */
     bool m_active = false;
     flvdmx::File m_file;
     flvdmx::Info m_info;
     flvdmx::Metadata m_metadata;
     std::unique_ptr<uint8_t[]> m_spare; // for frames whose size is not known beforehand
     std::array<Output, 2> m_outputs;    // video, audio
-    int64_t m_next_tag = -1;            // where the reader stands, -1 after a jump
-    guint32 m_sequence = 0;             // number of the open or of the last seek, for all events
+    int64_t m_next_tag = -1;            // where the reader stands; -1 after a seek
+    guint32 m_sequence = 0;             // sequence number of the open or of the last seek, for all events
     bool m_segment_is_new = false;
-    std::array<bool, 2> m_warned{}; // of tags that are left out: video, audio
+    std::array<bool, 2> m_warned{}; // about tags that are not played: video, audio
     Timeline m_timeline;
 
     GstSegment m_segment{};                   // written under the stream lock and the object lock, read under either
-    std::atomic<GstClockTime> m_position = 0; // of what was pushed last
+    std::atomic<GstClockTime> m_position = 0; // of the last buffer pushed
 
     std::atomic<bool> m_seekable = false;
 
     std::mutex m_flush_mutex; // held while a flush begins or ends
-    unsigned m_flushes = 0;   // begun
+    unsigned m_flushes = 0;   // number begun
 
-    std::atomic<guint32> m_last_seek = GST_SEQNUM_INVALID; // every sink of a pipeline sends the same seek
+    std::atomic<guint32> m_last_seek = GST_SEQNUM_INVALID; // each sink of a pipeline sends the same seek
 };
 
 } // namespace flvdmx_gst

@@ -10,7 +10,7 @@ namespace flvdmx_gst {
 namespace {
 
 struct TextTag {
-    const char* property; // muxers write what they like; these are what players of FLV look for
+    const char* property; // muxers may write any; FLV players read these
     const char* tag;
 };
 
@@ -29,7 +29,7 @@ constexpr TextTag text_tags[] = {
 };
 
 constexpr double bits_per_kbit = 1000.0;
-constexpr double bit_rate_max = 4e9; // bits per second, far beyond any that can be meant
+constexpr double bit_rate_max = 4e9; // bits per second; more cannot be meant
 
 } // namespace
 

@@ -1,5 +1,5 @@
 /*
- * The metadata of an FLV file as tags.
+ * The metadata of an FLV file as GStreamer tags.
  */
 #pragma once
 
@@ -9,10 +9,10 @@
 
 namespace flvdmx_gst {
 
-/** Title, creator and the like, and the container's name: for all streams. Owned by the caller. */
+/** Title, creator and so on, and the name of the container: for all streams. Owned by the caller. */
 GstTagList* make_file_tags(const flvdmx::Metadata& metadata);
 
-/** Codec and bit rate of one stream with these caps. Owned by the caller. */
+/** Codec and bit rate of a stream with these caps. Owned by the caller. */
 GstTagList* make_stream_tags(const flvdmx::Metadata& metadata, flvdmx::Stream stream, const GstCaps* caps);
 
 } // namespace flvdmx_gst

@@ -7,7 +7,7 @@ namespace flvdmx_gst {
 
 namespace {
 
-// The timestamps of one stream go back by a little where they were written out of order, by more where they restart.
+// Timestamps of a stream that go back by at most this were written out of order; by more, they restart.
 constexpr flvdmx::Milliseconds jitter_max{1000};
 
 } // namespace

@@ -1,6 +1,6 @@
 /*
- * Decoding times that go on where timestamps start again midway, as in recordings that were joined or whose 32 bits
- * were exceeded.
+ * Decoding times that stay continuous where timestamps restart, as in recordings that were joined or whose timestamps
+ * exceeded 32 bits.
  */
 #pragma once
 
@@ -13,14 +13,14 @@ namespace flvdmx_gst {
 
 class Timeline {
 public:
-    /** What comes next was read after a jump to `time`: times of the file. */
+    /** Call it after a seek to `time`, as in the file. */
     void jump(flvdmx::Milliseconds time);
-    /** The first frame is at 0, whatever its timestamp says. */
+    /** Places the first frame at 0, whatever its timestamp is. */
     void start_at_first_frame();
 
-    /** The time of the next frame, 0 or more. */
+    /** Returns the time of the next frame, 0 or more. */
     flvdmx::Milliseconds follow(const flvdmx::Frame& frame);
-    /** What is added to the times of the file, since they started again. */
+    /** Returns what is added to the times of the file since the last restart. */
     flvdmx::Milliseconds offset() const { return m_offset; }
 
 private:
@@ -30,7 +30,7 @@ private:
     };
 
     flvdmx::Milliseconds m_offset{};
-    flvdmx::Milliseconds m_latest{}; // of both streams
+    flvdmx::Milliseconds m_latest{}; // the later time of both streams
     std::array<Stream, 2> m_streams; // video, audio
     bool m_starts_at_first_frame = false;
 };

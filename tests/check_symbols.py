@@ -5,7 +5,7 @@ usage: check_symbols.py NM READELF HEADERS MAP ABSENT LIBRARY
 
 Exports: the names in the version script, which must be the FLVD_API declarations of the public headers, those in HEADERS.
 Imports: the memory functions that a compiler may call on its own, and the toolchain's start-up symbols.
-Also: the soname, no library needed but the C library, and no path of the build machine inside.
+Also: the soname, that only the C library is needed, and that the library contains no path of the build machine.
 """
 import pathlib
 import re

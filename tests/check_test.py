@@ -1,4 +1,4 @@
-"""`flvdmx check`: a file with known faults gives exactly these findings."""
+"""`flvdmx check`: files with known faults produce exactly these findings."""
 import json
 import re
 import struct
@@ -8,7 +8,7 @@ from flv import split_tags
 from tool_test import AVC_BYTES, DATA, HEADER, SAMPLES, TAGS, TOOL, Case, run, sample, sample_bytes
 
 INDEXED = sample_bytes("avc_aac_index")
-POSITIONS, TIMES = (INDEXED.index(key) + len(key) for key in (b"filepositions\x0a", b"times\x0a"))  # of the counts
+POSITIONS, TIMES = (INDEXED.index(key) + len(key) for key in (b"filepositions\x0a", b"times\x0a"))  # of counts
 BAD_BACK_POINTER, ZEROS, JUNK = b"\0\0\1\0", bytes(4), b"\x55" * 100
 RUINED = HEADER + TAGS[1] + TAGS[2] + (TAGS[20] + b"\x55") * 1500 + TAGS[20]
 
@@ -18,12 +18,12 @@ def time_of(tag):
 
 
 def shift(tag, ms):
-    """The tag at another time."""
+    """The tag with a timestamp later by `ms`."""
     return tag[:4] + (time_of(tag) + ms).to_bytes(3, "big") + tag[7:]
 
 
 def unlink(number, back_pointer=ZEROS):
-    """The tag with another back-pointer, or none."""
+    """The tag with a different back-pointer, or none."""
     return {number: TAGS[number][:-4] + back_pointer}
 
 
@@ -36,19 +36,19 @@ def start(number):
 
 
 def jump(number, tag):
-    """What is found at a tag that another time was given to."""
+    """The finding at a tag whose time was changed."""
     return "jump", start(number), "video" if tag[0] == 9 else "audio", time_of(tag)
 
 
 def members(value):
-    """Names in a JSON document, without those that come from the file or name kinds of findings."""
+    """The member names of a JSON document, except those that come from the file or are kinds of findings."""
     if isinstance(value, dict):
         return set(value).union(*(members(v) for name, v in value.items() if name not in ("metadata", "counts")))
     return set().union(*map(members, value)) if isinstance(value, list) else set()
 
 
 def put(*changes):
-    """The sample with other tags at some places."""
+    """The sample with some tags replaced."""
     merged = {i: tag for change in changes for i, tag in change.items()}
     return HEADER + b"".join(merged.get(i, tag) for i, tag in enumerate(TAGS))
 
@@ -63,7 +63,7 @@ class Check(Case):
                          sum(f["count"] for f in document["findings"]) + document["unlisted"])
         return document
 
-    def test_sound_samples(self):
+    def test_undamaged_samples(self):
         for name in set(SAMPLES) - {"damaged", "truncated"}:
             data = sample_bytes(name)
             found = self.check(data)
@@ -105,13 +105,13 @@ class Check(Case):
                 self.assertEqual([tuple(f[key] for key in keys if key in f) for f in found["findings"]], findings)
                 self.assertEqual(found["lost_bytes"], lost)
 
-    def test_lying_index(self):
+    def test_wrong_index(self):
         tags = split_tags(INDEXED)[1]
         delta = 13 + sum(map(len, tags[:next(i for i, t in enumerate(tags) if t[0] == 9 and t[11] >> 4 == 2)]))
         for array, number, value, words in (
-                (POSITIONS, 3, 9999, "leads to byte 9999, where there is no keyframe"),
+                (POSITIONS, 3, 9999, "points to byte 9999, where there is no keyframe"),
                 (POSITIONS, 2, delta, f"byte {delta}, where there is no keyframe"), (POSITIONS, 1, -5, "byte -5, which"),
-                (POSITIONS, 5, 1e9, "byte 1000000000, which the file does not have"),
+                (POSITIONS, 5, 1e9, "byte 1000000000, which is not in the file"),
                 (POSITIONS, 4, float("nan"), "byte nan"), (TIMES, 1, 1.5, "states 0:00:01.500, but the keyframe at byte"),
                 (TIMES, 4, float("inf"), "states inf s"), (TIMES, 2, 1.2, None)):
             with self.subTest(array=array, value=value):
@@ -125,12 +125,12 @@ class Check(Case):
         cut = self.check(INDEXED[:-len(tags[-1]) - len(tags[-2])])
         self.assertEqual([(f["kind"], f["offset"]) for f in cut["findings"]], [("cut_short", cut["size"])])
 
-    def test_no_right_back_pointer_at_all(self):
+    def test_all_back_pointers_wrong(self):
         found = self.check(put(*map(unlink, range(len(TAGS)))))
         self.assertEqual(found["counts"], {"not_playable": 1, "back_pointer": len(TAGS)})
 
-    def test_player_of_two_files_in_one(self):
-        """What `check` calls lost is what frames of a player lack."""
+    def test_two_files_in_one(self):
+        """The bytes that `check` counts as lost are those of frames that a player does not deliver."""
         found = self.check(AVC_BYTES + b"".join(TAGS[1:60]))
         self.assertEqual({"jump", "passed_over"}, set(found["counts"]))
         late = [len(tag) for tag in TAGS if time_of(tag) > max(map(time_of, TAGS[1:60]))]
@@ -141,13 +141,13 @@ class Check(Case):
         config, video = TAGS[1], [tag for tag in TAGS if tag[0] == 9 and tag[12] == 1]
         key = start(next(i for i, tag in enumerate(TAGS) if tag == [v for v in video if v[11] >> 4 == 1][1]))
         apart = HEADER + b"".join(sorted(TAGS, key=lambda tag: -tag[0]))
-        for data, arguments, kinds, place in (
+        for data, arguments, kinds, position in (
                 (put(), ["--max-gap", "1.2"], [], None), (put(), ["--max-gap", "0.9"], ["keyframe_distance"], key),
                 (apart, ["--max-gap", "1.2"], ["interleaving"], None), (apart, [], [], None)):
             found = self.check(data, *arguments)["findings"]
             self.assertEqual([f["kind"] for f in found], kinds)
-            if place:
-                self.assertEqual(found[0]["offset"], place)
+            if position:
+                self.assertEqual(found[0]["offset"], position)
         other = config[:-5] + bytes([config[-5] ^ 1]) + config[-4:]
         found = self.check(HEADER + b"".join(TAGS[:90]) + shift(other, time_of(TAGS[90])) + b"".join(TAGS[90:]))
         self.assertEqual([(f["kind"], f["offset"]) for f in found["notes"]], [("configuration", start(90))])
@@ -177,9 +177,9 @@ class Check(Case):
                          [f"{root}/b.flv", f"{root}/c.flv", f"{root}/sub/a"])
         self.assertRegex(result.stderr, rf"{root}: note: skipped 1 file that is not FLV\n.*c.flv: .*is empty\n\Z")
         (root / "sub/a").unlink()
-        self.tool("check", root / "sub", code=1, stderr=".*there is no FLV file in this folder\n")
+        self.tool("check", root / "sub", code=1, stderr=".*this folder contains no FLV file\n")
 
-    def test_jobs_say_the_same_as_one(self):
+    def test_jobs_do_not_change_the_output(self):
         files = [*map(sample, SAMPLES), "missing.flv", DATA / "make_samples.sh", self.write("ruined.flv", RUINED)] * 3
         for arguments in ([], ["--json"]):
             alone = run("check", *arguments, *files)
@@ -190,12 +190,12 @@ class Check(Case):
         documents = json.loads(alone.stdout)["files"]
         self.assertEqual([document["file"] for document in documents], list(map(str, files)))
         self.assertEqual([d["error"]["code"] for d in documents if d.get("error")], [-5, -1004] * 3)
-        ruined = documents[-1]  # not listed whole
+        ruined = documents[-1]  # not all findings are listed
         self.assertEqual((ruined["counts"], len(ruined["findings"]), ruined["unlisted"]), ({"gap": 1500}, 1000, 500))
         text = self.tool("check", sample("aac_only"), "--jobs", 9)
         self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, 0 of them not playable\n")
 
-    def test_jobs_end_when_nobody_reads(self):
+    def test_jobs_end_when_the_pipe_is_closed(self):
         files = [self.write("ruined.flv", RUINED)] * 20
         with subprocess.Popen([TOOL, "check", "--jobs", "2", *files], stdout=subprocess.PIPE) as process:
             process.stdout.close()

@@ -1,4 +1,4 @@
-// What a file says about its streams: codec configurations from the first tags, and script data.
+// What a file states about its streams: codec configurations from the first tags, and script data.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -13,7 +13,7 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr uint32_t OLD = 77; // what a field holds before the call
+constexpr uint32_t OLD = 77; // the value of a field before the call
 
 struct Audio {
     int32_t rc;
@@ -43,7 +43,8 @@ TEST(AudioConfig, OfAac)
         const std::string index = std::to_string(i) + "/4 ", frequency = i < 15 ? index : "15/4 44100/24 ";
         expect({"2/5 ", frequency, index, "0/3 4294967295/32"}, rates[i], counts[i]);
     }
-    // Channel configuration 0: a general type counts the elements of its program, here 2 + 4 + 1 + 1.
+    // Channel configuration 0: for the general object types, the elements of the program are counted, here 2 + 4 + 1
+    // + 1.
     const std::set<uint32_t> general{1, 2, 3, 4, 6, 7, 17, 19, 20, 21, 22, 23};
     const std::string program = "1/1 5/4 3/2 9/4 2/4 4/4 1/4 1/2", core = " 1/1 1/1 5461/14 ", no_core = " 1/1 0/1 ";
     for (uint32_t type = 0; type < 96; ++type) {
@@ -65,7 +66,7 @@ TEST(AudioConfig, OfMpegAudio)
         {0, 32, 48, 56, 64, 80, 96, 112, 128, 144, 160, 176, 192, 224, 256, 0}, // low sampling frequencies: layer I
         {0, 8, 16, 24, 32, 40, 48, 56, 64, 80, 96, 112, 128, 144, 160, 0}};     // and the others
     const uint32_t sample_rates[] = {44100, 48000, 32000, 0}, shifts[] = {2, 0, 1, 0};
-    for (uint32_t i = 0; i < 1 << 15; ++i) { // all that follows the synchronisation and matters
+    for (uint32_t i = 0; i < 1 << 15; ++i) { // all relevant bits after the sync word
         const uint32_t version = i >> 13, layer = i >> 11 & 3, bit_rate = i >> 6 & 15, rate = i >> 4 & 3, mode = i & 3;
         const uint32_t row = version == 3 ? (3 - layer) & 3 : layer == 3 ? 3 : 4;
         const uint32_t channels = mode == 3 ? 1 : 2, tag = layer == 2 ? 0x50 : 0x55;
@@ -76,12 +77,12 @@ TEST(AudioConfig, OfMpegAudio)
     }
 }
 
-TEST(VideoConfig, IsWhatTheTableSays)
+TEST(VideoConfig, MatchesTheTable)
 {
     for (const std::vector<std::string>& row : ReadTable("picture_headers.txt")) {
         ASSERT_EQ(row.size(), 3u) << row[0];
         const int32_t codec = std::stoi(row[0]);
-        for (const size_t more : {0u, 8u}) { // ones after the header change nothing
+        for (const size_t more : {0u, 8u}) { // one bits after the header change nothing
             Bytes header = Bits(row[1]);
             const auto length = static_cast<int32_t>(header.size());
             header.insert(header.end(), more, 0xFF);
@@ -95,7 +96,7 @@ TEST(VideoConfig, IsWhatTheTableSays)
     }
 }
 
-// What an open learns of the stream of some tags of a type: codec, sizes, bytes of its configuration.
+// Opens a file of some tags of a type and describes the stream found: codec, sizes, bytes of its configuration.
 std::string Probe(uint8_t type, const std::vector<Bytes>& tags)
 {
     Tags all = {type == 9 ? Pcm(0) : Screen(0)};
@@ -127,13 +128,13 @@ TEST(StreamProbe, DescribesTheFirstTag)
         uint8_t type = 9;
     } rows[] = {
         {.what = "128 bytes of parameter sets", .tags = {parameters(128)}, .described = "H264 320x240 131"},
-        {.what = "one more", .tags = {parameters(129)}, .described = " 0x0 132"},
+        {.what = "129 bytes", .tags = {parameters(129)}, .described = " 0x0 132"},
         {.what = "damaged, then too large: the first stays", .tags = {damaged, large}, .described = " 0x0 9"},
-        {.what = "then an empty one", .tags = {damaged, large, {0x17, 0}}, .described = " 0x0 0"},
+        {.what = "too large, then empty", .tags = {damaged, large, {0x17, 0}}, .described = " 0x0 0"},
         {.what = "damaged, then valid", .tags = {damaged, g_avc.data}, .described = "H264 320x240 23"},
         {.what = "AAC", .tags = {AacConfig({0x11, 0x90})}, .described = "43712 48000x2 0 2", .type = 8}, // 0xAAC0
         {.what = "AAC, empty", .tags = {AacConfig({})}, .described = "43712 96000x0 0 0", .type = 8},
-        {.what = "AAC, none", .tags = {AacRaw(Noise(20), 0xAA)}, .described = "43712 22050x1 0 0", .type = 8},
+        {.what = "AAC, missing", .tags = {AacRaw(Noise(20), 0xAA)}, .described = "43712 22050x1 0 0", .type = 8},
         {.what = "MP3", .tags = {AudioData(SOUND_MP3, Mp3Frame())}, .described = "85 44100x2 128 0", .type = 8},
         {.what = "8 kHz, II", .tags = {{0xEE, 0xFF, 0xFD, 0x90, 0xC4}}, .described = "85 44100x1 160 0", .type = 8},
         {.what = "PCM, 5.5 kHz", .tags = {AudioData(0x32, Noise(20))}, .described = "0 5500x1 0 0", .type = 8},
@@ -141,7 +142,7 @@ TEST(StreamProbe, DescribesTheFirstTag)
     };
     for (const auto& row : rows)
         EXPECT_EQ(Probe(row.type, row.tags), row.described) << row.what;
-    // Data with a header for each codec that reads one.
+    // Data that starts with a picture header for each codec that has one.
     const Bytes any = Concat({{0, 0, 0x46, 15, 0, 0x46, 20, 0, 15, 20}, H263Picture(3)});
     const char* const codecs[] = {" 0x0 0",         "JPEG 0x0 0", "FLV1 176x144 0", "SCR1 0x0 0", "VP60 320x1120 0",
                                   "VP6A 320x240 0", "SCR2 0x0 0", " 0x0 206",       " 0x0 0"};
@@ -149,8 +150,8 @@ TEST(StreamProbe, DescribesTheFirstTag)
         EXPECT_EQ(Probe(9, {VideoData(1, static_cast<uint8_t>(codec), any)}), codecs[codec]);
 }
 
-// Reads script data after the tags of a file: `length` bytes, 0 for all. Told are the result, and what is not 0 in
-// the instance.
+// Reads script data after the tags of a file: `length` bytes, 0 for all. Returns the result, and all values in the
+// instance that are not 0.
 void Expect(const std::string& text, const std::string& told, uint32_t options = 0, uint32_t length = 0,
             HostFn failing = HostFn::Eof, uint64_t nth = 0)
 {
@@ -168,7 +169,7 @@ void Expect(const std::string& text, const std::string& told, uint32_t options =
     out << FLVD_ReadMetadata(&ctx, length != 0 ? length : static_cast<uint32_t>(payload.size()));
     host.fail_nothing();
     const auto read = static_cast<uint64_t>(__FLV_DMX__fioTell64(ctx.cur_reader) - START);
-    const bool stays = failing == HostFn::Tell && nth == 1; // it does not know where the payload ends
+    const bool stays = failing == HostFn::Tell && nth == 1; // without the position, the end of the payload is unknown
     const uint64_t due = stays ? 0 : length != 0 ? length : payload.size();
     EXPECT_TRUE(failing == HostFn::Seek || read == due) << text << read; // whatever the result
     const auto& [video, audio, index, arrays] =
@@ -192,7 +193,7 @@ void Expect(const std::string& text, const std::string& told, uint32_t options =
     EXPECT_EQ(out.str(), told) << text;
 }
 
-// What a file with these properties in its first tag is opened with.
+// Opens a file with these properties in its first tag.
 std::string Index(const std::string& properties, uint32_t options)
 {
     FakeHost host(File({{18, 0, OnMetaData(properties)}, Pcm(5)}, 4).bytes);
@@ -201,9 +202,9 @@ std::string Index(const std::string& properties, uint32_t options)
     return "by " + std::string(by[session.ctx()->seek_method]) + ' ' + std::to_string(session.ctx()->last_keyframe_ms);
 }
 
-TEST(ScriptData, SetsWhatTheTableSays)
+TEST(ScriptData, MatchesTheTable)
 {
-    // The first column: options, and the length of the payload, 0 for all.
+    // Options of the first column, with the length of the payload, 0 for all.
     const std::map<std::string, std::pair<uint32_t, uint32_t>> opens = {
         {"-", {0, 0}}, {"index", {INDEX, 0}}, {"growing", {GROWING, 0}}, {"index, endless", {INDEX, 0xFFFFFFF0}}};
     for (const std::vector<std::string>& row : ReadTable("script_data.txt")) {
@@ -220,7 +221,7 @@ TEST(ScriptData, SetsWhatTheTableSays)
 TEST(ScriptValue, EndsWhenTheHostFails)
 {
     Expect("%5.5.5", "-101", 0, 3, HostFn::Seek, 1);
-    Expect("'text", "0", 0, 3, HostFn::Seek, 1); // a seek back from after the payload does not count
+    Expect("'text", "0", 0, 3, HostFn::Seek, 1); // a failed seek back from after the payload does not matter
     Expect("'text", "-1", 0, 3, HostFn::Tell, 1);
     Expect("{ keyframes: { times: [2 1 2 filepositions: [2 5 6 } }", "0 entries 2 P 152", 0, 0, HostFn::Tell, 2);
 }
@@ -236,8 +237,8 @@ TEST(ScriptValue, IsBounded)
     Expect("[1 " + deep + high, "-1");
     Expect("< width: 320 >", "-1", 0, 12); // a value that starts after the end is not read
     Expect("< width: 320 >", "0 width 320", 0, 13);
-    Expect("{ a: %5 } 1", "0", 0, 16);              // more consumed than counted
-    Expect(keys + "< width: 320 >", "0 width 320"); // an empty key counts nothing
+    Expect("{ a: %5 } 1", "0", 0, 16);              // more bytes were read than counted
+    Expect(keys + "< width: 320 >", "0 width 320"); // an empty key is not counted
 }
 
 TEST(KeyframeIndex, CannotBeReadPastTheEndOfTheFile)

@@ -1,4 +1,4 @@
-"""`flvdmx extract`: what comes out has once been decoded to the same pictures and sound by an independent decoder."""
+"""`flvdmx extract`: hashes of output that an independent decoder has decoded to the same pictures and samples."""
 import fcntl
 import hashlib
 import os
@@ -36,7 +36,7 @@ class Extract(Case):
 
     @staticmethod
     def content(path):
-        """What HASHES tells: for WAV of the samples alone."""
+        """The hash to compare with HASHES; for WAV, that of the samples only."""
         data = path.read_bytes()
         return hashlib.sha256(data[44:] if data.startswith(b"RIFF") else data).hexdigest()
 
@@ -57,12 +57,12 @@ class Extract(Case):
                         self.assertIn(f"{path}: {len(Expected(name).of[kind])} frames, {path.stat().st_size} b", said)
 
     def test_annexb(self):
-        """Rewritten with each size of lengths, with configurations between, and with damaged lengths."""
+        """Files with each size of the length fields, with configurations in between, and with damaged lengths."""
         header, (_, config, *tags) = split_tags(sample_bytes("avc_only"))
         frames, record = [tag for tag in tags if tag[12] == 1], config[16:-4]
         sps_end = 8 + int.from_bytes(record[6:8], "big")
         sps, pps = record[8:sps_end], record[sps_end + 3:][:int.from_bytes(record[sps_end + 1:sps_end + 3], "big")]
-        other_sps = sps[:-1] + bytes([sps[-1] ^ 1])  # still a whole set
+        other_sps = sps[:-1] + bytes([sps[-1] ^ 1])  # still a complete set
         other = record.replace(sps, other_sps)
         sets = {record: START + sps + START + pps, other: START + other_sps + START + pps}
         keys = [i for i, tag in enumerate(frames) if tag[11] >> 4 == 1]
@@ -86,12 +86,12 @@ class Extract(Case):
                     lengths = b"".join(len(unit).to_bytes(size, "big") + unit for unit in units)
                     made.append(retag(tag, tag[11:16] + lengths + damage.get(i, b"")))
                     wanted += b"".join(START + unit for unit in units)
-                stderr = ".*configuration is damaged; the previous one.*\n" if 5 in changes else ""
+                stderr = ".*configuration is damaged; the previous configuration.*\n" if 5 in changes else ""
                 if damage:
-                    stderr = f".*NAL units that do not fit their frame in {len(damage)} frames?, .* at byte {place}\n"
+                    stderr = f".*NAL units that exceed their frame in {len(damage)} frames?, .* at byte {place}\n"
                 self.assertEqual(self.extract(b"".join(made), stderr=stderr).read_bytes(), wanted)
 
-    def test_refused(self):
+    def test_rejected(self):
         data = sample_bytes("aac_only")
         config = data.index(b"\xaf\0") + 2
         for bits, words in ((0x2A88, "object type 21 cannot"),  # the core of HE-AAC
@@ -128,13 +128,13 @@ class Extract(Case):
         with wave.open(str(out)) as sound:
             self.assertEqual(sound.getparams()[:3], (1, 2, 11025))
             self.assertEqual(sound.readframes(1 << 20), data[44:])
-        self.tool("extract", sample("avc_aac"), "-o", "-", code=1, stderr=".*takes one stream.*\n")
+        self.tool("extract", sample("avc_aac"), "-o", "-", code=1, stderr=".*takes only one stream.*\n")
 
     def test_nothing_is_left_after_an_interruption(self):
         folder = self.write("any", b"").parent
-        os.mkfifo(folder / "out.aac")  # the tool waits for a reader, the file for the video being there
+        os.mkfifo(folder / "out.aac")  # the tool waits for a reader, while the file for the video exists
         with subprocess.Popen([TOOL, "extract", sample("avc_aac"), "-o", folder / "out"]) as process:
-            while not list(folder.glob("out.h264.*")):  # its name until it is finished
+            while not list(folder.glob("out.h264.*")):  # its name until it is complete
                 time.sleep(0.01)
             process.send_signal(signal.SIGINT)
         self.assertEqual(process.returncode, -signal.SIGINT)
@@ -143,7 +143,7 @@ class Extract(Case):
     def test_bar_appears_after_a_second_and_fits(self):
         name = "x" * 60 + "é.flv"
         folder = self.write(name, sample_bytes("aac_only")).parent
-        os.mkfifo(folder / "out")  # nobody takes what is written until a bar could have come
+        os.mkfifo(folder / "out")  # nobody reads the output until a bar should have appeared
         terminal, end = pty.openpty()
         fcntl.ioctl(end, termios.TIOCSWINSZ, struct.pack("HHHH", 24, 60, 0, 0))
         with subprocess.Popen([TOOL, "extract", folder / name, "-o", folder / "out"], stderr=end) as process:

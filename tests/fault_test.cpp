@@ -1,6 +1,6 @@
-// A host that fails: in each scenario every call that can fail fails once, with and without all later calls, and every
-// read is cut short. Every failure is a listed one, all memory and files are accounted for, only frames of the file are
-// delivered, and a host that has recovered gets the remaining ones.
+// A host that fails: in each scenario, every call that can fail fails once, with and without all later calls, and every
+// read is cut short. Every failure is a listed one, all memory and files are released, only frames of the file are
+// delivered, and the remaining ones follow after the host has recovered.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -14,18 +14,18 @@ using namespace flvd_test;
 
 namespace {
 
-constexpr int64_t STEP = 601; // of a growing file
+constexpr int64_t STEP = 601; // bytes by which a file grows
 constexpr size_t UNKNOWN = SIZE_MAX;
 
 struct Seek {
     int32_t time;
-    uint32_t mode = 0, stream = 0; // of a stream: a frame seek, BACK or FORTH
+    uint32_t mode = 0, stream = 0; // with a stream: a frame seek, BACK or FORTH
 };
 
 struct Scenario {
     const char* what;
     Flv flv;
-    std::vector<OpenOptions> opens; // taken in turn
+    std::vector<OpenOptions> opens; // used in turn
     std::vector<Seek> seeks = {};
     int64_t shown = INT64_MAX; // bytes at first
 };
@@ -37,7 +37,7 @@ struct Fault {
     uint32_t bytes = 0;
 };
 
-using Seen = std::map<int32_t, std::set<HostFn>>; // line numbers, and the functions whose failure led to them
+using Seen = std::map<int32_t, std::set<HostFn>>; // line numbers, and the functions whose failure caused them
 
 // One scenario under one fault.
 class Course {
@@ -66,7 +66,7 @@ public:
         Session session(m_host, m_open);
         m_session = &session;
         m_exact = !fired() && !m_open.for_info;
-        judge(Op::Open, session.open_rc());
+        check(Op::Open, session.open_rc());
         bool on = session.opened();
         const bool rewound = on && fired() && !m_fault.later;
         EXPECT_TRUE(!rewound || __FLV_DMX__fioTell64(session.ctx()->main_reader) == session.ctx()->data_offset);
@@ -84,7 +84,7 @@ private:
     bool growing() const { return (m_open.options & GROWING) != 0; }
     uint64_t calls() const { return m_fault.bytes != 0 ? m_host.calls(HostFn::Read) : m_host.failable_calls(); }
     bool fired() const { return m_fault.nth != 0 && calls() >= m_fault.nth; }
-    // Without its position, a growing file is read on from inside a tag, where a false header may look valid.
+    // If its position is unknown, reading a growing file continues inside a tag, where a false header may look valid.
     bool strays() const { return growing() && m_by == HostFn::Tell; }
     void arm(HostFn fn)
     {
@@ -101,8 +101,9 @@ private:
             << code << " / " << line;
         m_seen[line].insert(m_by);
     }
-    // After every operation: a failure is a listed one, and the host holds exactly what the instance refers to.
-    void judge(Op op, int32_t rc)
+    // After every operation: a failure must be a listed one, and the host must hold exactly what the instance refers
+    // to.
+    void check(Op op, int32_t rc)
     {
         const int32_t code = m_session->last_error(), line = m_session->error_line();
         const bool miss = op == Op::FrameSeek && (rc == FLVD_ERR_END_OF_DATA || line == 0);
@@ -133,12 +134,12 @@ private:
         EXPECT_EQ(static_cast<size_t>(std::count_if(blocks.begin(), blocks.end(), held)), m_host.live_blocks());
         EXPECT_EQ(m_host.open_handles(), ctx.audio_reader != ctx.main_reader ? 2u : 1u);
     }
-    // One request. It delivers a frame of the file: the next one, unless the fault struck during the request.
+    // One request. It must deliver a frame of the file: the next one, unless the fault occurred during the request.
     int32_t frame(uint32_t stream)
     {
         const bool before = fired();
         const auto [rc, got] = m_session->frame(stream);
-        judge(Op::Frame, rc);
+        check(Op::Frame, rc);
         auto& [frames, next] = m_due.at(stream);
         if (before != fired() && !(growing() && rc != 0))
             next = UNKNOWN;
@@ -166,13 +167,13 @@ private:
         const bool before = fired();
         if (seek.stream != 0) {
             uint32_t result = 0;
-            judge(Op::FrameSeek,
+            check(Op::FrameSeek,
                   m_session->frame_seek(static_cast<uint32_t>(seek.time), seek.stream, seek.mode, &result));
             return false;
         }
         int32_t reached = -1;
         const int32_t rc = m_session->seek(seek.time, seek.mode, &reached);
-        judge(Op::Seek, rc);
+        check(Op::Seek, rc);
         EXPECT_TRUE(rc == 0 ? reached >= 0 && reached < 1000 : reached == -1);
         EXPECT_TRUE(rc == 0 || rc == -2 || fired() != before || m_fault.later || !m_exact);
         const bool waits = ctx.saved_main_pos != 0 || ctx.saved_audio_pos != 0; // going back failed as well
@@ -208,7 +209,7 @@ private:
     Seen& m_seen;
     FakeHost m_host;
     const OpenOptions m_open;
-    // For each requested stream: all frames of the file with the times of their tags, and which one is next.
+    // For each requested stream: all frames of the file with the times of their tags, and the index of the next one.
     std::map<uint32_t, std::pair<Frames, size_t>> m_due;
     Session* m_session = nullptr;
     HostFn m_by = HostFn::Count; // the function that failed
@@ -265,7 +266,7 @@ std::vector<Scenario> Scenarios()
         {.what = "damaged", .flv = damaged, .opens = {open(0), open(SEPARATE)}, .seeks = seeks},
         {.what = "bytes after the last tag", .flv = Cut(indexed, indexed.size() + 50), .opens = {open(0)}},
         {.what = "cut in a keyframe", .flv = Cut(indexed, second_key + 20), .opens = {open(0), open(INDEX)}},
-        {.what = "cut after it", .flv = Cut(indexed, second_key + 900), .opens = {open(INDEX)}},
+        {.what = "cut after its start", .flv = Cut(indexed, second_key + 900), .opens = {open(INDEX)}},
         {.what = "first tags larger than the cache", .flv = first_large, .opens = {open(0, SMALL)}},
         {.what = "large AVC frames", .flv = avc, .opens = {open(0, SMALL)}},
         {.what = "large AAC frames", .flv = large(g_aac, Raw, LARGE), .opens = {open(0, SMALL)}},
@@ -285,7 +286,7 @@ std::vector<Scenario> Scenarios()
     };
 }
 
-// Every call of a scenario fails, once and from there on, and every read is cut short.
+// Every call of a scenario fails, alone and with all later ones, and every read is cut short.
 void SweepFaults(const Scenario& scenario, const OpenOptions& open, Sweep* sweep, Seen* seen)
 {
     const auto run = [&](const Fault& fault) {
@@ -313,7 +314,7 @@ TEST(Faults, AreSurvivedAtEveryCall)
         for (const OpenOptions& open : scenario.opens)
             SweepFaults(scenario, open, &sweep, &seen);
     if (!Sweep::is_complete())
-        return; // a sample of the sweep does not reach every site
+        return; // a sampled sweep does not reach every site
     const std::map<std::string, HostFn> functions = {{"alloc", HostFn::Alloc},
                                                      {"open", HostFn::Open},
                                                      {"read", HostFn::Read},

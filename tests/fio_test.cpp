@@ -1,4 +1,4 @@
-// The cached file and its bit reader alone: what they deliver, and which host calls that costs.
+// The cached file and its bit reader on their own: what they deliver, and which host calls that costs.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -32,7 +32,7 @@ public:
     }
     ~Cached() { __FLV_DMX__fioClose(file); }
 
-    // What a call returns, with the host calls that it costs.
+    // Makes a call. Returns its result and the host calls that it costs.
     std::string call(const std::string& text)
     {
         std::string name;
@@ -46,7 +46,7 @@ public:
         const std::map<std::string, std::function<void()>> changes = {
             {"narrow",
              [&] {
-                 host.use_32_bit_only(); // from here on
+                 host.use_32_bit_only(); // for all later calls
                  const fio_funcs_t funcs = host.funcs();
                  __FLV_DMX__fioSetFunc(&funcs);
              }},
@@ -101,15 +101,15 @@ public:
     fio_file_t* file;
 
 private:
-    // The bytes that a peek shows.
+    // Returns the bytes of a peek.
     Bytes peek(uint32_t n) const
     {
         const uint8_t* bytes = nullptr;
         const uint32_t got = __FLV_DMX__fioShowBytesByPtr(&bytes, n, file);
-        EXPECT_EQ(bytes == nullptr, file->state == FIO_STATE_WRITE); // untouched when refused
+        EXPECT_EQ(bytes == nullptr, file->state == FIO_STATE_WRITE); // unchanged if rejected
         return Bytes(bytes, bytes + got);
     }
-    // The complete elements read, as bytes.
+    // Returns the complete elements read, as bytes.
     Bytes read(uint32_t count, uint32_t size) const
     {
         Bytes out(size_t{size} * count);
@@ -121,7 +121,7 @@ private:
         const Bytes bytes = Part(static_cast<size_t>(from), static_cast<size_t>(to));
         return __FLV_DMX__fioWrite(bytes.data(), size, static_cast<uint32_t>(bytes.size()) / size, file);
     }
-    // Where the bytes came from, or the number returned, and the host calls since the call before.
+    // Describes where the bytes came from, or the number returned, and the host calls since the previous call.
     std::string told(const Bytes& got)
     {
         const size_t from = got.empty() ? 0 : got.front();
@@ -135,7 +135,7 @@ private:
     }
 };
 
-TEST(CachedFile, DoesWhatTheTableSays)
+TEST(CachedFile, MatchesTheTable)
 {
     std::optional<Cached> f;
     for (const std::vector<std::string>& row : ReadTable("cached_file.txt")) {
@@ -155,7 +155,7 @@ TEST(CachedFile, RejectsCountsThatAreTooLarge)
 {
     Cached f({CACHE, 0, 0, UPDATE_BINARY}, Part(0, 10));
     __FLV_DMX__fiodbgReset();
-    EXPECT_EQ(__FLV_DMX__fiodbgReadBytes(), 0u); // this build counts nothing
+    EXPECT_EQ(__FLV_DMX__fiodbgReadBytes(), 0u); // this build does not count
     EXPECT_EQ(f.call("seek 2 0"), "0: seek64(2,0)=0");
     uint8_t byte = 77;
     const std::pair<uint32_t, uint32_t> refused[] = {{0, 5}, {0x10000, 0x10000}, {3, 0x55555556}}; // 2 with 32 bits
@@ -179,7 +179,7 @@ TEST(CachedFile, RejectsCountsThatAreTooLarge)
         EXPECT_EQ(f.call(call), "0..0");
     EXPECT_EQ(f.file->count, 0u);
     f.call("write 0 10");
-    EXPECT_EQ(__FLV_DMX__fioWrite(&byte, 1, 0xFFFFFFF8, f.file), 0xFFFFFFF8); // no room for all, though the sum wraps
+    EXPECT_EQ(__FLV_DMX__fioWrite(&byte, 1, 0xFFFFFFF8, f.file), 0xFFFFFFF8); // does not fit, though the sum wraps
     EXPECT_EQ(f.host.open_reader({0xFFFFFFF0, 1, 0x20}), nullptr);            // the sum does not fit 32 bits
 }
 

@@ -1,4 +1,4 @@
-"""FLV files as bytes, tag by tag."""
+"""Splits FLV files into tags and rewrites them."""
 
 
 def split_tags(data):
@@ -11,5 +11,5 @@ def split_tags(data):
 
 
 def retag(tag, payload):
-    """The tag with another payload and a back-pointer to match."""
+    """The tag with another payload and a matching back-pointer."""
     return tag[:1] + len(payload).to_bytes(3, "big") + tag[4:11] + payload + (11 + len(payload)).to_bytes(4, "big")

@@ -1,4 +1,4 @@
-// Opening, probing and delivery as a host sees them, and every site where they can fail.
+// Opening, probing and delivery as the host sees them, and every site where they can fail.
 
 #include "support/report.h"
 #include "support/session.h"
@@ -44,12 +44,12 @@ struct Row {
     const char* what;
     Bytes file = {};
     OpenOptions open = {};
-    std::optional<Site> site = {};        // recorded; if it is not one of the operation, the call succeeds
+    std::optional<Site> site = {};        // recorded; if the operation cannot fail there, the call succeeds
     std::optional<Site> in_instance = {}; // recorded in the instance that a failed open releases; empty: anything
     int before = 0;                       // requests before this one
     uint32_t stream = 0;                  // requested
     HostFault fault = {};                 // in this request
-    std::optional<uint32_t> time = {};    // of the frame delivered, by the next request if this one fails
+    std::optional<uint32_t> time = {};    // of the frame delivered; if this request fails, by the next one
 };
 
 void Expect(const Row& row, Op op)
@@ -150,12 +150,12 @@ TEST(Failures, OfDelivery)
     const auto configs = [](size_t n) { return Repeat(n, g_avc, {Nalu(0)}, 1).bytes; };
     const Row rows[] = {
         // each also in a growing file
-        {.what = "end", .file = g_chain.bytes, .site = FRAME_END, .before = frames},
+        {.what = "end of the data", .file = g_chain.bytes, .site = FRAME_END, .before = frames},
         {.what = "within the budget", .file = configs(BUDGET - 1), .time = 0},
         {.what = "beyond it", .file = configs(BUDGET), .site = FRAME_END, .time = 0},
-        {.what = "no room for AVC", .file = large(g_avc, Nalu), .open = Buffer(1000), .site = VIDEO_NO_ROOM},
-        {.what = "for AAC", .file = large(g_aac, Raw), .open = Buffer(1000), .site = AAC_NO_ROOM},
-        {.what = "for PCM", .file = large(Pcm(0), Pcm), .open = Buffer(1000), .site = AUDIO_NO_ROOM, .before = 1},
+        {.what = "AVC: no room", .file = large(g_avc, Nalu), .open = Buffer(1000), .site = VIDEO_NO_ROOM},
+        {.what = "AAC: no room", .file = large(g_aac, Raw), .open = Buffer(1000), .site = AAC_NO_ROOM},
+        {.what = "PCM: no room", .file = large(Pcm(0), Pcm), .open = Buffer(1000), .site = AUDIO_NO_ROOM, .before = 1},
         {.what = "information", .file = audio, .open = {SEPARATE, true}, .site = FRAME_INFO_ONLY, .stream = AUDIO},
         {.what = "no video", .file = audio, .open = {SEPARATE}, .site = FRAME_NO_VIDEO, .stream = VIDEO},
         {.what = "no audio", .file = video, .open = {SEPARATE}, .site = FRAME_NO_AUDIO, .stream = AUDIO},
@@ -169,7 +169,7 @@ TEST(Failures, OfDelivery)
         }
 }
 
-TEST(Open, BoundsTheSizesOfTheInitialisationBlock)
+TEST(Open, LimitsTheSizesOfTheInitialisationBlock)
 {
     FakeHost host(g_chain.bytes);
     const auto expect = [&host](uint32_t cache, uint32_t scan, const OpenOptions& given) {
@@ -184,7 +184,7 @@ TEST(Open, BoundsTheSizesOfTheInitialisationBlock)
     expect(1025, 1025, {.cache_size = 1025, .scan_read_size = 1025});
 }
 
-TEST(Open, TakesInOrderAndReleasesInOrder)
+TEST(Open, AcquiresAndReleasesInOrder)
 {
     constexpr uint32_t UNKNOWN = 0xFFFFFFF0, CTX = sizeof(flvd_ctx_t), FIO = sizeof(fio_file_t);
     const auto config = static_cast<uint32_t>(SmallAvcRecord().size());
@@ -218,7 +218,7 @@ TEST(Probing, FindsStreamsAndTimes)
         return File({Pcm(0), Screen(5), Pcm(9)}, 5, prefix, header);
     };
     Flv far = after(Noise(MIB), 9);
-    far.bytes[MIB] = 'X'; // accepted as a signature there, whatever it is
+    far.bytes[MIB] = 'X'; // at this distance, any byte is accepted as a signature
     const Flv video = File({g_avc, Nalu(40), Nalu(90)}, 1), aac = File({g_aac, Raw(23), Raw(46)}, 4);
     const Flv sorted = File({g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)});
     const Flv all_found = File({g_meta, g_avc, g_aac, Raw(50), Nalu(40), Nalu(90)});
@@ -237,7 +237,7 @@ TEST(Probing, FindsStreamsAndTimes)
         {.what = "AVC configuration", .file = video, .streams = VIDEO, .first_ts = 40, .duration = 50},
         {.what = "AAC configuration", .file = aac, .streams = AUDIO, .first_ts = 23, .duration = 23},
         {.what = "any PCM tag", .file = File({Pcm(10), Pcm(30)}, 4), .streams = AUDIO, .first_ts = 10, .duration = 20},
-        {.what = "of video AVC alone", .file = File({Screen(10), Pcm(50), Screen(60)}), .first_ts = 50, .duration = 10},
+        {.what = "only AVC video", .file = File({Screen(10), Pcm(50), Screen(60)}), .first_ts = 50, .duration = 10},
         {.what = "smallest time", .file = sorted, .first_ts = 40, .duration = 50},
         {.what = "first time once all is found", .file = all_found, .first_ts = 50, .duration = 40},
         {.what = "no stream announced", .file = unannounced, .first_ts = 50, .duration = 10},
@@ -307,15 +307,15 @@ TEST(Delivery, ReturnsThePayloadsAfterTheCodecBytes)
 TEST(Delivery, ContinuesAfterAFailure)
 {
     const Bytes last_turn = Repeat(BUDGET - 1, g_avc, {Damaged(Nalu(0, 5000)), Nalu(0), Nalu(40)}, 1).bytes;
-    // The second request seeks past a configuration, and then by the size of one in the damage.
+    // The second request seeks past a configuration, and then by the size of a tag in the damage.
     const Bytes damage = Concat({File({g_avc, Nalu(0), {9, 9, AvcConfig(Noise(5000))}}).bytes, Bytes(3u << 20)});
     const Bytes screen = File({Screen(0), Screen(40), Screen(80)}, 1).bytes;
     const Bytes large = File({g_avc, Nalu(0), Nalu(40, 5000), Nalu(80)}, 1).bytes;
     const Bytes other = File(Tags{Screen(0)} + Tags(4100, Pcm(9)) + Tags{Screen(5000)}).bytes;
     constexpr HostFn TELL = HostFn::Tell, SEEK = HostFn::Seek;
     const OpenOptions grows = {GROWING}, two = {GROWING | SEPARATE}, small = Buffer(1000, GROWING);
-    // Tags whose back-pointer disagrees, in two runs with a configuration packet between them, which is a turn of its
-    // own: 16384 checks may fail in all turns of a request together.
+    // Tags with a wrong back-pointer, in two runs separated by a configuration packet, which starts a new turn: in all
+    // turns of a request together, 16384 checks may fail.
     constexpr size_t CHECKS = 16384;
     const auto bad = [](size_t first, size_t second) {
         const Tag tag = Damaged(Raw(0, 3));
@@ -339,7 +339,7 @@ TEST(Delivery, ContinuesAfterAFailure)
     };
     for (Row row : rows) {
         row.before = row.file == last_turn ? 0 : 1;
-        row.stream = VIDEO; // that of two readers
+        row.stream = VIDEO; // ignored unless there are two readers
         Expect(row, Op::Frame);
     }
 }
@@ -347,8 +347,8 @@ TEST(Delivery, ContinuesAfterAFailure)
 // Frames larger than the cache, and false headers that claim such frames.
 
 // A frame of 50,000 bytes: what is cached of it, the rest in one read, and a refill that starts with its back-pointer.
-// When that read is short the back-pointer is checked all the same: the tag is recorded as cut short, and the next one
-// is delivered.
+// If that read is short, the back-pointer is still checked: the tag is recorded as cut short, and the next one is
+// delivered.
 TEST(LargeFrames, AreReadInOrder)
 {
     constexpr size_t BIG = 50000;
@@ -370,7 +370,7 @@ TEST(LargeFrames, AreReadInOrder)
     };
     const std::regex query("tell64\\(\\)=\\d+ ");
     for (const auto& row : rows)
-        for (const uint32_t bytes : {UINT32_MAX, 0u, 100u}) { // the most that the read of the rest returns
+        for (const uint32_t bytes : {UINT32_MAX, 0u, 100u}) { // most bytes that the read of the rest returns
             SCOPED_TRACE(testing::PrintToString(std::pair(&row - rows, bytes)));
             const bool whole = bytes == UINT32_MAX;
             const uint32_t stream = row.tags[0].stream();
@@ -406,7 +406,7 @@ TEST(LargeFrames, AreCheckedFirstWhenTheBufferHasToGrow)
     expect(524289, 2, 540672);
 }
 
-TEST(LargeFrames, WithAWrongBackPointerAreSkippedAlone)
+TEST(LargeFrames, WithAWrongBackPointerAreTheOnlyOnesSkipped)
 {
     const Tag bad = Damaged(Nalu(40, 6000)), last = Damaged(Nalu(100, 9000));
     FakeHost host(File({g_avc, Nalu(0, 5000), bad, Nalu(80, 7000), Nalu(120, 8000), last}, 1).bytes);
@@ -415,18 +415,18 @@ TEST(LargeFrames, WithAWrongBackPointerAreSkippedAlone)
         const FrameResult got = session.frame();
         EXPECT_EQ(got.frame.timestamp, time);
         EXPECT_EQ(session.ctx()->last_frame_size, size);
-        EXPECT_EQ(session.last_error(), got.rc == 0 ? 0 : -10002); // a frame that was copied in vain is not recorded
+        EXPECT_EQ(session.last_error(), got.rc == 0 ? 0 : -10002); // a copy that was rejected is not recorded
     }
 }
 
-// False headers in damaged data that claim half a MiB, or more than is left; all in one turn of a request, or each in
-// a turn of its own, after a configuration packet.
+// False headers in damaged data that claim half a MiB, or more than is left: all in one turn of a request, or each in
+// its own turn, after a configuration packet.
 TEST(LargeFrames, CostAtMostOnePayloadWhenTheyAreFalse)
 {
     constexpr uint64_t CACHE = 4096, HEADERS = 50, FRAME = 10000;
     const uint64_t crossed =
         HEADERS * (200 + 2 * CACHE + 16) + FRAME + 4 * CACHE; // each header, and the frame after them
-    const Tags bad = {Damaged(Nalu(20))};                     // fails a check before them
+    const Tags bad = {Damaged(Nalu(20))};                     // a check that fails before the false headers
     const struct {
         const char* what;
         uint32_t claim;
@@ -456,7 +456,7 @@ TEST(LargeFrames, CostAtMostOnePayloadWhenTheyAreFalse)
         host.reset_calls();
         EXPECT_EQ(session.frame().frame.timestamp, 80u);
         EXPECT_LE(host.bytes_read(), row.most);
-        EXPECT_EQ(host.calls(HostFn::Alloc), 0u); // the buffer stays as it is
+        EXPECT_EQ(host.calls(HostFn::Alloc), 0u); // the buffer does not grow
         EXPECT_EQ(session.last_error(), 0);
     }
 }

@@ -1,4 +1,4 @@
-// The hosts of the kit keep the contract of the public header, all on the same bytes.
+// All hosts of the kit keep the contract of the public header, on the same bytes.
 
 #include "flvdmx/memory_host.h"
 #include "flvdmx/posix_host.h"
@@ -24,7 +24,7 @@ const std::map<std::string, void (*)(flvd_init_t*)> g_fill = {{"stdio", flvd_std
                                                               {"posix", flvd_posix_host_fill},
                                                               {"memory", flvd_memory_host_fill},
                                                               {"callbacks", flvd_callback_host_fill}};
-constexpr int64_t SIZE = 200000, FAR = (int64_t{1} << 32) + 12345; // SIZE: three windows and a bit
+constexpr int64_t SIZE = 200000, FAR = (int64_t{1} << 32) + 12345; // SIZE: a little more than three windows
 
 class Host : public testing::TestWithParam<std::string> {
 protected:
@@ -86,7 +86,7 @@ TEST_P(Host, ReadsSeeksAndTells)
     EXPECT_NE(t.file_seek64(handle, -1, 0), 0);
     for (const int unknown : {-1, 3})
         EXPECT_NE(t.file_seek64(handle, 1, unknown), 0);
-    EXPECT_EQ(t.file_tell64(handle), at) << "a seek that failed moves nothing";
+    EXPECT_EQ(t.file_tell64(handle), at) << "a failed seek does not move the position";
     for (const std::string& path : {folder + "/absent", folder}) {
         EXPECT_EQ(t.file_open(path.c_str(), "rb"), nullptr) << path;
         const bool is_folder = path == folder && (GetParam() == "stdio" || GetParam() == "posix");
@@ -94,7 +94,7 @@ TEST_P(Host, ReadsSeeksAndTells)
     }
 }
 
-// After the end flag, a seek lets the host see what has been added.
+// After the end flag was set, a seek makes added bytes visible.
 TEST_P(Host, SeesAFileGrow)
 {
     std::filesystem::resize_file(file, memory.size = callbacks.size = SIZE - 100);
@@ -105,7 +105,7 @@ TEST_P(Host, SeesAFileGrow)
     EXPECT_EQ(read(150), bytes.substr(SIZE - 150, 150));
 }
 
-// A file that got its full size first: the stdio host keeps no bytes that it read before.
+// A file that had its full size from the start: the stdio host does not cache bytes.
 TEST_P(FileHost, SeesBytesChangedInPlace)
 {
     EXPECT_EQ(read(10), bytes.substr(0, 10));
@@ -122,10 +122,10 @@ TEST_P(FileHost, ReachesBeyondFourGibibytes)
     EXPECT_EQ(t.file_tell64(handle), FAR);
     EXPECT_EQ(read(4), "far");
     ASSERT_EQ(t.file_seek64(handle, 12345, 0), 0);
-    EXPECT_EQ(read(3), bytes.substr(12345, 3)) << "the position differs in its high half only";
+    EXPECT_EQ(read(3), bytes.substr(12345, 3)) << "the positions differ only in the high half";
 }
 
-// A pipe holds only what has been written so far; a read continues until the request is filled.
+// A pipe returns only what has been written so far; a read continues until the request is complete.
 TEST_P(FileHost, FillsARequestFromAPipe)
 {
     const std::string fifo = folder + "/fifo";
@@ -143,8 +143,8 @@ TEST_P(FileHost, FillsARequestFromAPipe)
     writer.join();
 }
 
-// Appending moves the position to the end of what was written, wherever it was.
-TEST_P(FileHost, TellsWhereAnAppendEnded)
+// Appending moves the position to the end of what was written, wherever it was before.
+TEST_P(FileHost, ReturnsThePositionAfterAnAppend)
 {
     t.file_close(handle);
     handle = t.file_open(file.c_str(), GetParam() == "posix" ? "rb" : "a+b"); // the POSIX host only reads

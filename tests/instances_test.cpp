@@ -20,7 +20,7 @@ std::string Step(Session& session, uint32_t n)
         std::tuple(result.rc, reached, result.frame, result.frame.data, session.last_error(), session.error_line()));
 }
 
-TEST(Instances, DoNotDisturbEachOther)
+TEST(Instances, DoNotAffectEachOther)
 {
     constexpr uint32_t STEPS = 100;
     FakeHost host(MakeChain().bytes);
@@ -48,7 +48,7 @@ TEST(Instances, DoNotDisturbEachOther)
     }
 }
 
-TEST(Instances, RefusesWhatItCannotServe)
+TEST(Instances, RejectWrongCalls)
 {
     FakeHost host(MakeChain().bytes);
     Session session(host);
@@ -80,7 +80,7 @@ TEST(Instances, RefusesWhatItCannotServe)
             flvd_ctx_t* word = live;
             expect(operation, &word, first ? nullptr : &init, first ? &info : nullptr, -1);
             const bool opens = operation == FLVD_OP_OPEN || operation == FLVD_OP_OPEN_INFO;
-            EXPECT_EQ(word, opens ? nullptr : live) << operation; // a refused open is a failed open
+            EXPECT_EQ(word, opens ? nullptr : live) << operation; // a rejected open is a failed open
         }
     for (const uint32_t operation : {6u, 7u, 8u, 9u, 11u, 0xFFFFFFFFu})
         expect(operation, &live, &init, &info, -1);

@@ -22,7 +22,7 @@ namespace {
 const std::string g_data = FLVDMX_TEST_DATA "/";
 const flvdmx::Host g_memory = flvdmx::make_host(flvd_memory_host_fill);
 
-// A file in memory. Of several, the newest is the one that can be opened.
+// A file in memory. If there are several, only the newest can be opened.
 struct Memory : flvd_memory_file_t {
     explicit Memory(Bytes contents)
         : flvd_memory_file_t{"memory", nullptr, contents.size(), nullptr}, bytes(std::move(contents))
@@ -44,7 +44,7 @@ const auto Streams = [](bool apart) {
     return apart ? std::vector{Stream::video, Stream::audio} : std::vector{Stream::any};
 };
 
-// A frame in one line. Times in ms: decoding, presentation.
+// Describes a frame in one line. Times in ms: decoding, presentation.
 std::string Line(Stream stream, int64_t time, int64_t presentation, bool keyframe, int64_t position, const Bytes& data)
 {
     std::ostringstream line;
@@ -66,7 +66,7 @@ std::string Line(const Tag& tag, int64_t time, int64_t presentation, bool keyfra
 
 using Lines = std::vector<std::string>;
 
-// What the prober found of the requested streams, in a sample that starts at 0 ms.
+// What the prober found in the requested streams of a sample that starts at 0 ms.
 Lines ExpectedLines(const Expected& sample, Stream requested = Stream::any)
 {
     Lines lines;
@@ -124,8 +124,8 @@ void ExpectDescribed(const flvdmx::Info& info, const ExpectedStream& stream)
 }
 
 class Sample : public testing::TestWithParam<std::string> {};
-// All frames and the description of the file, compared with what another demuxer found: one reader, and two with the
-// caller's buffer; complete and growing. Lists that are read halfway do not change the frames.
+// Compares all frames and the description of the file with what another demuxer found: with one reader, and with two
+// and the caller's buffer; complete and growing. Reading lists halfway through does not change the frames.
 TEST_P(Sample, IsDescribedAndPlayed)
 {
     const Expected expected = ReadExpected(GetParam());
@@ -158,7 +158,7 @@ TEST_P(Sample, IsDescribedAndPlayed)
                 if (lines.size() != wanted.size() / 2)
                     continue;
                 const Keyframes list = List(moved.keyframes());
-                const bool by_index = info.seek_method == flvdmx::SeekMethod::by_index; // has its own times
+                const bool by_index = info.seek_method == flvdmx::SeekMethod::by_index; // its times differ
                 EXPECT_EQ(list.size(), keyframes.size());
                 EXPECT_TRUE(by_index || list == keyframes);
                 const auto metadata = moved.metadata();
@@ -170,8 +170,8 @@ TEST_P(Sample, IsDescribedAndPlayed)
 }
 INSTANTIATE_TEST_SUITE_P(Interface, Sample, testing::ValuesIn(g_samples));
 
-// Values that the samples lack: negative offsets, frame types, extended timestamps, a first timestamp other than 0,
-// script data and damage between frames; sizes below and above the cache.
+// Tests values that the samples lack: negative offsets, frame types, extended timestamps, a first timestamp other than
+// 0, script data and damage between frames; sizes below and above the cache.
 TEST(Interface, DescribesEachFrame)
 {
     const auto picture = [](uint32_t ts, int32_t offset, size_t size) {
@@ -199,7 +199,7 @@ TEST(Interface, DescribesEachFrame)
     }
 }
 
-// Configurations named by letters: capitals for AVC, small ones for AAC. L does not fit the cache, X is too long.
+// Configurations named by letters: upper case for AVC, lower case for AAC. L does not fit the cache, X is too long.
 Bytes ConfigOf(char letter)
 {
     Bytes config = letter < 'a' ? SmallAvcRecord() : Bytes{0x12, 0x10};
@@ -249,17 +249,17 @@ std::string ReportedConfigs(flvdmx::File& file, const Flv& flv, const std::strin
     return reported;
 }
 
-// Under each file: what is reported when it is played, and when it is played again from the start.
+// Below each file: what is reported when it is played, and when it is played again from the start.
 TEST(Interface, ReportsChangedConfigurations)
 {
     const struct {
         const char *name, *file, *first, *again;
     } cases[] = {
-        {.name = "a copy of the configuration in force is no change",
+        {.name = "a copy of the current configuration is not a change",
          .file = "Aa12Aa12B212bB12AC12",
          .first = "..........B....b..C.",
          .again = "..Aa......B....b..C."},
-        {.name = "no frame needs the one between", .file = "A1BA1B1", .first = "......B", .again = ".A....B"},
+        {.name = "no frame needs the one in between", .file = "A1BA1B1", .first = "......B", .again = ".A....B"},
         {.name = "larger than the cache", .file = "A1L11B1", .first = "...L..B", .again = ".A.L..B"},
         {.name = "above 64 KiB", .file = "A11X1B1", .first = "......B", .again = ".A....B"},
         {.name = "after holes longer than a search", .file = "A121#B#12", .first = ".......B.", .again = ".A.....B."}};
@@ -332,7 +332,7 @@ char LastReport(flvdmx::File& file, int64_t from, int64_t to, Stream stream)
     return reported;
 }
 
-TEST(Interface, KnowsConfigurationsThatItHasPassed)
+TEST(Interface, RemembersConfigurationsThatItHasPassed)
 {
     const std::string nine(9, '1');
     const Memory back(ConfigFile("A" + nine + "B" + nine + "A" + nine + "A" + nine).bytes);
@@ -348,7 +348,7 @@ TEST(Interface, KnowsConfigurationsThatItHasPassed)
 }
 
 // A stream that starts after the tags that an open examines is missing from the information, but its frames are
-// complete. Before its first one come more tags without a frame than one request skips.
+// complete. Before its first frame, there are more tags without a frame than one request skips.
 TEST(Interface, DescribesFramesOfAStreamThatBeginsLate)
 {
     const std::string letters = "a" + std::string(120, '2') + std::string(120, 'A') + "12";
@@ -383,7 +383,7 @@ TEST(Interface, ForgetsEarlyConfigurations)
     EXPECT_EQ(reported(), config(280));
 }
 
-// Uses a host of which no call fails, and then one for each call with that call failing.
+// Runs with a host that does not fail, and then once for each call with that call failing.
 void FailEachCall(const Bytes& bytes, const std::function<void(const flvdmx::Host& host)>& use)
 {
     const auto run = [&](uint64_t failing_call) {
@@ -401,7 +401,7 @@ void FailEachCall(const Bytes& bytes, const std::function<void(const flvdmx::Hos
             run(n);
 }
 
-// The configurations that the decoders of video and audio end with, after up to two failed requests.
+// The last configurations that were reported for video and audio, after up to two failed requests.
 std::pair<Bytes, Bytes> LastConfigs(flvdmx::File& file, bool apart)
 {
     std::pair configs(file.info().video->config, file.info().audio->config);
@@ -453,10 +453,10 @@ TEST(Interface, ListsWhatAGrowingFileHolds)
     auto open = memory.open({.growing = true});
     EXPECT_EQ((*open->keyframes()).size(), 3u);
     for (memory.size -= 40; memory.size != growing.bytes.size(); ++memory.size)
-        EXPECT_TRUE(open->metadata()) << memory.size; // wherever it ends
+        EXPECT_TRUE(open->metadata()) << memory.size; // at any size
 }
 
-// Most frames of a recording whose timestamps restart are later than its last one.
+// Most frames of a recording whose timestamps restart are later than its last timestamp.
 TEST(Interface, DeliversAllFramesOfRestartingTimestamps)
 {
     const Memory memory(File({g_meta, Pcm(0), Pcm(500), Pcm(1000), Pcm(1500), Pcm(20), Pcm(100)}).bytes);
@@ -490,8 +490,8 @@ TEST(Interface, ScansWhereTheIndexIsWrong)
     EXPECT_EQ(file->position(), position);
 }
 
-// From the index as it is, in the file and in memory; without one by a scan, which continues after damage until the
-// caller stops it.
+// The list comes from the index, in the file or in memory. Without one, it comes from a scan, which continues after
+// damage until the caller stops it.
 TEST(Interface, ListsKeyframes)
 {
     constexpr uint32_t FIRST = 1000;
@@ -550,8 +550,8 @@ TEST(Interface, ReadsTheMetadataOfTheTable)
     }
 }
 
-// Names that repeat in every property, properties without end, values that are not kept.
-TEST(Interface, BoundsMetadata)
+// Names that repeat in every property, endless properties, and values that are not kept.
+TEST(Interface, LimitsMetadata)
 {
     const auto count = [](const Bytes& script) {
         flvdmx::Metadata metadata;
@@ -566,7 +566,7 @@ TEST(Interface, BoundsMetadata)
     EXPECT_EQ(count(Concat({Amf("[2000000"), Bytes(1999999, 5), Amf("1")})), 0u);
 }
 
-TEST(Interface, RefusesASecondHostAndAnIncompleteOne)
+TEST(Interface, RejectsASecondHostAndAnIncompleteOne)
 {
     const std::string path = g_data + "avc_aac.flv";
     const flvdmx::Host posix = flvdmx::make_host(flvd_posix_host_fill);
@@ -580,7 +580,7 @@ TEST(Interface, RefusesASecondHostAndAnIncompleteOne)
     EXPECT_TRUE(second->next_frame());
     second->close();
     EXPECT_TRUE(flvdmx::File::open(path, posix));
-    EXPECT_TRUE(flvdmx::File::open(path)) << "the file before was closed at once";
+    EXPECT_TRUE(flvdmx::File::open(path)) << "the previous file was closed at once";
     flvd_init_t functions = posix.functions();
     functions.file_eof = nullptr;
     for (const flvdmx::Host& host : {flvdmx::Host(functions), flvdmx::make_host(nullptr)})
@@ -628,7 +628,7 @@ TEST(Interface, SurvivesMisuse)
     auto apart = flvdmx::File::open(g_data + "avc_aac.flv", {.separate_audio_reader = true});
     for (const Stream stream : {Stream::any, static_cast<Stream>(7)})
         EXPECT_STREQ(apart->next_frame(stream).error().name(), "FLVD_ERR_BAD_STREAM");
-    EXPECT_EQ((*apart->next_frame(Stream::video)).position, 495) << "the refused requests skipped nothing";
+    EXPECT_EQ((*apart->next_frame(Stream::video)).position, 495) << "the rejected requests skipped nothing";
 
     auto walked = flvdmx::File::open(g_data + "avc_aac.flv");
     (void)walked->keyframes([&](int64_t, int64_t) { // must not use the file that is being scanned
@@ -642,7 +642,7 @@ TEST(Interface, SurvivesMisuse)
     EXPECT_EQ(Line(*walked->next_frame()), ExpectedLines(ReadExpected("avc_aac"))[0]) << "playing continues";
 }
 
-// Uses all functions of a file. Each frame delivered must be one of the file's, described as its tag says.
+// Uses all functions of a file. Each frame delivered must be one of the file's, described as in its tag.
 void UseAll(flvdmx::result<flvdmx::File> file, const Lines& whole)
 {
     const auto play = [&](int frames) {
@@ -671,7 +671,7 @@ TEST(Interface, SurvivesEveryHostFailure)
 }
 
 // Keyframes every 0.4 s: the index starts at 0, the tags at 23 ms.
-TEST(Interface, SeeksAsNamed)
+TEST(Interface, SeeksInEveryMode)
 {
     // From, time, mode, time reached or -1 for a miss.
     const std::tuple<std::chrono::milliseconds, std::chrono::milliseconds, SeekMode, int64_t> cases[] = {

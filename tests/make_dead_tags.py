@@ -1,5 +1,5 @@
-"""Puts 150 tags without a frame, more than one request skips, into an FLV file: its first video tag, the configuration.
-The file gets a title as well.
+"""Inserts 150 tags without a frame, more than one request skips, into an FLV file: copies of its first video tag, the
+configuration. Also adds a title.
 
 usage: make_dead_tags.py FILE OUTPUT
 """

@@ -1,4 +1,4 @@
-"""`flvdmx plot`: the drawing read back."""
+"""`flvdmx plot`: checks what the drawing shows."""
 import re
 import xml.etree.ElementTree
 
@@ -86,7 +86,7 @@ class Plot(Case):
         lead = [float(y) for y in re.findall(r" (-?[\d.]+)", self.of(root, "lead")[0])]
         self.assertLess(max(lead) - min(lead), 110)  # the height of its diagram is 120
 
-    def test_many_keyframes_are_no_solid_bar(self):
+    def test_many_keyframes_do_not_become_a_solid_bar(self):
         header, tags = split_tags(sample_bytes("avc_only"))
         key = next(tag for tag in tags if tag[0] == 9 and tag[11] == 0x17 and tag[12] == 1)
         many = [key[:4] + (i * 1000 & 0xFFFFFF).to_bytes(3, "big") + key[7:] for i in range(7200)]

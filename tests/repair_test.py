@@ -1,4 +1,4 @@
-"""`flvdmx repair`, `index` and `cut`: files that `check` finds nothing wrong with, and that hold the same frames."""
+"""`flvdmx repair`, `index` and `cut`: new files have the same frames, and `check` finds nothing wrong with them."""
 import os
 import random
 
@@ -20,7 +20,7 @@ def time_of(tag):
 
 class Rewritten(Case):
     def rewrite(self, command, path, *options, stderr="(?s:.*)"):
-        """The new file, which must be sound."""
+        """The new file, which must not have any findings."""
         out = path.parent / "out.flv"
         self.tool(command, path, "-o", out, "--force", *options, stderr=stderr)
         self.tool("check", out)
@@ -41,7 +41,7 @@ class Repair(Rewritten):
                 self.assertEqual(self.frames(out), self.frames(sample(name)))
 
     def test_damaged_copies(self):
-        """Bytes that are changed, inserted and cut out; a copy that cannot be opened is not written."""
+        """Bytes are changed, inserted and removed; from a copy that cannot be opened, nothing is written."""
         for seed in range(0, 200, STEP):
             random.seed(seed)
             data = bytearray(sample_bytes(random.choice(SAMPLES)))
@@ -54,7 +54,7 @@ class Repair(Rewritten):
                     self.assertSamePayloads(self.rewrite("repair", path), path)
 
     def test_times(self):
-        """A recording that starts again, one with a gap, a single wrong time, and a step back that is jitter."""
+        """A recording that restarts, one with a gap, a single wrong time, and a small step back (jitter)."""
         media = [tag for tag in TAGS if tag[0] != 18]
         last = time_of(media[-1])
         for name, tags, duration in (
@@ -73,7 +73,7 @@ class Repair(Rewritten):
         self.assertEqual(self.frames(kept), self.frames(path))
 
     def test_metadata_and_configurations(self):
-        """Other properties are kept as they are, those that are wrong now replaced; each frame has its configuration."""
+        """Properties are kept unless they are wrong now; each frame has its configuration."""
         script = (b"\2\0\x0aonMetaData\x08\0\0\0\3\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09"
                   b"\0\x08duration\0\x7f\xef" + bytes(6) + b"\0\0\x09")
         config = next(tag for tag in TAGS if tag[0] == 9)
@@ -89,13 +89,13 @@ class Repair(Rewritten):
                              [tag[11:] for tag in tags if tag[0] == kind and tag[12] != 2])  # 2: end of sequence
 
     def test_late_audio(self):
-        """A stream that begins after the tags in which players look is found in the new file."""
+        """A stream that begins after the tags that players search is found in the new file."""
         media = [at(tag, time_of(tag) + 2600 * i) for i in range(3) for tag in TAGS[1:] if tag[0] == 9 or i == 2]
         out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(media)))
         self.assertEqual(sum(f[0] == "audio" for f in self.frames(out)), 109)
 
     def test_output(self):
-        """Nothing but a finished file has the name."""
+        """Only a complete file has the requested name."""
         path = self.write("in.flv", sample_bytes("avc_aac"))
         old = path.parent / "old.flv"
         old.write_bytes(b"old")
@@ -103,7 +103,7 @@ class Repair(Rewritten):
                                ((path, "-o", "/dev/full"), "No space left"),
                                ((self.write("x", b"FLV"), "-o", old, "--force"), "damaged or cut short")):
             self.tool("repair", *options, code=1, stderr=f".*{words}.*\n")
-        self.assertRegex(self.tool("repair", "--dry-run", path, "-o", old), "^would write: 63 pictures and 109 audio")
+        self.assertRegex(self.tool("repair", "--dry-run", path, "-o", old), "^would write: 63 video frames and 109 audio")
         self.assertEqual((old.read_bytes(), sorted(os.listdir(path.parent))), (b"old", ["in.flv", "old.flv"]))
         self.assertEqual(path.read_bytes(), sample_bytes("avc_aac"))
 
@@ -117,7 +117,7 @@ class IndexAndCut(Rewritten):
         self.tool("index", DATA / "damaged.flv", "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'\n")
 
     def test_cut(self):
-        """Parts that follow each other hold every frame once."""
+        """Consecutive parts contain every frame once."""
         whole = self.frames(sample("avc_aac_index"))
         path = self.write("in.flv", sample_bytes("avc_aac_index"))
         for times in (("--from", "0", "--to", "1"), ("--from", "1.3"), ("--to", "0.5")):

@@ -1,5 +1,5 @@
-// The sample files complete, growing, cut short, and damaged. What is delivered is what an independent prober found in
-// them; in every case all memory and files are released, which the fake host itself checks.
+// The sample files: complete, growing, cut short, and damaged. The library must deliver what an independent prober
+// found in them, and release all memory and files, which the fake host checks.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -23,7 +23,8 @@ const std::vector<Expected>& Samples()
     return samples;
 }
 
-// The frames whose tags are complete in the first bytes. Samples start at 0 ms, so frames have the times of their tags.
+// The frames whose tags are complete within the first `size` bytes. Samples start at 0 ms, so frames have the times of
+// their tags.
 Frames Whole(const Expected& sample, uint32_t streams, int64_t size = INT64_MAX)
 {
     Flv shown;
@@ -87,8 +88,8 @@ TEST(Samples, DeliverWhatTheProberFound)
                 }
 }
 
-// The file grows by one byte at a time: until it can be opened, with two readers until both streams can be seen, and
-// then between requests. Each frame comes with the request after its last byte.
+// The file grows by one byte at a time: first until it can be opened, with two readers until both streams are visible,
+// and then between requests. Each frame is delivered by the first request after its last byte.
 void PlayGrowing(const Expected& sample, uint32_t options)
 {
     FakeHost host(sample.bytes);
@@ -126,13 +127,13 @@ TEST(Samples, GrowByOneByteBetweenRequests)
                 PlayGrowing(sample, options);
 }
 
-// Used in turn. The last one is the slowest: the library's own frame buffer is large.
+// Used in turn. The last one is the slowest, as the library's own frame buffer is large.
 const OpenOptions g_variants[] = {
     {USER},    {USER | GROWING | SEPARATE}, {USER | SEPARATE | INDEX, false, 1024}, {USER | GROWING}, {USER, true},
     {SEPARATE}};
 constexpr size_t VARIANTS = std::size(g_variants);
 
-// More than ten thousand opens and closes on one host, each of which leaves nothing behind.
+// More than ten thousand opens and closes on one host, without a leak.
 TEST(Samples, CutAtEveryByteDeliverTheCompleteTags)
 {
     Sweep sweep;
@@ -154,7 +155,7 @@ TEST(Samples, SurviveEveryChangedByte)
     for (const Expected& sample : Samples()) {
         FakeHost host;
         for (size_t at = 0; at < std::min<size_t>(sample.bytes.size(), 2000); ++at)
-            for (const size_t value : {size_t{0}, size_t{0xFF}, at * 167 % 256}) { // any value now and then
+            for (const size_t value : {size_t{0}, size_t{0xFF}, at * 167 % 256}) { // a third value that varies
                 if (!sweep.takes_next())
                     continue;
                 SCOPED_TRACE(sample.name + " with " + std::to_string(value) + " at " + std::to_string(at));

@@ -1,4 +1,4 @@
-// Seeking: where it lands, what is delivered from there, and that a failed seek moves nothing.
+// Seeking: where it lands, what is delivered after it, and that a failed seek does not move the reader.
 
 #include "support/expected.h"
 #include "support/report.h"
@@ -17,8 +17,8 @@ using enum Site;
 
 constexpr uint32_t AUTO = 0, ONE = 0, TWO = SEPARATE, TIME = 0, INFO = 1u << 31, EACH = 1u << 30;
 constexpr int32_t UNTOUCHED = -77777;
-// What a seek chooses besides tags: nothing, the current position, a rewind, and the first tag. The last two lead to
-// the end of the file header.
+// What a seek may choose instead of a tag: nothing, the current position, a rewind, and the first tag. The last two go
+// to the end of the file header.
 constexpr int64_t NOWHERE = 0, HERE = 1, REWIND = 2, FIRST_TAG = 9;
 constexpr size_t ALL = 100000;
 constexpr int64_t NONE = -1;
@@ -32,20 +32,20 @@ size_t Elements(const Bytes& bytes, const std::string& key)
 
 Flv WithoutIndex(Flv flv)
 {
-    flv.bytes.at(Elements(flv.bytes, "keyframes") - 6) = '~'; // the property has another name then
+    flv.bytes.at(Elements(flv.bytes, "keyframes") - 6) = '~'; // changes the name of the property
     return flv;
 }
 
-// A file, its frames in order, and those that a seek may choose, with the times by which it chooses.
+// A file, its frames in order, and those that a seek may choose, with the times used to choose.
 struct Media {
     Bytes bytes;
     Frames frames;
-    uint32_t stream; // the one that is sought in
+    uint32_t stream; // the one in which seeks search
     uint32_t first_ts, last_ts = 0;
     bool by_index, audio;
     Tags tags, keys; // of the frames
 
-    // index_lag: ms by which the times in the index are too early
+    // index_lag: ms by which the times in the index are too low
     explicit Media(const Flv& flv, uint32_t index_lag = 0)
         : bytes(flv.bytes), frames(flv.frames()), stream((bytes[4] & 1) != 0 ? VIDEO : AUDIO), first_ts(flv.first_ts()),
           by_index(Elements(bytes, "keyframes") < bytes.size()), audio(!flv.frames(AUDIO).empty())
@@ -53,7 +53,7 @@ struct Media {
         std::copy_if(flv.tags.begin(), flv.tags.end(), std::back_inserter(tags), std::mem_fn(&Tag::is_frame));
         for (Tag tag : tags) {
             last_ts = std::max(last_ts, tag.timestamp);
-            if (by_index) // which holds seconds
+            if (by_index) // the index is in seconds
                 tag.timestamp = static_cast<uint32_t>((tag.timestamp - index_lag) / 1000.0 * 1000.0);
             if (tag.stream() == stream && (stream == AUDIO || tag.is_keyframe()))
                 keys.push_back(tag);
@@ -61,7 +61,7 @@ struct Media {
     }
 };
 
-// Plays and seeks, comparing every result with what follows from the lists of the media.
+// Plays and seeks, and compares every result with what follows from the lists of the media.
 struct Player {
     const Media& m;
     Session session;
@@ -71,7 +71,7 @@ struct Player {
     Player(FakeHost& host, const Media& media, const OpenOptions& options) : m(media), session(host, options) {}
 
     bool has(uint32_t option) const { return (session.ctx()->options & option) != 0; }
-    // The reader that seeks: the two are one without the option.
+    // The reader that seeks. Without the option, both are the same.
     fio_file_t* reader() const { return m.stream == VIDEO ? session.ctx()->main_reader : session.ctx()->audio_reader; }
 
     uint32_t& current() { return times.at(m.stream); }
@@ -99,7 +99,7 @@ struct Player {
             }
     }
 
-    // The position that the rules choose.
+    // The position that a seek must choose.
     int64_t choose(int32_t time, uint32_t mode)
     {
         const bool relative = (mode & REL) != 0;
@@ -118,8 +118,8 @@ struct Player {
         return (backward && !exact ? chosen - 1 : chosen)->offset;
     }
 
-    // Sets what a seek to this position leaves. In a growing file the seek does not move a separate audio reader to the
-    // picture's time.
+    // Sets the state after a seek to this position. In a growing file, the seek does not move a separate audio reader
+    // to the time of the video frame.
     void place(int64_t pos, bool rewound = false)
     {
         next.fill(at(pos));
@@ -129,7 +129,7 @@ struct Player {
         if (!has(TWO) || has(GROWING) || m.stream == AUDIO || time == m.first_ts)
             return;
         uint32_t last = 0;
-        next[2] = 0; // the last audio frame at or before the picture, or none when audio ends before it
+        next[2] = 0; // the last audio frame at or before the video frame; none if audio ends before it
         for (size_t i = 0; i < m.tags.size(); ++i) {
             last = m.tags[i].type == 8 ? m.tags[i].timestamp : last;
             next[2] = m.tags[i].type == 8 && last <= time ? i : next[2];
@@ -139,7 +139,7 @@ struct Player {
             times[AUDIO] = (last < time ? m.last_ts : m.tags[next[2]].timestamp) - m.first_ts;
     }
 
-    // Seeks, checks the result against the rules and returns the position chosen.
+    // Seeks, checks the result and returns the position chosen.
     int64_t seek(int32_t time, uint32_t mode)
     {
         int64_t chosen = choose(time, mode);
@@ -158,7 +158,7 @@ struct Player {
         chosen = rewinds ? FIRST_TAG : chosen;
         if (const int64_t pos = __FLV_DMX__fioTell64(reader()); rc == 0 && chosen != HERE) {
             place(pos, rewinds);
-            // audio may also be found at its configuration
+            // audio may also land on its configuration
             EXPECT_TRUE(m.stream == AUDIO ? at(chosen) == at(pos) : chosen == pos) << pos;
         }
         EXPECT_EQ(reached, rc == 0 ? static_cast<int32_t>(current()) : UNTOUCHED);
@@ -169,7 +169,7 @@ struct Player {
     }
 };
 
-// Seeks all over the file, plays a little after each seek, and to the end after the first seek to each position.
+// Seeks all over the file. Plays a little after each seek, and to the end after the first seek to each position.
 void SeekAround(const Media& media, const OpenOptions& options)
 {
     FakeHost host(media.bytes);
@@ -198,8 +198,8 @@ Flv Chain(uint32_t first_ts, bool index, bool video = true, uint32_t pictures = 
     return MakeChain({video, true, true, index, pictures, gop, first_ts});
 }
 
-// The first keyframe after 200 ms; configurations beside and between keyframes and ends of sequence in the middle, all
-// of them keyframes by their FrameType. Audio ends early.
+// The first keyframe comes after 200 ms. Configurations next to and between keyframes, and ends of sequence in the
+// middle, all have the FrameType of a keyframe. Audio ends early.
 Flv Configured()
 {
     Tags tags;
@@ -216,7 +216,7 @@ Flv Configured()
     return File(tags);
 }
 
-TEST(Seek, LandsWhereTheRulesSay)
+TEST(Seek, LandsOnTheRightFrame)
 {
     std::vector<Media> all = {Media(ReadExpected("avc_aac_index"), 23),
                               Media(WithoutIndex(ReadExpected("avc_aac_index")))};
@@ -228,7 +228,7 @@ TEST(Seek, LandsWhereTheRulesSay)
         all.emplace_back(flv);
     for (const Media& media : all)
         for (const uint32_t options : {ONE, TWO, INDEX, INDEX | TWO, GROWING, GROWING | TWO})
-            for (const uint32_t read_size : {0u, 4096u}) { // while scanning: the usual one, the whole cache
+            for (const uint32_t read_size : {0u, 4096u}) { // while scanning: the default, the whole cache
                 SCOPED_TRACE(testing::PrintToString(std::pair(&media - all.data(), options)));
                 if (media.by_index ? (options & GROWING) == 0 || media.first_ts == 0 : (options | TWO) == TWO)
                     SeekAround(media, {options, false, 0, read_size});
@@ -236,17 +236,17 @@ TEST(Seek, LandsWhereTheRulesSay)
 }
 
 // Failures caused by the host are in the fault sweep.
-TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
+TEST(Seek, ReportsTheTimeReachedOrTheFailure)
 {
     const Flv scan = Chain(0, false), index = Chain(0, true), audio = Chain(0, false, false);
     const Flv one_entry = Chain(0, true, true, 50, 50);
-    // The tags at 0, 200, 400, 600 and 2000 ms; the index has other times for the last three, and another position for
-    // the last.
+    // Tags at 0, 200, 400, 600 and 2000 ms; the index has wrong times for the last three, and a wrong position for the
+    // last.
     const Flv odd = IndexedFile({g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(2000)},
                                 [](auto& t, auto& p) { t[2] = 1.4, t[3] = 1.6015, t[4] = 1.8, p[4] = 1e9; });
     const std::string fewer_positions = "filepositions: [2 13 13 keyframes: { times: [5 0 0.2 0.4 0.6 0.8 }";
     const Flv two_positions = File({{18, 0, OnMetaData(fewer_positions)}, Screen(0)}, 1);
-    // The entry at 200 ms leads to position 5, where the file header reads as a tag at 0 ms.
+    // The entry at 200 ms points to position 5, where the file header looks like a tag at 0 ms.
     const Flv in_header = MakeChain({true, true, true, true, 50, 5, 0, [](auto&, auto& p) { p[1] = 5; }});
     // The first tag of one stream is later than the file's last time, so none is found; the other starts at 1538 ms.
     const auto without = [](Tags late, const auto& tag) {
@@ -257,8 +257,8 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
     const Flv no_video = without({Screen(90000)}, Pcm), mute = without({g_avc, Pcm(90000)}, Nalu);
     const Flv ended = Configured(); // audio up to 1978 ms, video up to 2360
     const int64_t end = ended.size();
-    // The times are the last bytes of the file, and it loses some of them after opening. Elements without a byte count
-    // as 0.0; with two of them in a row the index ends with its last entry, at 0 s, which is near enough to its tag at
+    // The times are the last bytes of the file, and some of them are removed after opening. A missing element counts as
+    // 0.0. If two in a row are missing, the index ends with its last entry, at 0 s, which is near enough to its tag at
     // 800 ms.
     Tags pictures = {g_avc, Nalu(0), Nalu(200), Nalu(400), Nalu(600), Nalu(800)};
     std::string positions = "filepositions: [5";
@@ -266,27 +266,27 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         positions += i++ != 0 ? " " + std::to_string(tag.offset) : "";
     pictures.push_back({18, 0, OnMetaData("keyframes: { " + positions + " times: [5 0 0.2 0.4 0.6 0.8 }")});
     const Flv cut = File(pictures, 1);
-    Flv text = index; // the positions have a string at 800 ms, the times one instead of 1600 ms
+    Flv text = index; // in the positions, the entry at 800 ms is a string, in the times the one of 1600 ms
     for (const auto& [key, element] : {std::pair("filepositions", 4 * 9), {"times", 8 * 9}})
         std::copy(g_string.begin(), g_string.end(), &text.bytes[Elements(text.bytes, key)] + element);
     const struct {
         const char* what;
         const Flv& flv;
-        uint32_t open = ONE, stream = TIME; // TIME: a time seek, else the frame seek of a stream
-        uint32_t to = 0, mode = AUTO;       // EACH: both directions, one after the other
+        uint32_t open = ONE, stream = TIME; // TIME: a time seek; otherwise a frame seek in the stream
+        uint32_t to = 0, mode = AUTO;       // EACH: both directions in turn
         std::optional<Site> site = {};      // where it fails
         int32_t rc = 0;                     // without a site
         uint32_t reached = 0;
         int64_t at = HERE;        // where the reader stands afterwards; HERE: not checked
         int64_t left = INT32_MAX; // bytes left from the times on; NONE: nothing can be read
     } rows[] = {
-        {.what = "for information", .flv = scan, .open = INFO, .to = 100, .site = SEEK_INFO_ONLY},
+        {.what = "opened for information", .flv = scan, .open = INFO, .to = 100, .site = SEEK_INFO_ONLY},
         {.what = "growing: no index", .flv = scan, .open = GROWING, .to = 100, .site = SEEK_NOT_SEEKABLE},
         {.what = "growing: no video", .flv = audio, .open = GROWING, .to = 100, .site = SEEK_NOT_SEEKABLE},
         {.what = "growing: audio", .flv = index, .open = GROWING, .stream = AUDIO, .to = 900, .rc = -1},
         {.what = "growing: fewer positions", .flv = two_positions, .open = GROWING, .to = 1900, .mode = BACK},
         {.what = "index of one entry", .flv = one_entry, .to = 100, .site = SEEK_NOT_SEEKABLE},
-        {.what = "frame seek by it", .flv = one_entry, .stream = VIDEO, .to = 900, .mode = BACK, .site = SEEK_METHOD},
+        {.what = "frame seek in it", .flv = one_entry, .stream = VIDEO, .to = 900, .mode = BACK, .site = SEEK_METHOD},
         {.what = "after the last time", .flv = scan, .to = 9000, .site = SEEK_MISS},
         {.what = "growing: after the last entry", .flv = index, .open = GROWING, .to = 9000, .site = SEEK_MISS},
         {.what = "after the last keyframe", .flv = scan, .to = 1950, .mode = FORTH, .site = SEEK_MISS},
@@ -297,7 +297,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         {.what = "1001 ms off the tag", .flv = odd, .stream = VIDEO, .to = 1601, .site = FILE_INDEX_TOLERANCE},
         {.what = "memory", .flv = odd, .open = INDEX, .stream = VIDEO, .to = 1601, .site = MEMORY_INDEX_TOLERANCE},
         {.what = "1000 ms off the tag", .flv = odd, .stream = VIDEO, .to = 1400, .mode = BACK, .reached = 400},
-        {.what = "before an entry with another time", .flv = odd, .to = 700, .mode = BACK, .reached = 200},
+        {.what = "before an entry with a wrong time", .flv = odd, .to = 700, .mode = BACK, .reached = 200},
         {.what = "string as a position", .flv = text, .stream = VIDEO, .to = 800, .site = FILE_INDEX_POSITION_TYPE},
         {.what = "string ends the times", .flv = text, .stream = VIDEO, .to = 1900, .mode = BACK, .reached = 1400},
         {.what = "position in the file header", .flv = in_header, .stream = VIDEO, .to = 200, .at = 5},
@@ -346,7 +346,7 @@ TEST(Seek, ReportsWhatItReachedOrWhereItFailed)
         }
 }
 
-TEST(Seek, InAFileThatStillGrows)
+TEST(Seek, WorksInAGrowingFile)
 {
     const Media media(Chain(0, true));
     for (const uint32_t options : {GROWING, GROWING | TWO}) {
@@ -358,20 +358,20 @@ TEST(Seek, InAFileThatStillGrows)
         EXPECT_EQ(player.session.seek(1300, BACK), -1);
         player.deliver(2);
         host.grow(1);
-        player.seek(1300, BACK); // to a tag of which no more has been written
+        player.seek(1300, BACK); // to a tag of which only these bytes have been written
         host.fail_from(HostFn::Seek, host.calls(HostFn::Seek) + 1);
-        EXPECT_EQ(player.session.frame(VIDEO).rc, -1); // and cannot go back to it, so the position is saved
+        EXPECT_EQ(player.session.frame(VIDEO).rc, -1); // nor go back to its start, so the position is saved
         host.fail_nothing();
-        player.seek(0, REL); // a seek that does not move or fails keeps it
+        player.seek(0, REL); // a seek that fails or does not move keeps it
         player.seek(9000, FORTH);
         host.grow(ALL);
         player.deliver(ALL);
     }
 }
 
-// After a seek that failed and could not go back, the next one that fails goes back to where the first started, however
-// much was played between them, unless one succeeded in between.
-TEST(Seek, GoesBackToAPositionThatItCouldNotGoBackToBefore)
+// After a seek that failed and could not go back, the next failing seek goes back to where the first one started, even
+// after frames were played, unless a seek succeeded in between.
+TEST(Seek, ReturnsToASavedPosition)
 {
     const Media media(Chain(0, false));
     for (const bool succeeds : {false, true}) {
@@ -397,7 +397,7 @@ TEST(Seek, GoesBackToAPositionThatItCouldNotGoBackToBefore)
     }
 }
 
-// Every step of a scan starts at the same position and may find the same tag again. One of these seeks never ended.
+// Every step of a scan starts at the same position and may find the same tag again, which must not loop forever.
 TEST(Seek, EndsOnAHostWhosePositionStaysTheSame)
 {
     constexpr uint64_t many = 20000; // scanning 200 tags takes a few thousand reads
@@ -436,9 +436,9 @@ TEST(Seek, BeyondFourGiB)
     for (uint32_t i = 0; i < SECONDS; ++i) {
         const Tag picture = {9, i * 1000, AvcNalu(i % 3 == 0, {7}), PICTURE + 11, PICTURE};
         const Bytes both = File({picture, {8, i * 1000 + 10, AacRaw({1, 2, 3, 4})}}).bytes;
-        const int64_t place = head + i * SECOND; // the end of the frame is a hole
-        extents[place] = Bytes(both.begin() + 13, both.begin() + 30);
-        extents[place + 11 + PICTURE] = Bytes(both.begin() + 30, both.end());
+        const int64_t position = head + i * SECOND; // the end of the frame is a hole
+        extents[position] = Bytes(both.begin() + 13, both.begin() + 30);
+        extents[position + 11 + PICTURE] = Bytes(both.begin() + 30, both.end());
     }
     for (const uint32_t options : {INFO, ONE, INDEX, GROWING}) { // the first without index
         SCOPED_TRACE(options);

@@ -1,4 +1,4 @@
-// Tag navigation: which headers are plausible, how damage is crossed, which host calls a step costs, and where the
+// Tag navigation: which headers are plausible, how searches cross damage, which host calls a step costs, and where the
 // valid data of a file ends.
 
 #include "support/report.h"
@@ -14,13 +14,13 @@ constexpr uint32_t KEY = VIDEO | FLVD_TAG_KEYFRAME, ANY = VIDEO | AUDIO | SCRIPT
 constexpr int32_t NOT_FOUND = FLVD_ERR_NOT_FOUND, ENDED = FLVD_ERR_END_OF_DATA;
 constexpr int64_t DATA_OFFSET = 9, FIRST_TAG = 13;
 constexpr uint32_t CACHE = 4096;
-constexpr int64_t MIB = 0x100000;                        // what resynchronisation covers
-constexpr int64_t WINDOW = CACHE - 12;                   // candidate starts in a cache
-constexpr int64_t SCANNED = (MIB / WINDOW + 1) * WINDOW; // what a failed scan has examined
+constexpr int64_t MIB = 0x100000;                        // the range of a resynchronisation
+constexpr int64_t WINDOW = CACHE - 12;                   // possible starts of a tag per cache
+constexpr int64_t SCANNED = (MIB / WINDOW + 1) * WINDOW; // bytes that a failed scan has examined
 
 using Found = std::tuple<int32_t, int64_t, uint32_t>; // result; position and kind on success
 
-// A reader on some bytes, with an instance that knows nothing of its streams.
+// A reader on some bytes, with an instance that has no information about the streams.
 struct Reader {
     FakeHost host;
     flvd_ctx_t ctx{};
@@ -65,24 +65,25 @@ Bytes operator+(const Bytes& front, const Tag& tag)
     return Concat({front, File({tag}).body()});
 }
 
-// A header at its bounds: found by a search that starts at it, by one that scans for it, and by one going backward.
+// A header with values at the limits, and whether it is found by a search that starts at it, by one that scans for it,
+// and by one that goes backward.
 TEST(TagHeaders, ArePlausibleUpToTheirBounds)
 {
     constexpr uint32_t ANY_CODEC = 0xFFFF, NONE = 0, STANDING = 1, SCANNING = 2, BACKWARD = 4, ALL = 7;
     const Bytes avc6 = {0x67, 1, 0, 0, 0}, last5 = {0x5F, 0}, first6 = {0x60, 0};
     const struct {
         const char* what;
-        uint32_t taken; // the searches that find it
+        uint32_t taken; // searches that find it
         Bytes data = {0x17, 1, 0, 0, 0};
         uint32_t timestamp = 5000;
-        uint32_t last_ts = 0; // 0: not known
+        uint32_t last_ts = 0; // 0: unknown
         int64_t data_end = 1000;
         uint32_t video = ANY_CODEC, audio = ANY_CODEC; // filters
         uint8_t type = 9;
     } rows[] = {
         {.what = "at the last time", .taken = STANDING | BACKWARD, .last_ts = 5000},
         {.what = "before it", .taken = ALL, .last_ts = 5001},
-        {.what = "after it", .taken = NONE, .last_ts = 4999},
+        {.what = "after the last time", .taken = NONE, .last_ts = 4999},
         {.what = "no time known", .taken = ALL, .timestamp = UINT32_MAX - 1},
         {.what = "the largest time", .taken = STANDING | BACKWARD, .timestamp = UINT32_MAX},
         {.what = "as large as all data", .taken = BACKWARD, .data_end = 5},
@@ -108,7 +109,7 @@ TEST(TagHeaders, ArePlausibleUpToTheirBounds)
 }
 
 // Many muxers write a wrong back-pointer after the first script tag, which may start up to four bytes after DataOffset.
-TEST(TagHeaders, OfAFirstScriptTagNeedNoBackPointer)
+TEST(TagHeaders, OfTheFirstScriptTagNeedNoBackPointer)
 {
     const auto expect = [](const Tag& tag, int64_t at, const Found& found) {
         Reader r(Concat({Zeros(at) + tag, Zeros(6000)}));
@@ -121,7 +122,7 @@ TEST(TagHeaders, OfAFirstScriptTagNeedNoBackPointer)
     expect({9, 0, AvcNalu(true, Noise(100)), 7}, FIRST_TAG, {ENDED, 0, 0});
 }
 
-// The kind reported depends on the kinds wanted and on the direction.
+// The kind reported depends on the requested kinds and on the direction.
 TEST(TagKinds, AreReportedInBothDirections)
 {
     constexpr uint32_t s = SCRIPT, v = VIDEO, a = AUDIO, k = KEY;
@@ -132,7 +133,7 @@ TEST(TagKinds, AreReportedInBothDirections)
     struct Row {
         const char* what;
         Tag tag;
-        Kinds any = {}, config = {}, keyframe = {}; // when all tags, configurations, or keyframes are wanted
+        Kinds any = {}, config = {}, keyframe = {}; // if all tags, configurations, or keyframes are requested
     };
     const Row rows[] = {
         {.what = "script data", .tag = g_meta, .any = {s, s}},
@@ -189,24 +190,24 @@ TEST(FindNextTag, CountsTheBytesToTheNextCandidate)
 
 // An audio tag of 20 bytes with a plausible header and a wrong back-pointer; and many of them.
 const Tag BAD{8, 0, Bytes{0xAF, 1, 0xEE, 0xEE, 0xEE}, 0xEEEEEEEE};
-constexpr int64_t BAD_SIZE = 20, CHECKS = 16384; // CHECKS: how many may fail in one search
+constexpr int64_t BAD_SIZE = 20, CHECKS = 16384; // CHECKS: may fail in one search
 const auto Bad = [](int64_t count) { return File(std::vector(static_cast<size_t>(count), BAD)).body(); };
 
-// From position 100 on: damage, then the wanted tag, which each search finds or gives up with a result.
-TEST(Resynchronisation, CoversOneMiBInAll)
+// From position 100 on: damage, then the requested tag, which each search either finds or fails to find with a result.
+TEST(Resynchronisation, CoversOneMiBInTotal)
 {
     const Bytes half = Zeros(MIB / 2 + 1000), two_gaps = Concat({half + AudioTag(), half});
     const Bytes failed = Concat({Bad(CHECKS), Zeros(30)});
-    // With a failed check every 64 bytes the whole MiB is crossed: a check costs no distance.
+    // With a failed check every 64 bytes, the whole MiB is still covered: a check does not reduce the range.
     const Bytes sparse = Concat(std::vector<Bytes>(MIB / 64 - 1, Concat({Bad(1), Zeros(64 - BAD_SIZE)})));
-    // Nor does one after which a scan finds nothing: a whole MiB is left.
+    // Nor does a check after which a scan finds nothing: a whole MiB is left.
     const Bytes gap = Concat({Bad(1), Zeros(1 + SCANNED - BAD_SIZE + MIB)});
     struct Results {
         int32_t verify = 0, next = 0, trust = 0;
     };
     constexpr Results none = {NOT_FOUND, NOT_FOUND, NOT_FOUND}, ended = {ENDED, ENDED, ENDED};
-    constexpr Results spent = {NOT_FOUND, NOT_FOUND, 0};        // the checks; a search that trusts makes none
-    constexpr Results by_place = {NOT_FOUND, ENDED, NOT_FOUND}; // a step checks where its budget ran out
+    constexpr Results spent = {NOT_FOUND, NOT_FOUND, 0};        // no checks are left; without verifying, none are made
+    constexpr Results at_limit = {NOT_FOUND, ENDED, NOT_FOUND}; // a step checks the position where its budget ran out
     const struct {
         const char* what;
         Bytes damage;
@@ -217,13 +218,13 @@ TEST(Resynchronisation, CoversOneMiBInAll)
     } rows[] = {
         {.what = "one MiB", .damage = Zeros(MIB)},
         {.what = "one byte more", .damage = Zeros(MIB + 1), .rc = none},
-        {.what = "the data ends", .damage = Zeros(MIB / 2), .rc = ended, .tag = false},
+        {.what = "the data ends within the range", .damage = Zeros(MIB / 2), .rc = ended, .tag = false},
         // No header can start in the last 12 bytes.
         {.what = "the data ends first", .damage = Zeros(MIB + 12), .rc = ended, .tag = false},
-        {.what = "the limit comes first", .damage = Zeros(MIB + 13), .rc = by_place, .tag = false},
-        {.what = "near it", .damage = Zeros(2 * MIB), .rc = by_place, .tag = false, .data_end = 101 + SCANNED + 12},
+        {.what = "the limit comes first", .damage = Zeros(MIB + 13), .rc = at_limit, .tag = false},
+        {.what = "near it", .damage = Zeros(2 * MIB), .rc = at_limit, .tag = false, .data_end = 101 + SCANNED + 12},
         {.what = "not near", .damage = Zeros(2 * MIB), .rc = none, .tag = false, .data_end = 101 + SCANNED + 13},
-        {.what = "a valid tag restores the budget of a careful search", .damage = two_gaps, .rc = {0, 0, NOT_FOUND}},
+        {.what = "a valid tag restores the checking budget", .damage = two_gaps, .rc = {0, 0, NOT_FOUND}},
         {.what = "failed checks everywhere", .damage = sparse},
         {.what = "all checks but one fail", .damage = Bad(CHECKS - 1)},
         {.what = "all checks fail", .damage = Bad(CHECKS), .rc = spent},
@@ -252,11 +253,11 @@ TEST(Resynchronisation, CoversOneMiBInAll)
     }
 }
 
-// A position query that returns another position, or a seek that fails and is not retried.
+// A position query that returns a wrong position, or a seek that fails and is not retried.
 TEST(Position, ThatDoesNotAdvanceEndsASearch)
 {
-    // Video of 65 bytes and 15 more, audio of 115 bytes in all, video; the first tag starts at FIRST_TAG. Or audio that
-    // the cache does not hold, and video.
+    // Video of 65 bytes and 15 more, audio of 115 bytes in total, video; the first tag starts at FIRST_TAG. Or audio
+    // that does not fit the cache, and video.
     const Bytes small = Zeros(FIRST_TAG) + VideoTag(65) + AudioTag() + VideoTag();
     const Bytes large = Zeros(FIRST_TAG) + AudioTag(5000) + VideoTag();
     const int64_t audio = FIRST_TAG + 80, last = audio + 115;
@@ -295,16 +296,16 @@ TEST(Position, ThatDoesNotAdvanceEndsASearch)
     }
 }
 
-TEST(PrevTag, IsNoneBeforeTheFirst)
+TEST(PrevTag, DoesNotExistBeforeTheFirst)
 {
-    Reader r(Bytes() + AudioTag()); // a back-pointer to the start of the file is no tag
+    Reader r(Bytes() + AudioTag()); // a back-pointer to the start of the file does not point to a tag
     for (const int64_t from : {DATA_OFFSET, r.end}) {
         EXPECT_EQ(r.at(from).prev(ANY), Found(FLVD_ERR_AT_FIRST_TAG, 0, 0));
         EXPECT_EQ(__FLV_DMX__fioTell64(r.file), DATA_OFFSET);
     }
 }
 
-TEST(PrevTag, GoesBackOneMiBInAll)
+TEST(PrevTag, GoesBackOneMiBInTotal)
 {
     Reader twice(Concat({Zeros(FIRST_TAG) + AudioTag(), Zeros(MIB - 1) + VideoTag(), {0}}), CACHE, 16);
     EXPECT_EQ(twice.at(twice.end).prev(AUDIO), Found(0, FIRST_TAG, AUDIO)); // the valid tag restores the budget
@@ -346,7 +347,7 @@ TEST(HostCalls, OfTheBackPointerCheck)
     }
 }
 
-// What an open finds out.
+// What an open finds.
 struct Extent {
     int64_t end; // of the valid data
     uint32_t last_ts;
@@ -368,7 +369,7 @@ void ExpectExtent(const char* what, const Bytes& file, const OpenOptions& open, 
     EXPECT_EQ(ctx.video_info.last_key_time_ms, expected.last_key_ms);
 }
 
-// Video every 40 ms, each second frame a keyframe, audio up to 782 ms.
+// Video every 40 ms, every second frame a keyframe, audio up to 782 ms.
 const ChainOptions CHAIN = {true, true, false, false, 20, 2};
 const auto Indexed = [](const IndexHook& hook) { return MakeChain({true, true, true, true, 20, 2, 0, hook}); };
 
@@ -383,13 +384,13 @@ TEST(Extent, EndsWithTheLastTag)
     ExpectExtent("100 bytes after them", with(Bytes(100, 0xEE)), {}, {.end = end, .last_ts = 782});
     ExpectExtent("3 MiB of bad tags", with(Bad(3 * MIB / BAD_SIZE)), {}, {.end = end, .last_ts = 782});
     ExpectExtent("zeros in the second half", Concat({half, Zeros(3 * MIB)}), {}, {.end = half_end, .last_ts = 5});
-    // The name and the version of the file header read as a tag size, and the last four bytes agree with it.
+    // The signature and version of the file header look like a tag size that the last four bytes agree with.
     const Bytes far = Concat({Zeros(0x4C5601 + 11 - end), {0, 0x4C, 0x56, 0x0C}});
     ExpectExtent("a back-pointer to the start of the file", with(far), {}, {.end = end, .last_ts = 782});
     // Opened for information.
     ExpectExtent("15 bytes", with(Bytes(15, 0xEE)), QUICK, {.end = end, .last_ts = 782, .method = FLVD_SEEK_NONE});
     ExpectExtent("16 bytes", with(Bytes(16, 0xEE)), QUICK, {.end = end + 16, .last_ts = 0, .method = FLVD_SEEK_NONE});
-    for (uint64_t nth = 255; nth < 275; ++nth) { // a seek of the search for the last tag
+    for (uint64_t nth = 255; nth < 275; ++nth) { // a seek in the search for the last tag
         FakeHost host(with(Zeros(3 * MIB)));
         host.fail_nth(HostFn::Seek, nth);
         Session session(host);
@@ -397,7 +398,7 @@ TEST(Extent, EndsWithTheLastTag)
     }
 }
 
-TEST(Extent, TakesTheLargestTimeOfTheLastTags)
+TEST(Extent, UsesTheLargestTimeOfTheLastTags)
 {
     const auto expect = [](const char* what, Tags tags, uint32_t audio, uint32_t last_ts) {
         for (uint32_t i = 0; i < audio; ++i)
@@ -409,7 +410,7 @@ TEST(Extent, TakesTheLargestTimeOfTheLastTags)
     expect("audio is later", {Screen(0), Screen(700)}, 1, 900);
     expect("video is later, the tenth tag from the end", {Screen(0), inter}, 9, 1700);
     expect("the eleventh", {Screen(0), inter}, 10, 900);
-    expect("audio alone: the last tag decides", {}, 2, 899);
+    expect("audio only: the last tag counts", {}, 2, 899);
 }
 
 TEST(Extent, TrimsAKeyframeIndexToTheData)
@@ -423,7 +424,7 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
     const Bytes astray =
         Indexed([&](auto&, auto& at) { at[3] = static_cast<double>(flv.size()) + 24, at[4] = 1e12; }).bytes;
     const Bytes fewer = Concat({Indexed([](auto& times, auto&) { times.resize(3); }).bytes, Bytes(100, 0xEE)});
-    // Neither the last position in the file nor the bytes after its tags lead to a tag.
+    // Neither the last position in the file nor the bytes after its tags contain a tag.
     const Bytes no_step = Concat({astray, Bytes(20, 0xEE), {0, 0, 0, 7, 0xEE}});
     for (const OpenOptions& open : {OpenOptions{INDEX}, OpenOptions{}}) {
         SCOPED_TRACE(open.options);
@@ -436,7 +437,7 @@ TEST(Extent, TrimsAKeyframeIndexToTheData)
         // One entry past the end stays.
         expect("cut in a frame", cut(34), flv.tags[34].offset, 437, 7, 480);
         expect("cut in a keyframe", cut(31), flv.tags[31].offset, 391, 6, 400);
-        // Seven times of nine bytes less.
+        // Seven times fewer, of nine bytes each.
         expect("fewer times than positions", fewer, flv.size() - 63, 782, 3, 160);
         expect("entries past the end", no_step, flv.size(), 782, 4, 240);
     }

@@ -43,7 +43,7 @@ def run(*arguments, **options):
 
 
 class Expected:
-    """What an independent prober found in a sample; times from the first timestamp, as the library gives them."""
+    """What an independent prober found in a sample; times count from the first timestamp, as in the library."""
 
     def __init__(self, name):
         lines = [line.split(" ") for line in (DATA / "expected" / f"{name}.txt").read_text().splitlines()]
@@ -94,16 +94,16 @@ class Case(unittest.TestCase):
 
     @staticmethod
     def shown(terminal):
-        """All that was written to a pseudo terminal."""
+        """Returns all that was written to a pseudo terminal."""
         shown = b""
-        with contextlib.suppress(OSError):  # a terminal that is closed on the other side ends with an error
+        with contextlib.suppress(OSError):  # reading ends with an error when the other side is closed
             while more := os.read(terminal, 10000):
                 shown += more
         os.close(terminal)
         return shown
 
     def tool(self, *arguments, code=0, stderr="", **streams):
-        """What the tool writes; it has to end with this code and to tell nothing but what the pattern says."""
+        """Returns the tool's output; its exit code must be `code`, and standard error must match the pattern."""
         result = run(*arguments, **streams)
         self.assertEqual(result.returncode, code, result.stderr)
         self.assertRegex(result.stderr, rf"\A{stderr}\Z")
@@ -133,11 +133,11 @@ class Frames(Case):
     def test_selection(self):
         frames, of, whole = AVC.frames, AVC.of, sample("avc_aac")
         start = max(k for k in AVC.keyframes if k[0] <= 1500)[2]
-        # Probing ends at the audio configuration; of streams that are apart it has seen only pictures by then.
+        # Probing ends at the audio configuration; if all audio follows the video, it has seen only video frames then.
         late = [(kind, time_ms - AVC.keyframes[0][0], *rest) for kind, time_ms, *rest in of["video"] + of["audio"]]
         self.assertLess(min(f[1] for f in late), 0)
         apart = self.write("apart.flv", APART)
-        # More unplayed tags than one request passes.
+        # More tags without frames than one request skips.
         configs = self.write("configs.flv", HEADER + b"".join([*TAGS[:40], *[TAGS[1]] * 250, *TAGS[40:]]))
         for file, arguments, wanted in (
                 (whole, "--stream video", of["video"]), (whole, "--stream audio --separate-audio", of["audio"]),
@@ -197,7 +197,7 @@ class Info(Case):
 
 
     def test_details(self):
-        """What the file tells of itself, and what a scan adds."""
+        """What the file states about itself, and what a scan adds."""
         [plain, scanned] = [json.loads(self.tool("info", "--json", *scan, sample("avc_aac_index")))["files"][0]
                             for scan in ([], ["--scan"])]
         self.assertEqual((plain["metadata"]["hasKeyframes"], plain["metadata"]["lasttimestamp"]), (True, 2.96))
@@ -246,7 +246,7 @@ class Info(Case):
                     self.tool("info", path, stderr=f".*the video is not played: .*{words}.*\n")
                 document = json.loads(self.tool("info", "--json", "--scan", path, stderr="(.*\n)?"))["files"][0]
                 [result] = json.loads(self.tool("check", "--json", path, code=1))["files"]
-                [finding] = result["findings"]  # one for all of them
+                [finding] = result["findings"]  # one finding for all of them
                 self.assertRegex(finding["text"], words)
                 self.assertEqual((document["bytes_left_out"], "video" in document),
                                  (result["lost_bytes"], scan is None))
@@ -261,7 +261,7 @@ class Info(Case):
         other = put(lambda tag: retag(tag, bytes([tag[11] & 0xF0 | 12]) + tag[12:-4]) if tag[0] == 9 else tag)
         self.assertRegex(self.tool("info", other, stderr=".*is not defined by FLV.*\n"), r"video +HEVC \(CodecID 12\)")
 
-    def test_facts_that_the_tag_headers_do_not_hold(self):
+    def test_facts_that_the_tag_headers_do_not_contain(self):
         header, [script, *tags] = split_tags(sample_bytes("pcm_only"))
         for byte, rate, size in ((0x70, 8000, 16), (0x80, 8000, 16), (0x40, 16000, 16), (0x50, 8000, 16),
                                  (0x3c, 44100, 8), (0x3e, 44100, 16)):
@@ -304,7 +304,7 @@ class Seek(Case):
                         frames = expected.frames[place[2]:] if place else []
                         self.assertEqual(frames_of(found.get("frames", [])), frames)
 
-    def test_relative_goes_from_the_last_picture_played(self):
+    def test_relative_counts_from_the_last_video_frame(self):
         current = [f for f in AVC.frames[:150] if f[0] == "video"][-1][1]
         earlier = max(k[0] for k in AVC.keyframes if k[0] <= current - 300)
         for text, time_ms, keyframe in (("-0.3", earlier, True), ("0", current, False)):
@@ -318,7 +318,7 @@ class Seek(Case):
             found = json.loads(run("seek", "--json", sample("avc_aac"), text).stdout)
             self.assertEqual(found["time_ms"], time_ms, text)
 
-    def test_misses_in_words(self):
+    def test_miss_messages(self):
         behind = (AVC.keyframes[-1][0] + 10) / 1000
         for arguments, miss, words in (
                 (["99"], "beyond_end", "seek to 0:01:39.000 missed: that is beyond the end at 0:00:0"),
@@ -364,7 +364,7 @@ class Failures(Case):
                     else:
                         self.assertEqual(found, "")
 
-    def test_stream_that_is_not_there(self):
+    def test_missing_stream(self):
         for arguments in ([], ["--separate-audio"]):
             self.assertEqual("", self.tool("frames", "--stream", "video", sample("mp3_only"), *arguments, code=1,
                                            stderr=".*the file has no video stream.*\n"))
@@ -377,12 +377,12 @@ class Failures(Case):
             self.assertTrue(subprocess.run(arguments, stdout=subprocess.PIPE).stdout.endswith(codes), closed)
             self.assertNotIn(b"flvdmx", out.read_bytes())  # the note about raw streams
 
-    def test_file_that_another_was_appended_to(self):
+    def test_two_files_in_one(self):
         frames = json_frames(self.tool("frames", "--json", self.write("two.flv", AVC_BYTES + b"".join(TAGS[:60]))))
         again = [f for f in AVC.frames if f[1] <= max(f[1] for f in frames[-40:])]
         self.assertEqual(frames, AVC.frames + again[:len(frames) - 172])
 
-    def test_wrong_use(self):
+    def test_usage_errors(self):
         for text in ("", "play FILE", "info", "info --count 1 FILE", "frames", "frames FILE FILE",
                      "frames --count x FILE", "frames --stream subtitles FILE", "frames --count -1 FILE",
                      "frames --timeout 1 FILE", "frames --follow --timeout -1 FILE", "frames --from soon FILE",
@@ -395,7 +395,7 @@ class Failures(Case):
                 told = r"flvdmx: .+\nTry 'flvdmx .*--help'\.\n"
                 self.assertEqual(self.tool(*arguments, code=2, stderr=told), "")
 
-    def test_choices_and_dashes_are_told(self):
+    def test_choices_and_dashes_are_explained(self):
         folder = self.write("-x.flv", AVC_BYTES).parent
         for arguments, words in ((["frames", "--stream", "all", "x"], "'all' is not one of: audio, video"),
                                  (["seek", "--mode", "up", "x", "1"], "not one of: auto, backward, forward"),
@@ -416,7 +416,7 @@ class Failures(Case):
 
 
 class Output(Case):
-    def test_closed_pipe_ends_quietly_and_a_full_disk_is_told(self):
+    def test_closed_pipe_ends_quietly_and_a_full_disk_is_reported(self):
         full = "flvdmx: cannot write: No space left on device\n"
         for text in ("frames FILE", "frames --json FILE", "info FILE", "frames --follow --timeout 30 FILE", "--help",
                      "--version", "extract FILE --stream video -o -", "plot FILE -o -"):
@@ -446,7 +446,7 @@ class Output(Case):
 
 
 class Follow(Case):
-    """A thread plays the writer; the file starts empty and grows in uneven steps."""
+    """A thread acts as the writer; the file starts empty and grows in uneven steps."""
 
     def follow(self, data, arguments):
         path, gate = self.write("growing.flv", b""), threading.Event()
@@ -470,7 +470,7 @@ class Follow(Case):
         return json_frames("".join(lines)), process.returncode, stderr
 
     def test_growing_file(self):
-        """Files that come whole, and writers that stop; side by side, since most wait for their timeout."""
+        """Files that are completed, and writers that stop. They run in parallel, as most wait for a timeout."""
         early = sum(f[1] <= 300 for f in AVC.frames)
         broken = r"flvdmx: .*warning: the last \d+ bytes are not a complete frame\n"
         cases = [("avc_aac", None, "4", None, ""), ("avc_aac", None, "4 --separate-audio", None, ""),
@@ -482,7 +482,7 @@ class Follow(Case):
         start = time.monotonic()
         with concurrent.futures.ThreadPoolExecutor(len(cases)) as pool:
             results = list(pool.map(lambda case: self.follow(sample_bytes(case[0])[:case[1]], case[2].split()), cases))
-        self.assertLess(time.monotonic() - start, 15)  # nobody waits behind the last frame wanted
+        self.assertLess(time.monotonic() - start, 15)  # nothing waits after the last requested frame
         for (name, size, arguments, count, words), (frames, code, stderr) in zip(cases, results):
             with self.subTest(name=name, size=size, arguments=arguments):
                 tags = Expected(name).tags[:count]
@@ -491,7 +491,7 @@ class Follow(Case):
                 self.assertEqual((code, frames), (1 if count == 0 else 0, tags))
                 self.assertRegex(stderr, rf"\A{words}\Z")
 
-    def test_file_that_comes_later(self):
+    def test_file_that_is_created_later(self):
         path = self.write("any", b"").parent / "later.flv"
         writer = threading.Timer(0.5, path.write_bytes, [AVC_BYTES])
         writer.start()

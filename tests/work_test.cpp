@@ -1,5 +1,5 @@
-// Work is bounded: what each operation costs on the worst files that we can think of, within the bounds of
-// docs/damage.md for a file of that size; and what playing, opening and seeking cost on valid files.
+// Work is limited: on the worst files that we know of, each operation stays within the limits of docs/damage.md for a
+// file of that size; and playing, opening and seeking are cheap on valid files.
 
 #include "support/report.h"
 #include "support/session.h"
@@ -14,7 +14,7 @@ namespace {
 
 constexpr uint64_t CACHE = 4096, BIG_CACHE = 1u << 20, NARROW = 16; // sizes of reads
 constexpr uint64_t MIB = 1u << 20;
-constexpr uint64_t REQUEST_CHECKS = 16384, REQUEST_TURNS = 102; // checks may fail in all turns of a request together
+constexpr uint64_t REQUEST_CHECKS = 16384, REQUEST_TURNS = 102; // per request: failed checks in total, turns
 constexpr uint64_t MOST_CALLS = 100000;                         // of one request, on the worst file that we know
 constexpr uint64_t TAIL_CURSORS = MIB + 256;                    // positions tried in the search for the last tag
 constexpr uint32_t FRAMES = 200, TINY = 80, BIG = 50000;        // of valid files; the cache does not hold BIG
@@ -60,7 +60,7 @@ Bytes Repeat(const Bytes& pattern, size_t size)
     return out;
 }
 
-/** Audio whose header byte is 8, the tag type: in a run of it every byte starts a plausible tag. */
+/** Audio whose codec byte is 8, like the tag type: in a run of these bytes, every byte starts a plausible tag. */
 WorkCase FalseHeaders(const char* name, uint32_t options, uint64_t cache, Cost pass)
 {
     const auto audio = [](uint32_t first_ts) {
@@ -80,7 +80,7 @@ WorkCase Tail(const char* name, const Bytes& pattern, size_t size, uint32_t opti
     return {name, file, options, CACHE, open, Forward(file.size()), Forward(2 * file.size())};
 }
 
-/** Bytes in which every fourth position is a back-pointer to nearby, then audio alone; repeated several times. */
+/** Bytes in which every fourth position is a back-pointer to a nearby byte, then only audio; repeated several times. */
 WorkCase Slide(const char* name, size_t size, uint64_t read_size, size_t times = 1)
 {
     const Bytes stretch = Concat({Repeat({0, 0, 0, 15}, size), MakeChain({false, true}).body()});
@@ -89,7 +89,7 @@ WorkCase Slide(const char* name, size_t size, uint64_t read_size, size_t times =
     return {name, file, 0, CACHE, back + pass, pass, back + pass + 2 * FEW * Cost{0, 6 * read_size}, read_size};
 }
 
-/** Many valid tags. The index, if there is one, leads past the end of the file. */
+/** Many valid tags. The index, if there is one, points past the end of the file. */
 WorkCase ManyTags(const char* name, bool video, size_t size, bool index, Cost tag, uint32_t options = 0)
 {
     constexpr uint64_t count = 500;
@@ -169,7 +169,7 @@ void HoldAll(const WorkCase& c)
     ASSERT_TRUE(session.opened());
     Hold("open", Taken(host), c.open);
     const bool growing = (c.options & GROWING) != 0;
-    Cost request = Forward(c.file.size(), REQUEST_CHECKS, c.cache); // in whatever turns
+    Cost request = Forward(c.file.size(), REQUEST_CHECKS, c.cache); // in any number of turns
     request.calls = std::min(request.calls, MOST_CALLS);
     Cost all;
     const auto is_left = [&] { return __FLV_DMX__fioTell64(session.ctx()->audio_reader) < host.visible(); };
@@ -200,8 +200,8 @@ TEST(Work, StaysWithinItsBoundOnTheWorstFiles)
     }
 }
 
-// 1 MiB of random bytes between tags, of which about 12,300 start a plausible header when no filter is set: any size
-// and any time will do, since the file is large and ends late.
+// 1 MiB of random bytes between tags, of which about 12,300 start a plausible header when no filter is set: the file is
+// large and ends late, so any size and time are plausible.
 TEST(Work, CrossesOneMiBOfRandomBytes)
 {
     std::mt19937 random(13);
@@ -254,7 +254,7 @@ constexpr Calls Walk(uint64_t forward, uint64_t backward)
     return {reads, 4 + forward + 2 * backward, 4 + 2 * forward + backward, CACHE + NARROW * reads};
 }
 
-// Video at 40 ms each, every twentieth frame a keyframe.
+// A video frame every 40 ms, every twentieth a keyframe.
 TEST(Work, CostsLittleOnValidFiles)
 {
     const auto opened = [](Session&) {};
@@ -265,11 +265,11 @@ TEST(Work, CostsLittleOnValidFiles)
         EXPECT_EQ(reached, 4000);
     };
     const Calls opening = HEADER + FIRST_TAGS + LAST_TAG + LAST_TIME + REWIND;
-    // Makes the estimate wrong: it leads to the tag at 3,280 ms, 38 tags before the keyframe after 4,200 ms, which is
+    // Makes the estimate wrong: it points to the tag at 3,280 ms, 38 tags before the keyframe after 4,200 ms, which is
     // 20 tags after the target. The two keyframes on the way are read twice.
     const Bytes long_text = Amf("'x^5000");
     const Calls astray = Walk(38 + 2, 20);
-    // With large tags the estimate is inside one; from the next, at 4,240 ms, the target is 6 tags back.
+    // If tags are large, the estimate is inside one; from the next, at 4,240 ms, the target is 6 tags back.
     const Calls inside = Calls{BIG / (CACHE - 12) + 1, 0, 0, BIG} + Walk(0, 6);
     // Bytes after the file header: script data and configuration, 95 in all, and the frames.
     const uint64_t tags = FRAMES + 2, tiny = 95 + FRAMES * (TINY + 20), big = 95 + FRAMES * (BIG + 20);

@@ -32,17 +32,17 @@ void Chain::Walk()
     AddAlone(m_video);
     AddAlone(m_audio);
     if (m_limits.maxGapMs && m_video.time)
-        JudgeKeyframes(m_reader.FileSize(), *m_video.time);
+        CheckKeyframes(m_reader.FileSize(), *m_video.time);
 }
 
-// One step costs one read for most tags: the back-pointer and the next header are side by side.
+// Most tags need a single read: the back-pointer and the next header are adjacent.
 int64_t Chain::Step(int64_t position)
 {
     const std::optional<Tag> tag = m_reader.At(position);
     if (!tag)
         return Resume(position, tag);
     if (IsChained(*tag)) {
-        JudgePlayed(*tag);
+        CheckPlayed(*tag);
         Take(*tag);
         return tag->End();
     }
@@ -55,7 +55,7 @@ int64_t Chain::Step(int64_t position)
     return Resume(position, tag);
 }
 
-void Chain::JudgePlayed(const Tag& tag)
+void Chain::CheckPlayed(const Tag& tag)
 {
     const std::string why = m_reader.WhyNotPlayed(tag);
     if (why.empty())
@@ -70,14 +70,15 @@ bool Chain::IsChained(const Tag& tag)
     return bytes != nullptr && BigEndian(bytes, BACK_POINTER_SIZE) == TAG_HEADER_SIZE + tag.size;
 }
 
-// Without a back-pointer to confirm it the next header must be beyond doubt: type, StreamID 0, and whole.
+// Without a back-pointer that confirms it, the next header must have a known type and StreamID 0, and its tag must be
+// complete.
 bool Chain::CouldFollow(int64_t position)
 {
     const std::optional<Tag> next = m_reader.At(position);
     return next && next->DataEnd() <= m_reader.FileSize() && next->streamId == 0;
 }
 
-// A player passes such a tag over, unless it is the first script tag. Those that follow each other have one cause.
+// Players skip such a tag, unless it is the first tag and has script data. Consecutive ones count as one cause.
 void Chain::TakeUnlinked(const Tag& tag, int64_t next)
 {
     const int64_t offset = tag.DataEnd();
@@ -110,7 +111,7 @@ int64_t Chain::Resume(int64_t position, const std::optional<Tag>& tag)
     return found->position;
 }
 
-// The end of the file holds no tag any more: its last one was cut off, or something else follows.
+// No valid tag follows: the last one is cut short, or there are other bytes at the end.
 void Chain::AddRest(int64_t position, const std::optional<Tag>& tag)
 {
     const int64_t rest = m_reader.FileSize() - position;
@@ -131,16 +132,16 @@ void Chain::Take(const Tag& tag)
 {
     ++m_tags;
     if (tag.IsConfig())
-        JudgeConfig(tag);
+        CheckConfig(tag);
     if (!tag.IsFrame())
         return;
-    JudgeTime(tag);
+    CheckTime(tag);
     if (m_limits.maxGapMs)
-        JudgeGaps(tag);
+        CheckGaps(tag);
 }
 
-// A configuration longer than the reader shows at once is none: they have a few dozen bytes.
-void Chain::JudgeConfig(const Tag& tag)
+// A configuration that does not fit the reader's cache cannot be valid: they have a few dozen bytes.
+void Chain::CheckConfig(const Tag& tag)
 {
     const uint32_t size = tag.size - std::min(tag.size, tag.CodecHeaderSize());
     const uint8_t* const bytes = m_reader.Bytes(tag.position + TAG_HEADER_SIZE + tag.CodecHeaderSize(), size);
@@ -153,7 +154,7 @@ void Chain::JudgeConfig(const Tag& tag)
     config.assign(bytes, bytes + size);
 }
 
-void Chain::JudgeTime(const Tag& tag)
+void Chain::CheckTime(const Tag& tag)
 {
     Lane& lane = LaneOf(tag);
     const Times::Step step = m_times.Take(tag.Stream(), tag.timestamp);
@@ -169,7 +170,7 @@ void Chain::JudgeTime(const Tag& tag)
     }
     if (step == Times::Step::pause)
         lane.odd.reset();
-    AddAlone(lane); // another tag follows, and no jump
+    AddAlone(lane); // the odd tag was not followed by a jump
     if (step == Times::Step::odd)
         lane.odd = here;
     else if (step == Times::Step::back || (step == Times::Step::alone && !known))
@@ -180,7 +181,7 @@ void Chain::JudgeTime(const Tag& tag)
                                     FormatTime(tag.timestamp)));
 }
 
-// Both streams jump where a recording was cut or started again: that is one finding.
+// Where a recording was cut or restarted, both streams jump: that is one finding.
 void Chain::AddJump(const Jump& jump)
 {
     constexpr int64_t TOGETHER_MS = 1000;
@@ -208,7 +209,7 @@ void Chain::AddAlone(Lane& lane)
                    {{"stream", stream}, {"from_ms", odd->from}, {"to_ms", odd->tag.timestamp}});
 }
 
-void Chain::JudgeKeyframes(int64_t position, int64_t time)
+void Chain::CheckKeyframes(int64_t position, int64_t time)
 {
     if (m_keyframe && time - *m_keyframe > *m_limits.maxGapMs)
         m_findings.Add("keyframe_distance", "all", position,
@@ -216,13 +217,13 @@ void Chain::JudgeKeyframes(int64_t position, int64_t time)
     m_keyframe = time;
 }
 
-// By times that continue after jumps.
-void Chain::JudgeGaps(const Tag& tag)
+// Compares times that are continuous across jumps.
+void Chain::CheckGaps(const Tag& tag)
 {
     const int64_t time = m_times.Time();
     LaneOf(tag).time = time;
     if (tag.IsVideo() && !tag.IsExtended() && (tag.IsKeyframe() || !m_keyframe))
-        JudgeKeyframes(tag.position, time);
+        CheckKeyframes(tag.position, time);
     if (!m_video.time || !m_audio.time)
         return;
     const int64_t lead = *m_audio.time - *m_video.time;

@@ -37,11 +37,11 @@ struct Subject {
     std::string name;
     std::optional<Input> input{};
     Findings findings{};
-    std::optional<FileError> error{}; // why it is not open
+    std::optional<FileError> error{}; // why it could not be opened
 };
 
-// A file that cannot be played may still open as a growing file, which has to meet fewer conditions. Then its tags can
-// be checked.
+// A file that cannot be played may still open as a growing file, which has fewer requirements. Then its tags can be
+// checked.
 Subject Open(const std::string& name)
 {
     Subject subject{name};
@@ -62,7 +62,7 @@ Subject Open(const std::string& name)
 
 Json CheckTags(Subject& subject, const CheckOptions& options, const Chain::Progress& progress)
 {
-    const Input input = std::move(*std::exchange(subject.input, std::nullopt)); // closed at the end
+    const Input input = std::move(*std::exchange(subject.input, std::nullopt)); // closed on return
     Findings& findings = subject.findings;
     TagReader reader(input);
     Limits limits{static_cast<int64_t>(options.jumpSeconds * MS_PER_SECOND)};
@@ -131,8 +131,8 @@ std::string Text(const std::string& file, const Json& result)
 }
 
 // Checks files on several threads and returns the results in order. All files are opened first, since no open may run
-// at the same time as other calls. An exception, for instance because the output pipe was closed, ends the threads
-// soon.
+// at the same time as other calls. An exception, for instance because the output pipe was closed, soon stops the
+// threads.
 class Crew {
 public:
     Crew(std::vector<Subject> subjects, const CheckOptions& options) : m_subjects(std::move(subjects))
@@ -171,7 +171,7 @@ private:
     std::atomic<bool> m_stopped{false};
 };
 
-// Prints the results as they come, or collects them for the JSON document.
+// Prints each result as soon as it is available, or collects them for the JSON document.
 class Results {
 public:
     explicit Results(const CheckOptions& options) : m_options(options) {}
@@ -235,7 +235,7 @@ void CheckInParallel(const std::vector<std::string>& files, const CheckOptions& 
     }
 }
 
-// The files in a folder and below it that are FLV by their first bytes or their name.
+// The files in a folder and its subfolders that are FLV by their first bytes or their name.
 std::vector<std::string> FilesIn(const std::string& folder)
 {
     std::vector<std::string> files;
@@ -254,7 +254,7 @@ std::vector<std::string> FilesIn(const std::string& folder)
     if (failure)
         throw FileError(folder, fmt::format("cannot be read: {}", failure.message()));
     if (files.empty())
-        throw FileError(folder, "there is no FLV file in this folder");
+        throw FileError(folder, "this folder contains no FLV file");
     if (others > 0)
         Complain(folder,
                  fmt::format("note: skipped {} that {} not FLV", Plural(others, "file"), others == 1 ? "is" : "are"));

@@ -12,7 +12,7 @@ namespace tool {
 namespace {
 
 constexpr uint32_t ESCAPED_OBJECT_TYPE = 31;
-constexpr uint32_t SBR_OBJECT_TYPE = 5; // HE-AAC: output rate and the core's own type follow
+constexpr uint32_t SBR_OBJECT_TYPE = 5; // HE-AAC: output rate and core type follow
 constexpr uint32_t PS_OBJECT_TYPE = 29; // HE-AAC version 2, likewise
 
 // Reads a configuration bit by bit; bits past its end are 0.
@@ -41,7 +41,7 @@ public:
             return Take(EXPLICIT_BITS);
         return index < FREQUENCIES.size() ? FREQUENCIES[index] : 0;
     }
-    // ue(v) of ISO/IEC 14496-10, 9.1. A code without end is cut off after the last bit.
+    // ue(v) of ISO/IEC 14496-10, 9.1. A code that never ends is cut off after the last bit.
     uint32_t TakeExpGolomb()
     {
         uint32_t zeros = 0;
@@ -72,11 +72,11 @@ std::vector<uint8_t> RemovePrevention(flvdmx::Bytes unit)
 
 void SkipScalingLists(Bits& bits, uint32_t count)
 {
-    constexpr uint32_t SMALL_LISTS = 6; // of 16 values; the others have 64
+    constexpr uint32_t SMALL_LISTS = 6; // those of 16 values; the others have 64
     for (uint32_t list = 0; list < count; ++list) {
         if (bits.Take(1) == 0)
             continue;
-        uint32_t next = 8; // modulo 256; after a 0 no more differences follow
+        uint32_t next = 8; // modulo 256; 0 ends the list of differences
         for (uint32_t size = list < SMALL_LISTS ? 16 : 64; size > 0 && next != 0; --size) {
             const uint32_t code = bits.TakeExpGolomb();
             next = (next + (code % 2 != 0 ? (code + 1) / 2 : 0U - code / 2)) & 0xFF;
@@ -84,8 +84,8 @@ void SkipScalingLists(Bits& bits, uint32_t count)
     }
 }
 
-// Takes what only the profiles above Main and Extended have. Returns ChromaArrayType: 0 monochrome or separate planes,
-// 1 4:2:0, 2 4:2:2, 3 4:4:4.
+// Reads the fields that only the High profiles have. Returns ChromaArrayType: 0 monochrome or separate planes, 1 4:2:0,
+// 2 4:2:2, 3 4:4:4.
 uint32_t TakeChromaFormat(Bits& bits)
 {
     constexpr uint32_t CHROMA_444 = 3;
@@ -113,11 +113,11 @@ void SkipPictureOrder(Bits& bits)
         bits.TakeExpGolomb(); // offset_for_ref_frame
 }
 
-// Size after cropping by the first sequence parameter set (ISO/IEC 14496-10, 7.3.2.1.1) of the record.
+// Size after cropping, from the first sequence parameter set (ISO/IEC 14496-10, 7.3.2.1.1) of the record.
 PictureSize AvcPictureSize(flvdmx::Bytes record)
 {
     constexpr size_t SET_LENGTH = 6;            // offset of the length of the first set
-    constexpr uint32_t MOST_MACROBLOCKS = 1024; // of a side; more comes from damage
+    constexpr uint32_t MOST_MACROBLOCKS = 1024; // per side; a larger value comes from damage
     constexpr std::array<uint32_t, 13> WITH_CHROMA_FORMAT = {44,  83,  86,  100, 110, 118, 122,
                                                              128, 134, 135, 138, 139, 244};
     const size_t length = size_t{record[SET_LENGTH]} << 8 | record[SET_LENGTH + 1];

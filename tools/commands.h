@@ -1,5 +1,5 @@
-// The commands of the tool. Each returns the exit status, DONE or FAILED; a failure that ends the work on its only file
-// is thrown as FileError.
+// The commands of the tool. Each returns the exit status, DONE or FAILED. Commands that take a single file throw
+// FileError when it fails.
 #ifndef FLVDMX_TOOLS_COMMANDS_H
 #define FLVDMX_TOOLS_COMMANDS_H
 
@@ -44,7 +44,7 @@ struct SeekOptions {
     uint32_t direction = FLVD_SEEK_BACKWARD; /**< FLVD_SEEK_BACKWARD, _FORWARD, or 0: automatic */
     uint32_t mode = 0;                       /**< other FLVD_SEEK_* bits */
     uint64_t play = 0;                       /**< frames to read before the seek */
-    uint64_t count = 5;                      /**< frames to show from where it landed */
+    uint64_t count = 5;                      /**< frames to show after the seek */
     bool separateAudio = false;
     bool json = false;
 };
@@ -57,11 +57,11 @@ struct ExtractOptions {
 };
 
 struct CheckOptions {
-    std::vector<std::string> files; /**< and folders */
+    std::vector<std::string> files; /**< may be folders */
     bool json = false;
     uint32_t jobs = 1;                   /**< files to check at the same time */
     double jumpSeconds = 10;             /**< a larger step from one frame of a stream to the next is a jump */
-    std::optional<double> maxGapSeconds; /**< allowed between keyframes, and between audio and video in the file */
+    std::optional<double> maxGapSeconds; /**< largest distance of keyframes, and of audio and video in the file */
 };
 
 struct PlotOptions {

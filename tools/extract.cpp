@@ -53,8 +53,8 @@ public:
     {
         if (frame.config_changed())
             if (const std::string refusal = m_format->Configure(frame.new_config); !refusal.empty())
-                Complain(m_file,
-                         fmt::format("warning: before byte {}: {}; the previous one is used", frame.position, refusal));
+                Complain(m_file, fmt::format("warning: before byte {}: {}; the previous configuration stays in use",
+                                             frame.position, refusal));
         m_bytes.clear();
         if (const char* const fault = m_format->Convert(frame, m_bytes); fault != nullptr && m_faults++ == 0) {
             m_fault = fault;
@@ -64,7 +64,7 @@ public:
         ++m_frames;
     }
 
-    // A stream without frames leaves no file. @return true when there is one
+    // Completes the file; a stream without frames leaves none. @return true if there were frames
     bool Finish()
     {
         if (m_faults > 0)
@@ -89,7 +89,7 @@ public:
     }
 
 private:
-    // The header states the largest size until the real one is known; in a pipe it cannot be corrected.
+    // Until the size is known, the header states the largest one; in a pipe it cannot be corrected.
     void Open(const std::string& path, bool force)
     {
         m_out = std::make_unique<OutputFile>(path, m_file, force);
@@ -125,7 +125,7 @@ std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input
                                                 StreamName(static_cast<flvdmx::Stream>(options.streams)), missing));
     if (options.out == STANDARD_STREAM && writers.size() > 1)
         throw FileError(input.name,
-                        "standard output takes one stream: select it with --stream video or --stream audio");
+                        "standard output takes only one stream: select it with --stream video or --stream audio");
     return writers;
 }
 

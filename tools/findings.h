@@ -10,12 +10,13 @@
 
 namespace tool {
 
-/** One finding per cause, with a count. Only the first ones are kept, which bounds the memory for a ruined file. */
+/** One finding per cause, with a count. Only the first ones are kept, which limits the memory for a very damaged file.
+ */
 class Findings {
 public:
     /**
      * @param kind   name of the kind, such as "gap"
-     * @param cause  findings of one kind with the same cause become one; empty: this one stands alone
+     * @param cause  findings of one kind with the same cause are combined; empty: not combined with others
      * @param offset position in the file
      * @param text   description for people
      * @param more   further members for programs
@@ -23,7 +24,7 @@ public:
     void Add(const char* kind, const std::string& cause, int64_t offset, const std::string& text,
              const Json& more = Json::object());
 
-    /** Adds something that is worth knowing but not a fault. */
+    /** Adds something that is worth knowing but is not a fault. */
     void Note(const char* kind, int64_t offset, const std::string& text);
 
     /** Counts bytes that are not played. */
@@ -33,7 +34,7 @@ public:
     void WriteTo(Json& object) const;
 
 private:
-    uint64_t m_total = 0; // findings, each counted once
+    uint64_t m_total = 0; // findings, combined ones counted once
     int64_t m_lost = 0;
     Json m_counts = Json::object();
     Json m_list = Json::array();

@@ -20,7 +20,7 @@ using flvdmx::Bytes;
 constexpr size_t FILE_HEADER_SIZE = 9;
 constexpr uint8_t HAS_AUDIO = 4; // TypeFlags
 constexpr uint8_t HAS_VIDEO = 1;
-constexpr size_t INDEX_MAX = 65536; // entries; of more keyframes every second, third and so on is listed
+constexpr size_t INDEX_MAX = 65536; // entries; with more keyframes, every nth one is listed
 constexpr double MS_PER_SECOND = 1000;
 
 // AMF0 type markers.
@@ -87,7 +87,7 @@ Buffer TagHeader(uint8_t type, size_t dataSize, uint32_t timestamp)
     return header;
 }
 
-// Steps over AMF0 values. Once one is damaged or cut short, everything fails.
+// Skips AMF0 values. After one that is damaged or cut short, every call fails.
 class ScriptReader {
 public:
     explicit ScriptReader(Bytes bytes) : m_bytes(bytes) {}
@@ -283,7 +283,7 @@ std::vector<uint8_t> FlvLayout::Beginning(const std::vector<ScriptProperty>& pro
     out.push_back(static_cast<uint8_t>((m_hasAudio ? HAS_AUDIO : 0) | (m_hasVideo ? HAS_VIDEO : 0)));
     PutInteger(out, FILE_HEADER_SIZE, 4);
     PutInteger(out, 0, BACK_POINTER_SIZE);                   // PreviousTagSize0
-    const size_t size = ScriptPayload(properties, 0).size(); // the same for all positions
+    const size_t size = ScriptPayload(properties, 0).size(); // does not depend on the positions
     const uint64_t firstTag = out.size() + TAG_HEADER_SIZE + size + BACK_POINTER_SIZE;
     Put(out, TagHeader(FLVD_TAG_TYPE_SCRIPT, size, 0));
     Put(out, ScriptPayload(properties, firstTag));

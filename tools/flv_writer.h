@@ -20,11 +20,11 @@ struct NewTag {
     uint32_t timestamp = 0; /**< ms */
     flvdmx::Bytes header;   /**< codec header, or empty if `payload` includes it */
     flvdmx::Bytes payload;
-    bool frame = false;    /**< its time counts for the duration */
+    bool frame = false;    /**< its time contributes to the duration */
     bool keyframe = false; /**< listed in the index */
 };
 
-/** A property of onMetaData, its value as AMF0 bytes. */
+/** A property of onMetaData, with its value as AMF0 bytes. */
 struct ScriptProperty {
     std::string name;
     std::vector<uint8_t> value;
@@ -39,7 +39,7 @@ bool IsMetadata(flvdmx::Bytes payload);
 /** @return a property with this number */
 ScriptProperty NumberProperty(std::string_view name, double value);
 
-/** Measures the tags of a file, and makes what comes before them. */
+/** Measures the tags of a file, and builds the header and metadata that come before them. */
 class FlvLayout {
 public:
     /** Adds the next tag of the file. */
@@ -47,15 +47,14 @@ public:
 
     bool HasVideo() const { return m_hasVideo; }
     bool HasAudio() const { return m_hasAudio; }
-    /** @return ms */
+    /** @return the duration in ms */
     uint32_t Duration() const { return m_lastTimestamp - std::min(m_firstTimestamp, m_lastTimestamp); }
     size_t Keyframes() const { return m_keyframes.size(); }
     uint64_t Size() const { return m_size; } /**< bytes of the tags */
 
     /**
-     * @return the file header and the onMetaData tag with `properties`. Properties that depend on the tags replace
-     * those given: duration, filesize, lasttimestamp, lastkeyframetimestamp, and keyframes, an index of at most 65,536
-     *         entries.
+     * @return the file header and the onMetaData tag with `properties`. Those that depend on the tags are replaced:
+     * duration, filesize, lasttimestamp, lastkeyframetimestamp, and keyframes, an index of at most 65,536 entries.
      */
     std::vector<uint8_t> Beginning(const std::vector<ScriptProperty>& properties) const;
 

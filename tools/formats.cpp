@@ -52,7 +52,7 @@ public:
 
     const char* Convert(const flvdmx::Frame& frame, Buffer& out) override
     {
-        constexpr const char* FAULT = "NAL units that do not fit their frame";
+        constexpr const char* FAULT = "NAL units that exceed their frame";
         if (m_pending && (frame.keyframe || !m_begun)) {
             Append(out, m_parameterSets);
             m_pending = false;
@@ -96,14 +96,14 @@ private:
 };
 
 // AAC as an audio data transport stream (ISO/IEC 13818-7, 14496-3): a header before every frame. For HE-AAC it
-// describes the core; decoders find the extension in the frames.
+// describes the core; decoders detect the extension in the frames.
 class Adts : public StreamFormat {
 public:
     Adts() : StreamFormat("aac") {}
 
     std::string Configure(flvdmx::Bytes config) override
     {
-        if (config.empty()) // it may still follow
+        if (config.empty()) // it may still arrive
             return {};
         const AacConfig aac = ParseAacConfig(config);
         if (std::string refusal = Refusal(aac); !refusal.empty())
@@ -112,11 +112,11 @@ public:
         return {};
     }
 
-    // Syncword, MPEG-4, no checksum; a buffer fullness of all ones, for a variable rate; one raw data block.
+    // Syncword, MPEG-4, no checksum; a buffer fullness of all ones means a variable rate; one raw data block.
     const char* Convert(const flvdmx::Frame& frame, Buffer& out) override
     {
         constexpr uint32_t HEADER_SIZE = 7;
-        constexpr uint32_t MOST_BYTES = 0x1FFF; // 13 bits, header included
+        constexpr uint32_t MOST_BYTES = 0x1FFF; // 13 bits, including the header
         if (frame.data.empty())
             return nullptr;
         if (m_fixed == 0)
@@ -156,7 +156,7 @@ private:
     uint32_t m_fixed = 0; // the first 32 bits without the size; 0 until there is a configuration
 };
 
-// PCM as RIFF/WAVE. SoundFormat 0 has the byte order of the machine that wrote it, in practice little-endian.
+// PCM as RIFF/WAVE. SoundFormat 0 uses the byte order of the machine that wrote it, in practice little-endian.
 class Wav : public StreamFormat {
 public:
     Wav(const flvdmx::AudioInfo& audio, uint32_t bits)
@@ -169,7 +169,7 @@ public:
         constexpr uint32_t AFTER_SIZE = 36; // bytes of the header after the size of the file
         constexpr uint32_t FORMAT_SIZE = 16;
         constexpr uint32_t PCM = 1;
-        constexpr uint64_t MOST = std::numeric_limits<uint32_t>::max() - AFTER_SIZE; // longer files play up to here
+        constexpr uint64_t MOST = std::numeric_limits<uint32_t>::max() - AFTER_SIZE; // more cannot be played
         const auto size = static_cast<uint32_t>(std::min(bytes, MOST));
         const uint32_t frame = m_channels * m_bits / 8;
         Buffer header;

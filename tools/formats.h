@@ -21,17 +21,17 @@ public:
 
     const std::string& Extension() const { return m_extension; }
 
-    /** Sets the codec configuration of the frames that follow. @return why that is not possible, in which case the
-     *  previous one stays in force; empty on success */
+    /** Sets the codec configuration of the frames that follow. @return why it was rejected, in which case the previous
+     *  one stays in use; empty on success */
     virtual std::string Configure(flvdmx::Bytes config);
 
     /** @return the header of a stream whose frames have this many bytes */
     virtual std::vector<uint8_t> Header(uint64_t bytes) const;
 
-    /** Appends a frame to `out`. @return what had to be skipped of it; null when nothing had to be */
+    /** Appends a frame to `out`. @return what part of it had to be skipped; null if none */
     virtual const char* Convert(const flvdmx::Frame& frame, std::vector<uint8_t>& out);
 
-    /** @return true when the frames are written as they are, which no player accepts */
+    /** @return true if the bare frames are written, which no player accepts */
     virtual bool IsRaw() const { return false; }
 
 private:
@@ -47,7 +47,7 @@ constexpr bool IsPcm(flvdmx::AudioCodec codec)
 /** @return bits per sample of an input with PCM audio */
 uint32_t PcmSampleSize(const Input& input);
 
-/** @return the format for a stream of the input: AVC as Annex B, AAC as ADTS, PCM as WAV, MP3 as it is, others raw */
+/** @return the format for a stream of the input: AVC as Annex B, AAC as ADTS, PCM as WAV, MP3 unchanged, others raw */
 std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream);
 
 } // namespace tool

@@ -89,7 +89,7 @@ void FrameSource::Refresh()
 
 void FrameSource::Fill(Lane& lane)
 {
-    if (!lane.asked || lane.ended || lane.frame)
+    if (!lane.wanted || lane.ended || lane.frame)
         return;
     const std::optional<flvdmx::Frame> frame = NextFrame(m_input, lane.stream);
     lane.ended = !frame;

@@ -12,11 +12,11 @@
 
 namespace tool {
 
-/** What is reported of a frame. */
+/** What is reported about a frame. */
 struct FrameRecord {
     flvdmx::Stream stream;
     bool keyframe;
-    int64_t timeMs;   /**< from the first timestamp; negative when the tag is before it */
+    int64_t timeMs;   /**< from the first timestamp; negative if the tag's is lower */
     int64_t shownMs;  /**< presentation time */
     size_t size;      /**< bytes */
     int64_t position; /**< of the tag in the file */
@@ -33,29 +33,29 @@ struct FrameRecord {
     static const char* const CSV_HEADING;
 };
 
-/** Delivers the frames of an input; of one with a separate audio reader it merges the two streams by time. */
+/** Delivers the frames of an input. If it has a separate audio reader, merges the two streams by time. */
 class FrameSource {
 public:
     using Frame = std::optional<FrameRecord>;
 
     /** @param input borrowed
      *  @param streams FLVD_STREAM_* bits of the frames wanted
-     *  @param losses borrowed, takes the frames of a single reader; may be null */
+     *  @param losses borrowed, receives the frames of a single reader; may be null */
     FrameSource(Input& input, uint32_t streams, Losses* losses = nullptr);
 
-    /** @return the next frame; nothing at the end of the data, which a growing file may pass later. Throws
+    /** @return the next frame; nothing at the end of the data, which a growing file may extend later. Throws
      *          FileError */
     Frame Next();
 
-    /** The file has grown: streams that were at their end are asked again. */
+    /** Call it after the file has grown: streams that were at their end are read again. */
     void Refresh();
 
 private:
-    // With two readers each stream is asked one frame ahead, to know which one is next. A stream at its end does
-    // not hold up the other one.
+    // With two readers, each stream is read one frame ahead, to know which frame is next. A stream at its end does not
+    // delay the other one.
     struct Lane {
         flvdmx::Stream stream;
-        bool asked;
+        bool wanted;
         bool ended = false;
         Frame frame{};
     };
@@ -70,7 +70,7 @@ private:
     Lane m_audio;
 };
 
-/** What becomes of the frames of a stream that starts too late for the open to find it. */
+/** What happens to the frames of a stream that starts too late for the open to find it. */
 enum class LateStreams { skipped, delivered };
 
 /** @return the next frame in the file, valid until the next call; nothing at the end. Throws FileError */

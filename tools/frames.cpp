@@ -42,7 +42,7 @@ public:
     {
     }
 
-    // Waits until the file is larger than it was the last time; false when it did not grow for the timeout.
+    // Waits until the file has grown since the last call. Returns false after the timeout.
     bool Wait()
     {
         const auto start = std::chrono::steady_clock::now();
@@ -65,7 +65,7 @@ private:
     int64_t m_size;
 };
 
-// Prints the frames of the wanted range, and knows when no more of them can come.
+// Prints the frames of the requested range, and knows when no more can follow.
 class FramePrinter {
 public:
     FramePrinter(const FramesOptions& options, uint32_t streams)
@@ -88,7 +88,7 @@ public:
 
     bool Started() const { return m_started; }
 
-    // There is no later frame: one that is exactly at the time sought may have waited for it.
+    // Prints a held frame that is exactly at the requested time, if no later frame has released it.
     void Finish()
     {
         const auto sought = [this](const FrameRecord& frame) { return frame.timeMs == *m_options.fromMs; };
@@ -97,8 +97,8 @@ public:
     }
 
 private:
-    // Until the time sought comes, the frames since the last keyframe are kept: the range begins there. Without video
-    // it begins at that time.
+    // Until the requested time is reached, keeps the frames from the last keyframe on: the range begins there. Without
+    // video, it begins at the requested time.
     void Hold(const FrameRecord& frame)
     {
         const bool video = (m_streams & FLVD_STREAM_VIDEO) != 0;
@@ -146,7 +146,7 @@ private:
     bool m_started;
     std::vector<FrameRecord> m_held;
     uint64_t m_number = 0;
-    Times m_times; // a single wrong time does not end the range
+    Times m_times; // prevents a single wrong time from ending the range
     Progress m_progress;
 };
 
@@ -163,7 +163,7 @@ uint32_t WantedStreams(const FramesOptions& options)
     return options.keyframes ? options.streams & FLVD_STREAM_VIDEO : options.streams;
 }
 
-// Where no seek gets through, as in much damage, the file is read from its beginning: the printer waits for the time.
+// If every seek fails, as in large damage, the file is read from the beginning: the printer waits for the time.
 void SeekToStart(Input& input, int32_t ms)
 {
     const flvdmx::error error = input.file.seek(flvdmx::Milliseconds(ms), flvdmx::SeekMode::backward).error();
@@ -174,7 +174,7 @@ void SeekToStart(Input& input, int32_t ms)
                         error);
 }
 
-// With two readers the frames come by time: what is between them is looked at in another pass, in file order.
+// Two readers deliver frames by time. What was skipped between them is found in another pass, in file order.
 void WarnOfLossApart(const std::string& file)
 {
     flvdmx::Options options;
@@ -210,7 +210,7 @@ void PrintComplete(const FramesOptions& options)
     ReadProgress progress(input.name, input.info.size);
     while (!printer.Done()) {
         const std::optional<FrameRecord> frame = source.Next();
-        progress.Hide(); // it shows only what takes long
+        progress.Hide(); // it is shown only while nothing is printed
         if (!frame)
             break;
         printer.Take(*frame);
@@ -224,8 +224,8 @@ void PrintComplete(const FramesOptions& options)
     losses.Warn();
 }
 
-// Opens as soon as the file is there and holds enough. With two readers a stream that was not found at the open is
-// never played, so that open waits for all streams that the file header promises.
+// Opens the file as soon as it exists and contains enough. With two readers, a stream that the open did not find is
+// never played, so the open waits for all streams that the file header announces.
 Input OpenGrowing(const FramesOptions& options, Growth& growth)
 {
     for (;;) {
@@ -256,7 +256,7 @@ void WarnOfRest(const Input& input, const Growth& growth)
 void PrintGrowing(const FramesOptions& options)
 {
     if (options.file == STANDARD_STREAM)
-        throw FileError(options.file, "cannot be followed: name the file that is being written");
+        throw FileError(options.file, "cannot be followed: give the name of the file that is being written");
     Growth growth(options.file, options.timeoutSeconds);
     Input input = OpenGrowing(options, growth);
     const uint32_t wanted = WantedStreams(options);

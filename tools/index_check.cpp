@@ -1,4 +1,4 @@
-// The keyframe index against the file. It is read where it is: a long one takes no memory.
+// Compares the keyframe index with the file. It is read in place, so a long one takes no memory.
 #include "tools/chain.h"
 
 #include <algorithm>
@@ -43,21 +43,21 @@ std::string TimeText(double seconds)
     return std::abs(seconds) < MOST_SECONDS ? FormatTime(std::llround(seconds * 1000)) : fmt::format("{} s", seconds);
 }
 
-// What is wrong with an entry: the word for it, which is the same for all entries with that fault, and the text.
+// What is wrong with an entry: the cause, which is the same for all entries with that fault, and the text.
 struct Fault {
     const char* cause;
     std::string text;
 };
 
-std::optional<Fault> Judge(TagReader& reader, double seconds, double position)
+std::optional<Fault> FaultOf(TagReader& reader, double seconds, double position)
 {
-    // Also when it is not a number.
+    // Also true for NaN.
     if (!(position >= 0 && position < static_cast<double>(reader.FileSize())))
-        return Fault{"outside", fmt::format("leads to byte {:.15g}, which the file does not have", position)};
+        return Fault{"outside", fmt::format("points to byte {:.15g}, which is not in the file", position)};
     const std::optional<Tag> tag = reader.At(static_cast<int64_t>(position));
-    // The configuration may be there instead of the first keyframe.
+    // The first entry may point to the configuration instead of the first keyframe.
     if (!tag || !(tag->IsKeyframe() || (tag->IsAvc() && tag->IsConfig())))
-        return Fault{"place", fmt::format("leads to byte {:.15g}, where there is no keyframe", position)};
+        return Fault{"position", fmt::format("points to byte {:.15g}, where there is no keyframe", position)};
     if (!(std::abs(seconds * 1000 - tag->timestamp) <= MOST_DIFFERENCE_MS))
         return Fault{"time", fmt::format("states {}, but the keyframe at byte {:.15g} has {}", TimeText(seconds),
                                          position, FormatTime(tag->timestamp))};
@@ -85,11 +85,11 @@ void CheckIndex(const Input& input, TagReader& reader, Findings& findings)
         const int64_t offset = index.positions_offset + int64_t{NUMBER_SIZE} * i;
         const std::optional<double> time = NumberAt(reader, index.times_offset, i);
         const std::optional<double> position = NumberAt(reader, index.positions_offset, i);
-        if (!time || !position) { // the array is not as long as it says
+        if (!time || !position) { // the array ends before its stated length
             findings.Add("index", "", offset, fmt::format("index entry {} is not a number", i + 1), {{"entry", i + 1}});
             return;
         }
-        if (const std::optional<Fault> fault = Judge(reader, *time, *position))
+        if (const std::optional<Fault> fault = FaultOf(reader, *time, *position))
             findings.Add("index", fault->cause, offset, fmt::format("index entry {} {}", i + 1, fault->text),
                          {{"entry", i + 1}});
     }

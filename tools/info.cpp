@@ -29,7 +29,7 @@ struct Subject {
     const Input& input;
     flvdmx::Metadata metadata{};
     std::optional<FileScan> scan{};
-    std::string noVideo{}; // why none is played, though the file has some or announces it
+    std::string noVideo{}; // why none is played, although the file contains or announces it
     std::string noAudio{};
 };
 
@@ -41,17 +41,17 @@ uint64_t DataRate(const Subject& subject)
     return duration.count() <= 0 ? 0 : bits / static_cast<uint64_t>(duration.count());
 }
 
-// The library counts entries before it has found the arrays. Without both of them the count means nothing.
+// The library counts entries before it has found the arrays. Unless it has found both, the count means nothing.
 uint32_t IndexEntries(const Input& input)
 {
     const flvd_keyframe_index_t& index = input.Instance().keyframe_index;
     return index.times_offset != 0 && index.positions_offset != 0 ? index.entry_count : 0;
 }
 
-// Skipped between the frames, and after the last tag.
+// Bytes skipped between the frames and after the last tag.
 uint64_t BytesSkipped(const Subject& subject)
 {
-    return static_cast<uint64_t>(subject.scan->bytesLeftOut + subject.input.Rest());
+    return static_cast<uint64_t>(subject.scan->bytesSkipped + subject.input.Rest());
 }
 
 const char* SeekMethodName(flvdmx::SeekMethod method)
@@ -66,14 +66,14 @@ const char* SeekMethodText(flvdmx::SeekMethod method)
     return TEXTS[std::min<size_t>(static_cast<size_t>(method), TEXTS.size() - 1)];
 }
 
-// What the codec byte of the audio tags says. AAC and MP3 have a rate of their own.
+// The sample rate in the codec byte of the audio tags. AAC and MP3 streams state their own.
 uint32_t HeaderSampleRate(const Input& input)
 {
     constexpr std::array<uint32_t, 4> RATES = {5500, 11025, 22050, 44100};
     return RATES[input.Instance().audio_format_filter >> 2 & 3];
 }
 
-// The codec byte cannot express the rates of codecs that have only one.
+// The codec byte cannot express the rate of codecs that have only one.
 uint32_t SampleRate(const flvdmx::AudioInfo& audio)
 {
     switch (audio.codec) {
@@ -89,7 +89,7 @@ uint32_t SampleRate(const flvdmx::AudioInfo& audio)
     }
 }
 
-// The last keyframe that was found, otherwise the one that the file states.
+// The last keyframe that a scan found; without a scan, the one that the file states.
 std::optional<flvdmx::Milliseconds> LastKeyframe(const Subject& subject)
 {
     if (subject.scan)
@@ -98,7 +98,7 @@ std::optional<flvdmx::Milliseconds> LastKeyframe(const Subject& subject)
     return stated.count() != 0 ? std::optional(stated) : std::nullopt;
 }
 
-// Collects `name  value` lines, without values that are not known.
+// Collects `name  value` lines, without unknown values.
 class Listing {
 public:
     void Line(std::string_view name, std::string_view value)
@@ -163,7 +163,7 @@ void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo
     const uint32_t header = HeaderSampleRate(subject.input);
     const uint32_t rate = SampleRate(audio);
     listing.Line("  sample rate", header == rate ? fmt::format("{} Hz", rate)
-                                                 : fmt::format("{} Hz (the tag headers say {} Hz)", rate, header));
+                                                 : fmt::format("{} Hz (the tag headers state {} Hz)", rate, header));
     if (IsPcm(audio.codec))
         listing.Line("  sample size", fmt::format("{} bits", PcmSampleSize(subject.input)));
     listing.Line("  channels", std::to_string(audio.channels));
@@ -173,7 +173,7 @@ void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo
     listing.Config(audio.config);
 }
 
-// Dates in ISO 8601 format; null for one that no calendar has.
+// The date in ISO 8601 format; null if it is out of range.
 struct ToJson {
     Json operator()(const flvdmx::Date& date) const
     {
@@ -327,12 +327,12 @@ void Warn(const Subject& subject)
         Complain(input.name, "note: " + note);
 }
 
-// Why a stream without frames has none. When its tags were not found, the file header may still announce it.
+// Why a stream has no frames. If no tag of it was found, the file header may still announce it.
 std::string WhyNoStream(TagReader& reader, flvdmx::Stream stream, const Input& input)
 {
     std::string why = reader.WhyNoStream(stream);
     if (why.empty() && (reader.AnnouncedStreams() & ~input.Streams() & static_cast<uint32_t>(stream)) != 0)
-        why = "the file header announces it, but no tag of it was found";
+        why = "the file header announces it, but none of its tags was found";
     return why;
 }
 

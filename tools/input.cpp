@@ -43,7 +43,7 @@ int SeekableStandardInput()
     return copy;
 }
 
-// The library reports only that there is no valid header. A look at the file tells the user more.
+// The library reports only that there is no valid header. The first bytes of the file explain more.
 std::string HeaderFailureText(const std::string& path)
 {
     std::error_code failure;
@@ -101,7 +101,7 @@ std::string PathOf(const std::string& name)
     struct stat status {};
     const bool special = stat(name.c_str(), &status) == 0 && !S_ISREG(status.st_mode) && !S_ISBLK(status.st_mode) &&
                          !S_ISDIR(status.st_mode);
-    if (special) // opening a pipe without a writer would block
+    if (special) // opening a pipe that nobody writes to would block
         throw FileError(name,
                         "cannot be opened: a pipe or device is not seekable; 'flvdmx COMMAND - <FILE' "
                         "reads a pipe into memory",

@@ -10,12 +10,12 @@
 
 namespace tool {
 
-constexpr uint64_t STANDARD_INPUT_MAX = 256ULL << 20; /**< bytes taken from a pipe */
+constexpr uint64_t STANDARD_INPUT_MAX = 256ULL << 20; /**< bytes read from a pipe */
 
-/** @return the functions with which all files are read */
+/** @return the host functions that read all files */
 const flvdmx::Host& Host();
 
-/** @return the path of the file that the user named; for "-", one that leads to standard input or a copy of it. Throws
+/** @return the path of the file that the user named; for "-", the path of standard input or of a copy of it. Throws
  *          FileError for a file that is not seekable */
 std::string PathOf(const std::string& name);
 
@@ -36,14 +36,14 @@ struct Input {
     uint32_t Streams() const; /**< FLVD_STREAM_* bits of the streams found */
     bool Has(flvdmx::Stream stream) const { return (Streams() & static_cast<uint32_t>(stream)) != 0; }
 
-    /** @return bytes after the last complete tag of a complete file */
+    /** @return the number of bytes after the last complete tag; 0 for a growing file */
     int64_t Rest() const;
 
-    /** Warns on standard error if the end of a complete file is missing. */
+    /** Warns on standard error if a complete file is cut short. */
     void WarnIfCutShort() const;
 };
 
-/** @return why a file could not be opened, in words */
+/** @return why a file could not be opened, as text */
 std::string OpenFailureText(const std::string& path, const flvdmx::error& error);
 
 } // namespace tool

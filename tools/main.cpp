@@ -28,7 +28,7 @@ namespace tool {
 
 namespace {
 
-constexpr const char* TIME_HELP = "TIME is seconds (12.5) or [HH:]MM:SS[.FRACTION].";
+constexpr const char* TIME_HELP = "TIME is a number of seconds (12.5) or [HH:]MM:SS[.FRACTION].";
 
 // Validators return what is wrong with a value; an empty text accepts it.
 const CLI::Validator IS_TIME(
@@ -42,11 +42,11 @@ const CLI::Validator IS_TIME(
 const CLI::Validator IS_COUNT(
     [](const std::string& text) {
         const bool digits = text.find_first_not_of("0123456789") == std::string::npos;
-        return digits ? std::string() : fmt::format("'{}' is not a number from 0 on", text);
+        return digits ? std::string() : fmt::format("'{}' is not a whole number of 0 or more", text);
     },
     "", "count");
 
-constexpr double MOST_SECONDS = 4294967; // 32 bits of milliseconds
+constexpr double MOST_SECONDS = 4294967; // as milliseconds, they fit 32 bits
 
 const CLI::Validator IS_SECONDS(
     [](const std::string& text) {
@@ -115,7 +115,7 @@ void AddInfo(CLI::App* command, InfoOptions& options)
 CLI::Option* AddFollow(CLI::App* command, FramesOptions& options)
 {
     command->add_flag("--follow", options.follow,
-                      "The file is still being written, or does not exist yet: print\nframes as they come");
+                      "Print frames as they arrive: the file is still being written,\nor does not exist yet");
     return command
         ->add_option("--timeout", options.timeoutSeconds,
                      "With --follow: stop when the file has not grown for S seconds (default 5)")
@@ -138,7 +138,7 @@ void AddFrames(CLI::App* command, FramesOptions& options)
     AddCount(command, "--count", options.count, "Stop after N frames");
     AddTime(
         command, "--from", [&options](int32_t ms) { options.fromMs = ms; },
-        "Begin at the keyframe at or before TIME; audio alone begins at TIME");
+        "Begin at the keyframe at or before TIME; without video, at TIME");
     AddTime(
         command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "Omit frames later than TIME");
     command->add_flag("--separate-audio", options.separateAudio,
@@ -148,7 +148,7 @@ void AddFrames(CLI::App* command, FramesOptions& options)
         if (timeout->count() != 0 && !options.follow)
             throw CLI::RequiresError("--timeout", "--follow");
         if (options.keyframes && options.streams == FLVD_STREAM_AUDIO)
-            throw CLI::ValidationError("--keyframes", "these are frames of the video");
+            throw CLI::ValidationError("--keyframes", "only video frames are keyframes");
     });
     command->footer(
         fmt::format("Each line holds number, stream, whether it is a video keyframe, time, presentation time, size in\n"
@@ -172,7 +172,7 @@ void AddSeekModes(CLI::App* command, SeekOptions& options)
             name, [&options, bit] { options.mode |= bit; }, help);
     };
     addBit("--relative", FLVD_SEEK_RELATIVE, "TIME is an offset from the current position and may be negative");
-    addBit("--end-on-miss", FLVD_SEEK_TO_END_ON_MISS, "Go to the end of the file after a miss");
+    addBit("--end-on-miss", FLVD_SEEK_TO_END_ON_MISS, "After a miss, go to the end of the file");
     addBit("--retry-backward", FLVD_SEEK_RETRY_BACKWARD, "Try backward after a miss");
 }
 
@@ -185,7 +185,7 @@ void AddSeek(CLI::App* command, SeekOptions& options)
         ->type_name("");
     AddSeekModes(command, options);
     AddCount(command, "--play", options.play, "Read N frames before the seek (default 0)");
-    AddCount(command, "--count", options.count, "Show N frames from there (default 5)");
+    AddCount(command, "--count", options.count, "Show N frames after the seek (default 5)");
     command->add_flag("--separate-audio", options.separateAudio, "Use a separate audio reader");
     command->add_flag("--json", options.json, "Print one JSON document");
     command->footer(fmt::format("{}\n\n"
@@ -204,14 +204,15 @@ void AddExtract(CLI::App* command, ExtractOptions& options)
     AddFile(command, options.file);
     AddOutput(command, options.out, options.force, "Where to write; - is standard output");
     AddChoice(command, "--stream", STREAMS, options.streams, "Write only this stream: video or audio");
-    command->footer("If the file has one stream, or --stream selects one, OUT is the name of the file to write. Two\n"
-                    "streams are written to OUT.EXTENSION each, such as OUT.h264 and OUT.aac. If OUT is an existing\n"
-                    "folder, the files in it are named after FILE.\n"
-                    "Extensions: h264 (AVC as Annex B), aac (ADTS), mp3, wav (PCM). Other codecs are written raw,\n"
-                    "one frame after the other, with the extension video or audio.\n\n"
-                    "  flvdmx extract clip.flv -o clip\n"
-                    "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
-                    "  flvdmx extract --stream video clip.flv -o - | player -");
+    command->footer(
+        "If the file has one stream, or --stream selects one, OUT is the name of the file to write. Two\n"
+        "streams are written to two files OUT.EXTENSION, such as OUT.h264 and OUT.aac. If OUT is an existing\n"
+        "folder, the files in it are named after FILE.\n"
+        "Extensions: h264 (AVC as Annex B), aac (ADTS), mp3, wav (PCM). Other codecs are written raw,\n"
+        "one frame after the other, with the extension video or audio.\n\n"
+        "  flvdmx extract clip.flv -o clip\n"
+        "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
+        "  flvdmx extract --stream video clip.flv -o - | player -");
 }
 
 void AddCheck(CLI::App* command, CheckOptions& options)
@@ -240,11 +241,12 @@ void AddCheck(CLI::App* command, CheckOptions& options)
         "  cut_short          the end of the last tag, or of the data that the metadata announces, is missing\n"
         "  back_pointer       the back-pointer of a tag is wrong\n"
         "  no_back_pointer    the back-pointer of a tag is missing\n"
-        "  passed_over        tags that players skip: of a stream or codec that is not played, later than\n"
-        "                     the last timestamp, empty or too short\n"
+        "  passed_over        tags that players skip: they belong to a stream or codec that is not played,\n"
+        "                     are later than the last timestamp, or are empty or too short\n"
         "  jump               time jumps back, or forward by more than --jump, within a stream;\n"
         "                     or a single tag has a wrong time\n"
-        "  index              an entry leads to no keyframe, or its time is wrong by more than a second\n"
+        "  index              an entry does not point to a keyframe, or its time is wrong by more than\n"
+        "                     a second\n"
         "  keyframe_distance  keyframes, or the last one and the end, are more than --max-gap apart\n"
         "  interleaving       audio and video at the same position in the file are more than --max-gap\n"
         "                     apart in time\n"
@@ -253,7 +255,7 @@ void AddCheck(CLI::App* command, CheckOptions& options)
         "Notes, which are not faults:\n"
         "  configuration      a codec configuration changes\n"
         "  codec              FLV does not define a codec of the file\n"
-        "  pause              a stream has no frames for longer than --jump, but the other one has\n"
+        "  pause              one stream has no frames for longer than --jump, while the other one has\n"
         "The first 1000 findings of a file are listed; all are counted.\n\n"
         "Exit status: 0 no findings, 1 a file has findings or could not be read, 2 usage error.");
 }
@@ -270,23 +272,23 @@ void AddRewrite(CLI::App* command, RewriteOptions& options)
 {
     AddFile(command, options.file);
     AddOutput(command, options.out, options.force, "FLV file to write; - is standard output");
-    command->add_flag("--dry-run", options.dryRun, "Say what would be written, and write nothing");
+    command->add_flag("--dry-run", options.dryRun, "Report what would be written, and write nothing");
 }
 
 void AddRepair(CLI::App* command, RewriteOptions& options)
 {
     AddRewrite(command, options);
     command->add_flag("--keep-times", options.keepTimes, "Leave timestamps that restart or jump as they are");
-    command->footer("Frames, codec configurations and cue points are kept, damage and other bytes are dropped. The\n"
+    command->footer("Frames, codec configurations and cue points are kept; damage and other bytes are dropped. The\n"
                     "metadata gets a new duration, file size and keyframe index. Timestamps that go back by more than\n"
-                    "a second or forward by more than ten are made continuous, single wrong ones replaced.\n\n"
+                    "a second or forward by more than ten are made continuous, and single wrong ones are replaced.\n\n"
                     "  flvdmx repair recording.flv -o repaired.flv");
 }
 
 void AddIndex(CLI::App* command, RewriteOptions& options)
 {
     AddRewrite(command, options);
-    command->footer("All tags but the metadata are copied as they are.\n\n"
+    command->footer("All tags except the metadata are copied unchanged.\n\n"
                     "  flvdmx index recording.flv -o seekable.flv");
 }
 
@@ -308,7 +310,7 @@ std::vector<std::string> Arguments(int argc, char** argv)
 {
     std::vector<std::string> arguments(argv + 1, argv + argc);
     for (std::string& text : arguments) {
-        if (text == "--") // only names follow
+        if (text == "--") // only file names follow
             break;
         if (!text.empty() && text.front() == '-' && ParseTime(text))
             text.insert(0, 1, ' ');
@@ -316,7 +318,7 @@ std::vector<std::string> Arguments(int argc, char** argv)
     return {arguments.rbegin(), arguments.rend()}; // CLI11 expects them in reverse
 }
 
-// For a file name that looks like an option.
+// Returns a hint if an argument that looks like an option is the name of a file.
 std::string DashAdvice(const std::vector<std::string>& arguments)
 {
     std::error_code failure;
@@ -338,8 +340,8 @@ int Usage(const CLI::App& app, const CLI::ParseError& error, const std::vector<s
     return WRONG_USE;
 }
 
-// Otherwise a file that is opened could get the number of a closed standard stream, and then the messages. The
-// replacement of standard output is not writable, so that writing fails and is noticed.
+// Otherwise a file opened later could get the descriptor of a closed standard stream, and messages would be written to
+// it. The replacement of standard output is not writable, so that writing fails and the failure is reported.
 void OccupyStandardStreams()
 {
     for (int descriptor = STDIN_FILENO; descriptor <= STDERR_FILENO; ++descriptor)
@@ -396,22 +398,22 @@ int Run(int argc, char** argv)
     app.set_help_flag("-h,--help", "Print help");
     app.set_version_flag("-V,--version", "flvdmx " FLVDMX_VERSION, "Print the version");
     app.add_flag_callback("--verbose", ShowCodes,
-                          "With any command: also print the library's error code and line number\nof a failure")
+                          "With any command: if something fails, also print the library's\nerror code and line number")
         ->trigger_on_parse();
     app.fallthrough();
     app.footer("Exit status: 0 done, 1 a file could not be read, written or played, or check found something,\n"
                "2 usage error. 'flvdmx help COMMAND' explains a command.");
-    app.require_subcommand(0, 1); // none is reported below, after CLI11 has rejected unknown words
+    app.require_subcommand(0, 1); // a missing command is reported below, after CLI11 has rejected unknown words
     Commands commands(app);
     commands.Add("info", "Show what is in each file", AddInfo, RunInfo);
     commands.Add("frames", "List the frames, one per line", AddFrames, RunFrames);
-    commands.Add("seek", "Seek, and show the position reached and the frames from there", AddSeek, RunSeek);
+    commands.Add("seek", "Seek, and show the position reached and the frames that follow", AddSeek, RunSeek);
     commands.Add("extract", "Write the streams to files that players accept", AddExtract, RunExtract);
     commands.Add("check", "Find damage, jumping timestamps and a wrong keyframe index", AddCheck, RunCheck);
     commands.Add("plot", "Draw bit rate, keyframes and interleaving over time", AddPlot, RunPlot);
     commands.Add("repair", "Write a valid file from everything that can be played", AddRepair, RunRepair);
     commands.Add("index", "Copy an undamaged file and give it a keyframe index", AddIndex, RunIndex);
-    commands.Add("cut", "Write a part of a file, with an index of its own", AddCut, RunCut);
+    commands.Add("cut", "Write part of a file, with its own index", AddCut, RunCut);
     commands.AddHelp();
     try {
         app.parse(Arguments(argc, argv));
@@ -434,7 +436,7 @@ int Run(int argc, char** argv)
 
 } // namespace tool
 
-// All failures end here. A reader such as `head` closes the pipe when it has seen enough, which is not a failure.
+// Reports all failures. A program such as `head` closes the pipe when it has seen enough, which is not a failure.
 int main(int argc, char** argv)
 {
     std::signal(SIGPIPE, SIG_IGN);

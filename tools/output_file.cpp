@@ -42,7 +42,7 @@ int Remember(const char* path)
 {
     for (const int signal : {SIGINT, SIGTERM, SIGHUP})
         if (std::signal(signal, RemoveUnfinished) == SIG_IGN)
-            std::signal(signal, SIG_IGN); // stay ignored under `nohup`
+            std::signal(signal, SIG_IGN); // keep ignoring it under `nohup`
     for (size_t slot = 0; slot < g_unfinished.size(); ++slot) {
         const char* none = nullptr;
         if (g_unfinished[slot].compare_exchange_strong(none, path))
@@ -110,7 +110,7 @@ OutputFile::OutputFile(std::string path, const std::string& input, bool force) :
             throw FileError(input, fmt::format("{} exists: use --force to overwrite it", Printable(m_path)));
         m_target = Target(m_path);
         m_temporary = m_target + ".XXXXXX";
-        m_slot = Remember(m_temporary.c_str()); // before the file exists: a signal may come at once
+        m_slot = Remember(m_temporary.c_str()); // before the file exists: a signal may arrive at once
         m_file = CreateTemporary(m_temporary, PermissionsOf(m_target));
     }
     if (m_file == nullptr) {

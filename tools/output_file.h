@@ -1,4 +1,4 @@
-// A file to write, completely or not at all.
+// An output file, written completely or not at all.
 #ifndef FLVDMX_TOOLS_OUTPUT_FILE_H
 #define FLVDMX_TOOLS_OUTPUT_FILE_H
 
@@ -16,8 +16,8 @@ namespace tool {
 class OutputFile {
 public:
     /**
-     * Creates a temporary file, which Finish() renames to `path`; "-" is standard output. An existing file is not
-     * overwritten without `force`, and the file `input` never is.
+     * Creates a temporary file, which Finish() renames to `path`; "-" is standard output. An existing file is
+     * overwritten only with `force`, and the file `input` never.
      */
     OutputFile(std::string path, const std::string& input, bool force);
     ~OutputFile();
@@ -27,10 +27,10 @@ public:
     void Write(const void* data, size_t size);
     void Write(std::string_view text) { Write(text.data(), text.size()); }
 
-    /** Replaces the first bytes if the file is seekable, which a pipe is not. */
+    /** Replaces the first bytes. Does nothing if the output is a pipe. */
     void Rewrite(flvdmx::Bytes beginning);
 
-    /** Completes the file. Must be called at the end: some errors, such as a full disk, may appear only then. */
+    /** Completes the file. Must be called at the end: some errors, such as a full disk, may be reported only then. */
     void Finish();
 
     uint64_t Written() const { return m_written; } /**< bytes */
@@ -43,9 +43,9 @@ private:
     const std::string m_path;
     const std::string m_input;
     std::string m_target;    // the file's own name, if m_path is a symbolic link
-    std::string m_temporary; // its name until it is finished
+    std::string m_temporary; // its name until it is complete
     std::FILE* m_file = nullptr;
-    int m_slot = -1; // of its name in the list of unfinished files
+    int m_slot = -1; // of that name in the list of unfinished files
     uint64_t m_written = 0;
 };
 

@@ -30,11 +30,11 @@ constexpr double RIGHT = WIDTH - 30;
 constexpr double TOP = 100;
 constexpr double LARGE = 210;   // height of a diagram
 constexpr double SMALL = 120;   // of the last one
-constexpr double DISTANCE = 78; // between two, for labels and heading
+constexpr double DISTANCE = 78; // between diagrams, for labels and heading
 constexpr double STRIP = 16;    // height of the keyframe marks
 constexpr double MARKS_LEGEND = 26;
 constexpr int MOST_TIME_TICKS = 12;
-constexpr size_t COLUMNS = 460; // twice the pixels between two points of a line
+constexpr size_t COLUMNS = 460; // one point of a line every two pixels
 constexpr double BITS_PER_BYTE = 8;
 
 constexpr const char* STYLE =
@@ -56,7 +56,7 @@ struct Unit {
     const char* name;
 };
 
-// The largest unit of which the value has at least one.
+// The largest unit that is not larger than the value.
 const Unit& UnitFor(const std::vector<Unit>& units, double value)
 {
     const auto fits = [value](const Unit& unit) { return value >= unit.size; };
@@ -106,7 +106,7 @@ private:
 
     double Height() const
     {
-        constexpr double BOTTOM = 60; // for the legend of the marks as well
+        constexpr double BOTTOM = 60; // includes the legend of the marks
         return TOP + LARGE + (HasVideo() ? STRIP : 0) + (m_both ? DISTANCE + LARGE + DISTANCE + SMALL : 0) + BOTTOM +
                (m_timeline.marks.empty() ? 0 : MARKS_LEGEND);
     }
@@ -119,7 +119,7 @@ private:
 
     void DrawTitle()
     {
-        constexpr size_t TITLE_COLUMNS = 76; // as many wide letters fit
+        constexpr size_t TITLE_COLUMNS = 76; // fit even if all letters are wide
         constexpr size_t ABOUT_COLUMNS = 130;
         const std::string name = std::filesystem::path(m_input.name).filename().string();
         m_svg.Text(LEFT, 34, "title", Shorten(Printable(name), TITLE_COLUMNS));
@@ -133,7 +133,7 @@ private:
         DrawMarksLegend(Height() - 14);
     }
 
-    // What the marks mean, under the diagrams.
+    // Explains the marks, below the diagrams.
     void DrawMarksLegend(double y)
     {
         std::vector<std::pair<const char*, std::string>> entries;
@@ -144,13 +144,13 @@ private:
         if (any(Mark::Kind::gap))
             entries.emplace_back("gap", "no frames");
         if (any(Mark::Kind::damage))
-            entries.emplace_back("damage", fmt::format("{} bytes skipped", m_timeline.bytesLeftOut));
+            entries.emplace_back("damage", fmt::format("{} bytes skipped", m_timeline.bytesSkipped));
         if (any(Mark::Kind::jump))
             entries.emplace_back("jump", "timestamps jump");
         DrawLegend(y, entries);
     }
 
-    // Each kind is one path: thousands of marks would be thousands of elements.
+    // Draws each kind as one path, so that thousands of marks do not become thousands of elements.
     void DrawMarks(double top, double bottom)
     {
         constexpr double LEAST_WIDTH = 1;
@@ -171,7 +171,7 @@ private:
         }
     }
 
-    // Grid, ticks and their labels. @return the axis of the values, which reaches to the tick above the highest
+    // Draws the grid, ticks and labels. @return the axis of the values, which ends at the tick above the highest
     Axis DrawFrame(double top, double height, const std::string& heading, const std::vector<Unit>& units, double low,
                    double high, double below = 0)
     {
@@ -206,7 +206,7 @@ private:
         }
     }
 
-    // Entries from the right: the last one first.
+    // Draws entries from right to left, the last one first.
     void DrawLegend(double y, const std::vector<std::pair<const char*, std::string>>& entries)
     {
         constexpr double CHARACTER = 7.6;
@@ -230,7 +230,7 @@ private:
         return entries;
     }
 
-    // The last interval ends with the file.
+    // The last interval ends where the file ends.
     double EndOf(size_t i) const
     {
         return i + 1 == m_timeline.video.bits.size() ? m_timeline.duration
@@ -268,7 +268,7 @@ private:
         DrawLegend(top - 12, legend);
     }
 
-    // Where frames are missing for a whole interval the line ends, and begins again after it.
+    // The line breaks where frames are missing for a whole interval.
     void DrawRate(const Axis& values, const StreamTimeline& stream, const char* kind)
     {
         std::string line;
@@ -294,7 +294,8 @@ private:
         m_svg.Add("<path class=\"{}\" d=\"{}\"/>", kind, line);
     }
 
-    // A mark per keyframe; when they would touch, a mark per few pixels that is the higher the more it stands for.
+    // Draws one mark per keyframe. If they would touch, one mark covers a few pixels, and is the taller the more
+    // keyframes it stands for.
     void DrawKeyframes(double top)
     {
         constexpr double CELL = 4; // pixels
@@ -325,7 +326,7 @@ private:
 
     void DrawPositions(double top)
     {
-        const Axis values = DrawFrame(top, LARGE, "Interleaving: place in the file", BYTE_UNITS, 0,
+        const Axis values = DrawFrame(top, LARGE, "Interleaving: position in the file", BYTE_UNITS, 0,
                                       static_cast<double>(m_input.Instance().data_end));
         DrawPosition(values, m_timeline.video, "video");
         DrawPosition(values, m_timeline.audio, "audio dots");

@@ -21,7 +21,7 @@ constexpr const char* WIPE_LINE = "\r\033[K";
 
 ReadProgress* g_readProgress = nullptr;
 
-// One column stays free: some terminals wrap the line when the last one is filled.
+// One column stays free: some terminals wrap the line when the last column is filled.
 size_t TerminalColumns()
 {
     constexpr size_t UNKNOWN = 80;

@@ -1,4 +1,4 @@
-// A line of progress on standard error, wiped at its end.
+// A line of progress on standard error, erased at the end.
 #ifndef FLVDMX_TOOLS_PROGRESS_H
 #define FLVDMX_TOOLS_PROGRESS_H
 
@@ -8,10 +8,10 @@
 
 namespace tool {
 
-/** Shows a line a few times per second, where it can be seen and disturbs nothing. */
+/** Updates a line a few times per second, if standard error is a terminal and other output is not disturbed. */
 class Progress {
 public:
-    /** For a user who has sent standard output elsewhere: needs standard error, and only that, on a terminal. */
+    /** For commands that print frames: active only if standard error is a terminal and standard output is not. */
     Progress();
     ~Progress();
     Progress(const Progress&) = delete;
@@ -20,7 +20,7 @@ public:
     /** Shows the number of frames and the time reached. */
     void Show(uint64_t frames, int64_t timeMs);
 
-    /** Makes room for something else on the terminal. */
+    /** Erases the line to make room for other output. */
     void Wipe();
 
 protected:
@@ -37,10 +37,10 @@ private:
     Clock::time_point m_next;
 };
 
-/** A bar for work that prints nothing on its way; it appears when the work has taken a second. */
+/** A bar for work that prints nothing until its end; it appears after a second. */
 class ProgressBar : public Progress {
 public:
-    /** @param name what is worked on
+    /** @param name what is being processed
      *  @param total amount of work, such as bytes */
     ProgressBar(const std::string& name, int64_t total);
 
@@ -51,8 +51,8 @@ private:
     const int64_t m_total;
 };
 
-/** A bar that follows what the library reads of files, also during one long search. One at a time, and no other thread
- *  may read. */
+/** A bar that follows the position at which the library reads, also during a long search. Only one may exist at a time,
+ *  and no other thread may read. */
 class ReadProgress : public ProgressBar {
 public:
     /** @param passes how often the file will be read */
@@ -63,15 +63,15 @@ public:
 
     void NextPass() { m_pass += m_size; }
 
-    /** Makes room for output; the bar appears again when nothing has come for a second. */
+    /** Makes room for output; the bar reappears if there is no output for a second. */
     void Hide();
 
-    /** Shows that a file is being read at this position. */
+    /** Shows that the file is being read at this position. */
     static void ShowRead(int64_t position);
 
 private:
     const int64_t m_size;
-    int64_t m_pass = 0; // bytes of the passes before
+    int64_t m_pass = 0; // bytes of the previous passes
 };
 
 } // namespace tool

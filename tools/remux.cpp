@@ -23,10 +23,10 @@ namespace tool {
 namespace {
 
 constexpr uint32_t SCRIPT_DATA_MAX = 1 << 20;                            // bytes
-constexpr int TAGS_BEFORE_METADATA = 102;                                // as far as players look
-constexpr size_t SMALLEST_TAG = TAG_HEADER_SIZE + 1 + BACK_POINTER_SIZE; // of a frame; has all codec bytes
+constexpr int TAGS_BEFORE_METADATA = 102;                                // players search only these
+constexpr size_t SMALLEST_TAG = TAG_HEADER_SIZE + 1 + BACK_POINTER_SIZE; // of a frame; includes all codec bytes
 
-// Bytes anywhere in a file. The codec's bytes before a frame are not delivered with it.
+// Reads bytes anywhere in a file. Needed for codec headers, which are not delivered with the frames.
 class RawFile {
 public:
     explicit RawFile(const std::string& file) : m_name(file), m_file(std::fopen(PathOf(file).c_str(), "rb")) {}
@@ -49,12 +49,12 @@ private:
 // A stream of the file.
 struct Track {
     uint8_t type;
-    std::vector<uint8_t> config{};       // in force; empty for codecs without one
-    std::vector<uint8_t> configHeader{}; // codec bytes before it
+    std::vector<uint8_t> config{};       // in use; empty for codecs without one
+    std::vector<uint8_t> configHeader{}; // its codec header
     bool hasEnded = false;
 };
 
-// An AVC configuration is a keyframe by its FrameType.
+// The codec header of a configuration. Its FrameType marks an AVC configuration as a keyframe.
 std::vector<uint8_t> ConfigHeader(uint32_t tagType, uint8_t codec)
 {
     constexpr uint8_t AVC_KEYFRAME = 0x17;
@@ -99,15 +99,15 @@ public:
         }
         if (m_options.toMs == std::numeric_limits<int64_t>::max()) {
             m_losses.Finish();
-            m_report.bytesLeftOut += m_losses.Rest();
+            m_report.bytesSkipped += m_losses.Rest();
         }
         m_report.jumps = m_times.Jumps();
-        m_report.bytesLeftOut += m_losses.Bytes();
+        m_report.bytesSkipped += m_losses.Bytes();
         return m_report;
     }
 
 private:
-    // The first configuration of a stream that begins late is moved to the beginning, where players look for it.
+    // If a stream begins late, its first configuration is moved to the beginning, where players search for it.
     void FindLateConfig(Track& track, flvdmx::Stream stream)
     {
         const std::optional<Tag> tag = m_input.Has(stream) ? std::nullopt : FirstIfLate(PathOf(m_input.name), stream);
@@ -138,8 +138,8 @@ private:
         }
         if (!IsWanted(frame.time.count()))
             return;
-        if (tag.IsAvc() && track.config.empty()) { // nothing decodes it
-            m_report.bytesLeftOut += tag.End() - tag.position;
+        if (tag.IsAvc() && track.config.empty()) { // it cannot be decoded
+            m_report.bytesSkipped += tag.End() - tag.position;
             return;
         }
         int64_t time = frame.time.count() + m_options.offsetMs;
@@ -162,7 +162,7 @@ private:
                 tag.IsKeyframe()});
     }
 
-    // Cue points and texts are kept; the metadata is made anew.
+    // Cue points and texts are kept; the metadata is rebuilt.
     void TakeScript(const Tag& tag)
     {
         const int64_t time = int64_t{tag.timestamp} - m_input.info.start_time.count();

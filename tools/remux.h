@@ -12,39 +12,39 @@
 
 namespace tool {
 
-/** Which frames to take, and how to make their timestamps. Times count from the file's first timestamp. */
+/** Which frames to copy, and how to change their timestamps. Times count from the file's first timestamp. */
 struct RemuxOptions {
     bool allFrames = false;                               /**< also those later than the file's last timestamp */
-    bool continuous = false;                              /**< make the timestamps continue after jumps */
+    bool continuous = false;                              /**< make timestamps continuous across jumps */
     int64_t offsetMs = 0;                                 /**< added to each time */
-    int64_t fromMs = std::numeric_limits<int64_t>::min(); /**< first time to take */
-    int64_t toMs = std::numeric_limits<int64_t>::max();   /**< first time not to take */
+    int64_t fromMs = std::numeric_limits<int64_t>::min(); /**< first time to copy */
+    int64_t toMs = std::numeric_limits<int64_t>::max();   /**< first time not to copy */
 };
 
-/** What was taken. */
+/** What was copied. */
 struct RemuxReport {
     uint64_t videoFrames = 0;
     uint64_t audioFrames = 0;
-    uint64_t jumps = 0;       /**< of the timestamps, when they were made continuous */
-    int64_t bytesLeftOut = 0; /**< between and after the frames, in bytes of the file */
+    uint64_t jumps = 0;       /**< of the timestamps, if they were made continuous */
+    int64_t bytesSkipped = 0; /**< between and after the frames, in bytes of the file */
 };
 
-/** Takes a tag, whose bytes are valid during the call. */
+/** Receives a tag, whose bytes are valid only during the call. */
 using TakeTag = std::function<void(const NewTag&)>;
 
 /**
- * Plays a file and makes a tag of each frame, and of each configuration before the first frame that needs it. Calls
- * with the same arguments make the same tags. Throws FileError.
+ * Plays a file and makes a tag from each frame, and from each configuration before the first frame that needs it. Calls
+ * with the same arguments produce the same tags. Throws FileError.
  */
 RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take);
 
 /**
- * Reads the tags of an undamaged file as they are, all but the onMetaData whose properties MetadataOf() returns. Throws
- * FileError, also for a damaged file.
+ * Reads the tags of an undamaged file unchanged, except the onMetaData whose properties MetadataOf() returns. Throws
+ * FileError, also if the file is damaged.
  */
 RemuxReport CopyTags(const std::string& file, const TakeTag& take);
 
-/** @return the properties of the first onMetaData of a file; what it lacks of picture size and codecs is added */
+/** @return the properties of the first onMetaData of a file; picture size and codecs are added if missing */
 std::vector<ScriptProperty> MetadataOf(const std::string& file);
 
 } // namespace tool

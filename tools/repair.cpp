@@ -1,4 +1,4 @@
-// `flvdmx repair`, `flvdmx index` and `flvdmx cut`: new files from what can be played of a file.
+// `flvdmx repair`, `flvdmx index` and `flvdmx cut`: new files from the playable parts of a file.
 #include <algorithm>
 #include <functional>
 #include <optional>
@@ -24,10 +24,10 @@ namespace {
 
 using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
-// Runs a pass that measures and, unless it is a rehearsal, one that writes.
+// Runs a pass that measures and, unless it is a dry run, one that writes.
 RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& pass)
 {
-    std::optional<OutputFile> out; // first of all: what cannot be written is refused at once
+    std::optional<OutputFile> out; // first of all, so that output that cannot be written fails at once
     if (!options.dryRun)
         out.emplace(options.out, options.file, options.force);
     ReadProgress progress(options.file, inputSize, options.dryRun ? 1 : 2);
@@ -42,7 +42,7 @@ RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& 
         progress.NextPass();
         const uint64_t size = beginning.size() + layout.Size();
         pass([&](const NewTag& tag) {
-            if (out->Written() < size) // a file that is still being written has more tags by now
+            if (out->Written() < size) // a file that is still being written may have more tags by now
                 WriteTag(*out, tag);
         });
         if (out->Written() != size)
@@ -54,13 +54,13 @@ RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& 
     if (options.out == STANDARD_STREAM && !options.dryRun)
         return report;
     Print(fmt::format("{}: {} and {}, {}, {} in the index{}\n", options.dryRun ? "would write" : Printable(options.out),
-                      Plural(report.videoFrames, "picture"), Plural(report.audioFrames, "audio frame"),
+                      Plural(report.videoFrames, "video frame"), Plural(report.audioFrames, "audio frame"),
                       FormatTime(layout.Duration()), Plural(layout.Keyframes(), "keyframe"),
                       options.dryRun ? "" : fmt::format(", {} bytes", written)));
     return report;
 }
 
-// The times between which to cut: those of the keyframes at or before the beginning and at or after the end.
+// The times at which to cut: those of the keyframes at or before the beginning and at or after the end.
 RemuxOptions CutOptions(const RewriteOptions& options)
 {
     RemuxOptions remux;
@@ -102,9 +102,9 @@ int RunRepair(const RewriteOptions& options)
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));
-    if (report.bytesLeftOut != 0)
+    if (report.bytesSkipped != 0)
         Tell(fmt::format("{}: {} skipped\n", Printable(options.file),
-                         Plural(static_cast<uint64_t>(report.bytesLeftOut), "byte")));
+                         Plural(static_cast<uint64_t>(report.bytesSkipped), "byte")));
     return DONE;
 }
 

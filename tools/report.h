@@ -14,21 +14,21 @@ namespace tool {
 
 using Json = nlohmann::ordered_json;
 
-/** Ends the work on a file; what() says why, without the file's name. */
+/** Ends the work on a file; what() returns the reason, without the file's name. */
 class FileError : public std::runtime_error {
 public:
     FileError(const std::string& file, const std::string& text, const flvdmx::error& error = {})
         : std::runtime_error(text), m_file(file), m_error(error)
     {
     }
-    /** Uses the library's text for its failure. */
+    /** Uses the library's text for the failure. */
     FileError(const std::string& file, const flvdmx::error& error) : FileError(file, error.text(), error) {}
 
     const std::string& File() const { return m_file; } /**< as the user named it */
     const flvdmx::error& Cause() const
     {
         return m_error;
-    }                    /**< the library's failure, Kind::none if it is another one */
+    }                    /**< the library's failure; Kind::none if it is not the library's */
     Json Object() const; /**< message, code and line */
 
 private:
@@ -50,7 +50,7 @@ void PrintJson(const Json& document, int indent = -1);
 
 constexpr const char* STANDARD_STREAM = "-"; /**< names standard input or standard output */
 
-/** @return the name of an input file for people, printable */
+/** @return the printable name of an input file */
 std::string DisplayName(const std::string& file);
 
 /** Writes `flvdmx: FILE: TEXT` to standard error. */

@@ -1,4 +1,4 @@
-// What only shows when all frames of a file are read.
+// What is known only after reading all frames of a file.
 #include "tools/scan.h"
 
 #include <algorithm>
@@ -38,17 +38,17 @@ FileScan ScanFile(const std::string& name)
     losses.Finish();
     if (scan.keyframes > 1)
         scan.averageDistanceMs = static_cast<double>(last - first) / static_cast<double>(scan.keyframes - 1);
-    scan.bytesLeftOut = losses.Bytes();
+    scan.bytesSkipped = losses.Bytes();
     scan.played = flvdmx::Milliseconds(times.Latest());
     scan.jumps = times.Jumps();
     return scan;
 }
 
-// The times of each stream of a recording that did not restart rise along the file, up to the last one.
+// Without a restart, the times of each stream rise through the file and do not exceed the last one.
 bool SeemsToRestart(const Input& input)
 {
-    constexpr int64_t PLACES = 16;
-    constexpr int64_t NEAR = 1 << 20; // bytes; nothing is found inside a larger tag
+    constexpr int64_t SAMPLES = 16;
+    constexpr int64_t NEAR = 1 << 20; // bytes; inside a larger tag, no sample is found
     constexpr uint32_t JITTER_MS = 2000;
     flvdmx::Options options;
     options.restarting_timestamps = true;
@@ -56,9 +56,9 @@ bool SeemsToRestart(const Input& input)
     TagReader reader(any);
     uint32_t video = 0; // the latest times
     uint32_t audio = 0;
-    for (int64_t i = 1; i < PLACES; ++i) {
-        const int64_t place = input.info.size / PLACES * i;
-        const std::optional<Tag> tag = reader.Find(place, place + NEAR);
+    for (int64_t i = 1; i < SAMPLES; ++i) {
+        const int64_t position = input.info.size / SAMPLES * i;
+        const std::optional<Tag> tag = reader.Find(position, position + NEAR);
         if (!tag || tag->IsScript())
             continue;
         uint32_t& latest = tag->IsVideo() ? video : audio;
@@ -72,8 +72,8 @@ bool SeemsToRestart(const Input& input)
 void WarnOfRestarts(const Input& input)
 {
     if (SeemsToRestart(input))
-        Complain(input.name, "warning: the timestamps jump, so a time may be found in the wrong part: 'flvdmx repair' "
-                             "makes them continuous");
+        Complain(input.name, "warning: the timestamps jump, so a seek may land in the wrong part of the file: 'flvdmx "
+                             "repair' makes them continuous");
 }
 
 } // namespace tool

@@ -1,4 +1,4 @@
-// `flvdmx seek`: seeks, shows where the readers landed and the frames from there on.
+// `flvdmx seek`: seeks, and shows where the readers landed and the frames that follow.
 #include <algorithm>
 #include <iterator>
 #include <limits>
@@ -23,12 +23,12 @@ namespace {
 using flvdmx::Milliseconds;
 using flvdmx::SeekMode;
 
-constexpr size_t MOST_FRAMES_TO_LOOK_AT = 100;
+constexpr size_t MOST_FRAMES_TO_READ = 100;
 
 struct Landing {
     int64_t timeMs;
     int64_t position;
-    std::optional<int64_t> audioPosition{}; // only with a reader of its own
+    std::optional<int64_t> audioPosition{}; // only with a separate audio reader
     std::optional<bool> keyframe{};         // only with video
     std::vector<FrameRecord> frames{};
 };
@@ -38,7 +38,7 @@ bool IsRelative(const SeekOptions& options)
     return (options.mode & FLVD_SEEK_RELATIVE) != 0;
 }
 
-std::string PlaceText(const Input& input, int64_t position)
+std::string PositionText(const Input& input, int64_t position)
 {
     const char* const place = position == input.Instance().data_offset ? ", the start"
                               : position == input.info.size            ? ", the end"
@@ -46,7 +46,7 @@ std::string PlaceText(const Input& input, int64_t position)
     return fmt::format("byte {}{}", position, place);
 }
 
-// The frames that are shown, and whether the first picture among them, or soon after them, is a keyframe.
+// Reads the frames to show, and finds out whether the first video frame among them, or soon after them, is a keyframe.
 Landing Look(Input& input, Milliseconds reached, uint64_t count)
 {
     const flvd_ctx_t& instance = input.Instance();
@@ -55,7 +55,7 @@ Landing Look(Input& input, Milliseconds reached, uint64_t count)
         landing.audioPosition = __FLV_DMX__fioTell64(instance.audio_reader);
     FrameSource source(input, BOTH_STREAMS);
     const auto needs = [&](size_t looked) {
-        const bool picture = input.Has(flvdmx::Stream::video) && !landing.keyframe && looked < MOST_FRAMES_TO_LOOK_AT;
+        const bool picture = input.Has(flvdmx::Stream::video) && !landing.keyframe && looked < MOST_FRAMES_TO_READ;
         return landing.frames.size() < count || picture;
     };
     for (size_t looked = 0; needs(looked); ++looked) {
@@ -102,9 +102,9 @@ void PrintText(const SeekOptions& options, const Input& input, const Landing& la
     const auto out = std::back_inserter(text);
     if (landing.keyframe)
         fmt::format_to(out, "keyframe  {}\n", *landing.keyframe ? "yes" : "no");
-    fmt::format_to(out, "position  {}\n", PlaceText(input, landing.position));
+    fmt::format_to(out, "position  {}\n", PositionText(input, landing.position));
     if (landing.audioPosition)
-        fmt::format_to(out, "audio     {}\n", PlaceText(input, *landing.audioPosition));
+        fmt::format_to(out, "audio     {}\n", PositionText(input, *landing.audioPosition));
     if (!landing.frames.empty())
         text += FrameRecord::HEADING;
     for (size_t i = 0; i < landing.frames.size(); ++i)
@@ -138,7 +138,7 @@ bool SeeksForward(const SeekOptions& options, int64_t target, int64_t current)
     return options.direction == FLVD_SEEK_FORWARD || (options.direction == 0 && target >= current);
 }
 
-// What would have worked, found by trying it.
+// Suggests the mode that would have worked, found by trying it.
 std::string Advice(Input& input, int64_t target, bool forward)
 {
     const auto other = forward ? SeekMode::backward : SeekMode::forward;
@@ -147,7 +147,7 @@ std::string Advice(Input& input, int64_t target, bool forward)
                    : "";
 }
 
-// Tells of a miss of `target`, the current time having been `current`.
+// Prints a miss of `target`, where `current` was the time before the seek, and returns the error to throw.
 FileError Miss(const SeekOptions& options, Input& input, int64_t target, int64_t current, const flvdmx::error& error)
 {
     const bool beyond = input.Instance().last_ts != 0 && Milliseconds(target) > input.info.duration;
@@ -166,19 +166,19 @@ FileError Miss(const SeekOptions& options, Input& input, int64_t target, int64_t
         PrintJson(document, 2);
     } else {
         Print(fmt::format("sought    {}\nlanded    nowhere\nposition  {}\n", RequestText(options),
-                          PlaceText(input, position)));
+                          PositionText(input, position)));
     }
     return miss;
 }
 
-// Reads frames and drops them. Of two readers the one whose last frame is earlier is asked, as a player does: no
-// reader gets further than the number of frames says.
+// Reads frames and discards them. Of two readers, the one whose last frame is earlier delivers the next one, as in a
+// player.
 void Play(Input& input, uint64_t frames)
 {
     constexpr int64_t ENDED = std::numeric_limits<int64_t>::max();
     int64_t video = input.Has(flvdmx::Stream::video) ? -1 : ENDED;
     int64_t audio = input.Has(flvdmx::Stream::audio) ? -1 : ENDED;
-    // With one reader it does not matter which stream is asked.
+    // With one reader, the stream does not matter.
     while (frames > 0 && (video != ENDED || audio != ENDED)) {
         const bool isVideo = video <= audio;
         const auto frame = NextFrame(input, isVideo ? flvdmx::Stream::video : flvdmx::Stream::audio);

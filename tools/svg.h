@@ -9,10 +9,10 @@
 
 namespace tool {
 
-/** @return the printable text with what XML reserves escaped */
+/** @return the printable text with XML's reserved characters escaped */
 std::string XmlText(std::string_view text);
 
-/** Collects elements. */
+/** Builds a document from elements. */
 class Svg {
 public:
     Svg(double width, double height, std::string_view style, std::string_view title);
@@ -32,7 +32,7 @@ private:
     std::string m_text;
 };
 
-/** A range of values and the pixels it is drawn to. */
+/** A range of values and the pixels that it is drawn to. */
 struct Axis {
     double low;
     double high;
@@ -42,13 +42,13 @@ struct Axis {
     double At(double value) const { return from + (value - low) / (high - low) * (to - from); }
 };
 
-/** @return distance of round ticks (1, 2 or 5 times a power of ten) of which at most `most` fit the range */
+/** @return a round distance of ticks (1, 2 or 5 times a power of ten), so that at most `most` fit the range */
 double RoundStep(double range, int most);
 
-/** @return the same for times in seconds: minutes and hours are round as well */
+/** @return the same for times in seconds, where minutes and hours count as round */
 double TimeStep(double seconds, int most);
 
-/** @return a time on an axis of so many seconds with so much between its ticks */
+/** @return the label of a time on an axis of this length and distance of ticks, all in seconds */
 std::string TimeLabel(double seconds, double range, double step);
 
 } // namespace tool

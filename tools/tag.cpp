@@ -1,4 +1,4 @@
-// One tag. Files are read here without the library, which may have refused to open them.
+// A single tag. Files are read here without the library, which may have failed to open them.
 #include "tools/tag.h"
 
 #include <algorithm>
@@ -13,14 +13,14 @@ namespace tool {
 
 namespace {
 
-constexpr int PROBED_TAGS = 102; // tags in which the library looks for streams
+constexpr int PROBED_TAGS = 102; // tags that the library searches for streams
 
-// The tags of a file from its first one on.
+// Reads the tags of a file from the first one on.
 class RawTags {
 public:
     explicit RawTags(const std::string& path) : m_file(path, std::ios::binary) {}
 
-    // Fewer bytes than requested at the end of the file.
+    // Returns fewer bytes than requested at the end of the file.
     std::vector<uint8_t> Bytes(int64_t position, size_t size)
     {
         std::vector<uint8_t> bytes(size);
@@ -31,7 +31,7 @@ public:
         return bytes;
     }
 
-    // The first tag of the stream that has data, and the number of tags before it.
+    // Finds the first tag of the stream that has data; `number` is the number of tags before it.
     std::optional<Tag> FindFirst(flvdmx::Stream stream, int& number)
     {
         constexpr int MOST_TAGS = 10000; // several minutes
@@ -56,7 +56,7 @@ private:
     std::ifstream m_file;
 };
 
-// What is wrong with an AVC configuration that the library does not accept.
+// What is wrong with an AVC configuration that the library rejects.
 std::string ConfigFault(RawTags& tags, const Tag& tag)
 {
     constexpr uint32_t MOST_SET_BYTES = 128;
@@ -83,7 +83,7 @@ std::string Reason(RawTags& tags, const Tag& tag, int number)
         return IsEnhanced(tag, fourcc) ? "it is " + codec
                                        : fmt::format("its first tag has an invalid codec byte: 0x{:02x}", tag.codec);
     if (number >= PROBED_TAGS)
-        return fmt::format("it starts after the first {} tags, and streams are looked for only among those",
+        return fmt::format("it starts after the first {} tags, the only ones that are searched for streams",
                            PROBED_TAGS);
     if (!tag.IsAvc())
         return fmt::format("its first tag, {}, has no valid codec header", codec);
@@ -116,7 +116,7 @@ Tag Tag::Parse(int64_t position, const uint8_t* bytes, size_t available)
     return tag;
 }
 
-// Codec configurations and the end of an AVC sequence are not played.
+// False for codec configurations and for the end of an AVC sequence.
 bool Tag::IsFrame() const
 {
     if ((!IsVideo() && !IsAudio()) || size < CodecHeaderSize())
@@ -171,8 +171,8 @@ std::string WhyNoStream(const std::string& path, flvdmx::Stream stream)
     return first ? Reason(tags, *first, number) : "";
 }
 
-// If no stream was found, each has a reason. If one was found but none of its frames, the file is enhanced FLV, or
-// damaged in a way of which no more is known here.
+// If no stream was found, there is a reason for each. If a stream was found but none of its frames, the file is
+// enhanced FLV, or damaged in a way that is not known here.
 std::string WhyNothingIsPlayed(const std::string& path, int32_t code)
 {
     std::string text;

@@ -1,4 +1,4 @@
-// One tag: its header, its codec, and why the stream that it belongs to may not be played.
+// A single tag: its header, its codec, and why its stream may not be played.
 #ifndef FLVDMX_TOOLS_TAG_H
 #define FLVDMX_TOOLS_TAG_H
 
@@ -31,7 +31,7 @@ struct Tag {
     uint8_t codec;
     uint8_t packetType;
 
-    /** Reads a header of TAG_HEADER_SIZE bytes, and those of the two bytes after it that are available. */
+    /** Reads a header of TAG_HEADER_SIZE bytes, and up to two bytes after it if they are available. */
     static Tag Parse(int64_t position, const uint8_t* bytes, size_t available);
 
     int64_t DataEnd() const { return position + TAG_HEADER_SIZE + size; }
@@ -42,7 +42,7 @@ struct Tag {
     bool IsScript() const { return type == FLVD_TAG_TYPE_SCRIPT; }
     flvdmx::VideoCodec VideoCodec() const { return static_cast<flvdmx::VideoCodec>(codec & CODEC_ID_MASK); }
     flvdmx::AudioCodec AudioCodec() const { return static_cast<flvdmx::AudioCodec>(codec >> 4); }
-    bool IsExtended() const { return IsVideo() && (codec & EXTENDED_HEADER) != 0; } /**< or damaged */
+    bool IsExtended() const { return IsVideo() && (codec & EXTENDED_HEADER) != 0; } /**< enhanced FLV, or damaged */
     bool IsAvc() const { return IsVideo() && VideoCodec() == flvdmx::VideoCodec::avc; }
     bool IsAac() const { return IsAudio() && AudioCodec() == flvdmx::AudioCodec::aac; }
     flvdmx::Stream Stream() const { return IsVideo() ? flvdmx::Stream::video : flvdmx::Stream::audio; }
@@ -63,14 +63,14 @@ bool IsEnhanced(const Tag& tag, std::string_view fourcc);
 /** @return name of the codec of a video or audio tag. @param fourcc as above */
 std::string CodecOf(const Tag& tag, std::string_view fourcc);
 
-/** @return the first tag of a stream that starts too late to be found */
+/** @return the first tag of a stream that starts too late for the library to find it */
 std::optional<Tag> FirstIfLate(const std::string& path, flvdmx::Stream stream);
 
-/** @return why no frame of a stream without playable frames is delivered, such as "it is enhanced FLV"; from its first
- *          tag at the beginning of the file, empty when there is none */
+/** @return why no frame of a stream is delivered, such as "it is enhanced FLV", judging by its first tag near the
+ *          beginning of the file; empty if there is none */
 std::string WhyNoStream(const std::string& path, flvdmx::Stream stream);
 
-/** @return why nothing can be played of a file that the library refused with this code; empty when that is not known */
+/** @return why a file that the library rejected with this code cannot be played; empty if unknown */
 std::string WhyNothingIsPlayed(const std::string& path, int32_t code);
 
 } // namespace tool

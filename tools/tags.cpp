@@ -1,4 +1,4 @@
-// The tags of a file as they are.
+// The tags of a file.
 #include "tools/tags.h"
 
 #include <algorithm>
@@ -13,7 +13,7 @@ namespace tool {
 
 namespace {
 
-constexpr uint32_t READER_CACHE = 4096; // more would bypass the window that the host reads ahead
+constexpr uint32_t READER_CACHE = 4096; // a larger one would bypass the host's read-ahead window
 constexpr uint32_t BYTES_WITH_CODEC = TAG_HEADER_SIZE + 2;
 
 } // namespace
@@ -119,7 +119,7 @@ const std::string& TagReader::WhyNoStream(flvdmx::Stream stream)
     return *reason;
 }
 
-// Without its AVC configuration a stream is not found at all.
+// AVC needs no check here: without its configuration, the stream is not found at all.
 std::string ConfigFault(const Input& input)
 {
     const bool missing =
@@ -145,7 +145,8 @@ std::string UndefinedCodec(const Input& input)
         codec = "audio's codec, " + CodecName(input.info.audio->codec);
     return codec.empty()
                ? codec
-               : fmt::format("the {}, is not defined by FLV: its frames hold everything after the codec byte", codec);
+               : fmt::format("the {}, is not defined by FLV: its frames contain everything after the codec byte",
+                             codec);
 }
 
 Losses::Losses(const Input& input, std::function<void(const Tag&)> script)
@@ -166,11 +167,11 @@ bool Losses::Take(const flvdmx::Frame& frame)
 
 int64_t Losses::EndOf(const flvdmx::Frame& frame)
 {
-    if (!m_input.Has(frame.stream)) { // it was found after the open
+    if (!m_input.Has(frame.stream)) { // the stream was found after the open
         const std::optional<Tag> tag = m_reader.At(frame.position);
         return tag ? tag->End() : frame.position;
     }
-    Tag tag{}; // as its stream's are
+    Tag tag{}; // with the codec byte of its stream
     tag.position = frame.position;
     tag.type = frame.stream == flvdmx::Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
     tag.codec = static_cast<uint8_t>(tag.IsVideo() ? m_input.Instance().video_codec_filter
@@ -179,8 +180,8 @@ int64_t Losses::EndOf(const flvdmx::Frame& frame)
     return tag.End();
 }
 
-// Usually there is nothing between two frames; otherwise configurations, script data, tags that are not played, or
-// damage.
+// Usually there is nothing between two frames; otherwise there are configurations, script data, tags that are not
+// played, or damage.
 void Losses::Inspect(int64_t from, int64_t to)
 {
     while (from < to) {

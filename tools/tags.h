@@ -1,4 +1,4 @@
-// The tags of a file as they are, for what playing does not show: damage, and tags that are not played.
+// The tags of a file, including what playing does not show: damage, and tags that are not played.
 #ifndef FLVDMX_TOOLS_TAGS_H
 #define FLVDMX_TOOLS_TAGS_H
 
@@ -24,29 +24,28 @@ public:
 
     int64_t FileSize() const { return m_fileSize; }
 
-    /** @return `size` bytes at `position`, valid until the next call; null when not all of them are there */
+    /** @return `size` bytes at `position`, valid until the next call; null if they are not all available */
     const uint8_t* Bytes(int64_t position, uint32_t size);
 
     /** @return the tag at `position`; nothing if its type is unknown or its header cut short */
     std::optional<Tag> At(int64_t position);
 
     /**
-     * Finds the first valid tag of the file's streams at or after `from`, however much damage is before it. One
-     * search of the library covers a bounded stretch; the next follows while the reader advances before `end`.
+     * Finds the first valid tag of the file's streams at or after `from`, after any amount of damage. One search of the
+     * library covers a limited range; it is repeated while the reader advances and has not reached `end`.
      *
-     * @param progress called with the position that each search without a tag has reached
+     * @param progress called with the position after each search that found no tag
      */
     std::optional<Tag> Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress = {});
 
     /** @return FLVD_STREAM_* bits of the streams that the file header announces */
     uint32_t AnnouncedStreams();
 
-    /** @return why a tag with nothing wrong about it is not played, such as "it is too short for a frame"; empty when
-     * it is */
+    /** @return why a valid tag is not played, such as "it is too short for a frame"; empty if it is played */
     std::string WhyNotPlayed(const Tag& tag);
 
-    /** @return why no frame of that stream is delivered, from its first tag; empty when the input has the stream, or
-     * when no such tag was found */
+    /** @return why no frame of that stream is delivered, judging by its first tag; empty if the input has the stream,
+     * or if no such tag was found */
     const std::string& WhyNoStream(flvdmx::Stream stream);
 
 private:
@@ -63,13 +62,14 @@ private:
     std::optional<std::string> m_noAudio;
 };
 
-/** @return what is wrong with the first codec configurations of the input; empty if nothing is */
+/** @return what is wrong with the first codec configurations of the input; empty if nothing */
 std::string ConfigFault(const Input& input);
 
 /** @return a text about a codec of the input that FLV does not define; empty if it defines all */
 std::string UndefinedCodec(const Input& input);
 
-/** Warns on standard error which of these streams (FLVD_STREAM_* bits) the file has but are not played, and why. */
+/** Warns on standard error about those of these streams (FLVD_STREAM_* bits) that the file has but that are not played,
+ *  and why. */
 void WarnOfUnplayed(const Input& input, uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
 
 /** Finds the bytes that are skipped between the frames of a file. */
@@ -79,18 +79,18 @@ public:
      *  @param script called with each script tag between frames; may be empty */
     explicit Losses(const Input& input, std::function<void(const Tag&)> script = {});
 
-    /** Takes every frame of the file, in file order. @return true if bytes were skipped before it */
+    /** Call it with every frame of the file, in file order. @return true if bytes were skipped before it */
     bool Take(const flvdmx::Frame& frame);
-    /** After the last frame. */
+    /** Call it after the last frame. */
     void Finish() { Inspect(m_end, m_input.Instance().data_end); }
 
     int64_t Bytes() const { return m_bytes; } /**< skipped so far */
-    /** @return bytes after the last frame and the end of the valid data */
+    /** @return the number of bytes after the last frame or the end of the valid data, whichever is later */
     int64_t Rest() const
     {
         return std::max(m_input.info.size - std::max(m_end, m_input.Instance().data_end), int64_t{0});
     }
-    /** Warns on standard error what was skipped. */
+    /** Warns on standard error about what was skipped. */
     void Warn() const;
 
 private:
@@ -109,8 +109,8 @@ private:
     TagReader m_reader;
     int64_t m_end;
     int64_t m_bytes = 0;
-    Loss m_damage;   // bytes of no valid tag
-    Loss m_unplayed; // tags without a fault that are not played
+    Loss m_damage;   // bytes outside valid tags
+    Loss m_unplayed; // valid tags that are not played
 };
 
 } // namespace tool

@@ -21,7 +21,7 @@ bool IsDigit(char c)
     return c >= '0' && c <= '9';
 }
 
-// Takes the digits at the start of `text`: at least one, and a value that fits a time.
+// Consumes the digits at the start of `text`: at least one, with a value that fits a time.
 std::optional<int64_t> TakeNumber(std::string_view& text)
 {
     int64_t value = 0;
@@ -50,7 +50,7 @@ std::optional<int64_t> ParseFraction(std::string_view digits)
     return (tenths + 5) / 10;
 }
 
-// Takes `SECONDS` or `[HH:]MM:SS`; after a colon only 0 to 59 are valid.
+// Consumes `SECONDS` or `[HH:]MM:SS`; after a colon, only 0 to 59 are valid.
 std::optional<int64_t> TakeSeconds(std::string_view& text)
 {
     std::optional<int64_t> seconds = TakeNumber(text);
@@ -64,7 +64,7 @@ std::optional<int64_t> TakeSeconds(std::string_view& text)
     return seconds;
 }
 
-// Size of the UTF-8 character at the start of `text`; 0 when there is none, or one that XML forbids.
+// Size of the UTF-8 character at the start of `text`; 0 if it is invalid or XML forbids it.
 size_t CharacterSize(std::string_view text)
 {
     const auto byte = [text](size_t i) { return i < text.size() ? static_cast<unsigned char>(text[i]) : 0U; };
@@ -88,7 +88,7 @@ bool IsControl(std::string_view character)
     return first < ' ' || first == 0x7F || c1;
 }
 
-// East Asian characters take two columns. Some that take one are counted as two, so that a line may get shorter.
+// East Asian characters take two columns. Some that take one are counted as two, which only makes a line shorter.
 size_t ColumnsOf(std::string_view text)
 {
     size_t columns = 0;

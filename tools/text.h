@@ -1,4 +1,4 @@
-// Text for people: times, numbers, and names that may contain anything.
+// Text for people: times, numbers, and names that may contain any bytes.
 #ifndef FLVDMX_TOOLS_TEXT_H
 #define FLVDMX_TOOLS_TEXT_H
 
@@ -30,7 +30,7 @@ inline std::string FormatTime(flvdmx::Milliseconds time)
 /** @return `1 frame`, `2 frames` */
 std::string Plural(uint64_t count, const char* noun);
 
-/** @return the number with at most `decimals` decimals, at least 1, and no trailing zeros; with an exponent only from
+/** @return the number with at most `decimals` decimals (1 or more) and no trailing zeros; with an exponent only from
  * 1e18 on */
 std::string Number(double value, int decimals = 3);
 

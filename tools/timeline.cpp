@@ -29,7 +29,7 @@ struct Point {
     bool video;
     bool keyframe;
     bool loss; // bytes were skipped before it
-    bool jump; // the timestamps jump
+    bool jump; // the timestamps jump to it
 };
 
 std::vector<Point> ReadPoints(Input& input, Timeline& timeline)
@@ -51,7 +51,7 @@ std::vector<Point> ReadPoints(Input& input, Timeline& timeline)
     losses.Finish();
     losses.Warn();
     timeline.durationMs = times.Latest();
-    timeline.bytesLeftOut = losses.Bytes();
+    timeline.bytesSkipped = losses.Bytes();
     return points;
 }
 
@@ -66,13 +66,13 @@ void Divide(Timeline& timeline, size_t columns)
     }
 }
 
-// Times before the first timestamp count to the first cell.
+// Times before the first timestamp belong to the first cell.
 size_t CellOf(double time, double cellSize, size_t cells)
 {
     return static_cast<size_t>(std::clamp(std::floor(time / cellSize), 0.0, static_cast<double>(cells - 1)));
 }
 
-// A pause of a stream that is long for it.
+// The longest step, in seconds, that is not drawn as a pause of the stream.
 double LongestStep(const Timeline& timeline, const StreamTimeline& stream)
 {
     constexpr double LEAST = 1;
@@ -81,7 +81,7 @@ double LongestStep(const Timeline& timeline, const StreamTimeline& stream)
                     TIMES_THE_AVERAGE * timeline.duration / static_cast<double>(std::max<uint64_t>(stream.frames, 1)));
 }
 
-// Enters the frames one after the other.
+// Adds frames to a timeline, in file order.
 class Gatherer {
 public:
     explicit Gatherer(Timeline& timeline) : m_timeline(timeline) {}
@@ -105,8 +105,8 @@ public:
 private:
     struct Lane {
         std::optional<double> last{};
-        std::optional<double> sinceBreak{}; // the last time, when it is not from before a break
-        bool breaks = false;                // the curve does not go on
+        std::optional<double> sinceBreak{}; // the last time, unless a break came after it
+        bool breaks = false;                // the curve does not continue
     };
 
     static void Enter(Range& range, bool& breaks, double value)
@@ -137,7 +137,7 @@ private:
     void TakeLead(Range& range, double lead)
     {
         if (!m_leadBreaks)
-            range.Take(m_lead); // as it was until here
+            range.Take(m_lead); // the lead before this frame
         Enter(range, m_leadBreaks, lead);
         m_lead = lead;
     }
@@ -149,7 +149,7 @@ private:
     bool m_leadBreaks = true;
 };
 
-// Marks that would touch in the drawing become one. A jump stays a moment.
+// Merges marks that would touch in the drawing. A jump remains a moment.
 void MergeMarks(std::vector<Mark>& marks, double distance)
 {
     const auto order = [](const Mark& mark) { return std::make_pair(mark.kind, mark.from); };

@@ -1,4 +1,4 @@
-// What happens over the time of a file, gathered for drawing.
+// What happens over the time of a file, collected for the drawing.
 #ifndef FLVDMX_TOOLS_TIMELINE_H
 #define FLVDMX_TOOLS_TIMELINE_H
 
@@ -10,11 +10,11 @@
 
 namespace tool {
 
-/** The range of the values met, nothing at first. */
+/** The range of the values taken, empty at first. */
 struct Range {
     double low = std::numeric_limits<double>::infinity();
     double high = -std::numeric_limits<double>::infinity();
-    bool breaks = false; /**< it does not go on from the range before */
+    bool breaks = false; /**< it does not continue the range before it */
 
     bool IsEmpty() const { return low > high; }
     void Take(double value);
@@ -27,15 +27,15 @@ struct StreamTimeline {
     uint64_t frames = 0;
 };
 
-/** A stretch of time in which something is missing, or a moment. */
+/** A range of time in which something is missing, or the moment of a jump. */
 struct Mark {
     enum class Kind { gap, damage, jump } kind;
     double from;
     double to;
 };
 
-/** Times in seconds from the first timestamp, continuing after jumps; intervals, the last one with the
- *  rest, and columns divide the duration. */
+/** Times are in seconds from the first timestamp, continuous across jumps. The duration is divided into intervals, the
+ *  last of which includes the rest, and into columns. */
 struct Timeline {
     int64_t durationMs;
     double duration; /**< seconds, never 0 */
@@ -45,13 +45,13 @@ struct Timeline {
     std::vector<double> keyframes; /**< their times */
     std::vector<Range> lead;       /**< of each column: by how much audio is ahead of video in the file, seconds */
     std::vector<Mark> marks;
-    int64_t bytesLeftOut;
+    int64_t bytesSkipped;
 
-    /** @return true when nothing is known of this time */
+    /** @return true if nothing is known about this time */
     bool IsMissing(double from, double to) const;
 };
 
-/** Reads the whole file, and warns on standard error what is skipped. Takes a few bytes of memory per frame. */
+/** Reads the whole file, and warns on standard error about what is skipped. Needs a few bytes of memory per frame. */
 Timeline ReadTimeline(Input& input, size_t columns);
 
 } // namespace tool

@@ -1,4 +1,4 @@
-// Which jumps of timestamps are real.
+// Tells real jumps of timestamps from single wrong ones.
 #include "tools/times.h"
 
 #include <algorithm>
@@ -13,7 +13,7 @@ constexpr int64_t JITTER_MS = 1000;
 constexpr int64_t LONGEST_STEP_MS = 1000;   // from the frame before an odd one
 constexpr int64_t SLOWEST_STEP_MS = 600000; // of a stream that has few frames, such as slides
 
-// The time of a timestamp that is nearest to `near`: timestamps have 32 bits.
+// The time that is nearest to `near`, as timestamps wrap around at 32 bits.
 int64_t Place(int64_t near, int64_t timestamp, int64_t shift)
 {
     return near + static_cast<int32_t>(static_cast<uint32_t>(timestamp + shift - near));
@@ -31,12 +31,12 @@ bool Times::Fits(const Lane& lane, int64_t timestamp, int64_t shift) const
 {
     const int64_t time = Place(lane.placed, timestamp, shift);
     const int64_t reached = shift == m_shift ? std::max(lane.time, m_latest) : lane.time;
-    const bool wasAlone = shift == lane.shift && lane.placed - lane.before > JITTER_MS; // the last frame, too late
+    const bool wasAlone = shift == lane.shift && lane.placed - lane.before > JITTER_MS; // the last frame was too late
     return time >= (wasAlone ? lane.before : lane.placed) - JITTER_MS && time >= lane.time - m_limit &&
            time <= reached + lane.limit;
 }
 
-// Moves the lane to where the other one, or the odd frame before, has jumped to.
+// Gives the lane the shift of the other one, or the one tried for an odd frame, if the timestamp fits it.
 bool Times::Join(Lane& lane, int64_t timestamp)
 {
     if (lane.shift != m_shift && Fits(lane, timestamp, m_shift)) {
@@ -58,7 +58,7 @@ bool Times::Join(Lane& lane, int64_t timestamp)
     return false;
 }
 
-// Of two long steps in a row none is a jump.
+// Two long steps in a row are the rate of a slow stream, not jumps.
 bool Times::IsSlow(Lane& lane, int64_t step) const
 {
     const auto isLong = [this](int64_t each) { return each > m_limit && each <= SLOWEST_STEP_MS; };
@@ -69,7 +69,7 @@ bool Times::IsSlow(Lane& lane, int64_t step) const
     return true;
 }
 
-Times::Step Times::Judge(Lane& lane, int64_t timestamp)
+Times::Step Times::Classify(Lane& lane, int64_t timestamp)
 {
     const int64_t step = Place(lane.placed, timestamp, lane.shift) - lane.placed;
     if (Fits(lane, timestamp, lane.shift)) {
@@ -101,7 +101,7 @@ Times::Step Times::Take(flvdmx::Stream stream, int64_t timestamp)
         const int64_t time = timestamp + m_shift;
         lane = {true, time, time, time, m_limit, 0, m_shift};
     }
-    const Step step = Judge(lane, timestamp);
+    const Step step = Classify(lane, timestamp);
     if (step == Step::odd) {
         lane.time += lane.step;
     } else {

@@ -1,6 +1,6 @@
-# Installs the build into a prefix, moves that, and uses it as a user would: the examples that it holds, in C through
-# pkg-config, in C and C++ through CMake, a copy of the host kit, and the tool. Called with BUILD, SOURCES, LIBDIR, CC
-# and SAMPLE.
+# Installs the build into a prefix, moves the prefix, and uses it as a user would: builds its examples in C through
+# pkg-config and in C and C++ through CMake, copies the host kit, and runs the tool. Called with BUILD, SOURCES, LIBDIR,
+# CC and SAMPLE.
 
 set(work ${BUILD}/consumer)
 set(prefix ${work}/moved)

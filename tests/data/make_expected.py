@@ -6,11 +6,11 @@ stream  kind= codec= width= height= rate= channels= extradata=
 packet  kind= pos= dts= pts= size= crc= key=   in file order; pos is the tag's start, dts the tag's timestamp in ms
 
 Every packet is compared with the tag at its position, so that no change by the prober goes unnoticed. The truncated
-and the damaged sample are expected to give the packets of avc_aac.flv whose tags are whole and untouched.
+and the damaged sample must deliver the packets of avc_aac.flv whose tags are complete and undamaged.
 
-With the program of the tool as argument, expected/extract.txt is written too: `NAME video|audio SHA-256` of the streams
-that it extracts. Streams with a demuxer of their own must first have been decoded to the same pictures and samples as
-the sample file, of a broken one its tags that are kept; the others must be its frames one behind the other.
+With the tool's program as argument, also writes expected/extract.txt: `NAME video|audio SHA-256` of the streams that
+the tool extracts. First, streams in formats that ffmpeg reads must decode to the same pictures and samples as the
+sample file (if that is damaged, as its complete tags); the others must consist of its frames, one after the other.
 """
 import hashlib
 import json
@@ -23,7 +23,7 @@ import zlib
 HERE = pathlib.Path(__file__).resolve().parent
 SAMPLES = sorted(HERE.glob("*.flv"))
 TAG_HEADER, BACK_POINTER = 11, 4
-KINDS, CODEC_BYTES = {8: "audio", 9: "video"}, {(9, 7): 5, (8, 10): 2}  # in front of the frame; else 1
+KINDS, CODEC_BYTES = {8: "audio", 9: "video"}, {(9, 7): 5, (8, 10): 2}  # before the frame; otherwise 1
 BROKEN = ["truncated", "damaged"]
 DEMUXERS = {"h264": ["-f", "h264"], "aac": ["-f", "aac"], "mp3": ["-f", "mp3"],
             "pcm_s16le": ["-f", "s16le", "-ar", "11025", "-ac", "1"]}
@@ -36,7 +36,7 @@ def probe(path):
 
 
 def all_tags(data):
-    """Each tag with its back-pointer, by the chain alone: {offset: bytes}."""
+    """Each tag with its back-pointer, following only the sizes: {offset: bytes}."""
     tags, pos = {}, 13
     while pos < len(data):
         tags[pos] = data[pos:pos + TAG_HEADER + int.from_bytes(data[pos + 1:pos + 4], "big") + BACK_POINTER]
@@ -57,7 +57,7 @@ def media_tags(data):
 
 
 def kept_tags(path):
-    """The whole tags of a sample without those that its damage or end has touched: {offset: bytes}."""
+    """The complete tags of a sample, without those affected by damage or a missing end: {offset: bytes}."""
     data = path.read_bytes()
     whole = all_tags((HERE / "avc_aac.flv").read_bytes() if path.stem in BROKEN else data)
     return {pos: tag for pos, tag in whole.items() if data[pos:pos + len(tag)] == tag}
@@ -79,7 +79,7 @@ def packet_line(packet, tag):
             f"key={key}")
 
 
-def sound_file(path):
+def undamaged_file(path):
     tags, found = media_tags(path.read_bytes()), probe(path)
     assert [int(p["pos"]) for p in found["packets"]] == list(tags), path
     duration = round(float(found["format"].get("duration", 0)) * 1000)
@@ -111,7 +111,7 @@ def extracted(tool, path, folder):
 def main():
     for path in SAMPLES:
         broken = path.stem in BROKEN
-        duration, streams, packets = sound_file(HERE / "avc_aac.flv" if broken else path)
+        duration, streams, packets = undamaged_file(HERE / "avc_aac.flv" if broken else path)
         lines = [f"file size={path.stat().st_size} duration_ms={0 if broken else duration}", *streams,
                  *(packets[pos] for pos in kept_tags(path) if pos in packets)]
         (HERE / "expected" / f"{path.stem}.txt").write_text("\n".join(lines) + "\n")

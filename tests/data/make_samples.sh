@@ -1,6 +1,6 @@
 #!/bin/sh
-# Makes the sample files beside it with Debian's ffmpeg, each from synthetic picture and sound. Encoders and muxer
-# run bit-exact in one thread, so that a second run with the same ffmpeg gives the same bytes.
+# Makes the sample files in this folder with Debian's ffmpeg, from synthetic pictures and sound. Encoders and muxer run
+# bit-exact in one thread, so that a second run with the same ffmpeg produces the same bytes.
 # The expected results are then made by make_expected.py.
 set -eu
 cd "$(dirname "$0")"
@@ -33,7 +33,7 @@ aac="-c:a aac -b:a 32k -ac 1"
     make pcm_only $(audio 11025 0.5) -c:a pcm_s16le -ac 1
 }
 
-# A download that broke off in the middle of a tag, and a stretch of 700 bytes overwritten.
+# A download that ended in the middle of a tag, and a file with 700 bytes overwritten.
 python3 - <<'PY'
 sound = open("avc_aac.flv", "rb").read()
 open("truncated.flv", "wb").write(sound[:len(sound) * 3 // 5 + 1])

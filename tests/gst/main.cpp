@@ -1,4 +1,4 @@
-// Runs the tests with the plugin of this build and with the framework's tracer of leaks, which speaks when it ends.
+// Runs the tests with the plugin of this build and with the framework's leak tracer, which prints leaks at the end.
 
 #include <gst/gst.h>
 #include <gtest/gtest.h>

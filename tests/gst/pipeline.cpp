@@ -88,7 +88,7 @@ GstFlowReturn Pipeline::take(GstAppSink* sink, gpointer pipeline)
     return GST_FLOW_OK;
 }
 
-// The buffer comes again when the pipeline plays.
+// The buffer arrives again when the pipeline plays.
 GstFlowReturn Pipeline::take_preroll(GstAppSink* sink, gpointer pipeline)
 {
     GstSample* const sample = gst_app_sink_pull_preroll(sink);

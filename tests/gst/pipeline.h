@@ -1,5 +1,5 @@
 /*
- * Pipelines of the tests: run from a description, with what arrives at their sinks.
+ * Test pipelines: made from a description, with a record of what arrives at their sinks.
  */
 #pragma once
 
@@ -22,7 +22,7 @@
 
 namespace flvd_test {
 
-/** A file of the temporary folder, which is removed in the end. */
+/** A file in the temporary folder, which is removed at the end. */
 class TemporaryFile {
 public:
     TemporaryFile()
@@ -51,34 +51,34 @@ struct Arrival {
     uint64_t offset = 0; /**< GST_BUFFER_OFFSET */
     bool discont = false;
     bool delta = false;
-    GstClockTime segment_start = 0; /**< of the segment in force */
+    GstClockTime segment_start = 0; /**< of the current segment */
     GstClockTime segment_base = 0;  /**< likewise */
     std::string checksum;           /**< of the bytes */
-    std::string caps;               /**< in force */
+    std::string caps;               /**< the current ones */
 };
 
-/** A pipeline whose appsinks keep all that arrives. Ends when it goes. */
+/** A pipeline whose appsinks record everything that arrives. Stopped by the destructor. */
 class Pipeline {
 public:
-    /** From the words of gst-launch-1.0. */
+    /** Makes a pipeline from a description in the syntax of gst-launch-1.0. */
     explicit Pipeline(const std::string& description);
     ~Pipeline();
     Pipeline(const Pipeline&) = delete;
     Pipeline& operator=(const Pipeline&) = delete;
 
     GstElement* element() const { return m_pipeline; }
-    /** Goes to a state, where a paused pipeline keeps the first buffers as well, and waits for it. False when that
-     * failed or took longer than ten seconds. */
+    /** Changes the state and waits for it; a pipeline that is paused also records the first buffers. Returns false if
+     * that failed or took longer than ten seconds. */
     bool go_to(GstState state);
-    /** Plays until a message of one of these types; null after 30 seconds. */
+    /** Plays until a message of one of these types arrives. Returns it, or null after 30 seconds. */
     GstMessage* play_until(int types);
-    /** Plays to the end, or to a message of a type that carries a text. Returns that text or the error's, else "". */
+    /** Plays to the end, or to a message of these types. Returns the text of the warning or error, or "". */
     std::string play(int types = GST_MESSAGE_EOS);
-    /** A seek in time, in milliseconds; `stop` -1: to the end. */
+    /** Seeks to a time in milliseconds; `stop` -1: to the end. */
     bool seek(int64_t start, int flags, int64_t stop = -1, double rate = 1.0);
-    /** What has arrived at the appsink of that name. */
+    /** Returns what has arrived at the appsink of that name. */
     std::vector<Arrival> arrivals(const char* sink);
-    /** Decoding time of the last one there; 0 without any. */
+    /** Returns the decoding time of the last buffer there, or 0. */
     GstClockTime last_time(const char* sink);
     void forget_arrivals();
 
@@ -93,7 +93,7 @@ private:
     std::map<std::string, std::vector<Arrival>> m_arrivals;
 };
 
-/** filesrc and the demuxer `d`, with these branches for `video` and `audio`; an empty one is left out. */
+/** Describes filesrc and the demuxer `d`, with these branches for `video` and `audio`; an empty one is omitted. */
 std::string demuxed(const std::string& path, const std::string& video, const std::string& audio,
                     const std::string& demuxer = "flvdmxdemux");
 

@@ -1,4 +1,4 @@
-// What the element delivers, beside the framework's own demuxer where that plays a file.
+// What the element delivers, compared with the framework's own demuxer where that plays the file.
 
 #include "pipeline.h"
 
@@ -27,8 +27,8 @@ Bytes Sound(uint8_t header, size_t size)
     return File(tags, 4).bytes;
 }
 
-// Pictures that can be decoded, of noise: simple profile, 6 x 4 macroblocks, of which the alpha channel has as many.
-// The first byte crops them to 93 x 59.
+// Pictures of noise that can be decoded: simple profile, 6 x 4 macroblocks, as many in the alpha channel. The first
+// byte crops them to 93 x 59.
 Bytes Vp6(bool alpha)
 {
     Tags tags = {{18, 0, OnMetaData("width: 88 height: 56")}};
@@ -45,7 +45,7 @@ struct Medium {
     const char* name;
     bool video;
     bool audio;
-    std::function<Bytes()> make = {}; // the sample of that name without
+    std::function<Bytes()> make = {}; // empty: the sample of that name
 };
 
 void PrintTo(const Medium& medium, std::ostream* out)
@@ -55,7 +55,7 @@ void PrintTo(const Medium& medium, std::ostream* out)
 
 class Play : public testing::TestWithParam<Medium> {
 public:
-    // Decoded, or as they come out of the demuxer.
+    // Returns the buffers decoded, or as they come out of the demuxer.
     static std::map<std::string, std::vector<Arrival>> play(const std::string& path, const char* demuxer, bool decodes)
     {
         const std::string decoder = decodes ? "decodebin ! " : "";
@@ -68,7 +68,7 @@ public:
     }
 };
 
-TEST_P(Play, GivesWhatTheFrameworksOwnDemuxerGives)
+TEST_P(Play, DeliversWhatTheFrameworksOwnDemuxerDelivers)
 {
     const TemporaryFile made(GetParam().make ? GetParam().make() : Bytes());
     const std::string path = GetParam().make ? made.path() : g_data + GetParam().name + ".flv";
@@ -82,7 +82,7 @@ TEST_P(Play, GivesWhatTheFrameworksOwnDemuxerGives)
             for (size_t i = 0; i < ours[stream].size(); ++i) {
                 const Arrival &one = ours[stream][i], &other = theirs[stream][i];
                 ASSERT_EQ(one.checksum, other.checksum) << i;
-                const bool cut = decodes && i == 0; // by the decoder: what is before the segment of theirs
+                const bool cut = decodes && i == 0; // their decoder clips to the start of the segment
                 ASSERT_TRUE(cut || one.pts == other.pts) << i;
                 ASSERT_EQ(one.dts, other.dts) << i;
                 ASSERT_EQ(one.delta, other.delta) << i;
@@ -108,12 +108,12 @@ INSTANTIATE_TEST_SUITE_P(Gst, Play,
                                          Medium{"mu_law", false, true, [] { return Sound(0x82, 160); }}),
                          [](const testing::TestParamInfo<Medium>& i) { return std::string(i.param.name); });
 
-// What arrives of a damaged file. Pictures and sounds that come after damage are marked.
+// What arrives from a damaged file. Video and audio frames after damage are marked.
 struct DamagedCase {
     const char* name;
     size_t pictures;
     size_t sounds;
-    size_t discontinuities; // of the video, the first picture among them
+    size_t discontinuities; // of the video, including the first picture
     std::function<void(const std::string& path)> make = {};
 };
 
@@ -143,7 +143,7 @@ void WriteHoles(const std::string& path)
 
 class Damaged : public testing::TestWithParam<DamagedCase> {};
 
-TEST_P(Damaged, PlaysOn)
+TEST_P(Damaged, ContinuesToPlay)
 {
     const DamagedCase& wanted = GetParam();
     const TemporaryFile made{Bytes()};
@@ -167,8 +167,8 @@ INSTANTIATE_TEST_SUITE_P(Gst, Damaged,
                                          DamagedCase{"holes", 1935, 0, 10, WriteHoles}),
                          [](const testing::TestParamInfo<DamagedCase>& i) { return std::string(i.param.name); });
 
-// Configurations that change midway come as caps before the frames that need them; equal ones do not, nor are frames
-// after them marked as discontinuous.
+// Configurations that change within the file arrive as caps before the frames that need them. Equal ones do not, and
+// the frames after them are not marked as discontinuous.
 TEST(Playing, AnnouncesChangedConfigurations)
 {
     const Tag other_sound = {8, 80, AacConfig({0x11, 0x90})};               // 48 kHz
@@ -191,7 +191,7 @@ TEST(Playing, AnnouncesChangedConfigurations)
     }
 }
 
-// Recordings that were joined, cut or written carelessly: all of the video arrives, and its times never go back.
+// Recordings that were joined, cut or badly written: all video frames arrive, and their times never go back.
 TEST(Playing, PutsTimesInOrder)
 {
     const auto video = [](const std::vector<uint32_t>& times) {
@@ -208,8 +208,8 @@ TEST(Playing, PutsTimesInOrder)
         {.tags = video({0, 40, 2000, 2040, 0, 40}), .times = {0, 40, 2000, 2040, 2080, 2120}},
         {.tags = video({0, 40, 4000, 4040, 0, 40, 80}), .times = {0, 40, 4000, 4040, 4080, 4120, 4160}},
         {.tags = video({0xFFFFFFB0, 0xFFFFFFD8, 0, 40}), .times = {0, 40, 80, 120}},
-        {.tags = Tags{g_meta} + video({20, 0, 40}), .times = {0, 0, 20}}, // the first one is not the earliest
-        {.tags = {g_avc, Nalu(0), {9, 40, AvcNalu(false, {})}, Nalu(80)}, .times = {0, 80}}, // one is empty
+        {.tags = Tags{g_meta} + video({20, 0, 40}), .times = {0, 0, 20}}, // the first frame is not the earliest
+        {.tags = {g_avc, Nalu(0), {9, 40, AvcNalu(false, {})}, Nalu(80)}, .times = {0, 80}}, // one frame is empty
         {.tags = {rate, g_avc, Nalu(0)}, .times = {0}, .caps = "framerate=(fraction)30000/1001"},
         {.tags = {screen}, .times = {0}, .caps = "video/x-flash-screen2"},
     };
@@ -226,8 +226,8 @@ TEST(Playing, PutsTimesInOrder)
     }
 }
 
-// What is left out is said once; the rest plays on.
-TEST(Playing, WarnsOfWhatIsLeftOut)
+// There is one warning about frames that are not played; the rest is played.
+TEST(Playing, WarnsOfWhatIsNotPlayed)
 {
     const Tag h263 = {9, 80, VideoData(1, CODEC_H263, H263Picture(3))};
     const Tag pcm_stereo = {8, 40, AudioData(SOUND_PCM | 1, Noise(60))};
@@ -236,8 +236,8 @@ TEST(Playing, WarnsOfWhatIsLeftOut)
         const char* text;
     } cases[] = {
         {{g_avc, Nalu(0), g_aac, Raw(0), h263, h263, Raw(80)}, "from H.264 (AVC) to Sorenson H.263"},
-        {{Pcm(0), Pcm(20), pcm_stereo, pcm_stereo}, "its sample rate, size or channels change"},
-        {{g_aac, Nalu(0), Raw(0), Nalu(40), Raw(23)}, "no AVC configuration"},
+        {{Pcm(0), Pcm(20), pcm_stereo, pcm_stereo}, "its sample rate, sample size or channels change"},
+        {{g_aac, Nalu(0), Raw(0), Nalu(40), Raw(23)}, "no usable AVC configuration"},
         {{g_aac, Raw(0), {8, 23, AacConfig({0xFF})}, Raw(23)}, "is damaged and not used"},
         {{g_avc, Nalu(0), Raw(0), Nalu(40)}, "the audio cannot be decoded"},
     };
@@ -250,7 +250,7 @@ TEST(Playing, WarnsOfWhatIsLeftOut)
     }
 }
 
-TEST(Playing, FindsAConfigurationThatComesLate)
+TEST(Playing, FindsAConfigurationAfterTheFirstFrames)
 {
     const TemporaryFile file(File({g_avc, Nalu(0), Raw(0), Raw(23), Nalu(40), g_aac, Raw(46), Raw(69)}).bytes);
     Pipeline pipeline(demuxed(file.path(), "fakesink", "appsink sync=false name=a"));
@@ -259,8 +259,8 @@ TEST(Playing, FindsAConfigurationThatComesLate)
     EXPECT_NE(pipeline.arrivals("a")[0].caps.find("codec_data=(buffer)121056e500"), std::string::npos);
 }
 
-// A source that brings nothing stops only its own pipeline, and not even that from ending.
-TEST(Playing, GoesOnBesideABlockedSource)
+// A source that delivers nothing blocks only its own pipeline, which can still be stopped.
+TEST(Playing, IsNotBlockedByAnotherSource)
 {
     Pipeline blocked("appsrc stream-type=random-access format=bytes size=100000 ! flvdmxdemux ! fakesink");
     gst_element_set_state(blocked.element(), GST_STATE_PLAYING);
@@ -269,7 +269,7 @@ TEST(Playing, GoesOnBesideABlockedSource)
     EXPECT_EQ(other.play(), "");
 }
 
-// A sink does not wait for sound that ended long before, when the queues hold less than what is left.
+// A sink does not wait for audio that ended long before, even if the queues hold less than the rest of the video.
 TEST(Playing, FillsGaps)
 {
     Tags tags = {g_avc, g_aac, Raw(0), Raw(23)};
@@ -285,7 +285,7 @@ TEST(Playing, FillsGaps)
     EXPECT_EQ(pipeline.play(), "");
 }
 
-// Stopped and given another file, an element plays that one alone.
+// An element that is stopped and given another file plays only that one.
 TEST(Playing, ForgetsThePreviousFile)
 {
     GstElement* const pipeline = gst_parse_launch("filesrc name=f ! flvdmxdemux name=d", nullptr);
@@ -298,7 +298,7 @@ TEST(Playing, ForgetsThePreviousFile)
     static Count s_count = count;
     const auto link = [](GstElement* demuxer, GstPad* pad, gpointer counts) {
         GstElement* const sink = gst_element_factory_make("fakesink", GST_PAD_NAME(pad));
-        g_object_set(sink, "async", FALSE, nullptr); // one thread feeds both: none may wait for the other
+        g_object_set(sink, "async", FALSE, nullptr); // one thread feeds both, so neither may wait for the other
         gst_bin_add(GST_BIN(GST_ELEMENT_PARENT(demuxer)), sink);
         gst_pad_add_probe(pad, GST_PAD_PROBE_TYPE_BUFFER, s_count, counts, nullptr);
         gst_element_link_pads(demuxer, GST_PAD_NAME(pad), sink, "sink");
@@ -321,7 +321,7 @@ TEST(Playing, ForgetsThePreviousFile)
         gst_object_unref(bus);
         EXPECT_EQ(std::pair(frames[0].load(), frames[1].load()), wanted) << name;
         gst_element_set_state(pipeline, GST_STATE_READY);
-        for (const char* pad : {"video", "audio"}) { // the pads are gone, and with them what ends the sinks
+        for (const char* pad : {"video", "audio"}) { // the pads were removed, and nothing else resets the sinks
             GstElement* const sink = gst_bin_get_by_name(GST_BIN(pipeline), pad);
             gst_element_set_state(sink, GST_STATE_NULL);
             gst_bin_remove(GST_BIN(pipeline), sink);
@@ -334,7 +334,7 @@ TEST(Playing, ForgetsThePreviousFile)
     gst_object_unref(pipeline);
 }
 
-TEST(Playing, TellsTags)
+TEST(Playing, ReportsTags)
 {
     const Tag meta = {18, 0, OnMetaData("title: 'Film creator: 'Somebody comment: %2.0.2.255.254 videodatarate: 500")};
     const TemporaryFile file(File({meta, g_avc, Nalu(0), Nalu(40)}, 1).bytes);
@@ -355,11 +355,11 @@ TEST(Playing, TellsTags)
     gst_tag_list_unref(tags);
     for (const char* wanted : {"title=(string)Film", "artist=(string)Somebody", "bitrate=(uint)500000", "H.264"})
         EXPECT_NE(told.find(wanted), std::string::npos) << told;
-    EXPECT_EQ(told.find("comment"), std::string::npos) << told; // which is no UTF-8
+    EXPECT_EQ(told.find("comment"), std::string::npos) << told; // it is not valid UTF-8
 }
 
-// What cannot be played is said, soon, and with words that help.
-TEST(Playing, RefusesWithReason)
+// A file that cannot be played fails soon, with a message that helps.
+TEST(Playing, FailsWithAReason)
 {
     const TemporaryFile empty(File({{18, 0, OnMetaData("width: 320")}}).bytes), configs(File({g_avc, g_aac}).bytes);
     const TemporaryFile unknown(
@@ -372,8 +372,8 @@ TEST(Playing, RefusesWithReason)
         {"filesrc location=" + configs.path() + " ! flvdmxdemux ! fakesink", "has no frames"},
         {"appsrc stream-type=random-access format=bytes ! flvdmxdemux ! fakesink", "size of the file"},
         {"filesrc location=" + g_data + "script_data.txt ! flvdmxdemux ! fakesink", "FLVD_ERR_FILE_HEADER"},
-        {"filesrc location=" + unknown.path() + " ! flvdmxdemux ! fakesink", "no stream of a codec"},
-        {"filesrc location=" + g_data + "avc_aac.flv ! queue ! flvdmxdemux ! fakesink", "can be pulled"},
+        {"filesrc location=" + unknown.path() + " ! flvdmxdemux ! fakesink", "no stream has a known codec"},
+        {"filesrc location=" + g_data + "avc_aac.flv ! queue ! flvdmxdemux ! fakesink", "supports pull mode"},
     };
     for (const auto& [description, text] : cases) {
         Pipeline pipeline(description);

@@ -29,11 +29,12 @@ std::string Path(const char* sample)
 struct SeekCase {
     int64_t target;
     int flags;
-    std::optional<int64_t> position; // of the tag that comes next, by the C++ header; none: the end
+    std::optional<int64_t> position; // of the next tag, as the C++ header finds it; none: the end
     int64_t time = 0;                // when to decode it
 };
 
-// Goes to the keyframe before the target, or as the flags say after it or to the nearest; after the last one, to that.
+// Goes to the keyframe before the target; if the flags require it, to the one after it or the nearest; after the last
+// one, to that.
 flvdmx::result<flvdmx::Milliseconds> Reach(flvdmx::File& file, const SeekCase& seek)
 {
     const flvdmx::Milliseconds target(seek.target);
@@ -44,7 +45,7 @@ flvdmx::result<flvdmx::Milliseconds> Reach(flvdmx::File& file, const SeekCase& s
     return goes_back ? file.seek(target, flvdmx::SeekMode::backward) : after;
 }
 
-// The pipelines are not there yet: all files that are open have one host.
+// Runs before there are pipelines, as all open files share one host.
 std::vector<SeekCase> MakeSeeks(const char* sample, int count)
 {
     std::mt19937 random(7); // NOLINT(cert-msc51-cpp): the same seeks in every run
@@ -94,8 +95,8 @@ TEST_P(Seek, LandsWhereTheHeaderDoes)
 INSTANTIATE_TEST_SUITE_P(Gst, Seek, testing::Values("avc_aac", "avc_aac_index", "avc_bframes_aac", "h263_mp3"),
                          [](const testing::TestParamInfo<const char*>& i) { return std::string(i.param); });
 
-// A segment ends where it was told to, with a message when that was asked for, and playing goes on from there.
-TEST(Seeking, KeepsToSegments)
+// A segment ends where the seek set its end, with a message if requested, and playing continues from there.
+TEST(Seeking, EndsSegments)
 {
     Pipeline pipeline(demuxed(Path("avc_aac_index"), "appsink sync=false name=v", "appsink sync=false name=a"));
     ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
@@ -108,7 +109,7 @@ TEST(Seeking, KeepsToSegments)
     gst_message_parse_segment_done(message, nullptr, &end);
     gst_message_unref(message);
     EXPECT_EQ(end, 2 * static_cast<gint64>(GST_SECOND));
-    for (const char* sink : {"v", "a"}) { // which may be behind the message
+    for (const char* sink : {"v", "a"}) { // buffers may arrive after the message
         for (int i = 0; i < 500 && pipeline.last_time(sink) <= 1900 * GST_MSECOND; ++i)
             std::this_thread::sleep_for(std::chrono::milliseconds(10));
         ASSERT_GT(pipeline.arrivals(sink).size(), 25u);
@@ -120,8 +121,9 @@ TEST(Seeking, KeepsToSegments)
     EXPECT_EQ(pipeline.arrivals("v").back().segment_base, GST_SECOND); // continues where the other one ended
 }
 
-// An index may count from the first frame where the timestamps do not. Without times that rise, nothing can be sought.
-TEST(Seeking, DoesWithoutAnIndex)
+// The times in an index may count from the first frame although the timestamps do not. Without rising times, seeking is
+// impossible.
+TEST(Seeking, ReplacesAWrongIndex)
 {
     const auto hook = [](std::vector<double>& times, std::vector<double>&) {
         std::for_each(times.begin(), times.end(), [](double& time) { time -= 100.0; });
@@ -145,7 +147,7 @@ TEST(Seeking, DoesWithoutAnIndex)
     gst_query_unref(query);
 }
 
-TEST(Seeking, RefusesWhatItCannotAndEndsBeyondTheEnd)
+TEST(Seeking, RejectsUnsupportedSeeksAndEndsPastTheEnd)
 {
     Pipeline pipeline(demuxed(Path("avc_aac"), "appsink sync=false name=v", "fakesink"));
     ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
@@ -177,7 +179,7 @@ TEST(Seeking, AnswersQueries)
     gst_query_unref(query);
 }
 
-// Until the time is over.
+// Seeks until the time is over.
 void SeekAtRandom(Pipeline& pipeline, unsigned seed, std::chrono::steady_clock::time_point end)
 {
     std::mt19937 random(seed);
@@ -188,16 +190,16 @@ void SeekAtRandom(Pipeline& pipeline, unsigned seed, std::chrono::steady_clock::
     }
 }
 
-// Several pipelines play, are sought from two threads each, and others are opened and ended beside them. All still
+// Several pipelines play while two threads seek in each, and others are opened and stopped at the same time. All still
 // reach their end.
-TEST(Seeking, HoldsFromManyThreads)
+TEST(Seeking, WorksFromManyThreads)
 {
     const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(2);
     std::vector<std::unique_ptr<Pipeline>> pipelines;
     std::vector<std::thread> threads;
     for (const char* sample : {"avc_aac", "avc_aac_index", "h263_mp3"}) {
         pipelines.push_back(std::make_unique<Pipeline>(
-            demuxed(Path(sample), "fakesink sync=true", "fakesink sync=true"))); // by the clock, so that they last
+            demuxed(Path(sample), "fakesink sync=true", "fakesink sync=true"))); // in real time, so that they last
         Pipeline& pipeline = *pipelines.back();
         ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
         gst_element_set_state(pipeline.element(), GST_STATE_PLAYING);

@@ -7,7 +7,7 @@
 
 namespace flvd_test {
 
-/** Bytes that the callback host opens by their name, while the object exists. It must outlive their instances. */
+/** Bytes that the callback host opens by name while the object exists, which must outlive all instances that use it. */
 struct CallbackFile : flvd_callback_file_t {
     CallbackFile(const void* bytes, uint64_t length)
         : flvd_callback_file_t{ReadAt, GetSize, this, "", nullptr}, data(static_cast<const char*>(bytes)), size(length)

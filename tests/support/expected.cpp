@@ -58,17 +58,17 @@ Expected ReadExpected(const std::string& name)
             out.streams.push_back(
                 {video ? 1u : 2u, fields["codec"], number("width"), number("rate"), FromHex(fields.at("extradata"))});
         if (kind == "file")
-            Require(number("size") == out.bytes.size(), name + " has another size");
+            Require(number("size") == out.bytes.size(), name + " has a wrong size");
         if (kind != "packet")
             continue;
         const size_t pos = number("pos");
-        const uint8_t* const at = &out.bytes.at(pos + 14) - 14; // header and back-pointer are there
+        const uint8_t* const at = &out.bytes.at(pos + 14) - 14; // includes header and back-pointer
         const auto length = static_cast<size_t>(at[1] << 16 | at[2] << 8 | at[3]);
         const uint8_t* const end = &out.bytes.at(pos + 14 + length) - 3;
         const Tag tag{*at, number("dts"), {at + 11, end}, {}, {}, static_cast<int64_t>(pos)};
         const Bytes frame = tag.frame();
         Require(tag.type == (video ? 9 : 8) && frame.size() == number("size") && Crc32(frame) == number("crc", 16),
-                name + ": another packet at " + fields["pos"]);
+                name + ": wrong packet at " + fields["pos"]);
         out.tags.push_back(tag);
         out.packets.push_back({number("pts"), number("key") != 0});
     }

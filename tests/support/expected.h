@@ -1,4 +1,4 @@
-/* What tests/data holds: sample files with their expected results, as make_expected.py writes them, and tables. */
+/* The contents of tests/data: sample files with their expected results, as make_expected.py writes them, and tables. */
 #pragma once
 
 #include "flv_writer.h"
@@ -16,23 +16,23 @@ struct ExpectedStream {
     Bytes extradata;
 };
 
-/** What the prober reports of a packet and its tag does not say. */
+/** What the prober reports about a packet and its tag does not contain. */
 struct ExpectedPacket {
     uint32_t presentation = 0; /**< ms */
     bool keyframe = false;     /**< always true for audio */
 };
 
-/** A sample file; its tags are those that carry the packets, which have been compared with them. */
+/** A sample file. Its tags are those that carry the packets; both have been compared. */
 struct Expected : Flv {
     std::string name;
     std::vector<ExpectedStream> streams;
     std::vector<ExpectedPacket> packets; /**< one per tag */
 };
 
-/** As zlib and Ethernet use it. */
+/** The CRC-32 of zlib and Ethernet. */
 uint32_t Crc32(const Bytes& bytes);
 
-/** NAME.flv and expected/NAME.txt in FLVDMX_TEST_DATA; throws when they cannot be read or do not agree. */
+/** Reads NAME.flv and expected/NAME.txt in FLVDMX_TEST_DATA. Throws if they cannot be read or do not agree. */
 Expected ReadExpected(const std::string& name);
 
 /** The rows of a table, split at " | ". Skips empty lines and lines that start with #. Throws if there are no rows. */

@@ -42,10 +42,10 @@ bool FakeHost::grow(int64_t n, const std::string& path)
     return visible(path) > before;
 }
 
-// The functions pass on to the current host. The carried slots are functions that must never run.
+// The functions forward to the current host. The unused slots hold functions that must never run.
 template <class Table> void FakeHost::fill(Table& table) const
 {
-    table.mem_slot1 = table.mem_slot3 = table.mem_slot5 = [] { violation("a carried memory function was called"); };
+    table.mem_slot1 = table.mem_slot3 = table.mem_slot5 = [] { violation("an unused memory function was called"); };
     table.mem_alloc = [](auto... args) { return current().alloc(args...); };
     table.mem_free = [](auto... args) { return current().release(args...); };
     table.mem_copy = [](auto... args) { return current().copy(args...); };
@@ -88,14 +88,14 @@ fio_file_t* FakeHost::open_reader(const ReaderOptions& options) const
     return __FLV_DMX__fioOpen(DEFAULT_FILE, options.mode, options.cache_size, options.overread, options.extra);
 }
 
-// Counts the call. False: it has to fail.
+// Counts the call. Returns false if it has to fail.
 bool FakeHost::begin(HostFn fn)
 {
     if (on_call)
         on_call(fn);
     const uint64_t number = ++m_counts.calls[index(fn)];
     if (fn == HostFn::Free || fn == HostFn::Copy || fn == HostFn::Set || fn == HostFn::Eof || fn == HostFn::Close)
-        return true; // these cannot
+        return true; // these cannot fail
     const auto& [first, last] = m_faults.failing[index(fn)];
     return ++m_counts.failable != m_faults.call && (number < first || number > last);
 }
@@ -121,7 +121,7 @@ FakeHost::Handle& FakeHost::handle(void* pointer)
     return m_none;
 }
 
-// Memory that starts in one of the blocks must end in it. Other memory is unknown here.
+// A range that starts in one of the blocks must end in it. Other memory is not known here.
 void FakeHost::check_range(const char* what, const void* pointer, uint32_t count)
 {
     const auto* const begin = static_cast<const uint8_t*>(pointer);
@@ -155,7 +155,7 @@ void FakeHost::release(void* memory)
         return;
     const auto block = m_blocks.find(static_cast<uint8_t*>(memory));
     if (block == m_blocks.end())
-        return violation("release of memory that is not held");
+        return violation("release of memory that is not allocated");
     if (on_release)
         on_release(memory, block->second);
     std::memset(memory, RELEASED_MEMORY, block->second);
@@ -239,7 +239,7 @@ FakeHost::Handle& FakeHost::transfer(const char* what, const void* buffer, uint3
     return handle(pointer);
 }
 
-// As fread of a C library: short only at the end, which sets the end flag; with the flag set nothing is read.
+// Like fread in a C library: short only at the end, which sets the end flag; while the flag is set, nothing is read.
 uint32_t FakeHost::read(void* buffer, uint32_t size, uint32_t count, void* pointer)
 {
     const bool allowed = begin(HostFn::Read);

@@ -1,11 +1,12 @@
 /*
- * A host in memory: files, memory functions and file functions that can be made to fail, that count and log every
- * call, and that check the contract: every block and handle is released once and not used afterwards, copies are not
- * empty, and reads stay inside the block that they start in.
+ * A host in memory, with files, memory functions and file functions. They can be made to fail, count and log every
+ * call, and check the contract: every block and handle is released once and not used afterwards, copies are not empty,
+ * and reads stay inside the block in which they start.
  *
- * The library's tables carry no context, so there is one current host: the newest FakeHost object, until it ends.
- * A breach of the contract, and whatever is still held when the host ends, goes to the violation handler; without
- * one it is printed and the process aborts. Include report.h in a GoogleTest source to have it fail the test.
+ * The library's tables carry no context, so there is one current host: the newest FakeHost object, while it exists.
+ * Breaches of the contract, and anything still held when the host is destroyed, are reported to the violation handler.
+ * Without one, they are printed and the process aborts. Include report.h in a GoogleTest source to make them fail the
+ * test.
  */
 #pragma once
 
@@ -27,7 +28,7 @@ namespace flvd_test {
 /** Seek and Tell stand for the 32- and the 64-bit function; in the log they differ. */
 enum class HostFn { Alloc, Free, Copy, Set, Open, Close, Read, Write, Seek, Tell, Eof, Flush, Count };
 
-/** How the library's file layer opens a file. */
+/** The sizes with which the library's file layer opens a file. */
 struct ReaderOptions {
     uint32_t cache_size;
     int32_t overread = 0;
@@ -35,7 +36,7 @@ struct ReaderOptions {
     uint32_t mode = FIO_MODE_READ | FIO_MODE_BINARY;
 };
 
-/** A call of a function that fails: null, -1, 0 bytes, 0 elements. With `later` all calls after it fail, too. */
+/** A call of a function that fails: null, -1, 0 bytes, 0 elements. With `later`, all calls after it fail, too. */
 struct HostFault {
     HostFn fn = HostFn::Read;
     uint64_t nth = 0; /**< 0: none */
@@ -59,35 +60,35 @@ public:
 
     static constexpr const char* DEFAULT_FILE = "a.flv";
     void add_file(const std::string& path, Bytes contents);
-    /** A file of `size` bytes, zero but for the given extents {offset: bytes}. May be far beyond 4 GiB. */
+    /** A file of `size` bytes: zeros, except for the given extents {offset: bytes}. May be far larger than 4 GiB. */
     void add_sparse_file(const std::string& path, int64_t size, std::map<int64_t, Bytes> extents)
     {
         m_files[path] = std::make_shared<File>(File{std::move(extents), size, size});
     }
-    /** Shows only the first `size` bytes (at most all): what a growing file has so far. Open handles see it at once. */
+    /** Makes only the first `size` bytes visible (at most all), like a growing file. Open handles see it at once. */
     void set_visible(int64_t size, const std::string& path = DEFAULT_FILE)
     {
         m_files.at(path)->visible = std::min(size, m_files.at(path)->size);
     }
-    /** Shows n bytes more. @return false when everything was visible already */
+    /** Makes n more bytes visible. @return false if everything was visible already */
     bool grow(int64_t n, const std::string& path = DEFAULT_FILE);
     int64_t visible(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->visible; }
-    /** Contents of a file that is not sparse. */
+    /** The contents of a file that is not sparse. */
     const Bytes& contents(const std::string& path = DEFAULT_FILE) const { return m_files.at(path)->extents.at(0); }
 
     /* -- tables for the library */
 
-    /** An initialisation block; words that the library must not read hold garbage. */
+    /** An initialisation block; words that the library must not read contain garbage. */
     flvd_init_t init(uint32_t options = 0, uint32_t cache_size = 0, uint32_t scan_read_size = 0,
                      const char* path = DEFAULT_FILE) const;
     fio_funcs_t funcs() const;
-    /** Leaves out the 64-bit functions; the 32-bit ones then fail beyond 2 GiB. Set before init() or funcs(). */
+    /** Omits the 64-bit functions; the 32-bit ones then fail beyond 2 GiB. Call it before init() or funcs(). */
     void use_32_bit_only() { m_only_32 = true; }
 
-    /** The library's file layer gets this host's functions and opens the file, for the caller to close. */
+    /** Gives the library's file layer this host's functions and opens the file, which the caller must close. */
     fio_file_t* open_reader(const ReaderOptions& options) const;
 
-    /* -- faults. Calls are numbered from 1, from the construction or the last reset_calls() on. */
+    /* -- faults. Calls are numbered from 1, starting at the construction or the last reset_calls(). */
 
     void fail(const HostFault& fault)
     {
@@ -102,35 +103,35 @@ public:
     void shorten_nth(HostFn fn, uint64_t n, uint32_t k) { m_faults.shortened[index(fn)] = {n, k}; }
     /** Every read moves at most k bytes. */
     void limit_reads(uint32_t k) { m_faults.shortened[index(HostFn::Read)] = {EACH, k}; }
-    /** Called at the start of every host function, before it counts: to let a file grow in the middle of a request. */
+    /** Called at the start of every host function, before it counts. Lets a file grow in the middle of a request. */
     std::function<void(HostFn)> on_call;
     /** If set, changes every position that is returned. */
     std::function<int64_t(int64_t position)> on_tell;
-    /** Called with every block that is released, before its contents are overwritten. */
+    /** Called with every released block, before its contents are overwritten. */
     std::function<void(const void* block, uint32_t size)> on_release;
 
     /* -- what happened */
 
     uint64_t calls(HostFn fn) const { return m_counts.calls[index(fn)]; }
-    /** Calls of functions that can fail. */
+    /** The number of calls of functions that can fail. */
     uint64_t failable_calls() const { return m_counts.failable; }
-    /** Reads, writes, seeks and tells. */
+    /** The number of reads, writes, seeks and tells. */
     uint64_t io_calls() const
     {
         return calls(HostFn::Read) + calls(HostFn::Write) + calls(HostFn::Seek) + calls(HostFn::Tell);
     }
     uint64_t bytes_read() const { return m_counts.bytes_read; }
     void reset_calls() { std::tie(m_counts, m_log) = std::pair(Counts{}, ""); }
-    /** Starts a log of all file calls (of memory calls too with `memory`). */
+    /** Starts a log of all file calls, with `memory` also of memory calls. */
     void start_log(bool memory = false) { std::tie(m_logging, m_log_memory, m_log) = std::tuple(true, memory, ""); }
     /**
-     * The log so far, emptied. Entries are separated by a blank, each `name(arguments)=result`: open(a.flv,rb)=1
-     * read(4096)=100 write(8)=8 seek(10,1)=0 seek64(10,0)=0 tell()=5 tell64()=5 eof()=1 flush()=0 close()=0
-     * alloc(64)=1 free(1)= copy(16)= set(0,16)=. Blocks show as 1, or 0 for null.
+     * Returns the log so far and empties it. Entries are `name(arguments)=result`, separated by a space:
+     * open(a.flv,rb)=1 read(4096)=100 write(8)=8 seek(10,1)=0 seek64(10,0)=0 tell()=5 tell64()=5 eof()=1 flush()=0
+     * close()=0 alloc(64)=1 free(1)= copy(16)= set(0,16)=. Blocks appear as 1, null as 0.
      */
     std::string take_log() { return std::exchange(m_log, {}); }
 
-    /** Size of a block that is held, 0 for any other pointer. */
+    /** The size of an allocated block; 0 for any other pointer. */
     size_t size_of(const void* block) const
     {
         const auto held = m_blocks.find(static_cast<const uint8_t*>(block));
@@ -198,7 +199,7 @@ private:
     FakeHost* const m_previous = m_current;
     std::map<std::string, std::shared_ptr<File>> m_files;
     std::map<const void*, Handle> m_handles;
-    std::deque<uint8_t> m_pointers; // one for each handle ever, so that a closed one is never taken for another
+    std::deque<uint8_t> m_pointers; // one for each handle ever opened, so that a closed one is not mistaken for another
     std::map<const uint8_t*, uint32_t> m_blocks;
     Counts m_counts;
     Faults m_faults;

@@ -45,7 +45,7 @@ Bytes Bits(const std::string& words)
     std::istringstream in(words);
     for (std::string word; in >> word;) {
         const size_t star = word.find('*'), slash = word.find('/');
-        const std::string number = word.substr(star + 1); // all of it when there is no star
+        const std::string number = word.substr(star + 1); // the whole word if there is no star
         const bool is_signed = number[0] == '+' || number[0] == '-';
         const int64_t n = std::stoll(number, nullptr, 0);
         std::string code = binary(!is_signed ? n + 1 : n > 0 ? 2 * n : 1 - 2 * n);
@@ -190,7 +190,7 @@ Flv File(const Tags& tags, uint8_t flags, const Bytes& prefix, uint32_t header)
     return flv;
 }
 
-// Numbers of AMF0 have a fixed size, so the index does not change the layout once it has its entries.
+// AMF0 numbers have a fixed size, so filling in the index does not change the layout.
 Flv IndexedFile(const Tags& tags, const IndexHook& hook, const std::string& properties, uint8_t flags)
 {
     Flv flv = File(Tags{{18, 0, {}}} + tags, flags);

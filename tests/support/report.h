@@ -1,4 +1,4 @@
-/* Lets a breach of the fake host's contract fail the running test. For GoogleTest sources only. */
+/* Makes breaches of the fake host's contract fail the running test. For GoogleTest sources only. */
 #pragma once
 
 #include "fake_host.h"

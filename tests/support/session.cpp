@@ -19,7 +19,7 @@ const std::vector<FailureSite>& FailureSites()
 
 int32_t FailureSite::result() const
 {
-    switch (op == Op::FrameSeek ? FLVD_ERR_NONE : code) { // a frame seek is no operation of the entry point
+    switch (op == Op::FrameSeek ? FLVD_ERR_NONE : code) { // a frame seek is not an operation of the entry point
     case FLVD_ERR_NO_INSTANCE:
         return FLVD_RET_NO_INSTANCE;
     case FLVD_ERR_OPEN_MAIN:

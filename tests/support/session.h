@@ -13,18 +13,18 @@ constexpr uint32_t BACK = FLVD_SEEK_BACKWARD, FORTH = FLVD_SEEK_FORWARD, REL = F
 constexpr uint32_t RETRY = FLVD_SEEK_RETRY_BACKWARD, AT_END = FLVD_SEEK_TO_END_ON_MISS;
 constexpr uint32_t VIDEO = FLVD_STREAM_VIDEO, AUDIO = FLVD_STREAM_AUDIO, BOTH = VIDEO | AUDIO;
 
-constexpr uint32_t SMALL = 1024;               // a cache below LARGE tags, which then cost host calls of their own
+constexpr uint32_t SMALL = 1024;               // a cache that LARGE tags do not fit, so that they cost extra host calls
 constexpr size_t LARGE = 3000, GROWN = 600000; // bytes; GROWN is above the first frame buffer
 
-/** The streams to request, one after the other, of a file that is opened with these options. */
+/** The streams to request in turn from a file that is opened with these options. */
 inline std::vector<uint32_t> Streams(uint32_t options)
 {
     return (options & SEPARATE) != 0 ? std::vector{VIDEO, AUDIO} : std::vector{BOTH};
 }
 
 /**
- * The operation that fails: a call without an instance, an open, a frame request, a time seek, a frame seek. Besides
- * these an open records why a tag does not describe its stream and why it finds no end, a request why it delivers no
+ * The operation that fails: a call without an instance, an open, a frame request, a time seek, a frame seek. An open
+ * also records why a tag does not describe its stream and why it finds no end, and a request why it does not deliver a
  * tag.
  */
 enum class Op { Call, Open, Codec, Extent, Tag, Frame, Seek, FrameSeek };
@@ -38,7 +38,7 @@ enum class Site : uint8_t {
 struct FailureSite {
     std::string name;
     Op op;
-    int32_t code, line, growing_line; /**< error code; lines, growing_line 0 when it is the same in a growing file */
+    int32_t code, line, growing_line; /**< error code; lines; growing_line is 0 if it is the same in a growing file */
 
     bool records(int32_t error, int32_t error_line) const
     {
@@ -48,7 +48,7 @@ struct FailureSite {
     {
         return (options & GROWING) != 0 && growing_line != 0 ? growing_line : line;
     }
-    /** What an operation returns that fails here. */
+    /** The result of an operation that fails here. */
     int32_t result() const;
 };
 /** All failure sites, in the order of the enumeration. */
@@ -62,19 +62,19 @@ struct OpenOptions {
     uint32_t cache_size = 0;
     uint32_t scan_read_size = 0;
     const char* path = FakeHost::DEFAULT_FILE;
-    uint32_t user_buffer_size = 8192; /**< with FLVD_OPT_USER_BUFFER: what each request offers */
+    uint32_t user_buffer_size = 8192; /**< with FLVD_OPT_USER_BUFFER: size of the buffer for each request */
 };
 
 struct FrameResult {
     int32_t rc = 0;
-    Frame frame; /**< copied; as far as delivered */
+    Frame frame; /**< a copy of what was delivered */
 };
 
 class Session {
 public:
     static constexpr uint8_t POISON = 0x5A;
 
-    /** Opens; see opened() and open_rc(). The host must live as long as the session. */
+    /** Opens; see opened() and open_rc(). The host must outlive the session. */
     explicit Session(FakeHost& host, const OpenOptions& options = {});
     ~Session();
     Session(const Session&) = delete;
@@ -88,7 +88,7 @@ public:
 
     /** stream: ignored without FLVD_OPT_SEPARATE_AUDIO_READER. */
     FrameResult frame(uint32_t stream = 0);
-    /** What the last request left in its record, which was full of POISON, and the buffer that it offered. */
+    /** The record of the last request, which was filled with POISON before, and the buffer for that request. */
     const flvd_frame_t& record() const { return m_record; }
     const Bytes& user_buffer() const { return m_user_buffer; }
     int32_t seek(int32_t time, uint32_t mode, int32_t* reached = nullptr);
@@ -97,14 +97,14 @@ public:
     int32_t last_error() { return QVX_FLV_DMX(FLVD_OP_GET_LAST_ERROR, &m_ctx, nullptr, nullptr); }
     /** Line of the last failure: the instance's, or the global one after a failed open. */
     int32_t error_line() const { return m_ctx != nullptr ? m_ctx->error_line : g_flvd_lErrorLine; }
-    /** The last failure is that of the site, or there is none. */
+    /** True if the last failure was at the site; nullopt: if there was none. */
     bool recorded(std::optional<Site> site)
     {
         return last_error() == (site ? At(*site).code : 0) && error_line() == (site ? At(*site).line_of(m_options) : 0);
     }
-    /** The last failure is one that such an operation may have. */
+    /** True if such an operation may have the last failure. */
     bool failed_as_listed(Op op, int32_t rc) { return IsListed(op, rc, last_error(), error_line()); }
-    /** Also done at the end. */
+    /** Also called by the destructor. */
     int32_t close();
 
 private:

@@ -1,4 +1,4 @@
-/* What is left of an exhaustive sweep when there is little time. */
+/* Runs only a sample of an exhaustive sweep when there is little time. */
 #pragma once
 
 #include <algorithm>
@@ -8,14 +8,15 @@
 namespace flvd_test {
 
 /**
- * The cases of one sweep, counted. A run takes all of them; with FLVDMX_SAMPLE=N in the environment it takes the first
- * and every Nth after it, always the same ones. N should have no factor in common with what a sweep takes in turn.
+ * Counts the cases of one sweep. By default all are run. With FLVDMX_SAMPLE=N in the environment, the first and every
+ * Nth after it are run, always the same ones. N should have no common factor with the number of options that a sweep
+ * uses in turn.
  */
 class Sweep {
 public:
-    /** Asked once before each case: whether to run it. */
+    /** Call it once before each case. Returns whether to run it. */
     bool takes_next() { return m_cases++ % step() == 0; }
-    /** Without a sample: what all cases together have to show can be tested. */
+    /** True if all cases are run, so that their combined result can be checked. */
     static bool is_complete() { return step() == 1; }
 
 private:

@@ -1,5 +1,5 @@
-// Ten callback files played on ten threads at the same time: threads FILE. The thread sanitizer, with which this is
-// compiled, ends it when two of them access the same memory without a lock.
+// Plays ten callback files on ten threads at the same time: threads FILE. It is compiled with the thread sanitizer,
+// which aborts if two threads access the same memory without a lock.
 
 #include "flvdmx/flvdmx.hpp"
 #include "support/callback_file.h"
@@ -31,7 +31,7 @@ size_t Play(flvdmx::File& file)
     return listed ? frames : 0;
 }
 
-// Opens, under the lock that File::open takes, and plays when all files are open.
+// Opens under the lock that File::open takes, and plays when all files are open.
 void PlayOwnFile(const std::vector<char>& bytes, std::atomic<size_t>& opened, size_t& frames)
 {
     const flvd_test::CallbackFile source(bytes.data(), bytes.size());

@@ -1,4 +1,4 @@
-#include "judge.h"
+#include "harness.h"
 
 #include <cstdio>
 #include <cstdlib>
@@ -34,11 +34,11 @@ Host::Host(Bytes file) : FakeHost(std::move(file))
     on_call = [this](HostFn) { require(m_calls_left-- != 0, "the operation made too many host calls"); };
 }
 
-// Work costs patience only while the host lies.
+// Work costs patience only while the host breaks its contract.
 bool Host::refuses(uint64_t effort)
 {
     const bool refused = m_patience == 0;
-    if (m_lies != 0)
+    if (m_breaches != 0)
         m_patience -= std::min(effort, m_patience);
     return refused;
 }
@@ -46,7 +46,7 @@ bool Host::refuses(uint64_t effort)
 int32_t Host::eof(void* handle)
 {
     const int32_t at_end = FakeHost::eof(handle);
-    return lies(Lie::AlwaysAtEnd) ? 1 : lies(Lie::NeverAtEnd) ? 0 : at_end;
+    return breaks(Breach::AlwaysAtEnd) ? 1 : breaks(Breach::NeverAtEnd) ? 0 : at_end;
 }
 
 uint32_t Host::read(void* buffer, uint32_t size, uint32_t count, void* handle)
@@ -55,27 +55,27 @@ uint32_t Host::read(void* buffer, uint32_t size, uint32_t count, void* handle)
         return 0;
     const uint32_t got = FakeHost::read(buffer, size, count, handle);
     refuses(got / 1024);
-    if (lies(Lie::ReadStands))
+    if (breaks(Breach::ReadStays))
         FakeHost::seek(handle, -int64_t{got}, FIO_SEEK_CUR, true);
-    return lies(Lie::ReadClaimsMore) ? count + 1 : got;
+    return breaks(Breach::ReadClaimsMore) ? count + 1 : got;
 }
 
 int32_t Host::seek(void* handle, int64_t offset, int32_t whence, bool wide)
 {
-    if (refuses(1) || lies(Lie::SeekStands))
-        return lies(Lie::SeekStands) ? 0 : -1;
-    return FakeHost::seek(handle, offset, lies(Lie::SeekForgetsWhere) ? FIO_SEEK_SET : whence, wide);
+    if (refuses(1) || breaks(Breach::SeekStays))
+        return breaks(Breach::SeekStays) ? 0 : -1;
+    return FakeHost::seek(handle, offset, breaks(Breach::SeekIgnoresWhence) ? FIO_SEEK_SET : whence, wide);
 }
 
 int64_t Host::tell(void* handle, bool wide)
 {
     const int64_t position = refuses(1) ? -1 : FakeHost::tell(handle, wide);
     const auto call = static_cast<int64_t>(calls(HostFn::Tell));
-    if (lies(Lie::TellGoesBack) && position > call % 16)
+    if (breaks(Breach::TellGoesBack) && position > call % 16)
         return position - call % 2 * (call % 16);
-    if (position >= 0 && lies(Lie::TellHuge))
+    if (position >= 0 && breaks(Breach::TellHuge))
         return INT64_MAX - call;
-    return position >= 0 && lies(Lie::TellStands) ? 20 : position;
+    return position >= 0 && breaks(Breach::TellStays) ? 20 : position;
 }
 
 int64_t Host::position(const fio_file_t* reader)

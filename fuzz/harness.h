@@ -1,6 +1,6 @@
 /*
- * What the fuzz targets share: the input, the list of targets, a host that lies, and require(), which prints a message
- * and aborts when a check fails.
+ * Shared by the fuzz targets: the input, the list of targets, a host that can break its contract, and require(), which
+ * prints a message and aborts if a check fails.
  */
 #pragma once
 
@@ -24,7 +24,7 @@ public:
     Input(const uint8_t* data, size_t size);
     const Bytes& payload() const { return m_payload; }
     bool empty() const { return m_next == m_control.size(); }
-    /** The next control byte; 0 when there are no more. */
+    /** Returns the next control byte; 0 if there are no more. */
     uint8_t byte() { return empty() ? uint8_t{0} : m_control[m_next++]; }
     uint16_t word()
     {
@@ -53,40 +53,44 @@ struct Target {
     static inline std::map<std::string, void (*)(Input&)> all;
 };
 
-enum class Lie : uint8_t {
-    ReadClaimsMore,   /**< claims more bytes than were requested */
-    ReadStands,       /**< does not advance the position */
-    TellGoesBack,     /**< returns too low a position every other time */
-    TellStands,       /**< always returns the same position */
-    TellHuge,         /**< returns a position that no file has */
-    SeekForgetsWhere, /**< takes every offset from the start */
-    SeekStands,       /**< succeeds without moving */
+enum class Breach : uint8_t {
+    ReadClaimsMore,    /**< claims more bytes than were requested */
+    ReadStays,         /**< does not advance the position */
+    TellGoesBack,      /**< returns too low a position every other time */
+    TellStays,         /**< always returns the same position */
+    TellHuge,          /**< returns a position that no file has */
+    SeekIgnoresWhence, /**< counts every offset from the start */
+    SeekStays,         /**< succeeds without moving */
     NeverAtEnd,
     AlwaysAtEnd,
     Count
 };
 
-/** The fake host with lies and a limit on its calls. Only one may exist at a time. */
+/** The fake host with breaches of its contract and a limit on its calls. Only one may exist at a time. */
 class Host : public FakeHost {
 public:
     explicit Host(Bytes file);
-    /** Tells these lies (bits 1 << Lie) until `patience` calls or KiB read are used up; after that its calls fail. */
-    void lie(uint32_t lies, uint64_t patience) { std::tie(m_lies, m_patience) = std::tie(lies, patience); }
+    /** Breaks the contract in these ways (bits 1 << Breach) until `patience` calls or KiB read are used up; after that,
+     *  its calls fail. */
+    void break_contract(uint32_t breaches, uint64_t patience)
+    {
+        std::tie(m_breaches, m_patience) = std::tie(breaches, patience);
+    }
     /** Sets how many host calls the next operation may make. */
     void begin(uint64_t calls) { m_calls_left = calls; }
-    /** Where a reader really stands. */
+    /** Returns the true position of a reader. */
     int64_t position(const fio_file_t* reader);
     void require_clean() const { require(live_blocks() + open_handles() == 0, "memory or a file was not released"); }
 
 private:
-    bool lies(Lie lie) const { return (m_lies >> static_cast<uint32_t>(lie) & 1u) != 0; }
+    bool breaks(Breach breach) const { return (m_breaches >> static_cast<uint32_t>(breach) & 1u) != 0; }
     bool refuses(uint64_t effort);
     int32_t eof(void* handle) override;
     uint32_t read(void* buffer, uint32_t size, uint32_t count, void* handle) override;
     int32_t seek(void* handle, int64_t offset, int32_t whence, bool wide) override;
     int64_t tell(void* handle, bool wide) override;
 
-    uint32_t m_lies = 0;
+    uint32_t m_breaches = 0;
     uint64_t m_patience = UINT64_MAX, m_calls_left = UINT64_MAX;
 };
 
@@ -101,7 +105,7 @@ struct FileTag {
     bool keyframe() const { return first / 16 == 1 || first / 16 == 4; }
 };
 uint32_t read_be(const uint8_t* bytes, size_t count);
-/** False when fewer than 13 bytes are left. */
+/** Returns false if fewer than 13 bytes are left. */
 bool read_tag(const Bytes& file, int64_t position, FileTag* tag);
 
 } // namespace flvd_fuzz
