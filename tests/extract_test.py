@@ -3,6 +3,7 @@ import fcntl
 import hashlib
 import os
 import pty
+import resource
 import signal
 import struct
 import subprocess
@@ -107,6 +108,14 @@ class Extract(Case):
                                (copy, "is the input file")):
                 self.tool(command, copy, "-o", out, code=1, stderr=f".*{words}.*\n")
         self.assertEqual(copy.read_bytes(), sample_bytes("aac_only"))
+
+        def fill_the_disk():
+            signal.signal(signal.SIGXFSZ, signal.SIG_IGN)
+            resource.setrlimit(resource.RLIMIT_FSIZE, (len(sample_bytes("pcm_only")) - 300,) * 2)
+
+        wav = copy.parent / "x.wav"  # its header is written last
+        self.tool("extract", sample("pcm_only"), "-o", wav, code=1, stderr=".*too large\n", preexec_fn=fill_the_disk)
+        self.assertFalse(wav.exists())
         self.tool("extract", "--stream", "video", copy, "-o", copy.parent / "x", code=1, stderr=".+\n")
 
     def test_files_that_exist_and_streams_without_frames(self):

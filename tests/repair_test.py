@@ -19,9 +19,9 @@ def time_of(tag):
 
 
 class Rewritten(Case):
-    def rewrite(self, command, path, *options, stderr="(?s:.*)"):
+    def rewrite(self, command, path, *options, out=None, stderr="(?s:.*)"):
         """The new file, which must not have any findings."""
-        out = path.parent / "out.flv"
+        out = out or path.parent / "out.flv"
         self.tool(command, path, "-o", out, "--force", *options, stderr=stderr)
         self.tool("check", out)
         return out
@@ -74,8 +74,8 @@ class Repair(Rewritten):
 
     def test_metadata_and_configurations(self):
         """Properties are kept unless they are wrong now; each frame has its configuration."""
-        script = (b"\2\0\x0aonMetaData\x08\0\0\0\3\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09"
-                  b"\0\x08duration\0\x7f\xef" + bytes(6) + b"\0\0\x09")
+        script = (b"\2\0\x0d@setDataFrame\2\0\x0aonMetaData\x08\0\0\0\4\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09"
+                  b"\0\x08datasize\5\0\x08duration\0\x7f\xef" + bytes(6) + b"\0\0\x09")
         config = next(tag for tag in TAGS if tag[0] == 9)
         changed = retag(config, config[11:14] + bytes(2) + config[16:17] + b"\x4d" + config[18:-4])
         cue = retag(TAGS[0], b"\2\0\x0aonCuePoint\5")
@@ -83,7 +83,8 @@ class Repair(Rewritten):
         out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(tags)))
         data = out.read_bytes()
         self.assertIn(b"\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09", data)
-        self.assertEqual((data.count(b"duration"), data.count(b"onCuePoint")), (1, 1))
+        counts = {name: data.count(name) for name in (b"duration", b"onCuePoint", b"datasize", b"@setDataFrame")}
+        self.assertEqual(list(counts.values()), [1, 1, 0, 0], counts)
         for kind in (8, 9):  # a configuration comes before the first frame that needs it
             self.assertEqual([tag[11:] for tag in split_tags(data)[1] if tag[0] == kind],
                              [tag[11:] for tag in tags if tag[0] == kind and tag[12] != 2])  # 2: end of sequence
@@ -106,6 +107,10 @@ class Repair(Rewritten):
         self.assertRegex(self.tool("repair", "--dry-run", path, "-o", old), "^would write: 63 video frames and 109 audio")
         self.assertEqual((old.read_bytes(), sorted(os.listdir(path.parent))), (b"old", ["in.flv", "old.flv"]))
         self.assertEqual(path.read_bytes(), sample_bytes("avc_aac"))
+        link = path.parent / "link.flv"
+        link.symlink_to("old.flv")
+        self.rewrite("repair", path, out=link)
+        self.assertTrue(link.is_symlink() and old.read_bytes().startswith(b"FLV"))
 
 
 class IndexAndCut(Rewritten):
