@@ -104,7 +104,7 @@ class Repair(Rewritten):
                                ((path, "-o", "/dev/full"), "No space left"),
                                ((self.write("x", b"FLV"), "-o", old, "--force"), "damaged or cut short")):
             self.tool("repair", *options, code=1, stderr=f".*{words}.*\n")
-        self.assertRegex(self.tool("repair", "--dry-run", path, "-o", old), "^would write: 63 video frames and 109 audio")
+        self.assertRegex(self.tool("repair", "--dry-run", path), "^would write: 63 video frames and 109 audio")
         self.assertEqual((old.read_bytes(), sorted(os.listdir(path.parent))), (b"old", ["in.flv", "old.flv"]))
         self.assertEqual(path.read_bytes(), sample_bytes("avc_aac"))
         link = path.parent / "link.flv"

@@ -64,10 +64,12 @@ void AddFile(CLI::App* command, std::string& file)
     command->add_option("FILE", file, "FLV file; - is standard input")->required()->type_name("");
 }
 
-void AddOutput(CLI::App* command, std::string& out, bool& force, const char* help)
+CLI::Option* AddOutput(CLI::App* command, std::string& out, bool& force, const char* help)
 {
-    command->add_option("-o,--output", out, help)->required()->check(IS_NAME)->type_name("OUT");
+    CLI::Option* const output =
+        command->add_option("-o,--output", out, help)->required()->check(IS_NAME)->type_name("OUT");
     command->add_flag("--force", force, "Overwrite an existing file");
+    return output;
 }
 
 CLI::Option* AddTime(CLI::App* command, const char* name, const std::function<void(int32_t)>& take, const char* help)
@@ -271,8 +273,13 @@ void AddPlot(CLI::App* command, PlotOptions& options)
 void AddRewrite(CLI::App* command, RewriteOptions& options)
 {
     AddFile(command, options.file);
-    AddOutput(command, options.out, options.force, "FLV file to write; - is standard output");
-    command->add_flag("--dry-run", options.dryRun, "Report what would be written, and write nothing");
+    CLI::Option* const out = AddOutput(command, options.out, options.force, "FLV file to write; - is standard output");
+    const auto dryRun = [&options, out] {
+        options.dryRun = true;
+        out->required(false);
+    };
+    command->add_flag_callback("--dry-run", dryRun, "Report what would be written, and write nothing; needs no OUT")
+        ->trigger_on_parse();
 }
 
 void AddRepair(CLI::App* command, RewriteOptions& options)
