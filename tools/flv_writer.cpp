@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "flvdmx/layers.h"
+#include "flvdmx/metadata.hpp"
 #include "tools/tags.h"
 
 namespace tool {
@@ -15,6 +16,7 @@ namespace tool {
 namespace {
 
 using Buffer = std::vector<uint8_t>;
+using flvdmx::Amf0;
 using flvdmx::Bytes;
 
 constexpr size_t FILE_HEADER_SIZE = 9;
@@ -23,21 +25,6 @@ constexpr uint8_t HAS_VIDEO = 1;
 constexpr size_t INDEX_MAX = 65536; // entries; with more keyframes, every nth one is listed
 constexpr double MS_PER_SECOND = 1000;
 
-// AMF0 type markers.
-enum : uint8_t {
-    NUMBER = 0,
-    BOOLEAN = 1,
-    STRING = 2,
-    OBJECT = 3,
-    NULL_VALUE = 5,
-    UNDEFINED = 6,
-    REFERENCE = 7,
-    ECMA_ARRAY = 8,
-    OBJECT_END = 9,
-    STRICT_ARRAY = 10,
-    DATE = 11,
-    LONG_STRING = 12
-};
 constexpr int MAX_DEPTH = 16;
 
 // Properties that are written anew, and others that describe the old file.
@@ -61,7 +48,7 @@ void PutNumber(Buffer& out, double value)
     uint64_t bits = 0;
     static_assert(sizeof bits == sizeof value);
     std::memcpy(&bits, &value, sizeof bits);
-    out.push_back(NUMBER);
+    out.push_back(Amf0::number);
     PutInteger(out, bits, sizeof bits);
 }
 
@@ -74,7 +61,7 @@ void PutKey(Buffer& out, std::string_view key)
 void PutObjectEnd(Buffer& out)
 {
     PutKey(out, "");
-    out.push_back(OBJECT_END);
+    out.push_back(Amf0::object_end);
 }
 
 Buffer TagHeader(uint8_t type, size_t dataSize, uint32_t timestamp)
@@ -88,7 +75,7 @@ Buffer TagHeader(uint8_t type, size_t dataSize, uint32_t timestamp)
 }
 
 // Skips AMF0 values. After one that is damaged or cut short, every call fails.
-class ScriptReader {
+class ScriptReader : private Amf0 {
 public:
     explicit ScriptReader(Bytes bytes) : m_bytes(bytes) {}
 
@@ -124,7 +111,7 @@ public:
     bool MetadataName()
     {
         std::string name;
-        const auto next = [&] { return Integer(1) == STRING && Key(name); };
+        const auto next = [&] { return Integer(1) == Amf0::string && Key(name); };
         return next() && (name != "@setDataFrame" || next()) && name == "onMetaData";
     }
 
@@ -133,26 +120,30 @@ public:
         if (depth > MAX_DEPTH)
             return false;
         switch (Integer(1)) {
-        case NUMBER:
+        case number:
             return Skip(sizeof(double));
-        case BOOLEAN:
+        case boolean:
             return Skip(1);
-        case STRING:
+        case string:
             return Skip(Integer(2));
-        case LONG_STRING:
-            return Skip(Integer(4));
-        case DATE:
-            return Skip(sizeof(double) + 2);
-        case REFERENCE:
+        case reference:
             return Skip(2);
-        case ECMA_ARRAY:
+        case long_string:
+        case xml_document:
+            return Skip(Integer(4));
+        case date:
+            return Skip(sizeof(double) + 2);
+        case typed_object:
+            return Skip(Integer(2)) && SkipMembers(depth);
+        case ecma_array:
             return Skip(4) && SkipMembers(depth);
-        case OBJECT:
+        case object:
             return SkipMembers(depth);
-        case STRICT_ARRAY:
+        case strict_array:
             return SkipElements(depth);
-        case NULL_VALUE:
-        case UNDEFINED:
+        case null:
+        case undefined:
+        case unsupported:
             return !m_failed;
         default:
             return false;
@@ -164,7 +155,7 @@ private:
     {
         std::string key;
         while (Key(key)) {
-            if (key.empty() && Position() != m_bytes.end() && *Position() == OBJECT_END)
+            if (key.empty() && Position() != m_bytes.end() && *Position() == Amf0::object_end)
                 return Skip(1);
             if (!SkipValue(depth + 1))
                 return false;
@@ -200,7 +191,7 @@ std::vector<ScriptProperty> ReadScriptProperties(Bytes payload)
     if (!reader.MetadataName())
         return properties;
     const uint64_t marker = reader.Integer(1);
-    if (marker != OBJECT && (marker != ECMA_ARRAY || !reader.Skip(4)))
+    if (marker != Amf0::object && (marker != Amf0::ecma_array || !reader.Skip(4)))
         return properties;
     while (reader.Key(key) && !key.empty()) {
         const uint8_t* const value = reader.Position();
@@ -235,15 +226,15 @@ ScriptProperty FlvLayout::Index(uint64_t firstTag) const
 {
     const size_t step = (m_keyframes.size() + INDEX_MAX - 1) / INDEX_MAX;
     const size_t count = (m_keyframes.size() + step - 1) / step;
-    Buffer times = {STRICT_ARRAY};
-    Buffer positions = {STRICT_ARRAY};
+    Buffer times = {Amf0::strict_array};
+    Buffer positions = {Amf0::strict_array};
     PutInteger(times, count, 4);
     PutInteger(positions, count, 4);
     for (size_t i = 0; i < m_keyframes.size(); i += step) {
         PutNumber(times, m_keyframes[i].timestamp / MS_PER_SECOND);
         PutNumber(positions, static_cast<double>(firstTag + m_keyframes[i].offset));
     }
-    ScriptProperty index = {"keyframes", {OBJECT}};
+    ScriptProperty index = {"keyframes", {Amf0::object}};
     PutKey(index.value, "times");
     Put(index.value, times);
     PutKey(index.value, "filepositions");
@@ -265,9 +256,9 @@ std::vector<uint8_t> FlvLayout::ScriptPayload(const std::vector<ScriptProperty>&
         all.push_back(NumberProperty("lastkeyframetimestamp", m_keyframes.back().timestamp / MS_PER_SECOND));
         all.push_back(Index(firstTag));
     }
-    Buffer payload = {STRING};
+    Buffer payload = {Amf0::string};
     PutKey(payload, "onMetaData");
-    payload.push_back(ECMA_ARRAY);
+    payload.push_back(Amf0::ecma_array);
     PutInteger(payload, all.size(), 4);
     for (const ScriptProperty& property : all) {
         PutKey(payload, property.name);

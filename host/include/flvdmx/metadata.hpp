@@ -18,6 +18,13 @@
 
 namespace flvdmx {
 
+/** Type markers of script data ("Action Message Format, AMF 0", 2.1). Each value starts with one. */
+struct Amf0 {
+    static constexpr uint8_t number = 0, boolean = 1, string = 2, object = 3, null = 5, undefined = 6, reference = 7,
+                             ecma_array = 8, object_end = 9, strict_array = 10, date = 11, long_string = 12,
+                             unsupported = 13, xml_document = 15, typed_object = 16;
+};
+
 /** A date in the metadata. */
 struct Date {
     double milliseconds = 0;  /**< since 1 January 1970 UTC, as in the file; may be NaN or infinite */
@@ -80,7 +87,7 @@ public:
 
 private:
     // Parses AMF0 values. Anything that cannot be parsed ends the payload.
-    class Reader {
+    class Reader : private Amf0 {
     public:
         Reader(Metadata& metadata, Bytes payload) : m_metadata(metadata), m_rest(payload) {}
 
@@ -97,11 +104,6 @@ private:
         }
 
     private:
-        // Type markers.
-        static constexpr uint8_t number = 0, boolean = 1, string = 2, object = 3, null = 5, undefined = 6,
-                                 reference = 7, ecma_array = 8, object_end = 9, strict_array = 10, date = 11,
-                                 long_string = 12, unsupported = 13, xml_document = 15, typed_object = 16;
-
         // Takes the next bytes. When there are fewer, returns none and ends the payload.
         Bytes take(size_t size)
         {
