@@ -20,9 +20,21 @@ namespace flvdmx {
 
 /** Type markers of script data ("Action Message Format, AMF 0", 2.1). Each value starts with one. */
 struct Amf0 {
-    static constexpr uint8_t number = 0, boolean = 1, string = 2, object = 3, null = 5, undefined = 6, reference = 7,
-                             ecma_array = 8, object_end = 9, strict_array = 10, date = 11, long_string = 12,
-                             unsupported = 13, xml_document = 15, typed_object = 16;
+    static constexpr uint8_t number = 0;        /**< a double, 8 bytes */
+    static constexpr uint8_t boolean = 1;       /**< 1 byte */
+    static constexpr uint8_t string = 2;        /**< length in 2 bytes, UTF-8 */
+    static constexpr uint8_t object = 3;        /**< members, up to object_end */
+    static constexpr uint8_t null = 5;          /**< no data */
+    static constexpr uint8_t undefined = 6;     /**< no data */
+    static constexpr uint8_t reference = 7;     /**< number of an earlier object in 2 bytes */
+    static constexpr uint8_t ecma_array = 8;    /**< count in 4 bytes, members, up to object_end */
+    static constexpr uint8_t object_end = 9;    /**< after the empty name that ends members */
+    static constexpr uint8_t strict_array = 10; /**< count in 4 bytes, values */
+    static constexpr uint8_t date = 11;         /**< a double, ms since 1970, and the time zone in 2 bytes */
+    static constexpr uint8_t long_string = 12;  /**< length in 4 bytes, UTF-8 */
+    static constexpr uint8_t unsupported = 13;  /**< no data */
+    static constexpr uint8_t xml_document = 15; /**< like long_string */
+    static constexpr uint8_t typed_object = 16; /**< name of the class, members, up to object_end */
 };
 
 /** A date in the metadata. */
