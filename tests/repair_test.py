@@ -114,7 +114,6 @@ class IndexAndCut(Rewritten):
         out = self.rewrite("index", path)
         self.assertEqual(split_tags(out.read_bytes())[1][1:], TAGS[1:])
         self.assertIn("3 entries", self.tool("info", out))
-        self.tool("index", DATA / "damaged.flv", "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'\n")
 
     def test_cut(self):
         """Parts that follow each other hold every frame once."""
@@ -128,3 +127,10 @@ class IndexAndCut(Rewritten):
             self.assertEqual(sorted(kept), sorted((k, t, *r) for k, t, *r in whole if first <= t < end))
             moved = self.frames(self.rewrite("cut", path, *times))
             self.assertEqual([f[1] for f in moved], [f[1] - first for f in kept])
+
+    def test_refused(self):
+        """Times of which one file has several, and damage, are the business of `repair`."""
+        restart = HEADER + b"".join(TAGS + TAGS[1:])
+        for command, data in (("cut", restart), ("index", (DATA / "damaged.flv").read_bytes())):
+            path = self.write("in.flv", data)
+            self.tool(command, path, "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'( first)?\n")

@@ -65,7 +65,8 @@ RemuxOptions CutOptions(const RewriteOptions& options)
 {
     RemuxOptions remux;
     Input input(options.file);
-    WarnOfRestarts(input);
+    if (SeemsToRestart(input))
+        throw FileError(options.file, "timestamps jump in this file: use 'flvdmx repair' first");
     WarnOfUnplayed(input);
     if (options.fromMs) {
         const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
