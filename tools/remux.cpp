@@ -106,14 +106,15 @@ public:
     }
 
 private:
-    // The first configuration of a stream that begins late is moved to the beginning, where players look for it.
+    // A configuration that comes after the first frames is moved to the beginning, where players look for it.
     void FindLateConfig(Track& track, flvdmx::Stream stream)
     {
-        const std::optional<Tag> tag = m_input.Has(stream) ? std::nullopt : FirstIfLate(PathOf(m_input.name), stream);
-        if (!tag || !tag->IsConfig() || tag->size > SCRIPT_DATA_MAX)
+        TagReader reader(m_input);
+        const std::optional<Tag> tag = track.config.empty() ? reader.FindConfig(stream) : std::nullopt;
+        if (!tag)
             return;
-        track.config.resize(tag->size - std::min(tag->size, tag->CodecHeaderSize()));
-        m_raw.Read(tag->position + TAG_HEADER_SIZE + tag->CodecHeaderSize(), track.config.data(), track.config.size());
+        const flvdmx::Bytes config = reader.ConfigBytes(*tag);
+        track.config.assign(config.begin(), config.end());
         track.configHeader = ConfigHeader(track.type, tag->codec);
     }
 

@@ -63,9 +63,6 @@ bool IsEnhanced(const Tag& tag, std::string_view fourcc);
 /** @return name of the codec of a video or audio tag. @param fourcc as above */
 std::string CodecOf(const Tag& tag, std::string_view fourcc);
 
-/** @return the first tag of a stream that starts too late to be found */
-std::optional<Tag> FirstIfLate(const std::string& path, flvdmx::Stream stream);
-
 /** @return why no frame of a stream without playable frames is delivered, such as "it is enhanced FLV"; from its first
  *          tag at the beginning of the file, empty when there is none */
 std::string WhyNoStream(const std::string& path, flvdmx::Stream stream);
