@@ -18,6 +18,13 @@ def time_of(tag):
     return int.from_bytes(tag[4:7], "big") | tag[7] << 24
 
 
+def late_config(kind):
+    """A stream that starts with frames; its configuration follows after damage."""
+    config = next(tag for tag in TAGS if tag[0] == kind)
+    tags = [tag for tag in TAGS if tag is not config]
+    return HEADER + b"".join(tags[:60] + [b"\xee" * 100] + tags[60:130] + [config] + tags[130:])
+
+
 class Rewritten(Case):
     def rewrite(self, command, path, *options, stderr="(?s:.*)"):
         """The new file, which must be sound."""
@@ -88,11 +95,14 @@ class Repair(Rewritten):
             self.assertEqual([tag[11:] for tag in split_tags(data)[1] if tag[0] == kind],
                              [tag[11:] for tag in tags if tag[0] == kind and tag[12] != 2])  # 2: end of sequence
 
-    def test_late_audio(self):
-        """A stream that begins after the tags in which players look is found in the new file."""
+    def test_late_streams(self):
+        """A stream, or the configuration of one, after the tags in which players look is found in the new file."""
         media = [at(tag, time_of(tag) + 2600 * i) for i in range(3) for tag in TAGS[1:] if tag[0] == 9 or i == 2]
         out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(media)))
         self.assertEqual(sum(f[0] == "audio" for f in self.frames(out)), 109)
+        for kind in (8, 9):
+            path = self.write("in.flv", late_config(kind))
+            self.assertSamePayloads(self.rewrite("repair", path), sample("avc_aac"))
 
     def test_output(self):
         """Nothing but a finished file has the name."""
@@ -131,6 +141,6 @@ class IndexAndCut(Rewritten):
     def test_refused(self):
         """Times of which one file has several, and damage, are the business of `repair`."""
         restart = HEADER + b"".join(TAGS + TAGS[1:])
-        for command, data in (("cut", restart), ("index", (DATA / "damaged.flv").read_bytes())):
+        for command, data in (("cut", restart), ("cut", late_config(9)), ("index", (DATA / "damaged.flv").read_bytes())):
             path = self.write("in.flv", data)
             self.tool(command, path, "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'( first)?\n")

@@ -60,13 +60,26 @@ RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& 
     return report;
 }
 
+// A time does not stand for one place in some files, and in others the keyframes are those of a stream that is not
+// found.
+void RefuseUnlessCuttable(const Input& input)
+{
+    constexpr const char* REMEDY = "use 'flvdmx repair' first";
+    if (SeemsToRestart(input))
+        throw FileError(input.name, fmt::format("timestamps jump in this file: {}", REMEDY));
+    TagReader reader(input);
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
+        if (!input.Has(stream) && reader.FindConfig(stream))
+            throw FileError(input.name, fmt::format("the configuration of the {} is not at the beginning: {}",
+                                                    StreamName(stream), REMEDY));
+}
+
 // The times between which to cut: those of the keyframes at or before the beginning and at or after the end.
 RemuxOptions CutOptions(const RewriteOptions& options)
 {
     RemuxOptions remux;
     Input input(options.file);
-    if (SeemsToRestart(input))
-        throw FileError(options.file, "timestamps jump in this file: use 'flvdmx repair' first");
+    RefuseUnlessCuttable(input);
     WarnOfUnplayed(input);
     if (options.fromMs) {
         const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
