@@ -103,6 +103,8 @@ class Repair(Rewritten):
         for kind in (8, 9):
             path = self.write("in.flv", late_config(kind))
             self.assertSamePayloads(self.rewrite("repair", path), sample("avc_aac"))
+        none = self.write("in.flv", HEADER + b"".join(tag for tag in TAGS if tag[0] != 8 or tag[12] != 0))
+        self.tool("repair", none, "-o", none.parent / "x", stderr=".*x: warning: the audio .* cannot be decoded\n")
 
     def test_output(self):
         """Nothing but a finished file has the name."""

@@ -1,8 +1,10 @@
 // `flvdmx repair`, `flvdmx index` and `flvdmx cut`: new files from what can be played of a file.
 #include <algorithm>
+#include <filesystem>
 #include <functional>
 #include <optional>
 #include <string>
+#include <system_error>
 #include <vector>
 
 #include <fmt/core.h>
@@ -23,6 +25,20 @@ namespace tool {
 namespace {
 
 using Pass = std::function<RemuxReport(const TakeTag& take)>;
+
+// Tells which streams of the file are not in the new one, and which of the new one players cannot play.
+void WarnOfUnplayed(const RewriteOptions& options, const RemuxReport& report)
+{
+    WarnOfUnplayed(Input(options.file), (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
+                                            (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
+    std::error_code unknown;
+    if (options.dryRun || options.out == STANDARD_STREAM || !std::filesystem::is_regular_file(options.out, unknown))
+        return;
+    const Input result(options.out);
+    WarnOfUnplayed(result);
+    if (const std::string fault = ConfigFault(result); !fault.empty())
+        Complain(options.out, "warning: " + fault);
+}
 
 // Runs a pass that measures and, unless it is a rehearsal, one that writes.
 RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& pass)
@@ -51,6 +67,7 @@ RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& 
         written = out->Written();
     }
     progress.Wipe();
+    WarnOfUnplayed(options, report);
     if (options.out == STANDARD_STREAM && !options.dryRun)
         return report;
     Print(fmt::format("{}: {} and {}, {}, {} in the index{}\n", options.dryRun ? "would write" : Printable(options.out),
@@ -80,7 +97,6 @@ RemuxOptions CutOptions(const RewriteOptions& options)
     RemuxOptions remux;
     Input input(options.file);
     RefuseUnlessCuttable(input);
-    WarnOfUnplayed(input);
     if (options.fromMs) {
         const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
         if (!from)
@@ -111,8 +127,6 @@ int RunRepair(const RewriteOptions& options)
     remux.offsetMs = input.info.start_time.count();
     const RemuxReport report =
         Write(options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
-    WarnOfUnplayed(input, (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
-                              (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));
