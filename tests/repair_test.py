@@ -143,6 +143,6 @@ class IndexAndCut(Rewritten):
     def test_refused(self):
         """Times of which one file has several, and damage, are the business of `repair`."""
         restart = HEADER + b"".join(TAGS + TAGS[1:])
-        for command, data in (("cut", restart), ("cut", late_config(9)), ("index", (DATA / "damaged.flv").read_bytes())):
+        for command, data in (("cut", restart), ("cut", late_config(9)), ("index", restart), ("index", (DATA / "damaged.flv").read_bytes())):
             path = self.write("in.flv", data)
             self.tool(command, path, "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'( first)?\n")

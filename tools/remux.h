@@ -40,7 +40,7 @@ RemuxReport Remux(const std::string& file, const RemuxOptions& options, const Ta
 
 /**
  * Reads the tags of an undamaged file as they are, all but the onMetaData whose properties MetadataOf() returns. Throws
- * FileError, also for a damaged file.
+ * FileError, also for a damaged file and for one in which timestamps jump back.
  */
 RemuxReport CopyTags(const std::string& file, const TakeTag& take);
 
