@@ -61,14 +61,16 @@ class Repair(Rewritten):
                     self.assertSamePayloads(self.rewrite("repair", path), path)
 
     def test_times(self):
-        """A recording that starts again, one with a gap, a single wrong time, and a step back that is jitter."""
+        """A recording that starts again, one with a gap, a single wrong time, two slides, and a step back that is jitter."""
         media = [tag for tag in TAGS if tag[0] != 18]
         last = time_of(media[-1])
+        slide = next(tag for tag in TAGS if tag[0] == 9 and tag[12] == 1)
         for name, tags, duration in (
                 ("restart", TAGS + media, 2 * last + 23),
                 ("gap", TAGS + [at(tag, time_of(tag) + 100_000) for tag in media], 2 * last + 23),
                 ("wrong", TAGS[:50] + [at(TAGS[50], 900_000)] + TAGS[51:], last),
                 ("wraps", [TAGS[0]] + [at(tag, (time_of(tag) - 1000) % 2**32) for tag in media], last),
+                ("slides", TAGS[:2] + [slide, at(slide, 15_000)], 15_000),
                 ("jitter", TAGS[:50] + [at(TAGS[50], time_of(TAGS[50]) - 200)] + TAGS[51:], last)):
             path = self.write("in.flv", HEADER + b"".join(tags))
             with self.subTest(name=name):

@@ -15,7 +15,8 @@ namespace tool {
  * more than a limit while the other stream does not lead there as well: a recording that started again, or a gap. The
  * time then continues after the latest one so far. Whether a jump is real shows with the next frame; a frame that is
  * alone with its time is placed after the one before it. A smaller step back is jitter: the time stands still.
- * Streams of a frame every few minutes do not jump. Timestamps of 32 bits may wrap around.
+ * Streams of a frame every few minutes do not jump; a file of one stream that starts with a long step has such a
+ * stream. Timestamps of 32 bits may wrap around.
  */
 class Times {
 public:
