@@ -31,6 +31,8 @@ class Rewritten(Case):
         out = path.parent / "out.flv"
         self.tool(command, path, "-o", out, "--force", *options, stderr=stderr)
         self.tool("check", out)
+        tags = split_tags(out.read_bytes())[1][1:]
+        self.assertEqual(time_of(tags[0]), min(map(time_of, tags)))  # a configuration is not later than any frame
         return out
 
     def frames(self, path):
@@ -71,6 +73,7 @@ class Repair(Rewritten):
                 ("wrong", TAGS[:50] + [at(TAGS[50], 900_000)] + TAGS[51:], last),
                 ("wraps", [TAGS[0]] + [at(tag, (time_of(tag) - 1000) % 2**32) for tag in media], last),
                 ("slides", TAGS[:2] + [slide, at(slide, 15_000)], 15_000),
+                ("video first", TAGS[:3] + [TAGS[4], TAGS[3]] + TAGS[5:], last),
                 ("jitter", TAGS[:50] + [at(TAGS[50], time_of(TAGS[50]) - 200)] + TAGS[51:], last)):
             path = self.write("in.flv", HEADER + b"".join(tags))
             with self.subTest(name=name):

@@ -149,12 +149,13 @@ private:
             time = m_times.Time();
         }
         if (m_report.videoFrames + m_report.audioFrames == 0) {
-            PutConfig(m_video, Timestamp(time));
-            PutConfig(m_audio, Timestamp(time));
+            PutConfig(m_video, std::min(Timestamp(time), m_options.firstTimestamp));
+            PutConfig(m_audio, std::min(Timestamp(time), m_options.firstTimestamp));
         } else if (frame.config_changed() && !repeated) {
             PutConfig(track, Timestamp(time));
         }
         ++(tag.IsVideo() ? m_report.videoFrames : m_report.audioFrames);
+        m_report.firstTimestamp = std::min(m_report.firstTimestamp, Timestamp(time));
         m_take({track.type,
                 Timestamp(time),
                 {header.data() + TAG_HEADER_SIZE, tag.CodecHeaderSize()},

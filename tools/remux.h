@@ -19,14 +19,16 @@ struct RemuxOptions {
     int64_t offsetMs = 0;                                 /**< added to each time */
     int64_t fromMs = std::numeric_limits<int64_t>::min(); /**< first time to take */
     int64_t toMs = std::numeric_limits<int64_t>::max();   /**< first time not to take */
+    uint32_t firstTimestamp = UINT32_MAX;                 /**< of the frames, once known: of the first configurations */
 };
 
 /** What was taken. */
 struct RemuxReport {
     uint64_t videoFrames = 0;
     uint64_t audioFrames = 0;
-    uint64_t jumps = 0;       /**< of the timestamps, when they were made continuous */
-    int64_t bytesLeftOut = 0; /**< between and after the frames, in bytes of the file */
+    uint32_t firstTimestamp = UINT32_MAX; /**< smallest of the frames, which need not be that of the first one */
+    uint64_t jumps = 0;                   /**< of the timestamps, when they were made continuous */
+    int64_t bytesLeftOut = 0;             /**< between and after the frames, in bytes of the file */
 };
 
 /** Takes a tag, whose bytes are valid during the call. */
@@ -34,7 +36,8 @@ using TakeTag = std::function<void(const NewTag&)>;
 
 /**
  * Plays a file and makes a tag of each frame, and of each configuration before the first frame that needs it. Calls
- * with the same arguments make the same tags. Throws FileError.
+ * with the same arguments make the same tags, and `firstTimestamp` changes no more than the timestamps of some. Throws
+ * FileError.
  */
 RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take);
 

@@ -91,6 +91,16 @@ void RefuseUnlessCuttable(const Input& input)
                                                     StreamName(stream), REMEDY));
 }
 
+// The first pass finds the first timestamp for the second one.
+Pass RemuxPass(const std::string& file, RemuxOptions remux)
+{
+    return [file, remux](const TakeTag& take) mutable {
+        const RemuxReport report = Remux(file, remux, take);
+        remux.firstTimestamp = report.firstTimestamp;
+        return report;
+    };
+}
+
 // The times between which to cut: those of the keyframes at or before the beginning and at or after the end.
 RemuxOptions CutOptions(const RewriteOptions& options)
 {
@@ -125,8 +135,7 @@ int RunRepair(const RewriteOptions& options)
     remux.allFrames = true;
     remux.continuous = !options.keepTimes;
     remux.offsetMs = input.info.start_time.count();
-    const RemuxReport report =
-        Write(options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    const RemuxReport report = Write(options, input.info.size, RemuxPass(options.file, remux));
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));
@@ -144,9 +153,7 @@ int RunIndex(const RewriteOptions& options)
 
 int RunCut(const RewriteOptions& options)
 {
-    const RemuxOptions remux = CutOptions(options);
-    Write(options, Input(options.file).info.size,
-          [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    Write(options, Input(options.file).info.size, RemuxPass(options.file, CutOptions(options)));
     return DONE;
 }
 
