@@ -18,12 +18,21 @@ def time_of(tag):
     return int.from_bytes(tag[4:7], "big") | tag[7] << 24
 
 
+def late_config(kind):
+    """A stream that starts with frames; its configuration follows after damage."""
+    config = next(tag for tag in TAGS if tag[0] == kind)
+    tags = [tag for tag in TAGS if tag is not config]
+    return HEADER + b"".join(tags[:60] + [b"\xee" * 100] + tags[60:130] + [config] + tags[130:])
+
+
 class Rewritten(Case):
     def rewrite(self, command, path, *options, out=None, stderr="(?s:.*)"):
         """The new file, which must not have any findings."""
         out = out or path.parent / "out.flv"
         self.tool(command, path, "-o", out, "--force", *options, stderr=stderr)
         self.tool("check", out)
+        tags = split_tags(out.read_bytes())[1][1:]
+        self.assertEqual(time_of(tags[0]), min(map(time_of, tags)))  # a configuration is not later than any frame
         return out
 
     def frames(self, path):
@@ -54,14 +63,17 @@ class Repair(Rewritten):
                     self.assertSamePayloads(self.rewrite("repair", path), path)
 
     def test_times(self):
-        """A recording that restarts, one with a gap, a single wrong time, and a small step back (jitter)."""
+        """A recording that restarts, one with a gap, a single wrong time, two slides, and a small step back (jitter)."""
         media = [tag for tag in TAGS if tag[0] != 18]
         last = time_of(media[-1])
+        slide = next(tag for tag in TAGS if tag[0] == 9 and tag[12] == 1)
         for name, tags, duration in (
                 ("restart", TAGS + media, 2 * last + 23),
                 ("gap", TAGS + [at(tag, time_of(tag) + 100_000) for tag in media], 2 * last + 23),
                 ("wrong", TAGS[:50] + [at(TAGS[50], 900_000)] + TAGS[51:], last),
                 ("wraps", [TAGS[0]] + [at(tag, (time_of(tag) - 1000) % 2**32) for tag in media], last),
+                ("slides", TAGS[:2] + [slide, at(slide, 15_000)], 15_000),
+                ("video first", TAGS[:3] + [TAGS[4], TAGS[3]] + TAGS[5:], last),
                 ("jitter", TAGS[:50] + [at(TAGS[50], time_of(TAGS[50]) - 200)] + TAGS[51:], last)):
             path = self.write("in.flv", HEADER + b"".join(tags))
             with self.subTest(name=name):
@@ -89,11 +101,16 @@ class Repair(Rewritten):
             self.assertEqual([tag[11:] for tag in split_tags(data)[1] if tag[0] == kind],
                              [tag[11:] for tag in tags if tag[0] == kind and tag[12] != 2])  # 2: end of sequence
 
-    def test_late_audio(self):
-        """A stream that begins after the tags that players search is found in the new file."""
+    def test_late_streams(self):
+        """A stream or configuration that comes after the tags that players search is found in the new file."""
         media = [at(tag, time_of(tag) + 2600 * i) for i in range(3) for tag in TAGS[1:] if tag[0] == 9 or i == 2]
         out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(media)))
         self.assertEqual(sum(f[0] == "audio" for f in self.frames(out)), 109)
+        for kind in (8, 9):
+            path = self.write("in.flv", late_config(kind))
+            self.assertSamePayloads(self.rewrite("repair", path), sample("avc_aac"))
+        none = self.write("in.flv", HEADER + b"".join(tag for tag in TAGS if tag[0] != 8 or tag[12] != 0))
+        self.tool("repair", none, "-o", none.parent / "x", stderr=".*x: warning: the audio .* cannot be decoded\n")
 
     def test_output(self):
         """Only a complete file has the requested name."""
@@ -119,7 +136,6 @@ class IndexAndCut(Rewritten):
         out = self.rewrite("index", path)
         self.assertEqual(split_tags(out.read_bytes())[1][1:], TAGS[1:])
         self.assertIn("3 entries", self.tool("info", out))
-        self.tool("index", DATA / "damaged.flv", "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'\n")
 
     def test_cut(self):
         """Consecutive parts contain every frame once."""
@@ -133,3 +149,10 @@ class IndexAndCut(Rewritten):
             self.assertEqual(sorted(kept), sorted((k, t, *r) for k, t, *r in whole if first <= t < end))
             moved = self.frames(self.rewrite("cut", path, *times))
             self.assertEqual([f[1] for f in moved], [f[1] - first for f in kept])
+
+    def test_refused(self):
+        """Times of which one file has several, and damage, are the business of `repair`."""
+        restart = HEADER + b"".join(TAGS + TAGS[1:])
+        for command, data in (("cut", restart), ("cut", late_config(9)), ("index", restart), ("index", (DATA / "damaged.flv").read_bytes())):
+            path = self.write("in.flv", data)
+            self.tool(command, path, "-o", path.parent / "x", code=1, stderr=".*use 'flvdmx repair'( first)?\n")

@@ -22,6 +22,7 @@ namespace tool {
 
 namespace {
 
+constexpr uint32_t JITTER_MS = 1000;                                     // larger steps back are jumps
 constexpr uint32_t SCRIPT_DATA_MAX = 1 << 20;                            // bytes
 constexpr int TAGS_BEFORE_METADATA = 102;                                // players search only these
 constexpr size_t SMALLEST_TAG = TAG_HEADER_SIZE + 1 + BACK_POINTER_SIZE; // of a frame; includes all codec bytes
@@ -107,14 +108,15 @@ public:
     }
 
 private:
-    // If a stream begins late, its first configuration is moved to the beginning, where players search for it.
+    // A configuration that comes after the first frames is moved to the beginning, where players search for it.
     void FindLateConfig(Track& track, flvdmx::Stream stream)
     {
-        const std::optional<Tag> tag = m_input.Has(stream) ? std::nullopt : FirstIfLate(PathOf(m_input.name), stream);
-        if (!tag || !tag->IsConfig() || tag->size > SCRIPT_DATA_MAX)
+        TagReader reader(m_input);
+        const std::optional<Tag> tag = track.config.empty() ? reader.FindConfig(stream) : std::nullopt;
+        if (!tag)
             return;
-        track.config.resize(tag->size - std::min(tag->size, tag->CodecHeaderSize()));
-        m_raw.Read(tag->position + TAG_HEADER_SIZE + tag->CodecHeaderSize(), track.config.data(), track.config.size());
+        const flvdmx::Bytes config = reader.ConfigBytes(*tag);
+        track.config.assign(config.begin(), config.end());
         track.configHeader = ConfigHeader(track.type, tag->codec);
     }
 
@@ -148,12 +150,13 @@ private:
             time = m_times.Time();
         }
         if (m_report.videoFrames + m_report.audioFrames == 0) {
-            PutConfig(m_video, Timestamp(time));
-            PutConfig(m_audio, Timestamp(time));
+            PutConfig(m_video, std::min(Timestamp(time), m_options.firstTimestamp));
+            PutConfig(m_audio, std::min(Timestamp(time), m_options.firstTimestamp));
         } else if (frame.config_changed() && !repeated) {
             PutConfig(track, Timestamp(time));
         }
         ++(tag.IsVideo() ? m_report.videoFrames : m_report.audioFrames);
+        m_report.firstTimestamp = std::min(m_report.firstTimestamp, Timestamp(time));
         m_take({track.type,
                 Timestamp(time),
                 {header.data() + TAG_HEADER_SIZE, tag.CodecHeaderSize()},
@@ -223,6 +226,21 @@ Metadata FindMetadata(const Input& input)
     return {};
 }
 
+// An undamaged tag; its payload and back-pointer go to `bytes`.
+Tag ReadUndamaged(const Input& input, TagReader& reader, const RawFile& raw, int64_t position,
+                  std::vector<uint8_t>& bytes)
+{
+    const std::optional<Tag> tag = reader.At(position);
+    if (!tag || tag->End() > reader.FileSize())
+        throw FileError(input.name, fmt::format("the file is damaged at byte {}: use 'flvdmx repair'", position));
+    bytes.resize(size_t{tag->size} + BACK_POINTER_SIZE);
+    raw.Read(position + TAG_HEADER_SIZE, bytes.data(), bytes.size());
+    if (BigEndian(&bytes[tag->size], BACK_POINTER_SIZE) != tag->size + TAG_HEADER_SIZE)
+        throw FileError(input.name,
+                        fmt::format("the back-pointer of the tag at byte {} is wrong: use 'flvdmx repair'", position));
+    return *tag;
+}
+
 } // namespace
 
 RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take)
@@ -237,26 +255,25 @@ RemuxReport CopyTags(const std::string& file, const TakeTag& take)
     const int64_t metadata = FindMetadata(input).position;
     TagReader reader(input);
     RemuxReport report;
-    std::vector<uint8_t> bytes; // payload and back-pointer
+    std::array<uint32_t, 2> latest{}; // timestamps of video and audio
+    std::vector<uint8_t> bytes;       // payload and back-pointer
     for (int64_t position = FirstTag(input); position < reader.FileSize();) {
-        const std::optional<Tag> tag = reader.At(position);
-        if (!tag || tag->End() > reader.FileSize())
-            throw FileError(file, fmt::format("the file is damaged at byte {}: use 'flvdmx repair'", position));
-        bytes.resize(size_t{tag->size} + BACK_POINTER_SIZE);
-        raw.Read(position + TAG_HEADER_SIZE, bytes.data(), bytes.size());
-        if (BigEndian(&bytes[tag->size], BACK_POINTER_SIZE) != tag->size + TAG_HEADER_SIZE)
-            throw FileError(
-                file, fmt::format("the back-pointer of the tag at byte {} is wrong: use 'flvdmx repair'", position));
+        const Tag tag = ReadUndamaged(input, reader, raw, position, bytes);
+        if (tag.IsFrame()) {
+            ++(tag.IsVideo() ? report.videoFrames : report.audioFrames);
+            uint32_t& time = latest.at(tag.IsVideo() ? 0 : 1);
+            if (time > tag.timestamp && time - tag.timestamp > JITTER_MS)
+                throw FileError(file, fmt::format("timestamps jump at byte {}: use 'flvdmx repair'", position));
+            time = std::max(time, tag.timestamp);
+        }
         if (position != metadata)
-            take({static_cast<uint8_t>(tag->type),
-                  tag->timestamp,
+            take({static_cast<uint8_t>(tag.type),
+                  tag.timestamp,
                   {},
-                  {bytes.data(), tag->size},
-                  tag->IsFrame(),
-                  tag->IsKeyframe()});
-        report.videoFrames += tag->IsVideo() && tag->IsFrame() ? 1U : 0U;
-        report.audioFrames += tag->IsAudio() && tag->IsFrame() ? 1U : 0U;
-        position = tag->End();
+                  {bytes.data(), tag.size},
+                  tag.IsFrame(),
+                  tag.IsKeyframe()});
+        position = tag.End();
     }
     return report;
 }

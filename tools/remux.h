@@ -19,14 +19,16 @@ struct RemuxOptions {
     int64_t offsetMs = 0;                                 /**< added to each time */
     int64_t fromMs = std::numeric_limits<int64_t>::min(); /**< first time to copy */
     int64_t toMs = std::numeric_limits<int64_t>::max();   /**< first time not to copy */
+    uint32_t firstTimestamp = UINT32_MAX; /**< of the frames, once known; for the configurations at the beginning */
 };
 
 /** What was copied. */
 struct RemuxReport {
     uint64_t videoFrames = 0;
     uint64_t audioFrames = 0;
-    uint64_t jumps = 0;       /**< of the timestamps, if they were made continuous */
-    int64_t bytesSkipped = 0; /**< between and after the frames, in bytes of the file */
+    uint32_t firstTimestamp = UINT32_MAX; /**< smallest of the frames, which may not be that of the first one */
+    uint64_t jumps = 0;                   /**< of the timestamps, if they were made continuous */
+    int64_t bytesSkipped = 0;             /**< between and after the frames, in bytes of the file */
 };
 
 /** Receives a tag, whose bytes are valid only during the call. */
@@ -34,13 +36,14 @@ using TakeTag = std::function<void(const NewTag&)>;
 
 /**
  * Plays a file and makes a tag from each frame, and from each configuration before the first frame that needs it. Calls
- * with the same arguments produce the same tags. Throws FileError.
+ * with the same arguments produce the same tags; `firstTimestamp` changes only the timestamps of some of them. Throws
+ * FileError.
  */
 RemuxReport Remux(const std::string& file, const RemuxOptions& options, const TakeTag& take);
 
 /**
  * Reads the tags of an undamaged file unchanged, except the onMetaData whose properties MetadataOf() returns. Throws
- * FileError, also if the file is damaged.
+ * FileError, also if the file is damaged or its timestamps jump back.
  */
 RemuxReport CopyTags(const std::string& file, const TakeTag& take);
 

@@ -1,8 +1,10 @@
 // `flvdmx repair`, `flvdmx index` and `flvdmx cut`: new files from the playable parts of a file.
 #include <algorithm>
+#include <filesystem>
 #include <functional>
 #include <optional>
 #include <string>
+#include <system_error>
 #include <vector>
 
 #include <fmt/core.h>
@@ -23,6 +25,20 @@ namespace tool {
 namespace {
 
 using Pass = std::function<RemuxReport(const TakeTag& take)>;
+
+// Warns of streams of the file that are not in the new one, and of streams in the new one that players cannot play.
+void WarnOfUnplayed(const RewriteOptions& options, const RemuxReport& report)
+{
+    WarnOfUnplayed(Input(options.file), (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
+                                            (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
+    std::error_code unknown;
+    if (options.dryRun || options.out == STANDARD_STREAM || !std::filesystem::is_regular_file(options.out, unknown))
+        return;
+    const Input result(options.out);
+    WarnOfUnplayed(result);
+    if (const std::string fault = ConfigFault(result); !fault.empty())
+        Complain(options.out, "warning: " + fault);
+}
 
 // Runs a pass that measures and, unless it is a dry run, one that writes.
 RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& pass)
@@ -51,6 +67,7 @@ RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& 
         written = out->Written();
     }
     progress.Wipe();
+    WarnOfUnplayed(options, report);
     if (options.out == STANDARD_STREAM && !options.dryRun)
         return report;
     Print(fmt::format("{}: {} and {}, {}, {} in the index{}\n", options.dryRun ? "would write" : Printable(options.out),
@@ -60,13 +77,35 @@ RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& 
     return report;
 }
 
+// If timestamps jump, a time does not stand for one position; if a stream is not found, neither are its keyframes.
+void RefuseUnlessCuttable(const Input& input)
+{
+    constexpr const char* REMEDY = "use 'flvdmx repair' first";
+    if (SeemsToRestart(input))
+        throw FileError(input.name, fmt::format("timestamps jump in this file: {}", REMEDY));
+    TagReader reader(input);
+    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio})
+        if (!input.Has(stream) && reader.FindConfig(stream))
+            throw FileError(input.name, fmt::format("the configuration of the {} is not at the beginning: {}",
+                                                    StreamName(stream), REMEDY));
+}
+
+// The first pass finds the first timestamp for the second one.
+Pass RemuxPass(const std::string& file, RemuxOptions remux)
+{
+    return [file, remux](const TakeTag& take) mutable {
+        const RemuxReport report = Remux(file, remux, take);
+        remux.firstTimestamp = report.firstTimestamp;
+        return report;
+    };
+}
+
 // The times at which to cut: those of the keyframes at or before the beginning and at or after the end.
 RemuxOptions CutOptions(const RewriteOptions& options)
 {
     RemuxOptions remux;
     Input input(options.file);
-    WarnOfRestarts(input);
-    WarnOfUnplayed(input);
+    RefuseUnlessCuttable(input);
     if (options.fromMs) {
         const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
         if (!from)
@@ -95,10 +134,7 @@ int RunRepair(const RewriteOptions& options)
     remux.allFrames = true;
     remux.continuous = !options.keepTimes;
     remux.offsetMs = input.info.start_time.count();
-    const RemuxReport report =
-        Write(options, input.info.size, [&](const TakeTag& take) { return Remux(options.file, remux, take); });
-    WarnOfUnplayed(input, (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
-                              (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
+    const RemuxReport report = Write(options, input.info.size, RemuxPass(options.file, remux));
     if (report.jumps != 0)
         Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
                          Plural(report.jumps, "place")));
@@ -116,9 +152,7 @@ int RunIndex(const RewriteOptions& options)
 
 int RunCut(const RewriteOptions& options)
 {
-    const RemuxOptions remux = CutOptions(options);
-    Write(options, Input(options.file).info.size,
-          [&](const TakeTag& take) { return Remux(options.file, remux, take); });
+    Write(options, Input(options.file).info.size, RemuxPass(options.file, CutOptions(options)));
     return DONE;
 }
 

@@ -155,14 +155,6 @@ std::string CodecOf(const Tag& tag, std::string_view fourcc)
     return fmt::format("enhanced FLV ({}FourCC '{}')", named == NAMES.end() ? "" : (*named)[1], fourcc);
 }
 
-std::optional<Tag> FirstIfLate(const std::string& path, flvdmx::Stream stream)
-{
-    RawTags tags(path);
-    int number = 0;
-    const std::optional<Tag> first = tags.FindFirst(stream, number);
-    return number >= PROBED_TAGS ? first : std::nullopt;
-}
-
 std::string WhyNoStream(const std::string& path, flvdmx::Stream stream)
 {
     RawTags tags(path);

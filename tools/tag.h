@@ -63,11 +63,8 @@ bool IsEnhanced(const Tag& tag, std::string_view fourcc);
 /** @return name of the codec of a video or audio tag. @param fourcc as above */
 std::string CodecOf(const Tag& tag, std::string_view fourcc);
 
-/** @return the first tag of a stream that starts too late for the library to find it */
-std::optional<Tag> FirstIfLate(const std::string& path, flvdmx::Stream stream);
-
-/** @return why no frame of a stream is delivered, such as "it is enhanced FLV", judging by its first tag near the
- *          beginning of the file; empty if there is none */
+/** @return why no frame of a stream without playable frames is delivered, such as "it is enhanced FLV", judging by its
+ *          first tag near the beginning of the file; empty if there is none */
 std::string WhyNoStream(const std::string& path, flvdmx::Stream stream);
 
 /** @return why a file that the library rejected with this code cannot be played; empty if unknown */

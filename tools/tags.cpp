@@ -2,6 +2,7 @@
 #include "tools/tags.h"
 
 #include <algorithm>
+#include <array>
 #include <string_view>
 
 #include <fmt/core.h>
@@ -15,6 +16,18 @@ namespace {
 
 constexpr uint32_t READER_CACHE = 4096; // a larger one would bypass the host's read-ahead window
 constexpr uint32_t BYTES_WITH_CODEC = TAG_HEADER_SIZE + 2;
+
+// As the library tests the first configuration, without which it does not find an AVC stream.
+bool IsValidAvcConfig(flvdmx::Bytes record)
+{
+    constexpr auto AVC = static_cast<int32_t>(flvdmx::VideoCodec::avc);
+    constexpr int32_t MOST_SET_BYTES = 128;
+    std::array<uint8_t, MOST_SET_BYTES> sets{};
+    flvd_video_info_t picture{};
+    const int32_t size =
+        FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()), sets.data(), MOST_SET_BYTES);
+    return size > 0 && FLVD_ParseVideoHeader(AVC, sets.data(), size, &picture) == 0;
+}
 
 } // namespace
 
@@ -67,6 +80,29 @@ std::optional<Tag> TagReader::Find(int64_t from, int64_t end, const std::functio
         if (progress)
             progress(reached);
     }
+}
+
+flvdmx::Bytes TagReader::ConfigBytes(const Tag& tag)
+{
+    const uint32_t size = tag.size - std::min(tag.size, tag.CodecHeaderSize());
+    const uint8_t* const bytes = Bytes(tag.position + TAG_HEADER_SIZE + tag.CodecHeaderSize(), size);
+    return {bytes, bytes != nullptr ? size : 0};
+}
+
+std::optional<Tag> TagReader::FindConfig(flvdmx::Stream stream)
+{
+    int64_t position = int64_t{m_instance->data_offset} + BACK_POINTER_SIZE;
+    while (const std::optional<Tag> tag = Find(position, m_fileSize)) {
+        position = tag->End();
+        if (tag->IsScript() || tag->Stream() != stream || tag->size == 0)
+            continue;
+        if (!tag->IsAvc() && !tag->IsAac())
+            break;
+        const flvdmx::Bytes config = tag->IsConfig() ? ConfigBytes(*tag) : flvdmx::Bytes();
+        if (config.size() > 1 && (tag->IsAac() || IsValidAvcConfig(config)))
+            return tag;
+    }
+    return std::nullopt;
 }
 
 // FLAGS of the file header (FLV file format, version 10.1, annex E.2).

@@ -38,6 +38,13 @@ public:
      */
     std::optional<Tag> Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress = {});
 
+    /** @return the first valid configuration of a stream, wherever it is; nothing for a codec without one */
+    std::optional<Tag> FindConfig(flvdmx::Stream stream);
+
+    /** @return the bytes of a configuration after the codec header, valid until the next call; empty when Bytes() does
+     *          not show all of them: they are a few dozen */
+    flvdmx::Bytes ConfigBytes(const Tag& tag);
+
     /** @return FLVD_STREAM_* bits of the streams that the file header announces */
     uint32_t AnnouncedStreams();
 

@@ -58,10 +58,14 @@ bool Times::Join(Lane& lane, int64_t timestamp)
     return false;
 }
 
-// Two long steps in a row are the rate of a slow stream, not jumps.
+// Two long steps in a row are the rate of a slow stream, not jumps. So is a long step at the start of a file with one
+// stream.
 bool Times::IsSlow(Lane& lane, int64_t step) const
 {
     const auto isLong = [this](int64_t each) { return each > m_limit && each <= SLOWEST_STEP_MS; };
+    const bool isAlone = !m_lanes[0].started || !m_lanes[1].started;
+    if (isAlone && lane.step == 0 && isLong(step))
+        return true;
     if (!lane.tried || !isLong(lane.oddStep) || !isLong(step - lane.oddStep))
         return false;
     lane.limit = SLOWEST_STEP_MS;

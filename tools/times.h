@@ -15,7 +15,8 @@ namespace tool {
  * more than a limit to where the other stream has not been: the recording restarted, or a part is missing. The time
  * then continues from the latest one so far. Only the next frame shows whether a jump is real; a single frame with a
  * wrong timestamp gets a time after the previous frame's. A smaller step back is jitter: the previous time is repeated.
- * Streams with a frame every few minutes do not jump. Timestamps of 32 bits may wrap around.
+ * Streams with a frame every few minutes do not jump; a file with one stream that starts with a long step has such a
+ * stream. Timestamps of 32 bits may wrap around.
  */
 class Times {
 public:
