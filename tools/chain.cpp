@@ -140,18 +140,16 @@ void Chain::Take(const Tag& tag)
         CheckGaps(tag);
 }
 
-// A configuration that does not fit the reader's cache cannot be valid: they have a few dozen bytes.
 void Chain::CheckConfig(const Tag& tag)
 {
-    const uint32_t size = tag.size - std::min(tag.size, tag.CodecHeaderSize());
-    const uint8_t* const bytes = m_reader.Bytes(tag.position + TAG_HEADER_SIZE + tag.CodecHeaderSize(), size);
-    if (bytes == nullptr || size == 0)
+    const flvdmx::Bytes bytes = m_reader.ConfigBytes(tag);
+    if (bytes.empty())
         return;
     std::vector<uint8_t>& config = LaneOf(tag).config;
-    if (!config.empty() && !std::equal(config.begin(), config.end(), bytes, bytes + size))
+    if (!config.empty() && !std::equal(config.begin(), config.end(), bytes.begin(), bytes.end()))
         m_findings.Note("configuration", tag.position,
                         fmt::format("the {} configuration changes", StreamName(tag.Stream())));
-    config.assign(bytes, bytes + size);
+    config.assign(bytes.begin(), bytes.end());
 }
 
 void Chain::CheckTime(const Tag& tag)

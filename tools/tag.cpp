@@ -59,7 +59,6 @@ private:
 // What is wrong with an AVC configuration that the library rejects.
 std::string ConfigFault(RawTags& tags, const Tag& tag)
 {
-    constexpr uint32_t MOST_SET_BYTES = 128;
     constexpr uint32_t SETS_OFFSET = 6; // of the first set's length in the record
     const std::vector<uint8_t> record =
         tags.Bytes(tag.position + TAG_HEADER_SIZE + tag.CodecHeaderSize(), SETS_OFFSET + 2);

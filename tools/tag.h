@@ -16,7 +16,8 @@ constexpr uint32_t BACK_POINTER_SIZE = 4;
 constexpr uint32_t CODEC_ID_MASK = 0x0F;
 constexpr uint8_t EXTENDED_HEADER = 0x80; /**< in the codec byte of enhanced FLV, before a FourCC */
 constexpr uint32_t FOURCC_SIZE = 4;
-constexpr uint32_t MOST_FRAME_TYPE = 5; /**< FrameType of video */
+constexpr uint32_t MOST_FRAME_TYPE = 5;  /**< FrameType of video */
+constexpr uint32_t MOST_SET_BYTES = 128; /**< of AVC parameter sets, for which the library has room */
 
 /** @return the number in the `size` bytes at `bytes`, most significant first */
 uint32_t BigEndian(const uint8_t* bytes, uint32_t size);

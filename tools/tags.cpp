@@ -21,11 +21,10 @@ constexpr uint32_t BYTES_WITH_CODEC = TAG_HEADER_SIZE + 2;
 bool IsValidAvcConfig(flvdmx::Bytes record)
 {
     constexpr auto AVC = static_cast<int32_t>(flvdmx::VideoCodec::avc);
-    constexpr int32_t MOST_SET_BYTES = 128;
     std::array<uint8_t, MOST_SET_BYTES> sets{};
     flvd_video_info_t picture{};
-    const int32_t size =
-        FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()), sets.data(), MOST_SET_BYTES);
+    const int32_t size = FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()), sets.data(),
+                                                      int32_t{MOST_SET_BYTES});
     return size > 0 && FLVD_ParseVideoHeader(AVC, sets.data(), size, &picture) == 0;
 }
 
