@@ -80,9 +80,20 @@ bool Streaming::seek(GstEvent* event)
         GST_OBJECT_LOCK(m_element);
         m_segment = segment;
         GST_OBJECT_UNLOCK(m_element);
+    } else if (flushes) {
+        continue_after_flush();
     }
     restart();
     return sought;
+}
+
+// A flush sets the running time to 0, so that the segment has to begin at the position that playing continues from.
+void Streaming::continue_after_flush()
+{
+    GST_OBJECT_LOCK(m_element);
+    m_segment.start = m_segment.time = m_segment.position = m_position;
+    m_segment.base = m_segment.offset = 0;
+    GST_OBJECT_UNLOCK(m_element);
 }
 
 // Moves the reader to the start of the segment; with KEY_UNIT, also moves the segment to the keyframe reached.

@@ -85,6 +85,7 @@ private:
     bool seek_file(GstSegment& segment, GstSeekFlags flags);
     flvdmx::result<flvdmx::Milliseconds> go_to_keyframe(flvdmx::Milliseconds target, GstSeekFlags flags);
     flvdmx::result<flvdmx::Milliseconds> go_to(flvdmx::Milliseconds target, flvdmx::SeekMode mode);
+    void continue_after_flush();
     void restart();
     unsigned begin_flush(guint32 sequence);
     bool end_flush(unsigned number, guint32 sequence);

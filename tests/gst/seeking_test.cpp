@@ -147,6 +147,28 @@ TEST(Seeking, ReplacesAWrongIndex)
     gst_query_unref(query);
 }
 
+// A flush sets the running time to 0. If the seek then fails, playing must not wait until the old time has passed
+// again.
+TEST(Seeking, ContinuesAtOnceAfterAFailedSeek)
+{
+    constexpr size_t size = 32768;
+    Tags tags = {g_avc};
+    for (uint32_t i = 0; i < 100; ++i)
+        tags.push_back(Nalu(i * 10, size));
+    const TemporaryFile file(File(tags, 1).bytes);
+    Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux ! appsink name=v");
+    gst_element_set_state(pipeline.element(), GST_STATE_PLAYING);
+    while (pipeline.last_time("v") < 500 * GST_MSECOND)
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    std::fstream(file.path(), std::ios::binary | std::ios::in | std::ios::out).seekp(100) << std::string(45 * size, 0);
+    EXPECT_FALSE(pipeline.seek(100, FLUSH)); // all frames before the position are gone
+    EXPECT_EQ(pipeline.play(), "");
+    const Arrival last = pipeline.arrivals("v").back();
+    EXPECT_EQ(last.dts, 990 * GST_MSECOND);
+    EXPECT_GE(last.segment_start, 500 * GST_MSECOND);
+    EXPECT_EQ(last.segment_base, 0u);
+}
+
 TEST(Seeking, RejectsUnsupportedSeeksAndEndsPastTheEnd)
 {
     Pipeline pipeline(demuxed(Path("avc_aac"), "appsink sync=false name=v", "fakesink"));
