@@ -132,14 +132,21 @@ flvdmx::result<flvdmx::Milliseconds> Streaming::go_to_keyframe(flvdmx::Milliseco
     return before_is_nearer ? go_to(target, flvdmx::SeekMode::backward) : after;
 }
 
-// If the index turns out to be wrong, seeks without it.
+// If the index turns out to be wrong, seeks without it. That search ends at a long hole in the file: then goes to a
+// keyframe that is further back, as playing crosses the hole.
 flvdmx::result<flvdmx::Milliseconds> Streaming::go_to(flvdmx::Milliseconds target, flvdmx::SeekMode mode)
 {
+    const auto failed = [this](const flvdmx::result<flvdmx::Milliseconds>& result) {
+        return !result && result.error().kind() == flvdmx::Kind::failed && m_source.flow() == GST_FLOW_OK;
+    };
     const auto reached = m_file.seek(target, mode);
-    if (reached || reached.error().kind() != flvdmx::Kind::failed || m_source.flow() != GST_FLOW_OK)
+    if (!failed(reached))
         return reached;
     m_file.ignore_index();
-    return m_file.seek(target, mode);
+    auto scanned = m_file.seek(target, mode);
+    while (failed(scanned) && mode == flvdmx::SeekMode::backward && target.count() > 0)
+        scanned = m_file.seek(target /= 2, mode);
+    return scanned;
 }
 
 // Continues from the position of the reader. A failed seek has not changed it.

@@ -147,6 +147,23 @@ TEST(Seeking, ReplacesAWrongIndex)
     gst_query_unref(query);
 }
 
+// Where a long hole keeps the library from finding the target, playing begins before the hole.
+TEST(Seeking, ReachesEveryTimeDespiteAHole)
+{
+    Bytes bytes = MakeChain({.index = false, .pictures = 100}).bytes;
+    bytes.insert(bytes.begin() + static_cast<std::ptrdiff_t>(bytes.size() / 2), 3 << 20, 0);
+    const TemporaryFile file(bytes);
+    Pipeline pipeline(demuxed(file.path(), "appsink sync=false name=v", "fakesink async=false"));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    for (const int flags : {FLUSH, KEY_UNIT, AFTER, ACCURATE})
+        for (int64_t target = 0; target < 4000; target += 500)
+            EXPECT_TRUE(pipeline.seek(target, flags)) << target << ", flags " << flags;
+    pipeline.forget_arrivals();
+    EXPECT_EQ(pipeline.play(), "");
+    EXPECT_LE(pipeline.arrivals("v").front().dts, 3500 * GST_MSECOND);
+    EXPECT_EQ(pipeline.last_time("v"), 3960 * GST_MSECOND);
+}
+
 // A flush sets the running time to 0. If the seek then fails, playing must not wait until the old time has passed
 // again.
 TEST(Seeking, ContinuesAtOnceAfterAFailedSeek)
