@@ -134,6 +134,8 @@ GstFlowReturn Streaming::push_frame()
         return GST_FLOW_EOS;
     if (const GstFlowReturn flow = has_output() ? GST_FLOW_OK : expose(); flow != GST_FLOW_OK)
         return flow;
+    if (m_segment_is_new) // a handler of the new pads has sought
+        return GST_FLOW_OK;
     Output& output = output_of(frame->stream);
     if (output.pad() == nullptr) {
         if (!warned_of(frame->stream))

@@ -147,6 +147,30 @@ TEST(Seeking, ReplacesAWrongIndex)
     gst_query_unref(query);
 }
 
+// A seek by a handler of the new pads runs within the streaming thread. Playing begins at its target.
+TEST(Seeking, WorksWhilePadsAreAdded)
+{
+    for (const char* signal : {"pad-added", "no-more-pads"}) {
+        Pipeline pipeline("filesrc location=" + Path("avc_aac") +
+                          " ! flvdmxdemux name=d d.audio ! appsink sync=false name=a");
+        GstElement* const demuxer = gst_bin_get_by_name(GST_BIN(pipeline.element()), "d");
+        const auto seek = [](GstElement* element) {
+            GstPad* const pad = gst_element_get_static_pad(element, "video");
+            const auto flags = static_cast<GstSeekFlags>(KEY_UNIT);
+            gst_pad_send_event(pad, gst_event_new_seek(1.0, GST_FORMAT_TIME, flags, GST_SEEK_TYPE_SET, GST_SECOND,
+                                                       GST_SEEK_TYPE_NONE, -1));
+            gst_object_unref(pad);
+        };
+        g_signal_connect(demuxer, signal, G_CALLBACK(+seek), nullptr);
+        gst_object_unref(demuxer);
+        EXPECT_EQ(pipeline.play(), "");
+        const std::vector<Arrival> audio = pipeline.arrivals("a");
+        ASSERT_FALSE(audio.empty()) << signal;
+        EXPECT_GT(audio[0].segment_start, 0u) << signal;
+        EXPECT_GT(audio[0].dts + 100 * GST_MSECOND, audio[0].segment_start) << signal;
+    }
+}
+
 // Where a long hole keeps the library from finding the target, playing begins before the hole.
 TEST(Seeking, ReachesEveryTimeDespiteAHole)
 {
