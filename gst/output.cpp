@@ -54,19 +54,21 @@ GstFlowReturn Output::push(GstBuffer* buffer, const flvdmx::Frame& frame, flvdmx
     return gst_pad_push(m_pad, buffer);
 }
 
-void Output::jump(GstClockTime time)
+void Output::jump(GstClockTime time, GstClockTime start)
 {
     m_discontinuity = m_waits = true;
     m_reached = time;
+    m_start = start;
 }
 
 void Output::reach(GstClockTime time)
 {
     if (m_pad == nullptr || time < m_reached + (m_waits ? first_gap_min : gap_min))
         return;
-    m_waits = false;
-    gst_pad_push_event(m_pad, gst_event_new_gap(m_reached, time - m_reached));
+    const GstClockTime begin = std::max(m_reached, m_start);
     m_reached = time;
+    if (std::exchange(m_waits, false) || time > begin)
+        gst_pad_push_event(m_pad, gst_event_new_gap(begin, time > begin ? time - begin : GST_CLOCK_TIME_NONE));
 }
 
 } // namespace flvdmx_gst

@@ -155,7 +155,7 @@ void Streaming::restart()
     m_next_tag = -1;
     m_segment_is_new = true;
     for (Output& output : m_outputs)
-        output.jump(std::max<GstClockTime>(m_position, m_segment.start));
+        output.jump(m_position, m_segment.start);
     gst_flow_combiner_reset(m_combiner.get());
     if ((m_segment.flags & GST_SEGMENT_FLAG_SEGMENT) != 0) {
         GstMessage* const message = gst_message_new_segment_start(GST_OBJECT(m_element), GST_FORMAT_TIME,

@@ -305,14 +305,16 @@ TEST(Playing, FillsGaps)
 {
     Tags tags = {g_avc, g_aac, Raw(0), Raw(23)};
     for (uint32_t i = 0; i < 250; ++i)
-        tags.push_back(Nalu(i * 40));
+        tags.push_back({9, i * 40, AvcNalu(i % 100 == 0, Noise(60))});
     const TemporaryFile file(File(tags).bytes);
     const std::string branch = " ! queue max-size-buffers=5 ! appsink sync=false ";
     Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux name=d d.video" + branch + "d.audio" +
                       branch);
     ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
-    ASSERT_TRUE(pipeline.seek(5000, GST_SEEK_FLAG_FLUSH | GST_SEEK_FLAG_KEY_UNIT));
-    EXPECT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    for (const int flags : {GST_SEEK_FLAG_KEY_UNIT, GST_SEEK_FLAG_ACCURATE}) {
+        ASSERT_TRUE(pipeline.seek(5000, GST_SEEK_FLAG_FLUSH | flags));
+        EXPECT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    }
     EXPECT_EQ(pipeline.play(), "");
 }
 
