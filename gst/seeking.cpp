@@ -81,11 +81,13 @@ bool Streaming::seek(GstEvent* event)
     const guint32 sequence = gst_event_get_seqnum(event);
     if (m_last_seek.exchange(sequence) == sequence)
         return true;
+    ++m_waiting_seeks;
     const unsigned flush = flushes ? begin_flush(sequence) : 0;
     if (!flushes)
         gst_pad_pause_task(m_sink);
 
     const StreamLock lock(m_sink);
+    --m_waiting_seeks;
     m_source.clear_flow();
     const bool is_latest = !flushes || end_flush(flush, sequence);
     if (!m_active || !m_file.is_open())
@@ -189,6 +191,8 @@ void Streaming::restart()
         gst_element_post_message(m_element, message);
     }
     start_task();
+    if (m_waiting_seeks != 0) // the task would keep the stream lock from a seek that has paused it
+        gst_pad_pause_task(m_sink);
 }
 
 // Interrupts the streaming thread if it waits. The flushes of two seeks may overlap: the later one ends both.

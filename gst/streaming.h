@@ -124,6 +124,7 @@ private:
     std::atomic<GstClockTime> m_position = 0; // of the last buffer pushed
 
     std::atomic<bool> m_seekable = false;
+    std::atomic<int> m_waiting_seeks = 0; // for the stream lock
 
     std::mutex m_flush_mutex; // held while a flush begins or ends
     unsigned m_flushes = 0;   // number begun
