@@ -188,6 +188,45 @@ TEST(Seeking, ReachesEveryTimeDespiteAHole)
     EXPECT_EQ(pipeline.last_time("v"), 3960 * GST_MSECOND);
 }
 
+// A flush sets the running time to 0. If the seek then fails, playing must not wait until the old time has passed
+// again.
+TEST(Seeking, ContinuesAtOnceAfterAFailedSeek)
+{
+    static std::atomic<bool> s_fails = false;
+    const auto fail = [](GstPad*, GstPadProbeInfo* info, gpointer) {
+        GST_PAD_PROBE_INFO_FLOW_RETURN(info) = GST_FLOW_ERROR;
+        return s_fails ? GST_PAD_PROBE_HANDLED : GST_PAD_PROBE_OK;
+    };
+    const auto watch = [](GstPad*, GstPadProbeInfo* info, gpointer) { // only the seek reads between these two events
+        const GstEventType type = GST_EVENT_TYPE(GST_PAD_PROBE_INFO_EVENT(info));
+        s_fails = (type == GST_EVENT_FLUSH_STOP || s_fails) && type != GST_EVENT_SEGMENT;
+        return GST_PAD_PROBE_OK;
+    };
+    Tags tags = {g_avc};
+    for (uint32_t i = 0; i < 100; ++i)
+        tags.push_back(Nalu(i * 10, 32768));
+    const TemporaryFile file(File(tags, 1).bytes);
+    Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux name=d ! appsink name=v");
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    GstElement* const demuxer = gst_bin_get_by_name(GST_BIN(pipeline.element()), "d");
+    GstPad *const sink = gst_element_get_static_pad(demuxer, "sink"), *const source =
+                                                                          gst_element_get_static_pad(demuxer, "video");
+    constexpr int events = GST_PAD_PROBE_TYPE_EVENT_DOWNSTREAM | GST_PAD_PROBE_TYPE_EVENT_FLUSH;
+    gst_pad_add_probe(sink, GST_PAD_PROBE_TYPE_PULL, fail, nullptr, nullptr);
+    gst_pad_add_probe(source, static_cast<GstPadProbeType>(events), watch, nullptr, nullptr);
+    for (gpointer object : {gpointer(demuxer), gpointer(sink), gpointer(source)})
+        gst_object_unref(object);
+    gst_element_set_state(pipeline.element(), GST_STATE_PLAYING);
+    while (pipeline.last_time("v") < 500 * GST_MSECOND)
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    EXPECT_FALSE(pipeline.seek(100, FLUSH));
+    EXPECT_EQ(pipeline.play(), "");
+    const Arrival last = pipeline.arrivals("v").back();
+    EXPECT_EQ(last.dts, 990 * GST_MSECOND);
+    EXPECT_GE(last.segment_start, 500 * GST_MSECOND);
+    EXPECT_EQ(last.segment_base, 0u);
+}
+
 // Either end of a segment may be relative to the end of the file or left as it is. A refused seek does not even flush.
 TEST(Seeking, ResolvesBothEnds)
 {
