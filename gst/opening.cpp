@@ -126,7 +126,7 @@ GstFlowReturn Streaming::expose()
     const guint group = group_id(m_sink);
     for (Output& output : m_outputs)
         if (output.pad() != nullptr)
-            output.start(m_element, group);
+            output.start(m_element, group, m_sequence);
 
     GST_OBJECT_LOCK(m_element);
     gst_segment_init(&m_segment, GST_FORMAT_TIME);
@@ -163,15 +163,13 @@ void Streaming::add_output(size_t index, OwnedCaps caps)
 
 void Streaming::push_tags()
 {
-    GstEvent* const event = gst_event_new_tag(make_file_tags(m_metadata));
     for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio}) {
-        const Output& output = output_of(stream);
+        Output& output = output_of(stream);
         if (output.pad() == nullptr)
             continue;
-        gst_pad_push_event(output.pad(), gst_event_ref(event));
-        gst_pad_push_event(output.pad(), gst_event_new_tag(make_stream_tags(m_metadata, stream, output.caps())));
+        output.push_event(gst_event_new_tag(make_file_tags(m_metadata)), m_sequence);
+        output.push_event(gst_event_new_tag(make_stream_tags(m_metadata, stream, output.caps())), m_sequence);
     }
-    gst_event_unref(event);
 }
 
 } // namespace flvdmx_gst

@@ -22,22 +22,22 @@ Output::Output(GstElement* element, const char* name, OwnedCaps caps)
     gst_pad_set_active(m_pad, TRUE);
 }
 
-void Output::start(GstElement* element, guint group)
+void Output::start(GstElement* element, guint group, guint32 sequence)
 {
     gchar* const id = gst_pad_create_stream_id(m_pad, element, GST_PAD_NAME(m_pad));
     GstEvent* const event = gst_event_new_stream_start(id);
     g_free(id);
     gst_event_set_group_id(event, group);
-    gst_pad_push_event(m_pad, event);
-    gst_pad_push_event(m_pad, gst_event_new_caps(m_caps.get()));
+    push_event(event, sequence);
+    push_event(gst_event_new_caps(m_caps.get()), sequence);
 }
 
-void Output::change_caps(OwnedCaps caps)
+void Output::change_caps(OwnedCaps caps, guint32 sequence)
 {
     if (gst_caps_is_equal(m_caps.get(), caps.get()) != FALSE)
         return;
     m_caps = std::move(caps);
-    gst_pad_push_event(m_pad, gst_event_new_caps(m_caps.get()));
+    push_event(gst_event_new_caps(m_caps.get()), sequence);
 }
 
 GstFlowReturn Output::push(GstBuffer* buffer, const flvdmx::Frame& frame, flvdmx::Milliseconds time)
@@ -54,19 +54,27 @@ GstFlowReturn Output::push(GstBuffer* buffer, const flvdmx::Frame& frame, flvdmx
     return gst_pad_push(m_pad, buffer);
 }
 
-void Output::jump(GstClockTime time)
+void Output::jump(GstClockTime time, GstClockTime start)
 {
     m_discontinuity = m_waits = true;
     m_reached = time;
+    m_start = start;
 }
 
-void Output::reach(GstClockTime time)
+void Output::reach(GstClockTime time, guint32 sequence)
 {
     if (m_pad == nullptr || time < m_reached + (m_waits ? first_gap_min : gap_min))
         return;
-    m_waits = false;
-    gst_pad_push_event(m_pad, gst_event_new_gap(m_reached, time - m_reached));
+    const GstClockTime begin = std::max(m_reached, m_start);
     m_reached = time;
+    if (std::exchange(m_waits, false) || time > begin)
+        push_event(gst_event_new_gap(begin, time > begin ? time - begin : GST_CLOCK_TIME_NONE), sequence);
+}
+
+void Output::push_event(GstEvent* event, guint32 sequence)
+{
+    gst_event_set_seqnum(event, sequence);
+    gst_pad_push_event(m_pad, event);
 }
 
 } // namespace flvdmx_gst

@@ -39,39 +39,67 @@ gboolean Streaming::handle_query(GstPad* pad, GstObject* parent, GstQuery* query
     return done ? TRUE : gst_pad_query_default(pad, parent, query);
 }
 
+// Returns nothing for a seek that is not supported.
+std::optional<Streaming::SeekRequest> Streaming::parse_seek(GstEvent* event) const
+{
+    SeekRequest request;
+    GstFormat format = GST_FORMAT_UNDEFINED;
+    GstSeekType stop_type = GST_SEEK_TYPE_NONE;
+    gst_event_parse_seek(event, &request.rate, &format, &request.flags, &request.start_type, &request.start, &stop_type,
+                         &request.stop);
+    if (!m_seekable || format != GST_FORMAT_TIME || request.rate <= 0.0 ||
+        (request.flags & GST_SEEK_FLAG_INSTANT_RATE_CHANGE) != 0)
+        return {};
+    GST_OBJECT_LOCK(m_element);
+    const GstSegment segment = m_segment;
+    GST_OBJECT_UNLOCK(m_element);
+    const auto resolve = [&segment](GstSeekType type, gint64 time, guint64 current) {
+        if (type == GST_SEEK_TYPE_NONE)
+            return static_cast<gint64>(current);
+        const auto duration = static_cast<gint64>(segment.duration);
+        return type == GST_SEEK_TYPE_END ? std::max<gint64>(duration + std::min<gint64>(time, 0), 0) : time;
+    };
+    const guint64 position = std::max<GstClockTime>(m_position, segment.start);
+    request.start = std::max<gint64>(resolve(request.start_type, request.start, position), 0);
+    request.stop = std::max<gint64>(resolve(stop_type, request.stop, segment.stop), -1);
+    if (request.stop >= 0 && request.stop < request.start) {
+        if (stop_type != GST_SEEK_TYPE_NONE)
+            return {};
+        request.stop = -1; // the end of an earlier segment
+    }
+    if (request.start_type == GST_SEEK_TYPE_END)
+        request.start_type = GST_SEEK_TYPE_SET;
+    return request;
+}
+
 bool Streaming::seek(GstEvent* event)
 {
-    gdouble rate = 1.0;
-    GstFormat format = GST_FORMAT_UNDEFINED;
-    GstSeekFlags flags = GST_SEEK_FLAG_NONE;
-    GstSeekType start_type = GST_SEEK_TYPE_NONE;
-    GstSeekType stop_type = GST_SEEK_TYPE_NONE;
-    gint64 start = 0;
-    gint64 stop = 0;
-    gst_event_parse_seek(event, &rate, &format, &flags, &start_type, &start, &stop_type, &stop);
-    if (!m_seekable || format != GST_FORMAT_TIME || rate <= 0.0 || (flags & GST_SEEK_FLAG_INSTANT_RATE_CHANGE) != 0)
+    const std::optional<SeekRequest> request = parse_seek(event);
+    if (!request)
         return false;
-    const bool both_set = start_type == GST_SEEK_TYPE_SET && stop_type == GST_SEEK_TYPE_SET;
-    if (both_set && stop >= 0 && start > stop)
-        return false;
-    const bool flushes = (flags & GST_SEEK_FLAG_FLUSH) != 0;
+    const bool flushes = (request->flags & GST_SEEK_FLAG_FLUSH) != 0;
     const guint32 sequence = gst_event_get_seqnum(event);
     if (m_last_seek.exchange(sequence) == sequence)
         return true;
+    ++m_waiting_seeks;
     const unsigned flush = flushes ? begin_flush(sequence) : 0;
     if (!flushes)
         gst_pad_pause_task(m_sink);
 
     const StreamLock lock(m_sink);
+    --m_waiting_seeks;
+    m_source.clear_flow();
+    const bool is_latest = !flushes || end_flush(flush, sequence);
     if (!m_active || !m_file.is_open())
         return false;
-    if (flushes && !end_flush(flush, sequence))
+    if (!is_latest)
         return true; // a later seek takes over
     GstSegment segment = m_segment;
-    segment.position = m_position;
-    const bool sought = gst_segment_do_seek(&segment, rate, format, flags, start_type, static_cast<guint64>(start),
-                                            stop_type, static_cast<guint64>(stop), nullptr) != FALSE &&
-                        seek_file(segment, flags);
+    segment.position = std::max<GstClockTime>(m_position, segment.start);
+    const bool sought = gst_segment_do_seek(&segment, request->rate, GST_FORMAT_TIME, request->flags,
+                                            request->start_type, static_cast<guint64>(request->start),
+                                            GST_SEEK_TYPE_SET, static_cast<guint64>(request->stop), nullptr) != FALSE &&
+                        seek_file(segment, request->flags);
     if (!sought && m_source.flow() == GST_FLOW_FLUSHING)
         return false; // interrupted by a later seek or by stopping
     if (sought) {
@@ -80,9 +108,20 @@ bool Streaming::seek(GstEvent* event)
         GST_OBJECT_LOCK(m_element);
         m_segment = segment;
         GST_OBJECT_UNLOCK(m_element);
+    } else if (flushes) {
+        continue_after_flush();
     }
     restart();
     return sought;
+}
+
+// A flush sets the running time to 0, so that the segment has to begin at the position that playing continues from.
+void Streaming::continue_after_flush()
+{
+    GST_OBJECT_LOCK(m_element);
+    m_segment.start = m_segment.time = m_segment.position = std::max<GstClockTime>(m_position, m_segment.start);
+    m_segment.base = m_segment.offset = 0;
+    GST_OBJECT_UNLOCK(m_element);
 }
 
 // Moves the reader to the start of the segment; with KEY_UNIT, also moves the segment to the keyframe reached.
@@ -91,7 +130,6 @@ bool Streaming::seek_file(GstSegment& segment, GstSeekFlags flags)
     constexpr auto to_end = flvdmx::SeekMode::backward | flvdmx::SeekMode::to_end_on_miss;
     const bool after = (flags & GST_SEEK_FLAG_KEY_UNIT) != 0 && (flags & GST_SEEK_FLAG_SNAP_AFTER) != 0;
     const flvdmx::Milliseconds target((segment.position + (after ? GST_MSECOND - 1 : 0)) / GST_MSECOND);
-    m_source.clear_flow();
     const std::shared_lock<OpenLock> lock(open_lock);
     const auto reached = target > m_info.duration ? m_file.seek(target, to_end) : go_to_keyframe(target, flags);
     if (m_source.flow() != GST_FLOW_OK)
@@ -121,14 +159,21 @@ flvdmx::result<flvdmx::Milliseconds> Streaming::go_to_keyframe(flvdmx::Milliseco
     return before_is_nearer ? go_to(target, flvdmx::SeekMode::backward) : after;
 }
 
-// If the index turns out to be wrong, seeks without it.
+// If the index turns out to be wrong, seeks without it. That search ends at a long hole in the file: then goes to a
+// keyframe that is further back, as playing crosses the hole.
 flvdmx::result<flvdmx::Milliseconds> Streaming::go_to(flvdmx::Milliseconds target, flvdmx::SeekMode mode)
 {
+    const auto failed = [this](const flvdmx::result<flvdmx::Milliseconds>& result) {
+        return !result && result.error().kind() == flvdmx::Kind::failed && m_source.flow() == GST_FLOW_OK;
+    };
     const auto reached = m_file.seek(target, mode);
-    if (reached || reached.error().kind() != flvdmx::Kind::failed || m_source.flow() != GST_FLOW_OK)
+    if (!failed(reached))
         return reached;
     m_file.ignore_index();
-    return m_file.seek(target, mode);
+    auto scanned = m_file.seek(target, mode);
+    while (failed(scanned) && mode == flvdmx::SeekMode::backward && target.count() > 0)
+        scanned = m_file.seek(target /= 2, mode);
+    return scanned;
 }
 
 // Continues from the position of the reader. A failed seek has not changed it.
@@ -137,7 +182,7 @@ void Streaming::restart()
     m_next_tag = -1;
     m_segment_is_new = true;
     for (Output& output : m_outputs)
-        output.jump(std::max<GstClockTime>(m_position, m_segment.start));
+        output.jump(m_position, m_segment.start);
     gst_flow_combiner_reset(m_combiner.get());
     if ((m_segment.flags & GST_SEGMENT_FLAG_SEGMENT) != 0) {
         GstMessage* const message = gst_message_new_segment_start(GST_OBJECT(m_element), GST_FORMAT_TIME,
@@ -146,6 +191,8 @@ void Streaming::restart()
         gst_element_post_message(m_element, message);
     }
     start_task();
+    if (m_waiting_seeks != 0) // the task would keep the stream lock from a seek that has paused it
+        gst_pad_pause_task(m_sink);
 }
 
 // Interrupts the streaming thread if it waits. The flushes of two seeks may overlap: the later one ends both.

@@ -129,11 +129,15 @@ GstFlowReturn Streaming::push_frame()
     const int64_t position = frame ? frame->position : -1;
     if (position != m_next_tag && m_next_tag >= 0 && goes_back(position))
         return GST_FLOW_OK;
+    if (m_source.flow() != GST_FLOW_OK)
+        return source_failed();
     m_next_tag = end;
     if (!frame)
         return GST_FLOW_EOS;
     if (const GstFlowReturn flow = has_output() ? GST_FLOW_OK : expose(); flow != GST_FLOW_OK)
         return flow;
+    if (m_segment_is_new) // a handler of the new pads has sought
+        return GST_FLOW_OK;
     Output& output = output_of(frame->stream);
     if (output.pad() == nullptr) {
         if (!warned_of(frame->stream))
@@ -166,7 +170,7 @@ GstFlowReturn Streaming::push_to(Output& output, GstBuffer* buffer, const flvdmx
     m_position = time;
     const GstFlowReturn flow = output.push(buffer, frame, frame_time);
     for (Output& other : m_outputs)
-        other.reach(time);
+        other.reach(time, m_sequence);
     return gst_flow_combiner_update_pad_flow(m_combiner.get(), output.pad(), flow);
 }
 
@@ -240,7 +244,7 @@ void Streaming::announce_config(const flvdmx::Frame& frame)
                              video ? "video" : "audio", frame.position));
     OwnedCaps caps(video ? make_caps(*m_info.video) : make_caps(*m_info.audio));
     if (valid && caps != nullptr)
-        output_of(frame.stream).change_caps(std::move(caps));
+        output_of(frame.stream).change_caps(std::move(caps), m_sequence);
 }
 
 // Handles a failure of the source. A flush is not an error: the thread that flushes restarts or stops the task.

@@ -81,10 +81,20 @@ private:
     /* Called by any thread. */
     static gboolean handle_event(GstPad* pad, GstObject* parent, GstEvent* event);
     static gboolean handle_query(GstPad* pad, GstObject* parent, GstQuery* query);
+    /* `start` and `stop` are times in ns; a stop of -1 is the end of the file. */
+    struct SeekRequest {
+        gdouble rate = 1.0;
+        GstSeekFlags flags = GST_SEEK_FLAG_NONE;
+        GstSeekType start_type = GST_SEEK_TYPE_NONE; // or SET
+        gint64 start = 0;
+        gint64 stop = -1;
+    };
+    std::optional<SeekRequest> parse_seek(GstEvent* event) const;
     bool seek(GstEvent* event);
     bool seek_file(GstSegment& segment, GstSeekFlags flags);
     flvdmx::result<flvdmx::Milliseconds> go_to_keyframe(flvdmx::Milliseconds target, GstSeekFlags flags);
     flvdmx::result<flvdmx::Milliseconds> go_to(flvdmx::Milliseconds target, flvdmx::SeekMode mode);
+    void continue_after_flush();
     void restart();
     unsigned begin_flush(guint32 sequence);
     bool end_flush(unsigned number, guint32 sequence);
@@ -114,6 +124,7 @@ private:
     std::atomic<GstClockTime> m_position = 0; // of the last buffer pushed
 
     std::atomic<bool> m_seekable = false;
+    std::atomic<int> m_waiting_seeks = 0; // for the stream lock
 
     std::mutex m_flush_mutex; // held while a flush begins or ends
     unsigned m_flushes = 0;   // number begun

@@ -27,6 +27,7 @@ private:
     struct Stream {
         std::optional<flvdmx::Milliseconds> last;
         flvdmx::Milliseconds distance{}; // between its last two frames
+        flvdmx::Milliseconds offset{};   // m_offset, except for frames from before a restart of the other stream
     };
 
     flvdmx::Milliseconds m_offset{};

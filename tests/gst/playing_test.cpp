@@ -226,6 +226,37 @@ TEST(Playing, PutsTimesInOrder)
     }
 }
 
+// Where the timestamps restart, the last audio frame before the restart may come after the first video frame after it.
+TEST(Playing, PutsTimesOfTwoStreamsInOrder)
+{
+    const uint32_t wrap = 0xFFFFFFB0; // 80 ms before the timestamps exceed 32 bits
+    const struct {
+        Tags tags;
+        std::vector<uint64_t> video, audio; // ms
+    } cases[] = {
+        {{g_avc, g_aac, Nalu(wrap), Raw(wrap), Nalu(wrap + 40), Nalu(0), Raw(wrap + 46), Raw(12), Nalu(40), Raw(58)},
+         {0, 40, 80, 120},
+         {0, 46, 92, 138}},
+        {{g_avc, g_aac, Nalu(0), Raw(0), Nalu(4000), Raw(4000), Nalu(4040), Nalu(0), Raw(4046), Raw(0), Nalu(40)},
+         {0, 4000, 4040, 4080, 4120},
+         {0, 4000, 4046, 4080}},
+        {{g_avc, g_aac, Nalu(0), Raw(0), Nalu(4000), Nalu(4040), Nalu(0), Raw(0), Nalu(40)},
+         {0, 4000, 4040, 4080, 4120},
+         {0, 4080}}, // the first part has less audio than video
+    };
+    for (const auto& [tags, video, audio] : cases) {
+        const TemporaryFile file(File(tags).bytes);
+        Pipeline pipeline(demuxed(file.path(), "appsink sync=false name=v", "appsink sync=false name=a"));
+        EXPECT_EQ(pipeline.play(), "");
+        for (const auto& [sink, times] : {std::pair("v", video), std::pair("a", audio)}) {
+            std::vector<uint64_t> arrived;
+            for (const Arrival& arrival : pipeline.arrivals(sink))
+                arrived.push_back(arrival.dts / GST_MSECOND);
+            EXPECT_EQ(arrived, times) << sink;
+        }
+    }
+}
+
 // There is one warning about frames that are not played; the rest is played.
 TEST(Playing, WarnsOfWhatIsNotPlayed)
 {
@@ -274,14 +305,16 @@ TEST(Playing, FillsGaps)
 {
     Tags tags = {g_avc, g_aac, Raw(0), Raw(23)};
     for (uint32_t i = 0; i < 250; ++i)
-        tags.push_back(Nalu(i * 40));
+        tags.push_back({9, i * 40, AvcNalu(i % 100 == 0, Noise(60))});
     const TemporaryFile file(File(tags).bytes);
     const std::string branch = " ! queue max-size-buffers=5 ! appsink sync=false ";
     Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux name=d d.video" + branch + "d.audio" +
                       branch);
     ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
-    ASSERT_TRUE(pipeline.seek(5000, GST_SEEK_FLAG_FLUSH | GST_SEEK_FLAG_KEY_UNIT));
-    EXPECT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    for (const int flags : {GST_SEEK_FLAG_KEY_UNIT, GST_SEEK_FLAG_ACCURATE}) {
+        ASSERT_TRUE(pipeline.seek(5000, GST_SEEK_FLAG_FLUSH | flags));
+        EXPECT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    }
     EXPECT_EQ(pipeline.play(), "");
 }
 

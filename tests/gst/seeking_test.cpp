@@ -147,6 +147,129 @@ TEST(Seeking, ReplacesAWrongIndex)
     gst_query_unref(query);
 }
 
+// A seek by a handler of the new pads runs within the streaming thread. Playing begins at its target.
+TEST(Seeking, WorksWhilePadsAreAdded)
+{
+    for (const char* signal : {"pad-added", "no-more-pads"}) {
+        Pipeline pipeline("filesrc location=" + Path("avc_aac") +
+                          " ! flvdmxdemux name=d d.audio ! appsink sync=false name=a");
+        GstElement* const demuxer = gst_bin_get_by_name(GST_BIN(pipeline.element()), "d");
+        const auto seek = [](GstElement* element) {
+            GstPad* const pad = gst_element_get_static_pad(element, "video");
+            const auto flags = static_cast<GstSeekFlags>(KEY_UNIT);
+            gst_pad_send_event(pad, gst_event_new_seek(1.0, GST_FORMAT_TIME, flags, GST_SEEK_TYPE_SET, GST_SECOND,
+                                                       GST_SEEK_TYPE_NONE, -1));
+            gst_object_unref(pad);
+        };
+        g_signal_connect(demuxer, signal, G_CALLBACK(+seek), nullptr);
+        gst_object_unref(demuxer);
+        EXPECT_EQ(pipeline.play(), "");
+        const std::vector<Arrival> audio = pipeline.arrivals("a");
+        ASSERT_FALSE(audio.empty()) << signal;
+        EXPECT_GT(audio[0].segment_start, 0u) << signal;
+        EXPECT_GT(audio[0].dts + 100 * GST_MSECOND, audio[0].segment_start) << signal;
+    }
+}
+
+// Where a long hole keeps the library from finding the target, playing begins before the hole.
+TEST(Seeking, ReachesEveryTimeDespiteAHole)
+{
+    Bytes bytes = MakeChain({.index = false, .pictures = 100}).bytes;
+    bytes.insert(bytes.begin() + static_cast<std::ptrdiff_t>(bytes.size() / 2), 3 << 20, 0);
+    const TemporaryFile file(bytes);
+    Pipeline pipeline(demuxed(file.path(), "appsink sync=false name=v", "fakesink async=false"));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    for (const int flags : {FLUSH, KEY_UNIT, AFTER, ACCURATE})
+        for (int64_t target = 0; target < 4000; target += 500)
+            EXPECT_TRUE(pipeline.seek(target, flags)) << target << ", flags " << flags;
+    pipeline.forget_arrivals();
+    EXPECT_EQ(pipeline.play(), "");
+    EXPECT_LE(pipeline.arrivals("v").front().dts, 3500 * GST_MSECOND);
+    EXPECT_EQ(pipeline.last_time("v"), 3960 * GST_MSECOND);
+}
+
+// A flush sets the running time to 0. If the seek then fails, playing must not wait until the old time has passed
+// again.
+TEST(Seeking, ContinuesAtOnceAfterAFailedSeek)
+{
+    static std::atomic<bool> s_fails = false;
+    const auto fail = [](GstPad*, GstPadProbeInfo* info, gpointer) {
+        GST_PAD_PROBE_INFO_FLOW_RETURN(info) = GST_FLOW_ERROR;
+        return s_fails ? GST_PAD_PROBE_HANDLED : GST_PAD_PROBE_OK;
+    };
+    const auto watch = [](GstPad*, GstPadProbeInfo* info, gpointer) { // only the seek reads between these two events
+        const GstEventType type = GST_EVENT_TYPE(GST_PAD_PROBE_INFO_EVENT(info));
+        s_fails = (type == GST_EVENT_FLUSH_STOP || s_fails) && type != GST_EVENT_SEGMENT;
+        return GST_PAD_PROBE_OK;
+    };
+    Tags tags = {g_avc};
+    for (uint32_t i = 0; i < 100; ++i)
+        tags.push_back(Nalu(i * 10, 32768));
+    const TemporaryFile file(File(tags, 1).bytes);
+    Pipeline pipeline("filesrc location=" + file.path() + " ! flvdmxdemux name=d ! appsink name=v");
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    GstElement* const demuxer = gst_bin_get_by_name(GST_BIN(pipeline.element()), "d");
+    GstPad *const sink = gst_element_get_static_pad(demuxer, "sink"), *const source =
+                                                                          gst_element_get_static_pad(demuxer, "video");
+    constexpr int events = GST_PAD_PROBE_TYPE_EVENT_DOWNSTREAM | GST_PAD_PROBE_TYPE_EVENT_FLUSH;
+    gst_pad_add_probe(sink, GST_PAD_PROBE_TYPE_PULL, fail, nullptr, nullptr);
+    gst_pad_add_probe(source, static_cast<GstPadProbeType>(events), watch, nullptr, nullptr);
+    for (gpointer object : {gpointer(demuxer), gpointer(sink), gpointer(source)})
+        gst_object_unref(object);
+    gst_element_set_state(pipeline.element(), GST_STATE_PLAYING);
+    while (pipeline.last_time("v") < 500 * GST_MSECOND)
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    EXPECT_FALSE(pipeline.seek(100, FLUSH));
+    EXPECT_EQ(pipeline.play(), "");
+    const Arrival last = pipeline.arrivals("v").back();
+    EXPECT_EQ(last.dts, 990 * GST_MSECOND);
+    EXPECT_GE(last.segment_start, 500 * GST_MSECOND);
+    EXPECT_EQ(last.segment_base, 0u);
+}
+
+// Either end of a segment may be relative to the end of the file or left as it is. A refused seek does not even flush.
+TEST(Seeking, ResolvesBothEnds)
+{
+    constexpr auto none = GST_SEEK_TYPE_NONE, set = GST_SEEK_TYPE_SET, end = GST_SEEK_TYPE_END;
+    constexpr int64_t refused = -2, open = -1;
+    const struct { // ms, one seek after the other in a file of 2508 ms
+        GstSeekType start_type;
+        int64_t start;
+        GstSeekType stop_type;
+        int64_t stop;
+        int64_t wanted_start, wanted_stop;
+    } cases[] = {
+        {set, 500, set, 1000, 500, 1000},  {set, 600, none, -1, 600, 1000},   {set, 1500, none, -1, 1500, open},
+        {none, -1, set, 1000, refused, 0}, {none, -1, set, 2000, 1500, 2000}, {end, -508, end, -8, 2000, 2500},
+        {end, -9000, set, -1, 0, open},    {set, -7000, set, 900, 0, 900},    {set, 2000, end, -2000, refused, 0},
+        {set, 1000, set, 999, refused, 0}, {set, 0, end, -9000, 0, 0},
+    };
+    Pipeline pipeline(demuxed(Path("avc_aac"), "appsink sync=false name=v", "fakesink async=false"));
+    ASSERT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+    for (const auto& [start_type, start, stop_type, stop, wanted_start, wanted_stop] : cases) {
+        SCOPED_TRACE(std::to_string(start) + " to " + std::to_string(stop));
+        const auto ns = [](int64_t time) { return time == -1 ? time : time * static_cast<int64_t>(GST_MSECOND); };
+        pipeline.forget_arrivals();
+        EXPECT_EQ(gst_element_seek(pipeline.element(), 1.0, GST_FORMAT_TIME, static_cast<GstSeekFlags>(ACCURATE),
+                                   start_type, ns(start), stop_type, ns(stop)) != FALSE,
+                  wanted_start != refused);
+        EXPECT_TRUE(pipeline.go_to(GST_STATE_PAUSED));
+        if (wanted_start == refused) {
+            EXPECT_TRUE(pipeline.arrivals("v").empty());
+            continue;
+        }
+        GstQuery* const query = gst_query_new_segment(GST_FORMAT_TIME);
+        GstElement* const demuxer = gst_bin_get_by_name(GST_BIN(pipeline.element()), "d");
+        EXPECT_TRUE(gst_element_query(demuxer, query));
+        gint64 first = 0, last = 0;
+        gst_query_parse_segment(query, nullptr, nullptr, &first, &last);
+        EXPECT_EQ(first, ns(wanted_start));
+        EXPECT_EQ(last, ns(wanted_stop == open ? 2508 : wanted_stop));
+        gst_object_unref(demuxer);
+        gst_query_unref(query);
+    }
+}
+
 TEST(Seeking, RejectsUnsupportedSeeksAndEndsPastTheEnd)
 {
     Pipeline pipeline(demuxed(Path("avc_aac"), "appsink sync=false name=v", "fakesink"));
