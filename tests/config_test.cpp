@@ -115,6 +115,37 @@ std::string Probe(uint8_t type, const std::vector<Bytes>& tags)
     return out.str();
 }
 
+// The probe gets only the first bytes of an audio tag.
+TEST(StreamProbe, NeedsTwelveBytesOfAnAudioTag)
+{
+    using enum Site;
+    const struct {
+        const char* name;
+        uint8_t header;
+        uint32_t filter, rate, channels;
+        std::optional<Site> site = {}; // where it fails
+        uint32_t bytes = 12;
+    } rows[] = {
+        {.name = "PCM needs no more", .header = 0x3E, .filter = 0x3E, .rate = 44100, .channels = 1},
+        {.name = "no AAC packet type", .header = 0xAF, .filter = 0xAF, .rate = 44100, .channels = 2, .site = AUDIO_TAG},
+        {.name = "no MP3 frame header", .header = 0x2A, .filter = 0x2A, .rate = 22050, .channels = 1, .site = MP3_DATA},
+        {.name = "short", .header = 0x3E, .filter = 0xFFFF, .rate = 0, .channels = 0, .site = AUDIO_TAG, .bytes = 11},
+    };
+    for (const auto& row : rows) {
+        SCOPED_TRACE(row.name);
+        FakeHost host(File({Screen(0), {8, 0, AudioData(row.header, Noise(LARGE))}, Screen(9)}).bytes);
+        host.shorten_nth(HostFn::Read, 4, row.bytes); // after file header, tag header and back-pointer
+        host.fail_nth(HostFn::Read, 5);
+        Session session(host, {0, false, SMALL});
+        ASSERT_TRUE(session.opened());
+        EXPECT_EQ(session.info().has_audio, row.site ? 0u : 1u);
+        EXPECT_EQ(session.ctx()->audio_format_filter, row.filter);
+        EXPECT_EQ(session.ctx()->audio_info.sample_rate, row.rate);
+        EXPECT_EQ(session.ctx()->audio_info.channels, row.channels);
+        EXPECT_TRUE(session.recorded(row.site)) << session.error_line();
+    }
+}
+
 TEST(StreamProbe, DescribesTheFirstTag)
 {
     const auto parameters = [](size_t size) { // in start-code form
