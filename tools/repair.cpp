@@ -27,7 +27,7 @@ namespace {
 using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
 // Warns of streams of the file that are not in the new one, and of streams in the new one that players cannot play.
-void WarnOfUnplayed(const RewriteOptions& options, const RemuxReport& report)
+void WarnOfWhatIsNotPlayed(const RewriteOptions& options, const RemuxReport& report)
 {
     WarnOfUnplayed(Input(options.file), (report.videoFrames == 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
                                             (report.audioFrames == 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0));
@@ -67,7 +67,7 @@ RemuxReport Write(const RewriteOptions& options, int64_t inputSize, const Pass& 
         written = out->Written();
     }
     progress.Wipe();
-    WarnOfUnplayed(options, report);
+    WarnOfWhatIsNotPlayed(options, report);
     if (options.out == STANDARD_STREAM && !options.dryRun)
         return report;
     Print(fmt::format("{}: {} and {}, {}, {} in the index{}\n", options.dryRun ? "would write" : Printable(options.out),
