@@ -8,54 +8,34 @@ namespace flvdmx_gst {
 
 namespace {
 
-constexpr uint32_t tag_header_size = 11;
-constexpr uint8_t type_audio = 8;
-constexpr uint8_t type_video = 9;
-constexpr uint8_t type_script = 18;
-
-uint32_t big_endian_24(const uint8_t* bytes)
+bool is_late(const flvdmx::Tag& tag, const flvdmx::File& file)
 {
-    return uint32_t{bytes[0]} << 16 | uint32_t{bytes[1]} << 8 | bytes[2];
-}
-
-bool is_late(const RawTag& tag, const flvdmx::File& file)
-{
-    return tag.stream != flvdmx::Stream::any && tag.timestamp > file.instance()->last_ts;
+    return tag.stream() != flvdmx::Stream::any && tag.timestamp() > file.instance()->last_ts;
 }
 
 } // namespace
 
-std::optional<RawTag> read_tag(Source& source, int64_t position)
+std::optional<flvdmx::Tag> read_tag(Source& source, int64_t position)
 {
-    std::array<uint8_t, tag_header_size + 1> header{};
-    std::array<uint8_t, sizeof(uint32_t)> back_pointer{};
+    std::array<uint8_t, flvdmx::Tag::header_size + 1> header{}; // and the codec byte
+    std::array<uint8_t, flvdmx::Tag::back_pointer_size> back{};
     if (!source.read_all(position, header.data(), header.size()))
         return std::nullopt;
-    const uint32_t size = big_endian_24(&header[1]);
-    const int64_t data_end = position + tag_header_size + size;
-    const uint8_t type = header[0];
-    if ((type != type_audio && type != type_video && type != type_script) || size == 0 ||
-        !source.read_all(data_end, back_pointer.data(), back_pointer.size()))
+    const flvdmx::Tag tag(position, {header.data(), header.size()});
+    if ((tag.stream() == flvdmx::Stream::any && !tag.is_script()) || tag.data_size() == 0 ||
+        !source.read_all(tag.data_end(), back.data(), back.size()))
         return std::nullopt;
-    const uint32_t tag_size = uint32_t{back_pointer[0]} << 24 | big_endian_24(&back_pointer[1]);
-    if (tag_size != tag_header_size + size)
-        return std::nullopt;
-    RawTag tag;
-    if (type != type_script)
-        tag.stream = type == type_video ? flvdmx::Stream::video : flvdmx::Stream::audio;
-    tag.timestamp = big_endian_24(&header[4]) | uint32_t{header[7]} << 24;
-    tag.codec_byte = header[tag_header_size];
-    tag.end = data_end + static_cast<int64_t>(back_pointer.size());
-    return tag;
+    const uint32_t size = uint32_t{back[0]} << 24 | uint32_t{back[1]} << 16 | uint32_t{back[2]} << 8 | back[3];
+    return size == flvdmx::Tag::header_size + tag.data_size() ? std::optional(tag) : std::nullopt;
 }
 
 bool is_before_restart(Source& source, int64_t position, const flvdmx::File& file)
 {
     if (file.instance()->last_ts == 0) // any time is valid
         return false;
-    std::optional<RawTag> tag;
+    std::optional<flvdmx::Tag> tag;
     bool late = false;
-    for (int i = 0; i < examined_tags && (tag = read_tag(source, position)); ++i, position = tag->end) {
+    for (int i = 0; i < examined_tags && (tag = read_tag(source, position)); ++i, position = tag->end()) {
         const bool follows_late = late;
         late = is_late(*tag, file);
         if (late && follows_late)
@@ -64,12 +44,12 @@ bool is_before_restart(Source& source, int64_t position, const flvdmx::File& fil
     return false;
 }
 
-std::string reason_to_skip(const RawTag& tag, const flvdmx::File& file, const flvdmx::Info& info)
+std::string reason_to_skip(const flvdmx::Tag& tag, const flvdmx::File& file, const flvdmx::Info& info)
 {
     using namespace std::string_literals;
-    if (tag.stream == flvdmx::Stream::any)
+    if (tag.stream() == flvdmx::Stream::any)
         return "";
-    const bool video = tag.stream == flvdmx::Stream::video;
+    const bool video = tag.stream() == flvdmx::Stream::video;
     const char* const codec = video ? flvdmx::name(tag.video_codec()) : flvdmx::name(tag.audio_codec());
     if (video && !info.video && tag.video_codec() == flvdmx::VideoCodec::avc)
         return "the video is not played: its first tags contain no usable AVC configuration";
@@ -80,7 +60,7 @@ std::string reason_to_skip(const RawTag& tag, const flvdmx::File& file, const fl
         return "video is not played: its codec changes from "s + flvdmx::name(info.video->codec) + " to " + codec;
     if (!video && tag.audio_codec() != info.audio->codec)
         return "audio is not played: its codec changes from "s + flvdmx::name(info.audio->codec) + " to " + codec;
-    if (!video && tag.codec_byte != (file.instance()->audio_format_filter & 0xFF))
+    if (!video && tag.codec_byte() != (file.instance()->audio_format_filter & 0xFF))
         return "audio is not played: its sample rate, sample size or channels change";
     return "";
 }

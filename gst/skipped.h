@@ -13,19 +13,8 @@
 
 namespace flvdmx_gst {
 
-/** A valid tag. */
-struct RawTag {
-    flvdmx::Stream stream = flvdmx::Stream::any; // any: script data
-    uint8_t codec_byte = 0;
-    uint32_t timestamp = 0; // ms, of the file
-    int64_t end = 0;        // file position after its back-pointer
-
-    flvdmx::VideoCodec video_codec() const { return static_cast<flvdmx::VideoCodec>(codec_byte & 15); }
-    flvdmx::AudioCodec audio_codec() const { return static_cast<flvdmx::AudioCodec>(codec_byte >> 4); }
-};
-
-/** Reads the tag at a position. Returns nothing if its header and its back-pointer do not agree. */
-std::optional<RawTag> read_tag(Source& source, int64_t position);
+/** Reads the tag at a position. Returns nothing if it is empty, or if its header and its back-pointer do not agree. */
+std::optional<flvdmx::Tag> read_tag(Source& source, int64_t position);
 
 /** Number of tags to examine: tags without frames may come before the skipped ones. */
 constexpr int examined_tags = 8;
@@ -35,6 +24,6 @@ constexpr int examined_tags = 8;
 bool is_before_restart(Source& source, int64_t position, const flvdmx::File& file);
 
 /** Returns why the tag does not match the file's description, as a sentence; "" if it does. */
-std::string reason_to_skip(const RawTag& tag, const flvdmx::File& file, const flvdmx::Info& info);
+std::string reason_to_skip(const flvdmx::Tag& tag, const flvdmx::File& file, const flvdmx::Info& info);
 
 } // namespace flvdmx_gst

@@ -207,11 +207,11 @@ bool Streaming::goes_back(int64_t position)
 // Warns once per stream why its tags are not played.
 void Streaming::warn_of_skipped(int64_t position)
 {
-    std::optional<RawTag> tag;
+    std::optional<flvdmx::Tag> tag;
     if (m_warned[0] && m_warned[1])
         return;
-    for (int i = 0; i < examined_tags && (tag = read_tag(m_source, position)); ++i, position = tag->end) {
-        bool& warned = warned_of(tag->stream);
+    for (int i = 0; i < examined_tags && (tag = read_tag(m_source, position)); ++i, position = tag->end()) {
+        bool& warned = warned_of(tag->stream());
         const std::string reason = warned ? "" : reason_to_skip(*tag, m_file, m_info);
         if (reason.empty())
             continue;

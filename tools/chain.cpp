@@ -1,8 +1,10 @@
-// The chain of tags.
+// What a check finds in a file.
 #include "tools/chain.h"
 
 #include <algorithm>
+#include <cmath>
 #include <cstdlib>
+#include <cstring>
 #include <utility>
 
 #include <fmt/core.h>
@@ -11,129 +13,180 @@
 
 namespace tool {
 
-Chain::Chain(const Input& input, TagReader& reader, Limits limits, Findings& findings, Progress progress)
-    : m_reader(reader), m_limits(limits), m_findings(findings), m_progress(std::move(progress)),
-      m_first(int64_t{input.Instance().data_offset} + BACK_POINTER_SIZE), m_times(limits.jumpMs)
+namespace {
+
+constexpr size_t MOST_LISTED = 1000;
+constexpr uint32_t COUNT_SIZE = 4; // AMF0 strict array: the count is before the elements
+constexpr uint32_t NUMBER_SIZE = 9;
+constexpr uint8_t NUMBER_MARKER = 0;
+constexpr double MOST_DIFFERENCE_MS = 1000;
+
+uint32_t CountAt(TagReader& reader, int64_t elements)
+{
+    const uint8_t* const bytes = reader.Bytes(elements - COUNT_SIZE, COUNT_SIZE);
+    return bytes == nullptr ? 0 : BigEndian(bytes, COUNT_SIZE);
+}
+
+std::optional<double> NumberAt(TagReader& reader, int64_t elements, uint32_t number)
+{
+    const uint8_t* const bytes = reader.Bytes(elements + int64_t{NUMBER_SIZE} * number, NUMBER_SIZE);
+    if (bytes == nullptr || bytes[0] != NUMBER_MARKER)
+        return std::nullopt;
+    const uint64_t bits = uint64_t{BigEndian(bytes + 1, 4)} << 32 | BigEndian(bytes + 5, 4);
+    double value = 0;
+    std::memcpy(&value, &bits, sizeof value);
+    return value;
+}
+
+std::string TimeText(double seconds)
+{
+    constexpr double MOST_SECONDS = 1e9;
+    return std::abs(seconds) < MOST_SECONDS ? FormatTime(std::llround(seconds * 1000)) : fmt::format("{} s", seconds);
+}
+
+// What is wrong with an entry: the cause, which is the same for all entries with that fault, and the text.
+struct Fault {
+    const char* cause;
+    std::string text;
+};
+
+std::optional<Fault> FaultOf(TagReader& reader, double seconds, double position)
+{
+    // Also true for NaN.
+    if (!(position >= 0 && position < static_cast<double>(reader.FileSize())))
+        return Fault{"outside", fmt::format("points to byte {:.15g}, which is not in the file", position)};
+    const std::optional<Tag> tag = reader.At(static_cast<int64_t>(position));
+    // The first entry may point to the configuration instead of the first keyframe.
+    if (!tag || !(IsVideoKeyframe(*tag) || (tag->is_avc() && tag->is_config())))
+        return Fault{"position", fmt::format("points to byte {:.15g}, where there is no keyframe", position)};
+    if (!(std::abs(seconds * 1000 - tag->timestamp()) <= MOST_DIFFERENCE_MS))
+        return Fault{"time", fmt::format("states {}, but the keyframe at byte {:.15g} has {}", TimeText(seconds),
+                                         position, FormatTime(tag->timestamp()))};
+    return std::nullopt;
+}
+
+} // namespace
+
+void Findings::Add(const char* kind, const std::string& cause, int64_t offset, const std::string& text,
+                   const Json& more)
+{
+    m_counts[kind] = m_counts.value(kind, uint64_t{0}) + 1;
+    const std::string key = std::string(kind) + ' ' + cause;
+    if (const auto known = m_causes.find(key); known != m_causes.end()) {
+        Json& finding = m_list[known->second];
+        finding["count"] = finding["count"].get<uint64_t>() + 1;
+        finding["last_offset"] = offset;
+        return;
+    }
+    ++m_total;
+    if (m_list.size() >= MOST_LISTED)
+        return;
+    if (!cause.empty())
+        m_causes[key] = m_list.size();
+    Json finding = {{"kind", kind}, {"offset", offset}, {"count", 1}};
+    finding.update(more);
+    finding["text"] = text;
+    m_list.push_back(finding);
+}
+
+void Findings::Note(const char* kind, int64_t offset, const std::string& text)
+{
+    if (m_notes.size() < MOST_LISTED)
+        m_notes.push_back({{"kind", kind}, {"offset", offset}, {"text", text}});
+}
+
+void Findings::WriteTo(Json& object, int64_t lost) const
+{
+    object["sound"] = m_total == 0;
+    object["lost_bytes"] = lost;
+    object["counts"] = m_counts;
+    object["findings"] = m_list;
+    object["unlisted"] = m_total - m_list.size();
+    object["notes"] = m_notes;
+}
+
+Chain::Chain(Played& played, Limits limits, Findings& findings)
+    : m_played(played), m_reader(played.Reader()), m_limits(limits), m_findings(findings), m_times(limits.jumpMs)
 {
 }
 
 void Chain::Walk()
 {
-    const int64_t begin = m_first - BACK_POINTER_SIZE;
-    const uint8_t* const zeroth = m_reader.Bytes(begin, BACK_POINTER_SIZE);
-    if (zeroth != nullptr && BigEndian(zeroth, BACK_POINTER_SIZE) != 0)
+    const int64_t begin = m_reader.FirstTag() - Tag::back_pointer_size;
+    const uint8_t* const zeroth = m_reader.Bytes(begin, Tag::back_pointer_size);
+    const uint32_t size = zeroth != nullptr ? BigEndian(zeroth, Tag::back_pointer_size) : 0;
+    if (size != 0)
         m_findings.Add("back_pointer", "", begin,
-                       fmt::format("the back-pointer before the first tag is {} instead of 0",
-                                   BigEndian(zeroth, BACK_POINTER_SIZE)));
-    for (int64_t position = m_first; position < m_reader.FileSize();) {
-        m_progress(position);
-        position = Step(position);
-    }
-    AddAlone(m_video);
-    AddAlone(m_audio);
-    if (m_limits.maxGapMs && m_video.time)
-        CheckKeyframes(m_reader.FileSize(), *m_video.time);
+                       fmt::format("the back-pointer before the first tag is {} instead of 0", size));
+    m_reader.Walk(m_reader.FirstTag(), m_reader.FileSize(), [this](const Part& part) {
+        See(part);
+        return true;
+    });
+    for (Lane& lane : m_lanes)
+        AddAlone(lane);
+    if (m_limits.maxGapMs && m_lanes[0].time)
+        CheckKeyframes(m_reader.FileSize(), *m_lanes[0].time);
 }
 
-// Most tags need a single read: the back-pointer and the next header are adjacent.
-int64_t Chain::Step(int64_t position)
+void Chain::See(const Part& part)
 {
-    const std::optional<Tag> tag = m_reader.At(position);
-    if (!tag)
-        return Resume(position, tag);
-    if (IsChained(*tag)) {
-        CheckPlayed(*tag);
-        Take(*tag);
-        return tag->End();
-    }
-    for (const int64_t next : {tag->End(), tag->DataEnd()}) {
-        if (CouldFollow(next) || (next == tag->End() && next == m_reader.FileSize())) {
-            TakeUnlinked(*tag, next);
-            return next;
-        }
-    }
-    return Resume(position, tag);
+    const bool skipped = m_played.IsSkipped(part);
+    if (part.kind == Part::Kind::damage)
+        return AddDamage(part);
+    if (part.kind == Part::Kind::unlinked)
+        AddUnlinked(part);
+    else if (skipped)
+        AddSkipped(part.tag);
+    Take(part.tag);
 }
 
-void Chain::CheckPlayed(const Tag& tag)
+void Chain::AddSkipped(const Tag& tag)
 {
-    const std::string why = m_reader.WhyNotPlayed(tag);
-    if (why.empty())
-        return;
-    m_findings.Lose(tag.End() - tag.position);
+    const std::string why = m_played.WhyNot(tag);
     m_findings.Add("passed_over", why, tag.position, fmt::format("players skip this tag: {}", why));
 }
 
-bool Chain::IsChained(const Tag& tag)
+// Consecutive tags without a valid back-pointer count as one cause.
+void Chain::AddUnlinked(const Part& part)
 {
-    const uint8_t* const bytes = m_reader.Bytes(tag.DataEnd(), BACK_POINTER_SIZE);
-    return bytes != nullptr && BigEndian(bytes, BACK_POINTER_SIZE) == TAG_HEADER_SIZE + tag.size;
-}
-
-// Without a back-pointer that confirms it, the next header must have a known type and StreamID 0, and its tag must be
-// complete.
-bool Chain::CouldFollow(int64_t position)
-{
-    const std::optional<Tag> next = m_reader.At(position);
-    return next && next->DataEnd() <= m_reader.FileSize() && next->streamId == 0;
-}
-
-// Players skip such a tag, unless it is the first tag and has script data. Consecutive ones count as one cause.
-void Chain::TakeUnlinked(const Tag& tag, int64_t next)
-{
-    const int64_t offset = tag.DataEnd();
-    const uint8_t* const bytes = m_reader.Bytes(offset, BACK_POINTER_SIZE);
+    const Tag& tag = part.tag;
     if (tag.position != m_unlinkedEnd)
         m_unlinkedCause = std::to_string(tag.position);
-    m_unlinkedEnd = next;
-    if (next == offset)
-        m_findings.Add("no_back_pointer", m_unlinkedCause, offset,
+    m_unlinkedEnd = part.end;
+    if (part.end == tag.data_end())
+        m_findings.Add("no_back_pointer", m_unlinkedCause, tag.data_end(),
                        fmt::format("the tag at byte {} has no back-pointer", tag.position));
-    else if (bytes != nullptr)
-        m_findings.Add("back_pointer", m_unlinkedCause, offset,
+    else if (const uint8_t* const bytes = m_reader.Bytes(tag.data_end(), Tag::back_pointer_size); bytes != nullptr)
+        m_findings.Add("back_pointer", m_unlinkedCause, tag.data_end(),
                        fmt::format("the back-pointer of the tag at byte {} is {} instead of {}", tag.position,
-                                   BigEndian(bytes, BACK_POINTER_SIZE), TAG_HEADER_SIZE + tag.size));
-    if (tag.position != m_first || !tag.IsScript())
-        m_findings.Lose(next - tag.position);
-    Take(tag);
+                                   BigEndian(bytes, Tag::back_pointer_size), Tag::header_size + tag.data_size()));
 }
 
-int64_t Chain::Resume(int64_t position, const std::optional<Tag>& tag)
+// At the end of the file, the last tag is cut short, or there are other bytes.
+void Chain::AddDamage(const Part& part)
 {
-    const std::optional<Tag> found = m_reader.Find(position + 1, m_reader.FileSize(), m_progress);
-    if (!found) {
-        AddRest(position, tag);
-        return m_reader.FileSize();
-    }
-    const int64_t bytes = found->position - position;
-    m_findings.Add("gap", "", position, fmt::format("{} bytes belong to no tag", bytes), {{"bytes", bytes}});
-    m_findings.Lose(bytes);
-    return found->position;
-}
-
-// No valid tag follows: the last one is cut short, or there are other bytes at the end.
-void Chain::AddRest(int64_t position, const std::optional<Tag>& tag)
-{
-    const int64_t rest = m_reader.FileSize() - position;
-    const uint8_t* const type = m_reader.Bytes(position, 1);
+    const int64_t bytes = part.Size();
+    const bool last = part.end == m_reader.FileSize();
+    const uint8_t* const type = m_reader.Bytes(part.begin, 1);
     const bool cutHeader =
-        rest < TAG_HEADER_SIZE && type != nullptr &&
+        last && bytes < Tag::header_size && type != nullptr &&
         (*type == FLVD_TAG_TYPE_AUDIO || *type == FLVD_TAG_TYPE_VIDEO || *type == FLVD_TAG_TYPE_SCRIPT);
-    const bool cutTag = tag && tag->End() > m_reader.FileSize();
-    m_findings.Lose(rest);
-    m_findings.Add(cutHeader || cutTag ? "cut_short" : "gap", "", position,
-                   cutHeader ? fmt::format("the last tag is cut short: {} bytes of its header", rest)
-                   : cutTag  ? fmt::format("the last tag is cut short: {} of its {} bytes", rest, tag->End() - position)
-                             : fmt::format("{} bytes after the last tag belong to no tag", rest),
-                   {{"bytes", rest}});
+    const bool cutTag = last && part.tag.position >= 0 && part.tag.end() > part.end;
+    m_findings.Add(
+        cutHeader || cutTag ? "cut_short" : "gap", "", part.begin,
+        cutHeader ? fmt::format("the last tag is cut short: {} bytes of its header", bytes)
+        : cutTag  ? fmt::format("the last tag is cut short: {} of its {} bytes", bytes, part.tag.end() - part.begin)
+        : last    ? fmt::format("{} bytes after the last tag belong to no tag", bytes)
+                  : fmt::format("{} bytes belong to no tag", bytes),
+        {{"bytes", bytes}});
 }
 
 void Chain::Take(const Tag& tag)
 {
     ++m_tags;
-    if (tag.IsConfig())
+    if (tag.is_config())
         CheckConfig(tag);
-    if (!tag.IsFrame())
+    if (!tag.has_frame())
         return;
     CheckTime(tag);
     if (m_limits.maxGapMs)
@@ -142,24 +195,24 @@ void Chain::Take(const Tag& tag)
 
 void Chain::CheckConfig(const Tag& tag)
 {
-    const flvdmx::Bytes bytes = m_reader.ConfigBytes(tag);
+    std::vector<uint8_t> bytes = m_reader.Config(tag);
     if (bytes.empty())
         return;
     std::vector<uint8_t>& config = LaneOf(tag).config;
-    if (!config.empty() && !std::equal(config.begin(), config.end(), bytes.begin(), bytes.end()))
+    if (!config.empty() && config != bytes)
         m_findings.Note("configuration", tag.position,
-                        fmt::format("the {} configuration changes", StreamName(tag.Stream())));
-    config.assign(bytes.begin(), bytes.end());
+                        fmt::format("the {} configuration changes", StreamName(tag.stream())));
+    config = std::move(bytes);
 }
 
 void Chain::CheckTime(const Tag& tag)
 {
     Lane& lane = LaneOf(tag);
-    const Times::Step step = m_times.Take(tag.Stream(), tag.timestamp);
-    const Jump here = {tag, std::exchange(lane.last, tag.timestamp)};
+    const Times::Step step = m_times.Take(tag.stream(), tag.timestamp());
+    const Jump here = {tag, std::exchange(lane.last, tag.timestamp())};
     const bool known = lane.odd.has_value();
     if (step == Times::Step::jump) {
-        for (Lane* const each : {&m_video, &m_audio})
+        for (Lane* const each : {&m_lanes[0], &m_lanes[1]})
             if (const auto odd = std::exchange(each->odd, std::nullopt))
                 AddJump(*odd);
         if (!known)
@@ -175,20 +228,20 @@ void Chain::CheckTime(const Tag& tag)
         AddJump(here);
     else if (step == Times::Step::pause)
         m_findings.Note("pause", tag.position,
-                        fmt::format("no {} frames from {} to {}", StreamName(tag.Stream()), FormatTime(here.from),
-                                    FormatTime(tag.timestamp)));
+                        fmt::format("no {} frames from {} to {}", StreamName(tag.stream()), FormatTime(here.from),
+                                    FormatTime(tag.timestamp())));
 }
 
 // Where a recording was cut or restarted, both streams jump: that is one finding.
 void Chain::AddJump(const Jump& jump)
 {
     constexpr int64_t TOGETHER_MS = 1000;
-    const int64_t to = jump.tag.timestamp;
+    const int64_t to = jump.tag.timestamp();
     const bool same = m_jump && std::abs(m_jump->from - jump.from) < TOGETHER_MS &&
-                      std::abs(int64_t{m_jump->tag.timestamp} - to) < TOGETHER_MS;
+                      std::abs(int64_t{m_jump->tag.timestamp()} - to) < TOGETHER_MS;
     m_jumpCause = same ? m_jumpCause : std::to_string(jump.tag.position);
     m_jump = jump;
-    const char* const stream = StreamName(jump.tag.Stream());
+    const char* const stream = StreamName(jump.tag.stream());
     m_findings.Add("jump", m_jumpCause, jump.tag.position,
                    fmt::format("{} time jumps {} from {} to {}", stream, to < jump.from ? "back" : "forward",
                                FormatTime(jump.from), FormatTime(to)),
@@ -200,11 +253,11 @@ void Chain::AddAlone(Lane& lane)
     const std::optional<Jump> odd = std::exchange(lane.odd, std::nullopt);
     if (!odd)
         return;
-    const char* const stream = StreamName(odd->tag.Stream());
+    const char* const stream = StreamName(odd->tag.stream());
     m_findings.Add("jump", "alone", odd->tag.position,
                    fmt::format("a single {} tag has the time {}, after one at {}", stream,
-                               FormatTime(odd->tag.timestamp), FormatTime(odd->from)),
-                   {{"stream", stream}, {"from_ms", odd->from}, {"to_ms", odd->tag.timestamp}});
+                               FormatTime(odd->tag.timestamp()), FormatTime(odd->from)),
+                   {{"stream", stream}, {"from_ms", odd->from}, {"to_ms", odd->tag.timestamp()}});
 }
 
 void Chain::CheckKeyframes(int64_t position, int64_t time)
@@ -220,15 +273,44 @@ void Chain::CheckGaps(const Tag& tag)
 {
     const int64_t time = m_times.Time();
     LaneOf(tag).time = time;
-    if (tag.IsVideo() && !tag.IsExtended() && (tag.IsKeyframe() || !m_keyframe))
+    if (tag.is_video() && !tag.is_enhanced() && (tag.is_keyframe() || !m_keyframe))
         CheckKeyframes(tag.position, time);
-    if (!m_video.time || !m_audio.time)
+    if (!m_lanes[0].time || !m_lanes[1].time)
         return;
-    const int64_t lead = *m_audio.time - *m_video.time;
+    const int64_t lead = *m_lanes[1].time - *m_lanes[0].time;
     if (std::abs(lead) > *m_limits.maxGapMs)
         m_findings.Add("interleaving", "all", tag.position,
                        fmt::format("audio is {} s {} video in the file", static_cast<double>(std::abs(lead)) / 1000,
                                    lead > 0 ? "ahead of" : "behind"));
+}
+
+void CheckIndex(const Input& input, TagReader& reader, Findings& findings)
+{
+    const flvd_keyframe_index_t& index = input.Instance().keyframe_index;
+    if (index.times_offset == 0 && index.positions_offset == 0)
+        return;
+    if (index.times_offset == 0 || index.positions_offset == 0) {
+        findings.Add("index", "", std::max(index.times_offset, index.positions_offset),
+                     fmt::format("the keyframe index has no {}", index.times_offset == 0 ? "times" : "positions"));
+        return;
+    }
+    const uint32_t times = CountAt(reader, index.times_offset);
+    const uint32_t positions = CountAt(reader, index.positions_offset);
+    if (times != positions)
+        findings.Add("index", "", index.positions_offset,
+                     fmt::format("the keyframe index has {} times and {} positions", times, positions));
+    for (uint32_t i = 0; i < std::min(times, positions); ++i) {
+        const int64_t offset = index.positions_offset + int64_t{NUMBER_SIZE} * i;
+        const std::optional<double> time = NumberAt(reader, index.times_offset, i);
+        const std::optional<double> position = NumberAt(reader, index.positions_offset, i);
+        if (!time || !position) { // the array ends before its stated length
+            findings.Add("index", "", offset, fmt::format("index entry {} is not a number", i + 1), {{"entry", i + 1}});
+            return;
+        }
+        if (const std::optional<Fault> fault = FaultOf(reader, *time, *position))
+            findings.Add("index", fault->cause, offset, fmt::format("index entry {} {}", i + 1, fault->text),
+                         {{"entry", i + 1}});
+    }
 }
 
 } // namespace tool

@@ -4,21 +4,20 @@
 #include <filesystem>
 #include <functional>
 #include <future>
-#include <iterator>
 #include <memory>
 #include <optional>
 #include <stdexcept>
 #include <string>
 #include <system_error>
-#include <thread>
 #include <utility>
 #include <vector>
 
+#include <boost/asio/post.hpp>
+#include <boost/asio/thread_pool.hpp>
 #include <fmt/core.h>
 
 #include "tools/chain.h"
 #include "tools/commands.h"
-#include "tools/findings.h"
 #include "tools/input.h"
 #include "tools/progress.h"
 #include "tools/report.h"
@@ -60,32 +59,32 @@ Subject Open(const std::string& name)
     return subject;
 }
 
-Json CheckTags(Subject& subject, const CheckOptions& options, const Chain::Progress& progress)
+Json CheckTags(Subject& subject, const CheckOptions& options, const TagReader::Progress& progress)
 {
     const Input input = std::move(*std::exchange(subject.input, std::nullopt)); // closed on return
     Findings& findings = subject.findings;
-    TagReader reader(input);
+    Played played(input, progress);
     Limits limits{static_cast<int64_t>(options.jumpSeconds * MS_PER_SECOND)};
     if (options.maxGapSeconds)
         limits.maxGapMs = static_cast<int64_t>(*options.maxGapSeconds * MS_PER_SECOND);
-    Chain chain(input, reader, limits, findings, progress);
+    Chain chain(played, limits, findings);
     chain.Walk();
-    CheckIndex(input, reader, findings);
+    CheckIndex(input, played.Reader(), findings);
     if (const std::string fault = ConfigFault(input); !fault.empty())
         findings.Add("no_configuration", "", input.Instance().data_offset, fault);
     if (const std::string note = UndefinedCodec(input); !note.empty())
         findings.Note("codec", input.Instance().data_offset, note);
     if (input.Instance().file_shorter_than_meta != 0)
-        findings.Add("cut_short", "", reader.FileSize(), "the metadata announces a larger file");
+        findings.Add("cut_short", "", played.Reader().FileSize(), "the metadata announces a larger file");
     Json object = {{"file", input.name},
-                   {"size", reader.FileSize()},
+                   {"size", played.Reader().FileSize()},
                    {"tags", chain.Tags()},
                    {"duration_ms", input.info.duration.count()}};
-    findings.WriteTo(object);
+    findings.WriteTo(object, played.BytesSkipped());
     return object;
 }
 
-Json Check(Subject& subject, const CheckOptions& options, const Chain::Progress& progress)
+Json Check(Subject& subject, const CheckOptions& options, const TagReader::Progress& progress)
 {
     try {
         if (!subject.error)
@@ -130,47 +129,6 @@ std::string Text(const std::string& file, const Json& result)
     return text;
 }
 
-// Checks files on several threads and returns the results in order. All files are opened first, since no open may run
-// at the same time as other calls. An exception, for instance because the output pipe was closed, soon stops the
-// threads.
-class Crew {
-public:
-    Crew(std::vector<Subject> subjects, const CheckOptions& options) : m_subjects(std::move(subjects))
-    {
-        const auto progress = [this](int64_t) {
-            if (m_stopped)
-                throw std::runtime_error("stopped");
-        };
-        for (Subject& subject : m_subjects)
-            m_tasks.emplace_back([&subject, &options, progress] { return Check(subject, options, progress); });
-        for (size_t i = 0; i < std::min<size_t>(options.jobs, m_tasks.size()); ++i)
-            m_threads.emplace_back([this] {
-                for (size_t task = 0; (task = m_next++) < m_tasks.size();)
-                    m_tasks[task]();
-            });
-    }
-    ~Crew()
-    {
-        m_stopped = true;
-        m_next = m_tasks.size();
-        for (std::thread& thread : m_threads)
-            thread.join();
-    }
-    Crew(const Crew&) = delete;
-    Crew& operator=(const Crew&) = delete;
-
-    size_t Size() const { return m_subjects.size(); }
-    const Subject& SubjectAt(size_t i) const { return m_subjects[i]; }
-    Json Result(size_t i) { return m_tasks[i].get_future().get(); }
-
-private:
-    std::vector<Subject> m_subjects;
-    std::vector<std::packaged_task<Json()>> m_tasks;
-    std::vector<std::thread> m_threads;
-    std::atomic<size_t> m_next{0};
-    std::atomic<bool> m_stopped{false};
-};
-
 // Prints each result as soon as it is available, or collects them for the JSON document.
 class Results {
 public:
@@ -202,36 +160,57 @@ private:
     bool m_allOk = true;
 };
 
-void CheckOneByOne(const std::vector<std::string>& files, const CheckOptions& options, Results& results)
+using TakeResult = std::function<void(const Subject& subject, Json result)>;
+
+// Checks open files on several threads and passes on the results in order. An exception, for instance because the
+// output pipe was closed, soon stops the threads.
+void CheckOpened(std::vector<Subject> subjects, const CheckOptions& options, const TagReader::Progress& progress,
+                 const TakeResult& take)
 {
-    for (const std::string& file : files) {
-        Subject subject = Open(file);
-        Json result;
-        {
-            ProgressBar bar(file, subject.input ? subject.input->info.size : 0);
-            result = Check(subject, options, [&bar](int64_t position) { bar.ShowDone(position); });
-        }
-        results.Take(subject, std::move(result));
-    }
+    std::atomic<bool> stopped = false;
+    const auto show = [&](int64_t position) {
+        if (stopped)
+            throw std::runtime_error("stopped");
+        if (progress)
+            progress(position);
+    };
+    std::vector<std::packaged_task<Json()>> tasks;
+    for (Subject& subject : subjects)
+        tasks.emplace_back([&] { return Check(subject, options, show); });
+    boost::asio::thread_pool pool(
+        options.jobs); // when destroyed, drops tasks that have not begun and awaits the others
+    const auto stop = [](std::atomic<bool>* flag) { *flag = true; };
+    const std::unique_ptr<std::atomic<bool>, decltype(stop)> stopper(&stopped, stop);
+    for (std::packaged_task<Json()>& task : tasks)
+        boost::asio::post(pool, [&task] { task(); });
+    for (size_t i = 0; i < tasks.size(); ++i)
+        take(subjects[i], tasks[i].get_future().get());
 }
 
-void CheckInParallel(const std::vector<std::string>& files, const CheckOptions& options, Results& results)
+// Opens a few files at a time, since no open may run at the same time as other calls.
+void CheckAll(const std::vector<std::string>& files, const CheckOptions& options, Results& results)
 {
     constexpr size_t OPEN_FILES = 64;
-    ProgressBar progress("files", static_cast<int64_t>(files.size()));
+    const bool single = files.size() == 1;
+    std::error_code unknown;
+    const uint64_t total = single ? fs::file_size(files[0], unknown) : files.size();
+    ProgressBar bar(single ? files[0] : "files", static_cast<int64_t>(total));
+    TagReader::Progress progress;
+    if (single)
+        progress = [&bar](int64_t position) { bar.ShowDone(position); };
+    int64_t done = 0;
+    const auto take = [&](const Subject& subject, Json result) {
+        bar.Wipe();
+        results.Take(subject, std::move(result));
+        if (!single)
+            bar.ShowDone(++done);
+    };
     const size_t most = std::max<size_t>(options.jobs, OPEN_FILES);
     for (size_t begin = 0; begin < files.size(); begin += most) {
-        const size_t end = std::min(begin + most, files.size());
         std::vector<Subject> subjects;
-        for (size_t i = begin; i < end; ++i)
+        for (size_t i = begin; i < std::min(begin + most, files.size()); ++i)
             subjects.push_back(Open(files[i]));
-        Crew crew(std::move(subjects), options);
-        for (size_t i = 0; i < crew.Size(); ++i) {
-            Json result = crew.Result(i);
-            progress.Wipe();
-            results.Take(crew.SubjectAt(i), std::move(result));
-            progress.ShowDone(static_cast<int64_t>(begin + i) + 1);
-        }
+        CheckOpened(std::move(subjects), options, progress, take);
     }
 }
 
@@ -282,10 +261,7 @@ int RunCheck(const CheckOptions& options)
             results.Fail();
         }
     }
-    if (options.jobs == 1)
-        CheckOneByOne(files, options, results);
-    else
-        CheckInParallel(files, options, results);
+    CheckAll(files, options, results);
     return results.Finish();
 }
 

@@ -15,9 +15,9 @@
 #include "tools/frame_source.h"
 #include "tools/input.h"
 #include "tools/output_file.h"
+#include "tools/played.h"
 #include "tools/progress.h"
 #include "tools/report.h"
-#include "tools/tags.h"
 #include "tools/text.h"
 
 namespace tool {
@@ -112,12 +112,12 @@ std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input
 {
     std::vector<StreamWriter> writers;
     std::string missing;
-    for (const flvdmx::Stream stream : {flvdmx::Stream::video, flvdmx::Stream::audio}) {
+    for (const flvdmx::Stream stream : STREAMS) {
         if ((options.streams & static_cast<uint32_t>(stream)) == 0)
             continue;
         if (input.Has(stream))
             writers.emplace_back(input, stream);
-        else if (const std::string why = TagReader(input).WhyNoStream(stream); !why.empty())
+        else if (const std::string why = Played(input).WhyNoStream(stream); !why.empty())
             missing = " that is played: " + why;
     }
     if (writers.empty())
@@ -140,20 +140,20 @@ int RunExtract(const ExtractOptions& options)
     for (StreamWriter& writer : writers)
         writer.Open(options, writers.size() > 1);
     input.file.accept_all_times();
-    Losses losses(input);
-    while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
+    Played played(input);
+    while (const std::optional<flvdmx::Frame> frame = NextFrame(input)) {
         progress.ShowDone(frame->position);
-        losses.Take(*frame);
+        played.Take(*frame);
         for (StreamWriter& writer : writers)
             if (writer.Stream() == frame->stream)
                 writer.Take(*frame);
     }
     progress.Wipe();
-    losses.Finish();
+    played.Finish();
     bool written = false;
     for (StreamWriter& writer : writers)
         written = writer.Finish() || written;
-    losses.Warn();
+    played.Warn();
     return written ? DONE : FAILED;
 }
 

@@ -9,35 +9,22 @@
 #include <string_view>
 #include <vector>
 
-#include "flvdmx/result.hpp"
+#include "flvdmx/metadata.hpp"
 #include "tools/output_file.h"
 
 namespace tool {
 
-/** A tag to write. Bytes are borrowed. */
+/** A tag to write. */
 struct NewTag {
-    uint8_t type = 0;       /**< FLVD_TAG_TYPE_* */
-    uint32_t timestamp = 0; /**< ms */
-    flvdmx::Bytes header;   /**< codec header, or empty if `payload` includes it */
-    flvdmx::Bytes payload;
+    uint8_t type;       /**< FLVD_TAG_TYPE_* */
+    uint32_t timestamp; /**< ms */
+    std::vector<uint8_t> payload;
     bool frame = false;    /**< its time contributes to the duration */
     bool keyframe = false; /**< listed in the index */
 };
 
-/** A property of onMetaData, with its value as AMF0 bytes. */
-struct ScriptProperty {
-    std::string name;
-    std::vector<uint8_t> value;
-};
-
-/** @return the properties in the payload of an onMetaData tag, up to the first damaged one; none of other payloads */
-std::vector<ScriptProperty> ReadScriptProperties(flvdmx::Bytes payload);
-
-/** @return true for the payload of an onMetaData tag */
-bool IsMetadata(flvdmx::Bytes payload);
-
 /** @return a property with this number */
-ScriptProperty NumberProperty(std::string_view name, double value);
+flvdmx::RawProperty NumberProperty(std::string_view name, double value);
 
 /** Measures the tags of a file, and builds the header and metadata that come before them. */
 class FlvLayout {
@@ -56,7 +43,7 @@ public:
      * @return the file header and the onMetaData tag with `properties`. Those that depend on the tags are replaced:
      * duration, filesize, lasttimestamp, lastkeyframetimestamp, and keyframes, an index of at most 65,536 entries.
      */
-    std::vector<uint8_t> Beginning(const std::vector<ScriptProperty>& properties) const;
+    std::vector<uint8_t> Beginning(const std::vector<flvdmx::RawProperty>& properties) const;
 
 private:
     struct Keyframe {
@@ -64,8 +51,8 @@ private:
         uint64_t offset; // from the first tag after onMetaData
     };
 
-    std::vector<uint8_t> ScriptPayload(const std::vector<ScriptProperty>& properties, uint64_t firstTag) const;
-    ScriptProperty Index(uint64_t firstTag) const;
+    std::vector<uint8_t> ScriptPayload(const std::vector<flvdmx::RawProperty>& properties, uint64_t firstTag) const;
+    flvdmx::RawProperty Index(uint64_t firstTag) const;
 
     bool m_hasVideo = false;
     bool m_hasAudio = false;

@@ -9,7 +9,7 @@
 #include <fmt/core.h>
 
 #include "flvdmx/layers.h"
-#include "tools/codec_config.h"
+#include "tools/codecs.h"
 #include "tools/report.h"
 #include "tools/tags.h"
 
@@ -220,12 +220,6 @@ const char* StreamFormat::Convert(const flvdmx::Frame& frame, Buffer& out)
     return nullptr;
 }
 
-uint32_t PcmSampleSize(const Input& input)
-{
-    constexpr uint32_t SIXTEEN_BITS = 0x02; // SoundSize in the codec byte of audio tags
-    return (input.Instance().audio_format_filter & SIXTEEN_BITS) != 0 ? 16 : 8;
-}
-
 std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream)
 {
     if (stream == flvdmx::Stream::video)
@@ -240,7 +234,7 @@ std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream
         return std::make_unique<StreamFormat>("mp3");
     case flvdmx::AudioCodec::pcm:
     case flvdmx::AudioCodec::pcm_little_endian:
-        return std::make_unique<Wav>(*input.info.audio, PcmSampleSize(input));
+        return std::make_unique<Wav>(*input.info.audio, input.PcmSampleSize());
     default:
         return std::make_unique<Raw>("audio");
     }

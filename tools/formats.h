@@ -38,15 +38,6 @@ private:
     std::string m_extension;
 };
 
-/** @return true for a codec whose samples are not compressed */
-constexpr bool IsPcm(flvdmx::AudioCodec codec)
-{
-    return codec == flvdmx::AudioCodec::pcm || codec == flvdmx::AudioCodec::pcm_little_endian;
-}
-
-/** @return bits per sample of an input with PCM audio */
-uint32_t PcmSampleSize(const Input& input);
-
 /** @return the format for a stream of the input: AVC as Annex B, AAC as ADTS, PCM as WAV, MP3 unchanged, others raw */
 std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream);
 

@@ -60,7 +60,8 @@ Json FrameRecord::Object(uint64_t number) const
             {"position", position}, {"crc32", fmt::format("{:08x}", crc)}};
 }
 
-std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream, LateStreams late)
+// The library also delivers frames of a stream that starts too late for the open to find it, without a configuration.
+std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream)
 {
     for (;;) {
         const flvdmx::result<flvdmx::Frame> frame = input.file.next_frame(stream);
@@ -68,14 +69,14 @@ std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream, Late
             throw FileError(input.name, frame.error());
         if (!frame)
             return std::nullopt;
-        if (input.Has(frame->stream) || late == LateStreams::delivered)
+        if (input.Has(frame->stream))
             return *frame;
     }
 }
 
-FrameSource::FrameSource(Input& input, uint32_t streams, Losses* losses)
+FrameSource::FrameSource(Input& input, uint32_t streams, Played* played)
     : m_input(input), m_streams(streams),
-      m_losses(losses), m_video{flvdmx::Stream::video,
+      m_played(played), m_video{flvdmx::Stream::video,
                                 (streams & FLVD_STREAM_VIDEO) != 0 && input.Has(flvdmx::Stream::video)},
       m_audio{flvdmx::Stream::audio, (streams & FLVD_STREAM_AUDIO) != 0 && input.Has(flvdmx::Stream::audio)}
 {
@@ -99,9 +100,9 @@ void FrameSource::Fill(Lane& lane)
 
 FrameSource::Frame FrameSource::NextOfOne()
 {
-    while (const std::optional<flvdmx::Frame> frame = NextFrame(m_input, flvdmx::Stream::any)) {
-        if (m_losses != nullptr)
-            m_losses->Take(*frame);
+    while (const std::optional<flvdmx::Frame> frame = NextFrame(m_input)) {
+        if (m_played != nullptr)
+            m_played->Take(*frame);
         if ((static_cast<uint32_t>(frame->stream) & m_streams) != 0)
             return FrameRecord(*frame);
     }

@@ -7,8 +7,8 @@
 #include <string>
 
 #include "tools/input.h"
+#include "tools/played.h"
 #include "tools/report.h"
-#include "tools/tags.h"
 
 namespace tool {
 
@@ -40,8 +40,8 @@ public:
 
     /** @param input borrowed
      *  @param streams FLVD_STREAM_* bits of the frames wanted
-     *  @param losses borrowed, receives the frames of a single reader; may be null */
-    FrameSource(Input& input, uint32_t streams, Losses* losses = nullptr);
+     *  @param played borrowed, receives the frames of a single reader; may be null */
+    FrameSource(Input& input, uint32_t streams, Played* played = nullptr);
 
     /** @return the next frame; nothing at the end of the data, which a growing file may extend later. Throws
      *          FileError */
@@ -65,16 +65,13 @@ private:
 
     Input& m_input;
     const uint32_t m_streams;
-    Losses* const m_losses;
+    Played* const m_played;
     Lane m_video;
     Lane m_audio;
 };
 
-/** What happens to the frames of a stream that starts too late for the open to find it. */
-enum class LateStreams { skipped, delivered };
-
 /** @return the next frame in the file, valid until the next call; nothing at the end. Throws FileError */
-std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream, LateStreams late = LateStreams::skipped);
+std::optional<flvdmx::Frame> NextFrame(Input& input, flvdmx::Stream stream = flvdmx::Stream::any);
 
 } // namespace tool
 

@@ -14,10 +14,9 @@
 #include "tools/commands.h"
 #include "tools/frame_source.h"
 #include "tools/input.h"
+#include "tools/played.h"
 #include "tools/progress.h"
 #include "tools/report.h"
-#include "tools/scan.h"
-#include "tools/tags.h"
 #include "tools/text.h"
 #include "tools/times.h"
 
@@ -174,19 +173,6 @@ void SeekToStart(Input& input, int32_t ms)
                         error);
 }
 
-// Two readers deliver frames by time. What was skipped between them is found in another pass, in file order.
-void WarnOfLossApart(const std::string& file)
-{
-    flvdmx::Options options;
-    options.restarting_timestamps = true;
-    Input input(file, options);
-    Losses losses(input);
-    while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any))
-        losses.Take(*frame);
-    losses.Finish();
-    losses.Warn();
-}
-
 void PrintComplete(const FramesOptions& options)
 {
     Input input(options.file, OpenOptions(options));
@@ -194,7 +180,7 @@ void PrintComplete(const FramesOptions& options)
     const uint32_t streams = WantedStreams(options) & input.Streams();
     if (streams == 0) {
         const auto wanted = static_cast<flvdmx::Stream>(WantedStreams(options));
-        const std::string why = TagReader(input).WhyNoStream(wanted);
+        const std::string why = Played(input).WhyNoStream(wanted);
         throw FileError(options.file, fmt::format("the file has no {} stream{}", StreamName(wanted),
                                                   why.empty() ? "" : " that is played: " + why));
     }
@@ -204,13 +190,11 @@ void PrintComplete(const FramesOptions& options)
     if (options.fromMs)
         SeekToStart(input, *options.fromMs);
     input.file.accept_all_times();
-    Losses losses(input);
-    FrameSource source(input, streams, &losses);
+    Played played(input);
+    FrameSource source(input, streams, &played);
     FramePrinter printer(options, streams);
-    ReadProgress progress(input.name, input.info.size);
     while (!printer.Done()) {
         const std::optional<FrameRecord> frame = source.Next();
-        progress.Hide(); // it is shown only while nothing is printed
         if (!frame)
             break;
         printer.Take(*frame);
@@ -219,9 +203,16 @@ void PrintComplete(const FramesOptions& options)
     if (printer.Done() || options.fromMs)
         return;
     if (options.separateAudio)
-        return WarnOfLossApart(options.file);
-    losses.Finish();
-    losses.Warn();
+        played.Walk([](const Tag&) { return true; }); // two readers do not deliver frames in file order
+    else
+        played.Finish();
+    played.Warn();
+}
+
+uint32_t Announced(const Input& input)
+{
+    TagReader reader(input.name);
+    return AnnouncedStreams(reader);
 }
 
 // Opens the file as soon as it exists and contains enough. With two readers, a stream that the open did not find is
@@ -229,18 +220,17 @@ void PrintComplete(const FramesOptions& options)
 Input OpenGrowing(const FramesOptions& options, Growth& growth)
 {
     for (;;) {
-        const std::string path = PathOf(options.file);
-        flvdmx::result<flvdmx::File> file = flvdmx::File::open(path, Host(), OpenOptions(options));
+        flvdmx::result<flvdmx::File> file = flvdmx::File::open(PathOf(options.file), Host(), OpenOptions(options));
         const flvdmx::error error = file.error();
         if (file) {
             Input input(options.file, std::move(*file));
-            const bool complete = (TagReader(input).AnnouncedStreams() & ~input.Streams()) == 0;
+            const bool complete = (Announced(input) & ~input.Streams()) == 0;
             if (complete || !options.separateAudio || !growth.Wait())
                 return input;
             continue;
         }
         if ((error.kind() != flvdmx::Kind::not_yet && error.system_error() != ENOENT) || !growth.Wait())
-            throw FileError(options.file, OpenFailureText(path, error), error);
+            throw FileError(options.file, OpenFailureText(options.file, error), error);
     }
 }
 
@@ -260,7 +250,7 @@ void PrintGrowing(const FramesOptions& options)
     Growth growth(options.file, options.timeoutSeconds);
     Input input = OpenGrowing(options, growth);
     const uint32_t wanted = WantedStreams(options);
-    FramePrinter printer(options, wanted & (TagReader(input).AnnouncedStreams() | input.Streams()));
+    FramePrinter printer(options, wanted & (Announced(input) | input.Streams()));
     FrameSource source(input, wanted);
     bool told = false;
     while (!printer.Done()) {

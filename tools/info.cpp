@@ -11,18 +11,64 @@
 #include <fmt/chrono.h>
 #include <fmt/core.h>
 
-#include "tools/codec_config.h"
+#include "tools/codecs.h"
 #include "tools/commands.h"
-#include "tools/formats.h"
 #include "tools/input.h"
+#include "tools/played.h"
+#include "tools/progress.h"
 #include "tools/report.h"
-#include "tools/scan.h"
 #include "tools/tags.h"
 #include "tools/text.h"
+#include "tools/times.h"
 
 namespace tool {
 
 namespace {
+
+// What is known only after a walk over all tags.
+struct FileScan {
+    uint64_t videoFrames = 0;
+    uint64_t audioFrames = 0;
+    uint64_t keyframes = 0;                             // of video
+    std::optional<flvdmx::Milliseconds> lastKeyframe{}; // from the first timestamp
+    int64_t longestDistanceMs = 0;                      // from one keyframe to the next
+    double averageDistanceMs = 0;                       // both are 0 for fewer than two keyframes
+    flvdmx::Milliseconds played{};                      // duration in times made continuous across jumps
+    uint64_t jumps = 0;                                 // of the timestamps
+    int64_t bytesSkipped = 0;
+};
+
+FileScan ScanFile(Input& input)
+{
+    FileScan scan;
+    Times times;
+    ProgressBar bar(input.name, input.info.size);
+    Played played(input, [&bar](int64_t position) { bar.ShowDone(position); });
+    input.file.accept_all_times();
+    int64_t first = 0; // keyframes
+    int64_t last = 0;
+    played.Walk([&](const Tag& tag) {
+        if (!tag.has_frame())
+            return true;
+        const int64_t time = input.TimeOf(tag);
+        times.Take(tag.stream(), time);
+        ++(tag.is_video() ? scan.videoFrames : scan.audioFrames);
+        if (!IsVideoKeyframe(tag))
+            return true;
+        if (scan.keyframes++ == 0)
+            first = last = times.Time();
+        scan.longestDistanceMs = std::max(scan.longestDistanceMs, times.Time() - last);
+        scan.lastKeyframe = flvdmx::Milliseconds(time);
+        last = times.Time();
+        return true;
+    });
+    if (scan.keyframes > 1)
+        scan.averageDistanceMs = static_cast<double>(last - first) / static_cast<double>(scan.keyframes - 1);
+    scan.bytesSkipped = played.BytesSkipped();
+    scan.played = flvdmx::Milliseconds(times.Latest());
+    scan.jumps = times.Jumps();
+    return scan;
+}
 
 // A file and its description.
 struct Subject {
@@ -70,7 +116,7 @@ const char* SeekMethodText(flvdmx::SeekMethod method)
 uint32_t HeaderSampleRate(const Input& input)
 {
     constexpr std::array<uint32_t, 4> RATES = {5500, 11025, 22050, 44100};
-    return RATES[input.Instance().audio_format_filter >> 2 & 3];
+    return RATES[input.audioFormat >> 2 & 3];
 }
 
 // The codec byte cannot express the rate of codecs that have only one.
@@ -165,7 +211,7 @@ void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo
     listing.Line("  sample rate", header == rate ? fmt::format("{} Hz", rate)
                                                  : fmt::format("{} Hz (the tag headers state {} Hz)", rate, header));
     if (IsPcm(audio.codec))
-        listing.Line("  sample size", fmt::format("{} bits", PcmSampleSize(subject.input)));
+        listing.Line("  sample size", fmt::format("{} bits", subject.input.PcmSampleSize()));
     listing.Line("  channels", std::to_string(audio.channels));
     listing.Quantity("  data rate", audio.data_rate, "kbit/s");
     if (subject.scan)
@@ -264,7 +310,7 @@ Json AudioObject(const Subject& subject, const flvdmx::AudioInfo& audio)
                    {"format_tag", audio.format_tag},
                    {"sample_rate", SampleRate(audio)},
                    {"header_sample_rate", HeaderSampleRate(subject.input)},
-                   {"sample_size", IsPcm(audio.codec) ? PcmSampleSize(subject.input) : audio.sample_size},
+                   {"sample_size", IsPcm(audio.codec) ? subject.input.PcmSampleSize() : audio.sample_size},
                    {"channels", audio.channels},
                    {"data_rate_kbit", audio.data_rate}};
     if (!audio.config.empty()) {
@@ -328,10 +374,10 @@ void Warn(const Subject& subject)
 }
 
 // Why a stream has no frames. If no tag of it was found, the file header may still announce it.
-std::string WhyNoStream(TagReader& reader, flvdmx::Stream stream, const Input& input)
+std::string WhyNoStream(Played& played, flvdmx::Stream stream, const Input& input)
 {
-    std::string why = reader.WhyNoStream(stream);
-    if (why.empty() && (reader.AnnouncedStreams() & ~input.Streams() & static_cast<uint32_t>(stream)) != 0)
+    std::string why = played.WhyNoStream(stream);
+    if (why.empty() && (AnnouncedStreams(played.Reader()) & ~input.Streams() & static_cast<uint32_t>(stream)) != 0)
         why = "the file header announces it, but none of its tags was found";
     return why;
 }
@@ -343,10 +389,10 @@ Json Inspect(const std::string& name, const InfoOptions& options, bool first)
     if (const auto metadata = input.file.metadata(); metadata)
         subject.metadata = *metadata;
     if (options.scan || SeemsToRestart(input))
-        subject.scan = ScanFile(name);
-    TagReader reader(input);
-    subject.noVideo = WhyNoStream(reader, flvdmx::Stream::video, input);
-    subject.noAudio = WhyNoStream(reader, flvdmx::Stream::audio, input);
+        subject.scan = ScanFile(input);
+    Played played(input);
+    subject.noVideo = WhyNoStream(played, flvdmx::Stream::video, input);
+    subject.noAudio = WhyNoStream(played, flvdmx::Stream::audio, input);
     Warn(subject);
     if (!options.json)
         Print((first ? "" : "\n") + InfoText(subject));

@@ -14,9 +14,8 @@
 #include <unistd.h>
 
 #include "flvdmx/posix_host.h"
-#include "tools/progress.h"
+#include "tools/played.h"
 #include "tools/report.h"
-#include "tools/tag.h"
 
 namespace tool {
 
@@ -57,30 +56,11 @@ std::string HeaderFailureText(const std::string& path)
     return "not an FLV file: it does not start with the signature FLV";
 }
 
-const flvd_init_t& PosixFunctions()
-{
-    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
-    return host.functions();
-}
-
-uint32_t ReadAndShow(void* buffer, uint32_t size, uint32_t count, void* handle)
-{
-    ReadProgress::ShowRead(PosixFunctions().file_tell64(handle));
-    return PosixFunctions().file_read(buffer, size, count, handle);
-}
-
-flvdmx::Host MakeHost()
-{
-    flvd_init_t functions = PosixFunctions();
-    functions.file_read = ReadAndShow;
-    return flvdmx::Host(functions);
-}
-
 } // namespace
 
 const flvdmx::Host& Host()
 {
-    static const flvdmx::Host host = MakeHost();
+    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
     return host;
 }
 
@@ -109,30 +89,31 @@ std::string PathOf(const std::string& name)
     return name;
 }
 
-std::string OpenFailureText(const std::string& path, const flvdmx::error& error)
+std::string OpenFailureText(const std::string& name, const flvdmx::error& error)
 {
     if (error.code() == FLVD_ERR_OPEN_MAIN || error.code() == FLVD_ERR_OPEN_AUDIO)
         return fmt::format("cannot be opened: {}",
                            error.system_error() != 0 ? std::strerror(error.system_error()) : "out of memory");
     if (error.code() == FLVD_ERR_FILE_HEADER)
-        return HeaderFailureText(path);
-    const std::string why = WhyNothingIsPlayed(path, error.code());
+        return HeaderFailureText(PathOf(name));
+    const std::string why = WhyNothingIsPlayed(name, error.code());
     return why.empty() ? error.text() : why;
 }
 
 Input::Input(const std::string& file_name, flvdmx::File&& opened)
-    : name(file_name), file(std::move(opened)), info(file.info())
+    : name(file_name), file(std::move(opened)), info(file.info()),
+      audioFormat(static_cast<uint8_t>(Instance().audio_format_filter))
 {
-    if (info.video && (Instance().video_codec_filter & EXTENDED_HEADER) != 0) // enhanced FLV: no frame is delivered
+    constexpr uint32_t ENHANCED = 0x80; // no frame is delivered
+    if (info.video && (Instance().video_codec_filter & ENHANCED) != 0)
         info.video.reset();
 }
 
 Input::Input(const std::string& file_name, const flvdmx::Options& options) : name(file_name)
 {
-    const std::string path = PathOf(name);
-    flvdmx::result<flvdmx::File> opened = flvdmx::File::open(path, Host(), options);
+    flvdmx::result<flvdmx::File> opened = flvdmx::File::open(PathOf(name), Host(), options);
     if (!opened)
-        throw FileError(name, OpenFailureText(path, opened.error()), opened.error());
+        throw FileError(name, OpenFailureText(name, opened.error()), opened.error());
     *this = Input(name, std::move(*opened));
 }
 

@@ -31,10 +31,17 @@ struct Input {
     std::string name; /**< as the user wrote it */
     flvdmx::File file;
     flvdmx::Info info;
+    uint8_t audioFormat = 0; /**< the codec byte of audio tags: SoundFormat, SoundRate, SoundSize, SoundType */
 
     const flvd_ctx_t& Instance() const { return *file.instance(); }
     uint32_t Streams() const; /**< FLVD_STREAM_* bits of the streams found */
     bool Has(flvdmx::Stream stream) const { return (Streams() & static_cast<uint32_t>(stream)) != 0; }
+
+    /** @return the time of a tag in ms, counted from the file's first timestamp; may be negative */
+    int64_t TimeOf(const flvdmx::Tag& tag) const { return int64_t{tag.timestamp()} - info.start_time.count(); }
+
+    /** @return bits per sample of PCM audio, by that byte */
+    uint32_t PcmSampleSize() const { return (audioFormat & 2) != 0 ? 16 : 8; }
 
     /** @return the number of bytes after the last complete tag; 0 for a growing file */
     int64_t Rest() const;
@@ -44,7 +51,7 @@ struct Input {
 };
 
 /** @return why a file could not be opened, as text */
-std::string OpenFailureText(const std::string& path, const flvdmx::error& error);
+std::string OpenFailureText(const std::string& name, const flvdmx::error& error);
 
 } // namespace tool
 

@@ -14,9 +14,9 @@
 #include "tools/commands.h"
 #include "tools/input.h"
 #include "tools/output_file.h"
+#include "tools/played.h"
 #include "tools/report.h"
 #include "tools/svg.h"
-#include "tools/tags.h"
 #include "tools/text.h"
 #include "tools/timeline.h"
 

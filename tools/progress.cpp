@@ -19,8 +19,6 @@ constexpr std::chrono::seconds BAR_DELAY{1};
 constexpr int64_t BAR_WIDTH = 30;
 constexpr const char* WIPE_LINE = "\r\033[K";
 
-ReadProgress* g_readProgress = nullptr;
-
 // One column stays free: some terminals wrap the line when the last column is filled.
 size_t TerminalColumns()
 {
@@ -46,12 +44,6 @@ void Progress::Wipe()
     m_shown = false;
 }
 
-void Progress::Postpone(Clock::duration delay)
-{
-    if (m_visible)
-        m_next = Clock::now() + delay;
-}
-
 void Progress::ShowLine(const std::string& name, const std::string& text)
 {
     const size_t columns = TerminalColumns();
@@ -59,7 +51,7 @@ void Progress::ShowLine(const std::string& name, const std::string& text)
                stderr);
     std::fflush(stderr);
     m_shown = true;
-    Postpone(INTERVAL);
+    m_next = Clock::now() + INTERVAL;
 }
 
 void Progress::Show(uint64_t frames, int64_t timeMs)
@@ -81,29 +73,6 @@ void ProgressBar::ShowDone(int64_t done)
     const double share = std::clamp(static_cast<double>(done) / static_cast<double>(m_total), 0.0, 1.0);
     const std::string bar(static_cast<size_t>(share * static_cast<double>(width)), '#');
     ShowLine(m_name, fmt::format(" [{:<{}}] {:3.0f}%", bar, width, share * 100));
-}
-
-ReadProgress::ReadProgress(const std::string& name, int64_t size, int passes)
-    : ProgressBar(name, size * passes), m_size(size)
-{
-    g_readProgress = this;
-}
-
-ReadProgress::~ReadProgress()
-{
-    g_readProgress = nullptr;
-}
-
-void ReadProgress::Hide()
-{
-    Wipe();
-    Postpone(BAR_DELAY);
-}
-
-void ReadProgress::ShowRead(int64_t position)
-{
-    if (g_readProgress != nullptr)
-        g_readProgress->ShowDone(g_readProgress->m_pass + position);
 }
 
 } // namespace tool

@@ -2,6 +2,7 @@
 #ifndef FLVDMX_TOOLS_REPORT_H
 #define FLVDMX_TOOLS_REPORT_H
 
+#include <array>
 #include <stdexcept>
 #include <string>
 #include <string_view>
@@ -61,6 +62,8 @@ void Complain(const FileError& error);
 
 /** Writes to standard error. A failure is ignored: there is nowhere to report it. */
 void Tell(const std::string& text);
+
+inline constexpr std::array STREAMS = {flvdmx::Stream::video, flvdmx::Stream::audio};
 
 /** @return "video" or "audio" */
 const char* StreamName(flvdmx::Stream stream);

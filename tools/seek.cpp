@@ -11,9 +11,8 @@
 #include "tools/commands.h"
 #include "tools/frame_source.h"
 #include "tools/input.h"
+#include "tools/played.h"
 #include "tools/report.h"
-#include "tools/scan.h"
-#include "tools/tags.h"
 #include "tools/text.h"
 
 namespace tool {

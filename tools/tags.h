@@ -1,8 +1,7 @@
-// The tags of a file, including what playing does not show: damage, and tags that are not played.
+// The tags of a file, read one after the other: what playing does not show.
 #ifndef FLVDMX_TOOLS_TAGS_H
 #define FLVDMX_TOOLS_TAGS_H
 
-#include <algorithm>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -10,114 +9,84 @@
 #include <string>
 #include <vector>
 
+#include "flvdmx/flvdmx.hpp"
 #include "flvdmx/layers.h"
-#include "tools/input.h"
-#include "tools/tag.h"
 
 namespace tool {
 
-/** Reads tags and bytes at any position of a file, with a separate reader. */
+using flvdmx::Tag;
+
+/** @return the number in the `size` bytes at `bytes`, most significant first */
+uint32_t BigEndian(const uint8_t* bytes, uint32_t size);
+
+/** @return true for a video frame that can be decoded without earlier ones */
+inline bool IsVideoKeyframe(const Tag& tag)
+{
+    return tag.is_video() && tag.has_frame() && tag.is_keyframe();
+}
+
+/** A part of a file. All parts together are the whole file. */
+struct Part {
+    enum class Kind {
+        tag,      /**< a tag whose back-pointer agrees with it */
+        unlinked, /**< a tag with a wrong back-pointer, or none: another tag follows, or it is the script data at the
+                       beginning, which players trust */
+        damage    /**< bytes that belong to no tag */
+    } kind;
+    int64_t begin; /**< position in the file */
+    int64_t end;
+    Tag tag; /**< with Kind::damage: what the bytes look like, for instance a tag that is cut short */
+
+    int64_t Size() const { return end - begin; }
+};
+
+/** Reads tags and bytes at any position of a file, with a reader of its own. */
 class TagReader {
 public:
-    /** @param input borrowed; its own position does not change */
-    explicit TagReader(const Input& input);
+    /** Called with the position reached, once per part and once per search in a long damage. */
+    using Progress = std::function<void(int64_t position)>;
 
-    int64_t FileSize() const { return m_fileSize; }
+    /** @param name     file, as the user named it; throws FileError if it cannot be opened
+     *  @param instance the open file, borrowed; its own position does not change. Null: Walk() is not possible */
+    explicit TagReader(const std::string& name, flvd_ctx_t* instance = nullptr, Progress progress = {});
 
-    /** @return `size` bytes at `position`, valid until the next call; null if they are not all available */
+    int64_t FileSize() const { return m_size; }
+
+    /** @return the position of the first tag */
+    int64_t FirstTag();
+
+    /** @return `size` bytes at `position`, at most a few hundred, valid until the next call; null if they are not all
+     *          in the file */
     const uint8_t* Bytes(int64_t position, uint32_t size);
+
+    /** @return the payload of a tag; throws FileError */
+    std::vector<uint8_t> Payload(const Tag& tag);
+
+    /** @return the codec configuration in a tag; throws FileError */
+    std::vector<uint8_t> Config(const Tag& tag);
 
     /** @return the tag at `position`; nothing if its type is unknown or its header cut short */
     std::optional<Tag> At(int64_t position);
 
-    /**
-     * Finds the first valid tag of the file's streams at or after `from`, after any amount of damage. One search of the
-     * library covers a limited range; it is repeated while the reader advances and has not reached `end`.
-     *
-     * @param progress called with the position after each search that found no tag
-     */
-    std::optional<Tag> Find(int64_t from, int64_t end, const std::function<void(int64_t)>& progress = {});
+    /** Calls `see` with each part between two positions, until it returns false. */
+    void Walk(int64_t from, int64_t to, const std::function<bool(const Part&)>& see);
 
-    /** @return the first valid configuration of a stream, wherever it is; nothing for a codec without one */
-    std::optional<Tag> FindConfig(flvdmx::Stream stream);
-
-    /** @return the bytes of a configuration after the codec header, valid until the next call; empty when Bytes() does
-     *          not show all of them: they are a few dozen */
-    flvdmx::Bytes ConfigBytes(const Tag& tag);
-
-    /** @return FLVD_STREAM_* bits of the streams that the file header announces */
-    uint32_t AnnouncedStreams();
-
-    /** @return why a valid tag is not played, such as "it is too short for a frame"; empty if it is played */
-    std::string WhyNotPlayed(const Tag& tag);
-
-    /** @return why no frame of that stream is delivered, judging by its first tag; empty if the input has the stream,
-     * or if no such tag was found */
-    const std::string& WhyNoStream(flvdmx::Stream stream);
+    /** @return the first valid tag of the file's streams at or after `from`, after any amount of damage */
+    std::optional<Tag> Find(int64_t from, int64_t to);
 
 private:
-    std::string WhyNotInStream(const Tag& tag);
+    Part PartAt(int64_t position, int64_t to);
+    bool IsLinked(const Tag& tag);
+    bool CouldFollow(int64_t position);
 
     struct Closer {
         void operator()(fio_file_t* reader) const { __FLV_DMX__fioClose(reader); }
     };
-    const Input& m_input;
+    const std::string m_name;
     flvd_ctx_t* const m_instance;
+    const Progress m_progress;
     const std::unique_ptr<fio_file_t, Closer> m_reader;
-    int64_t m_fileSize = 0;
-    std::optional<std::string> m_noVideo; // the reasons, once they have been determined
-    std::optional<std::string> m_noAudio;
-};
-
-/** @return what is wrong with the first codec configurations of the input; empty if nothing */
-std::string ConfigFault(const Input& input);
-
-/** @return a text about a codec of the input that FLV does not define; empty if it defines all */
-std::string UndefinedCodec(const Input& input);
-
-/** Warns on standard error about those of these streams (FLVD_STREAM_* bits) that the file has but that are not played,
- *  and why. */
-void WarnOfUnplayed(const Input& input, uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
-
-/** Finds the bytes that are skipped between the frames of a file. */
-class Losses {
-public:
-    /** @param input borrowed
-     *  @param script called with each script tag between frames; may be empty */
-    explicit Losses(const Input& input, std::function<void(const Tag&)> script = {});
-
-    /** Call it with every frame of the file, in file order. @return true if bytes were skipped before it */
-    bool Take(const flvdmx::Frame& frame);
-    /** Call it after the last frame. */
-    void Finish() { Inspect(m_end, m_input.Instance().data_end); }
-
-    int64_t Bytes() const { return m_bytes; } /**< skipped so far */
-    /** @return the number of bytes after the last frame or the end of the valid data, whichever is later */
-    int64_t Rest() const
-    {
-        return std::max(m_input.info.size - std::max(m_end, m_input.Instance().data_end), int64_t{0});
-    }
-    /** Warns on standard error about what was skipped. */
-    void Warn() const;
-
-private:
-    struct Loss {
-        int64_t bytes = 0;
-        int64_t first = 0; // position
-        std::string why{}; // of the first tag
-    };
-
-    int64_t EndOf(const flvdmx::Frame& frame);
-    void Inspect(int64_t from, int64_t to);
-    void Lose(int64_t from, int64_t to);
-
-    const Input& m_input;
-    const std::function<void(const Tag&)> m_script;
-    TagReader m_reader;
-    int64_t m_end;
-    int64_t m_bytes = 0;
-    Loss m_damage;   // bytes outside valid tags
-    Loss m_unplayed; // valid tags that are not played
+    int64_t m_size = 0;
 };
 
 } // namespace tool

@@ -6,7 +6,7 @@
 #include <optional>
 #include <utility>
 
-#include "tools/frame_source.h"
+#include "tools/played.h"
 #include "tools/progress.h"
 #include "tools/svg.h"
 #include "tools/tags.h"
@@ -32,26 +32,27 @@ struct Point {
     bool jump; // the timestamps jump to it
 };
 
-std::vector<Point> ReadPoints(Input& input, Timeline& timeline)
+std::vector<Point> ReadPoints(const Input& input, Timeline& timeline)
 {
     std::vector<Point> points;
     Times times;
-    Losses losses(input);
-    ReadProgress progress(input.name, input.info.size);
-    while (const std::optional<flvdmx::Frame> frame = NextFrame(input, flvdmx::Stream::any)) {
+    ProgressBar bar(input.name, input.Instance().data_end);
+    Played played(input, [&bar](int64_t position) { bar.ShowDone(position); });
+    int64_t skipped = 0;
+    played.Walk([&](const Tag& tag) {
+        if (!tag.has_frame())
+            return true;
         const uint64_t jumps = times.Jumps();
-        const bool loss = losses.Take(*frame);
-        times.Take(frame->stream, frame->time.count());
-        const auto time = static_cast<double>(times.Time()) / MS_PER_SECOND;
-        const bool video = frame->stream == flvdmx::Stream::video;
-        points.push_back({time, static_cast<double>(frame->position), static_cast<uint32_t>(frame->data.size()), video,
-                          video && frame->keyframe, loss, times.Jumps() > jumps});
-    }
-    progress.Wipe();
-    losses.Finish();
-    losses.Warn();
+        times.Take(tag.stream(), input.TimeOf(tag));
+        const bool loss = played.BytesSkipped() > std::exchange(skipped, played.BytesSkipped());
+        points.push_back({static_cast<double>(times.Time()) / MS_PER_SECOND, static_cast<double>(tag.position),
+                          tag.frame_size(), tag.is_video(), IsVideoKeyframe(tag), loss, times.Jumps() > jumps});
+        return true;
+    });
+    bar.Wipe();
+    played.Warn();
     timeline.durationMs = times.Latest();
-    timeline.bytesSkipped = losses.Bytes();
+    timeline.bytesSkipped = played.BytesSkipped();
     return points;
 }
 
@@ -178,7 +179,7 @@ bool Timeline::IsMissing(double from, double to) const
                        [=](const Mark& mark) { return mark.from <= from && mark.to >= to; });
 }
 
-Timeline ReadTimeline(Input& input, size_t columns)
+Timeline ReadTimeline(const Input& input, size_t columns)
 {
     Timeline timeline{};
     const std::vector<Point> points = ReadPoints(input, timeline);

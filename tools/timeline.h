@@ -52,7 +52,7 @@ struct Timeline {
 };
 
 /** Reads the whole file, and warns on standard error about what is skipped. Needs a few bytes of memory per frame. */
-Timeline ReadTimeline(Input& input, size_t columns);
+Timeline ReadTimeline(const Input& input, size_t columns);
 
 } // namespace tool
 

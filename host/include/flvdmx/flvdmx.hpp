@@ -52,6 +52,7 @@
 #include "flvdmx/next_frame.h"
 #include "flvdmx/result.hpp"
 #include "flvdmx/stdio_host.h"
+#include "flvdmx/tag.hpp"
 
 #include <algorithm>
 #include <array>
@@ -124,13 +125,6 @@ inline Host make_host(void (*fill)(flvd_init_t*))
 
 /* --------------------------------------------------------------------------------- what a file holds */
 
-/** A stream. */
-enum class Stream : uint32_t {
-    any = 0,                   /**< the next frame of either stream; only without a separate audio reader */
-    video = FLVD_STREAM_VIDEO, /**< video */
-    audio = FLVD_STREAM_AUDIO  /**< audio */
-};
-
 /**
  * One frame, without FLV headers. AVC: NAL units, each preceded by its length, a big-endian number whose size is given
  * in the configuration (usually 4 bytes); parameter sets are only in the configuration. AAC: a raw access unit without
@@ -149,68 +143,6 @@ struct Frame {
     Milliseconds presentation_time() const { return time + composition_offset; } /**< when to present it */
     bool config_changed() const { return !new_config.empty(); } /**< true: pass `new_config` to the decoder first */
 };
-
-/** CodecID of video tags (FLV file format, version 10.1, annex E.4.3.1). Files may contain other values. */
-enum class VideoCodec : uint32_t {
-    unknown = 0,        /**< none */
-    jpeg = 1,           /**< JPEG */
-    sorenson_h263 = 2,  /**< Sorenson H.263 */
-    screen_video = 3,   /**< screen video */
-    vp6 = 4,            /**< VP6 */
-    vp6_alpha = 5,      /**< VP6 with an alpha channel */
-    screen_video_2 = 6, /**< screen video, version 2 */
-    avc = 7             /**< AVC, H.264 */
-};
-
-/** SoundFormat of audio tags (annex E.4.2.1). Files may contain other values. */
-enum class AudioCodec : uint32_t {
-    pcm = 0,               /**< linear PCM, byte order of the machine that wrote it */
-    adpcm = 1,             /**< ADPCM */
-    mp3 = 2,               /**< MP3 */
-    pcm_little_endian = 3, /**< linear PCM, little-endian */
-    nellymoser_16khz = 4,  /**< Nellymoser, 16 kHz, mono */
-    nellymoser_8khz = 5,   /**< Nellymoser, 8 kHz, mono */
-    nellymoser = 6,        /**< Nellymoser */
-    a_law = 7,             /**< G.711 A-law */
-    mu_law = 8,            /**< G.711 mu-law */
-    unknown = 9,           /**< reserved */
-    aac = 10,              /**< AAC */
-    speex = 11,            /**< Speex */
-    mp3_8khz = 14,         /**< MP3, 8 kHz */
-    device_specific = 15   /**< device-specific sound */
-};
-
-/** @return the codec's name in plain words; "unknown" for a value that the format does not define */
-constexpr const char* name(VideoCodec codec)
-{
-    constexpr std::array names = {"unknown", "JPEG",           "Sorenson H.263", "screen video",
-                                  "VP6",     "VP6 with alpha", "screen video 2", "H.264 (AVC)"};
-    const auto number = static_cast<size_t>(codec);
-    return number < names.size() ? names[number] : names[0];
-}
-
-/** @return the same for audio */
-constexpr const char* name(AudioCodec codec)
-{
-    constexpr std::array names = {"PCM",
-                                  "ADPCM",
-                                  "MP3",
-                                  "PCM, little-endian",
-                                  "Nellymoser 16 kHz mono",
-                                  "Nellymoser 8 kHz mono",
-                                  "Nellymoser",
-                                  "G.711 A-law",
-                                  "G.711 mu-law",
-                                  "unknown",
-                                  "AAC",
-                                  "Speex",
-                                  "unknown",
-                                  "unknown",
-                                  "MP3 8 kHz",
-                                  "device-specific sound"};
-    const auto number = static_cast<size_t>(codec);
-    return number < names.size() ? names[number] : "unknown";
-}
 
 /** The video stream. Fields that are not known are 0. */
 struct VideoInfo {
@@ -480,7 +412,7 @@ public:
         fio_file_t* const reader = m_instance->main_reader;
         Learned& learned = learned_of(reader);
         const int64_t begin = learned.is_position ? learned.end : find_position(reader, learned);
-        const Tag ahead(reader, begin);
+        const Tag ahead = peek_tag(reader, begin);
         const uint32_t size = ahead.end() <= m_instance->data_end ? ahead.frame_size() : 0;
         uint8_t* const memory = size != 0 ? allocate(size) : nullptr;
         if (memory == nullptr)
@@ -624,74 +556,11 @@ public:
 private:
     friend FrameRange; // takes frames without a copy
 
-    // Tags (FLV file format, version 10.1, annex E.4).
-    static constexpr uint32_t tag_header_size = 11;
-    static constexpr uint32_t back_pointer_size = 4;
-    static constexpr int64_t smallest_tag_size = tag_header_size + 1 + back_pointer_size; // of a frame
+    static constexpr int64_t smallest_tag_size = Tag::header_size + 1 + Tag::back_pointer_size; // of a frame
     static constexpr uint32_t metadata_tags = 102;        // an open examines the same number
     static constexpr uint32_t script_data_max = 1u << 20; // bytes read from one script tag
     static constexpr uint32_t config_max = 1u << 16;      // bytes; longer configurations are not reported
     static constexpr size_t configs_max = 256;            // remembered per stream
-
-    // A tag header and the next five bytes, enough for every codec header.
-    class Tag {
-    public:
-        int64_t position = -1; // in the file; -1: no tag
-
-        Tag() = default;
-        // Peeks at the tag at the reader's position `at`. No tag if fewer bytes are left than the smallest tag has.
-        Tag(fio_file_t* reader, int64_t at)
-        {
-            const uint8_t* bytes = reader->cache + reader->head; // when it is cached, no call is needed
-            const bool cached = reader->count >= sizeof m_bytes;
-            if (!cached && __FLV_DMX__fioShowBytesByPtr(&bytes, sizeof m_bytes, reader) < sizeof m_bytes)
-                return;
-            std::memcpy(m_bytes, bytes, sizeof m_bytes);
-            position = at;
-        }
-
-        bool is_video() const { return m_bytes[0] == FLVD_TAG_TYPE_VIDEO; }
-        bool is_audio() const { return m_bytes[0] == FLVD_TAG_TYPE_AUDIO; }
-        Stream stream() const { return is_video() ? Stream::video : is_audio() ? Stream::audio : Stream::any; }
-        uint32_t data_size() const { return word(0) & 0xFFFFFF; }
-        uint32_t timestamp() const { return word(4) >> 8 | uint32_t{m_bytes[7]} << 24; }
-        int64_t end() const { return position + tag_header_size + data_size() + back_pointer_size; }
-        bool is_keyframe() const { return is_audio() || m_bytes[11] >> 4 == 1 || m_bytes[11] >> 4 == 4; }
-
-        // By the packet type of AVC and AAC: a configuration, a frame, or neither.
-        bool is_config() const { return (is_avc() || is_aac()) && m_bytes[12] == 0; }
-        bool has_frame() const { return !is_config() && !(is_avc() && m_bytes[12] == 2); }
-        uint32_t codec_header_size() const { return is_avc() ? 5 : is_aac() ? 2 : 1; }
-        // Size of the frame; 0 if there is none.
-        uint32_t frame_size() const
-        {
-            const bool carries_frame = (is_video() || is_audio()) && has_frame() && data_size() > codec_header_size();
-            return carries_frame ? data_size() - codec_header_size() : 0;
-        }
-        int32_t composition_offset() const
-        {
-            constexpr int32_t sign = 1 << 23;
-            return is_avc() ? (static_cast<int32_t>(word(12) & 0xFFFFFF) ^ sign) - sign : 0;
-        }
-
-        // True if this is the tag of a payload of this size, after which the reader stands at `payload_end`.
-        bool has_payload(Stream of, uint32_t payload, int64_t payload_end) const
-        {
-            const uint32_t type = of == Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
-            return word(0) == (type << 24 | payload) && end() == payload_end;
-        }
-
-    private:
-        bool is_avc() const { return is_video() && (m_bytes[11] & 15) == static_cast<uint8_t>(VideoCodec::avc); }
-        bool is_aac() const { return is_audio() && m_bytes[11] >> 4 == static_cast<uint8_t>(AudioCodec::aac); }
-        uint32_t word(size_t at) const
-        {
-            return uint32_t{m_bytes[at]} << 24 | uint32_t{m_bytes[at + 1]} << 16 | uint32_t{m_bytes[at + 2]} << 8 |
-                   m_bytes[at + 3];
-        }
-
-        uint8_t m_bytes[tag_header_size + 5]{};
-    };
 
     // Where the configuration of a stream is known to change, and which one the decoder has. Empty until the first
     // change: up to then the one found by the open holds everywhere.
@@ -910,13 +779,23 @@ private:
         return {};
     }
 
+    // The tag at the reader's position `at`. No tag if fewer bytes are left than the smallest one has.
+    static Tag peek_tag(fio_file_t* reader, int64_t at)
+    {
+        const uint8_t* bytes = reader->cache + reader->head; // when it is cached, no call is needed
+        const bool cached = reader->count >= Tag::bytes_used;
+        if (!cached && __FLV_DMX__fioShowBytesByPtr(&bytes, Tag::bytes_used, reader) < Tag::bytes_used)
+            return {};
+        return {at, {bytes, Tag::bytes_used}};
+    }
+
     // The first wanted tag at or after the reader's position, by the library's own rules. No tag if there is none or if
     // its position is not known.
     Tag find_tag(fio_file_t* reader, uint32_t wanted) const
     {
         flvd_tag_info_t info;
         const bool found = FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1) == 0;
-        return found ? Tag(reader, __FLV_DMX__fioTell64(reader)) : Tag();
+        return found ? peek_tag(reader, __FLV_DMX__fioTell64(reader)) : Tag();
     }
 
     // Calls `see` for each wanted tag between two file positions, until it returns false. Crosses damage. Returns 0,
@@ -940,7 +819,7 @@ private:
                 again = !again;
                 continue;
             }
-            const Tag tag(reader, position);
+            const Tag tag = peek_tag(reader, position);
             if (result != 0 || tag.position < 0)
                 return end - position < smallest_tag_size ? FLVD_ERR_NONE : FLVD_ERR_SHORT_DATA;
             if (position >= end || !see(tag))
@@ -964,7 +843,7 @@ private:
         Learned& learned = learned_of(reader);
         const int64_t begin = learned.is_position ? learned.end : find_position(reader, learned);
         learned.is_position = false;
-        Tag ahead(reader, begin);
+        Tag ahead = peek_tag(reader, begin);
         if (has_two_readers() && !go_to_stream(reader, stream, ahead))
             return false;
         m_request.stream = static_cast<uint32_t>(stream);
@@ -1055,8 +934,8 @@ private:
     {
         for (const uint32_t codec_header : {5U, 2U, 1U}) {
             const uint32_t payload = frame.size + codec_header;
-            const int64_t begin = end - back_pointer_size - payload - tag_header_size;
-            const Tag tag = begin >= 0 && move_to(reader, begin) ? Tag(reader, begin) : Tag();
+            const int64_t begin = end - Tag::back_pointer_size - payload - Tag::header_size;
+            const Tag tag = begin >= 0 && move_to(reader, begin) ? peek_tag(reader, begin) : Tag();
             if (tag.codec_header_size() == codec_header &&
                 tag.has_payload(static_cast<Stream>(frame.stream), payload, end))
                 return tag;
@@ -1093,7 +972,7 @@ private:
             return true;
         std::vector<uint8_t> config(tag.data_size() - headers);
         const auto size = static_cast<uint32_t>(config.size());
-        __FLV_DMX__fioSkipBytes(tag_header_size + headers, reader);
+        __FLV_DMX__fioSkipBytes(Tag::header_size + headers, reader);
         if (__FLV_DMX__fioRead(config.data(), 1, size, reader) != size)
             return false;
         configs_of(tag.stream()).add(tag.position, std::move(config));
@@ -1143,7 +1022,7 @@ private:
         uint32_t tags = 0;
         const uint32_t any = FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT;
         return walk(reader, m_instance->data_offset, std::numeric_limits<int64_t>::max(), any, [&](const Tag& tag) {
-            if (tag.stream() == Stream::any)
+            if (tag.is_script())
                 read_script_tag(reader, tag, metadata);
             return ++tags < metadata_tags;
         });
@@ -1152,7 +1031,7 @@ private:
     static void read_script_tag(fio_file_t* reader, const Tag& tag, Metadata& metadata)
     {
         std::vector<uint8_t> payload(std::min(tag.data_size(), script_data_max));
-        __FLV_DMX__fioSkipBytes(tag_header_size, reader);
+        __FLV_DMX__fioSkipBytes(Tag::header_size, reader);
         const uint32_t size = __FLV_DMX__fioRead(payload.data(), 1, static_cast<uint32_t>(payload.size()), reader);
         metadata.add_script_data({payload.data(), size});
     }

@@ -10,6 +10,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -47,6 +48,12 @@ struct Date {
 struct Property {
     std::string name;                                    /**< nested names are joined by dots: "cuePoints.0.name" */
     std::variant<double, bool, std::string, Date> value; /**< strings are UTF-8 if the file follows the format */
+};
+
+/** One property with its value as in the file, for programs that write the metadata to another file. */
+struct RawProperty {
+    std::string name;           /**< not joined with others */
+    std::vector<uint8_t> value; /**< AMF0, from its type marker on */
 };
 
 /**
@@ -97,6 +104,19 @@ public:
             ;
     }
 
+    /**
+     * Copies the properties of "onMetaData", all of them and without interpretation, up to the first one that is
+     * damaged or cut short.
+     *
+     * @param payload of a script tag
+     * @return the properties in file order; nothing if this is other script data
+     */
+    static std::optional<std::vector<RawProperty>> copy_properties(Bytes payload)
+    {
+        Metadata unused;
+        return Reader(unused, payload).copy_properties();
+    }
+
 private:
     // Parses AMF0 values. Anything that cannot be parsed ends the payload.
     class Reader : private Amf0 {
@@ -113,6 +133,30 @@ private:
             if (m_name == "onMetaData")
                 m_name.clear();
             return !m_failed;
+        }
+
+        std::optional<std::vector<RawProperty>> copy_properties()
+        {
+            std::string_view event;
+            do { // live servers store the command that sets the metadata before its name
+                if (take(1)[0] != string)
+                    return std::nullopt;
+                event = take_text(2);
+            } while (event == "@setDataFrame");
+            if (event != "onMetaData")
+                return std::nullopt;
+            std::vector<RawProperty> list;
+            m_skips = true;
+            const uint8_t marker = take(1)[0];
+            if (marker != object && (marker != ecma_array || !pass(4)))
+                return list;
+            for (std::string_view key = take_text(2); !key.empty(); key = take_text(2)) {
+                const uint8_t* const value = m_rest.begin();
+                if (!read_value(1))
+                    break;
+                list.push_back({std::string(key), {value, m_rest.begin()}});
+            }
+            return list;
         }
 
     private:

@@ -1,6 +1,6 @@
-// Fields of codec configurations.
-#ifndef FLVDMX_TOOLS_CODEC_CONFIG_H
-#define FLVDMX_TOOLS_CODEC_CONFIG_H
+// Codecs: their names, and the fields of their configurations.
+#ifndef FLVDMX_TOOLS_CODECS_H
+#define FLVDMX_TOOLS_CODECS_H
 
 #include <cstdint>
 #include <string>
@@ -8,6 +8,17 @@
 #include "flvdmx/flvdmx.hpp"
 
 namespace tool {
+
+/** @return name of a video codec, with the CodecID of one that FLV does not define */
+std::string CodecName(flvdmx::VideoCodec codec);
+/** @return the same for audio */
+std::string CodecName(flvdmx::AudioCodec codec);
+
+/** @return true for a codec whose samples are not compressed */
+constexpr bool IsPcm(flvdmx::AudioCodec codec)
+{
+    return codec == flvdmx::AudioCodec::pcm || codec == flvdmx::AudioCodec::pcm_little_endian;
+}
 
 /** An AudioSpecificConfig (ISO/IEC 14496-3). */
 struct AacConfig {
@@ -37,7 +48,7 @@ struct PictureSize {
     uint32_t height = 0;
 };
 
-/** @return the size after cropping. For some AVC profiles the library reads no chroma format and has a wrong size. */
+/** @return the size after cropping, also for AVC profiles that the library does not know. */
 PictureSize PictureSizeOf(const flvdmx::VideoInfo& video);
 
 /** @return the level of such a record, such as "3.1" */
