@@ -212,8 +212,8 @@ void Chain::CheckTime(const Tag& tag)
     const Jump here = {tag, std::exchange(lane.last, tag.timestamp())};
     const bool known = lane.odd.has_value();
     if (step == Times::Step::jump) {
-        for (Lane* const each : {&m_lanes[0], &m_lanes[1]})
-            if (const auto odd = std::exchange(each->odd, std::nullopt))
+        for (Lane& each : m_lanes)
+            if (const auto odd = std::exchange(each.odd, std::nullopt))
                 AddJump(*odd);
         if (!known)
             AddJump(here);

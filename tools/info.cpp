@@ -75,8 +75,7 @@ struct Subject {
     const Input& input;
     flvdmx::Metadata metadata{};
     std::optional<FileScan> scan{};
-    std::string noVideo{}; // why none is played, although the file contains or announces it
-    std::string noAudio{};
+    std::array<std::string, 2> notPlayed{}; // why no video or audio is, although the file contains or announces it
 };
 
 // Kilobits per second over the whole file: bits per millisecond.
@@ -92,12 +91,6 @@ uint32_t IndexEntries(const Input& input)
 {
     const flvd_keyframe_index_t& index = input.Instance().keyframe_index;
     return index.times_offset != 0 && index.positions_offset != 0 ? index.entry_count : 0;
-}
-
-// Bytes skipped between the frames and after the last tag.
-uint64_t BytesSkipped(const Subject& subject)
-{
-    return static_cast<uint64_t>(subject.scan->bytesSkipped + subject.input.Rest());
 }
 
 const char* SeekMethodName(flvdmx::SeekMethod method)
@@ -144,79 +137,105 @@ std::optional<flvdmx::Milliseconds> LastKeyframe(const Subject& subject)
     return stated.count() != 0 ? std::optional(stated) : std::nullopt;
 }
 
-// Collects `name  value` lines, without unknown values.
-class Listing {
+// Facts about a file: lines for people and members for programs.
+class Facts {
 public:
-    void Line(std::string_view name, std::string_view value)
+    // Without a text, there is no line.
+    void Add(std::string_view name, std::string_view text, const Json& members = Json::object())
     {
-        fmt::format_to(std::back_inserter(m_text), "  {:<23} {}\n", name, value);
+        if (!text.empty())
+            fmt::format_to(std::back_inserter(m_text), "  {:<23} {}\n", name, text);
+        m_object.update(members);
     }
-    void Quantity(std::string_view name, double value, std::string_view unit)
+    void AddConfig(const std::vector<uint8_t>& config)
     {
-        if (value != 0)
-            Line(name, fmt::format("{} {}", Number(value), unit));
+        if (config.empty())
+            return Add("", "", {{"config", nullptr}});
+        Add("  configuration", fmt::format("{} bytes: {}", config.size(), Hex(config)), {{"config", Hex(config)}});
     }
-    void Config(const std::vector<uint8_t>& config)
+    // Facts about a part become one member.
+    void Add(const char* member, const Facts& part)
     {
-        if (!config.empty())
-            Line("  configuration", fmt::format("{} bytes: {}", config.size(), Hex(config)));
+        m_text += part.m_text;
+        m_object[member] = part.m_object;
     }
     const std::string& Text() const { return m_text; }
+    const Json& Object() const { return m_object; }
 
 private:
     std::string m_text;
+    Json m_object = Json::object();
 };
 
-std::string StreamsText(const Input& input)
+std::string Quantity(double value, std::string_view unit)
 {
-    if (input.info.video)
-        return input.info.audio ? "video and audio" : "video only";
-    return "audio only";
+    return value != 0 ? fmt::format("{} {}", Number(value), unit) : "";
 }
 
-void ListVideo(Listing& listing, const Subject& subject, const flvdmx::VideoInfo& video)
+template <typename Value> Json OrNull(bool known, const Value& value)
 {
-    listing.Line("video", CodecName(video.codec));
-    if (!video.config.empty())
-        listing.Line("  profile",
-                     fmt::format("{}, level {}", AvcProfileName(video.config), AvcLevelName(video.config)));
-    const PictureSize size = PictureSizeOf(video);
-    if (size.width != 0 || size.height != 0)
-        listing.Line("  picture size", fmt::format("{} x {}", size.width, size.height));
-    listing.Quantity("  frame rate", video.frame_rate, "frames/s");
-    if (const auto last = LastKeyframe(subject))
-        listing.Line("  last keyframe", FormatTime(*last));
-    if (subject.scan) {
-        listing.Line("  frames",
-                     fmt::format("{}, {}", subject.scan->videoFrames, Plural(subject.scan->keyframes, "keyframe")));
-        if (subject.scan->keyframes > 1)
-            listing.Line("  keyframe distance",
-                         fmt::format("{} s on average, {} s at most", Number(subject.scan->averageDistanceMs / 1000),
-                                     Number(static_cast<double>(subject.scan->longestDistanceMs) / 1000)));
+    return known ? Json(value) : Json();
+}
+
+Facts VideoFacts(const Subject& subject, const flvdmx::VideoInfo& video)
+{
+    Facts facts;
+    const std::string codec = CodecName(video.codec);
+    facts.Add("video", codec, {{"codec", codec}, {"fourcc", OrNull(!video.fourcc.empty(), video.fourcc)}});
+    const bool avc = !video.config.empty();
+    const std::string profile = AvcProfileName(video.config);
+    const std::string level = AvcLevelName(video.config);
+    facts.Add("  profile", avc ? fmt::format("{}, level {}", profile, level) : "",
+              {{"profile", OrNull(avc, profile)}, {"level", OrNull(avc, level)}});
+    const auto [width, height] = PictureSizeOf(video);
+    facts.Add("  picture size", width != 0 || height != 0 ? fmt::format("{} x {}", width, height) : "",
+              {{"width", width}, {"height", height}});
+    facts.Add("  frame rate", Quantity(video.frame_rate, "frames/s"), {{"frame_rate", video.frame_rate}});
+    const auto last = LastKeyframe(subject);
+    facts.Add("  last keyframe", last ? FormatTime(*last) : "",
+              {{"last_keyframe_ms", last ? Json(last->count()) : Json()}});
+    if (const auto& scan = subject.scan) {
+        facts.Add("  frames", fmt::format("{}, {}", scan->videoFrames, Plural(scan->keyframes, "keyframe")),
+                  {{"frames", scan->videoFrames}, {"keyframes", scan->keyframes}});
+        const bool known = scan->keyframes > 1;
+        const Json distance = {{"average", OrNull(known, scan->averageDistanceMs)},
+                               {"longest", OrNull(known, scan->longestDistanceMs)}};
+        facts.Add("  keyframe distance",
+                  known ? fmt::format("{} s on average, {} s at most", Number(scan->averageDistanceMs / 1000),
+                                      Number(static_cast<double>(scan->longestDistanceMs) / 1000))
+                        : "",
+                  {{"keyframe_distance_ms", distance}});
     }
-    listing.Config(video.config);
+    facts.AddConfig(video.config);
+    return facts;
 }
 
-void ListAudio(Listing& listing, const Subject& subject, const flvdmx::AudioInfo& audio)
+Facts AudioFacts(const Subject& subject, const flvdmx::AudioInfo& audio)
 {
-    listing.Line("audio", CodecName(audio.codec));
+    Facts facts;
+    const std::string codec = CodecName(audio.codec);
+    facts.Add("audio", codec, {{"codec", codec}, {"format_tag", audio.format_tag}});
     if (!audio.config.empty()) {
         const AacConfig aac = ParseAacConfig(audio.config);
-        listing.Line("  object type", fmt::format("{} ({})", aac.objectType, AacObjectTypeName(aac.objectType)));
-        if (aac.outputSampleRate != aac.sampleRate)
-            listing.Quantity("  output rate", aac.outputSampleRate, "Hz");
+        facts.Add("  object type", fmt::format("{} ({})", aac.objectType, AacObjectTypeName(aac.objectType)),
+                  {{"object_type", aac.objectType}});
+        facts.Add("  output rate", aac.outputSampleRate != aac.sampleRate ? Quantity(aac.outputSampleRate, "Hz") : "",
+                  {{"output_sample_rate", aac.outputSampleRate}});
     }
     const uint32_t header = HeaderSampleRate(subject.input);
     const uint32_t rate = SampleRate(audio);
-    listing.Line("  sample rate", header == rate ? fmt::format("{} Hz", rate)
-                                                 : fmt::format("{} Hz (the tag headers state {} Hz)", rate, header));
-    if (IsPcm(audio.codec))
-        listing.Line("  sample size", fmt::format("{} bits", subject.input.PcmSampleSize()));
-    listing.Line("  channels", std::to_string(audio.channels));
-    listing.Quantity("  data rate", audio.data_rate, "kbit/s");
+    facts.Add("  sample rate",
+              header == rate ? fmt::format("{} Hz", rate)
+                             : fmt::format("{} Hz (the tag headers state {} Hz)", rate, header),
+              {{"sample_rate", rate}, {"header_sample_rate", header}});
+    const uint32_t size = IsPcm(audio.codec) ? subject.input.PcmSampleSize() : audio.sample_size;
+    facts.Add("  sample size", IsPcm(audio.codec) ? fmt::format("{} bits", size) : "", {{"sample_size", size}});
+    facts.Add("  channels", std::to_string(audio.channels), {{"channels", audio.channels}});
+    facts.Add("  data rate", Quantity(audio.data_rate, "kbit/s"), {{"data_rate_kbit", audio.data_rate}});
     if (subject.scan)
-        listing.Line("  frames", std::to_string(subject.scan->audioFrames));
-    listing.Config(audio.config);
+        facts.Add("  frames", std::to_string(subject.scan->audioFrames), {{"frames", subject.scan->audioFrames}});
+    facts.AddConfig(audio.config);
+    return facts;
 }
 
 // The date in ISO 8601 format; null if it is out of range.
@@ -245,116 +264,58 @@ std::string ValueText(const flvdmx::Property& property)
     return value.is_string() ? Printable(value.get<std::string>()) : value.dump();
 }
 
-std::string InfoText(const Subject& subject)
+Facts MetadataFacts(const flvdmx::Metadata& metadata)
 {
+    Facts facts;
+    if (metadata.size() > 0)
+        facts.Add("metadata", fmt::format("{} {}", metadata.size(), metadata.size() == 1 ? "property" : "properties"));
+    for (const flvdmx::Property& property : metadata) {
+        const bool repeated = facts.Object().contains(property.name);
+        facts.Add("  " + Printable(property.name), ValueText(property),
+                  repeated ? Json::object() : Json{{property.name, ValueOf(property)}});
+    }
+    return facts;
+}
+
+Facts FileFacts(const Subject& subject)
+{
+    Facts facts;
     const Input& input = subject.input;
-    Listing listing;
-    listing.Line("container", "FLV");
-    listing.Line("size", fmt::format("{} bytes", input.info.size));
-    listing.Line("streams", StreamsText(input));
-    listing.Line("duration", input.info.duration.count() != 0 ? FormatTime(input.info.duration) : "unknown");
-    if (subject.scan && subject.scan->jumps > 0)
-        listing.Line("played duration", fmt::format("{}, timestamps jump {}", FormatTime(subject.scan->played),
-                                                    Plural(subject.scan->jumps, "time")));
-    listing.Line("first timestamp", FormatTime(input.info.start_time));
-    listing.Quantity("data rate", static_cast<double>(DataRate(subject)), "kbit/s");
-    listing.Line("seek method", SeekMethodText(input.info.seek_method));
+    const flvdmx::Info& info = input.info;
+    facts.Add("container", "FLV", {{"file", input.name}, {"container", "FLV"}});
+    facts.Add("size", fmt::format("{} bytes", info.size), {{"size", info.size}});
+    facts.Add("streams", info.video ? info.audio ? "video and audio" : "video only" : "audio only");
+    facts.Add("duration", info.duration.count() != 0 ? FormatTime(info.duration) : "unknown",
+              {{"duration_ms", info.duration.count()}});
+    if (const auto& scan = subject.scan)
+        facts.Add("played duration",
+                  scan->jumps == 0
+                      ? ""
+                      : fmt::format("{}, timestamps jump {}", FormatTime(scan->played), Plural(scan->jumps, "time")),
+                  {{"played_duration_ms", scan->played.count()}, {"timestamp_restarts", scan->jumps}});
+    facts.Add("first timestamp", FormatTime(info.start_time), {{"first_timestamp_ms", info.start_time.count()}});
+    const uint64_t rate = DataRate(subject);
+    facts.Add("data rate", Quantity(static_cast<double>(rate), "kbit/s"), {{"data_rate_kbit", rate}});
+    facts.Add("seek method", SeekMethodText(info.seek_method), {{"seek_method", SeekMethodName(info.seek_method)}});
     const uint32_t entries = IndexEntries(input);
-    listing.Line("keyframe index", entries == 0 ? "none" : fmt::format("{} entries", entries));
-    if (subject.scan)
-        listing.Line("skipped", Plural(BytesSkipped(subject), "byte"));
-    if (input.info.video)
-        ListVideo(listing, subject, *input.info.video);
-    if (input.info.audio)
-        ListAudio(listing, subject, *input.info.audio);
-    if (subject.metadata.size() > 0)
-        listing.Line("metadata", fmt::format("{} {}", subject.metadata.size(),
-                                             subject.metadata.size() == 1 ? "property" : "properties"));
-    for (const flvdmx::Property& property : subject.metadata)
-        listing.Line("  " + Printable(property.name), ValueText(property));
-    return DisplayName(input.name) + "\n" + listing.Text();
-}
-
-template <typename Value> Json OrNull(bool known, const Value& value)
-{
-    return known ? Json(value) : Json();
-}
-
-Json VideoObject(const Subject& subject, const flvdmx::VideoInfo& video)
-{
-    const auto last = LastKeyframe(subject);
-    const bool avc = !video.config.empty();
-    const PictureSize size = PictureSizeOf(video);
-    Json object = {{"codec", CodecName(video.codec)},
-                   {"fourcc", OrNull(!video.fourcc.empty(), video.fourcc)},
-                   {"width", size.width},
-                   {"height", size.height},
-                   {"frame_rate", video.frame_rate},
-                   {"last_keyframe_ms", last ? Json(last->count()) : Json()},
-                   {"profile", OrNull(avc, AvcProfileName(video.config))},
-                   {"level", OrNull(avc, AvcLevelName(video.config))},
-                   {"config", OrNull(avc, Hex(video.config))}};
+    facts.Add("keyframe index", entries == 0 ? "none" : fmt::format("{} entries", entries),
+              {{"index_entries", entries}});
+    facts.Add("", "",
+              {{"shorter_than_metadata", input.Instance().file_shorter_than_meta != 0},
+               {"bytes_behind_last_tag", input.Rest()}});
     if (subject.scan) {
-        object["frames"] = subject.scan->videoFrames;
-        object["keyframes"] = subject.scan->keyframes;
-        const bool known = subject.scan->keyframes > 1;
-        object["keyframe_distance_ms"] = {{"average", OrNull(known, subject.scan->averageDistanceMs)},
-                                          {"longest", OrNull(known, subject.scan->longestDistanceMs)}};
+        const auto skipped = static_cast<uint64_t>(subject.scan->bytesSkipped + input.Rest());
+        facts.Add("skipped", Plural(skipped, "byte"), {{"bytes_left_out", skipped}});
     }
-    return object;
-}
-
-Json AudioObject(const Subject& subject, const flvdmx::AudioInfo& audio)
-{
-    Json object = {{"codec", CodecName(audio.codec)},
-                   {"format_tag", audio.format_tag},
-                   {"sample_rate", SampleRate(audio)},
-                   {"header_sample_rate", HeaderSampleRate(subject.input)},
-                   {"sample_size", IsPcm(audio.codec) ? subject.input.PcmSampleSize() : audio.sample_size},
-                   {"channels", audio.channels},
-                   {"data_rate_kbit", audio.data_rate}};
-    if (!audio.config.empty()) {
-        const AacConfig aac = ParseAacConfig(audio.config);
-        object["object_type"] = aac.objectType;
-        object["output_sample_rate"] = aac.outputSampleRate;
-    }
-    object["config"] = OrNull(!audio.config.empty(), Hex(audio.config));
-    if (subject.scan)
-        object["frames"] = subject.scan->audioFrames;
-    return object;
-}
-
-Json InfoObject(const Subject& subject)
-{
-    const Input& input = subject.input;
-    Json object = {{"file", input.name},
-                   {"container", "FLV"},
-                   {"size", input.info.size},
-                   {"duration_ms", input.info.duration.count()},
-                   {"first_timestamp_ms", input.info.start_time.count()},
-                   {"data_rate_kbit", DataRate(subject)},
-                   {"seek_method", SeekMethodName(input.info.seek_method)},
-                   {"index_entries", IndexEntries(input)},
-                   {"shorter_than_metadata", input.Instance().file_shorter_than_meta != 0},
-                   {"bytes_behind_last_tag", input.Rest()}};
-    if (subject.scan) {
-        object["played_duration_ms"] = subject.scan->played.count();
-        object["timestamp_restarts"] = subject.scan->jumps;
-        object["bytes_left_out"] = BytesSkipped(subject);
-    }
-    if (input.info.video)
-        object["video"] = VideoObject(subject, *input.info.video);
-    if (input.info.audio)
-        object["audio"] = AudioObject(subject, *input.info.audio);
-    for (const auto& [key, why] :
-         {std::pair("video_not_played", subject.noVideo), std::pair("audio_not_played", subject.noAudio)})
-        if (!why.empty())
-            object[key] = why;
-    Json& metadata = object["metadata"] = Json::object();
-    for (const flvdmx::Property& property : subject.metadata)
-        if (!metadata.contains(property.name))
-            metadata[property.name] = ValueOf(property);
-    return object;
+    if (info.video)
+        facts.Add("video", VideoFacts(subject, *info.video));
+    if (info.audio)
+        facts.Add("audio", AudioFacts(subject, *info.audio));
+    for (size_t i = 0; i < STREAMS.size(); ++i)
+        if (!subject.notPlayed.at(i).empty())
+            facts.Add("", "", {{fmt::format("{}_not_played", StreamName(STREAMS.at(i))), subject.notPlayed.at(i)}});
+    facts.Add("metadata", MetadataFacts(subject.metadata));
+    return facts;
 }
 
 void Warn(const Subject& subject)
@@ -364,9 +325,10 @@ void Warn(const Subject& subject)
     if (subject.scan && subject.scan->jumps > 0)
         Complain(input.name, fmt::format("warning: the timestamps jump: the last one is {}, but the frames play for {}",
                                          FormatTime(input.info.duration), FormatTime(subject.scan->played)));
-    for (const auto& [stream, why] : {std::pair("video", subject.noVideo), std::pair("audio", subject.noAudio)})
-        if (!why.empty())
-            Complain(input.name, fmt::format("warning: the {} is not played: {}", stream, why));
+    for (size_t i = 0; i < STREAMS.size(); ++i)
+        if (!subject.notPlayed.at(i).empty())
+            Complain(input.name, fmt::format("warning: the {} is not played: {}", StreamName(STREAMS.at(i)),
+                                             subject.notPlayed.at(i)));
     if (const std::string fault = ConfigFault(input); !fault.empty())
         Complain(input.name, "warning: " + fault);
     if (const std::string note = UndefinedCodec(input); !note.empty())
@@ -391,12 +353,13 @@ Json Inspect(const std::string& name, const InfoOptions& options, bool first)
     if (options.scan || SeemsToRestart(input))
         subject.scan = ScanFile(input);
     Played played(input);
-    subject.noVideo = WhyNoStream(played, flvdmx::Stream::video, input);
-    subject.noAudio = WhyNoStream(played, flvdmx::Stream::audio, input);
+    for (size_t i = 0; i < STREAMS.size(); ++i)
+        subject.notPlayed.at(i) = WhyNoStream(played, STREAMS.at(i), input);
     Warn(subject);
+    const Facts facts = FileFacts(subject);
     if (!options.json)
-        Print((first ? "" : "\n") + InfoText(subject));
-    return options.json ? InfoObject(subject) : Json();
+        Print((first ? "" : "\n") + DisplayName(name) + "\n" + facts.Text());
+    return facts.Object();
 }
 
 } // namespace

@@ -72,10 +72,16 @@ CLI::Option* AddOutput(CLI::App* command, std::string& out, bool& force, const c
     return output;
 }
 
-CLI::Option* AddTime(CLI::App* command, const char* name, const std::function<void(int32_t)>& take, const char* help)
+template <typename Time> CLI::Option* AddTime(CLI::App* command, const char* name, Time& time, const char* help)
 {
-    const auto parse = [take](const std::string& text) { take(ParseTime(text).value_or(0)); };
+    const auto parse = [&time](const std::string& text) { time = ParseTime(text).value_or(0); };
     return command->add_option_function<std::string>(name, parse, help)->check(IS_TIME)->type_name("TIME");
+}
+
+template <typename Seconds>
+CLI::Option* AddSeconds(CLI::App* command, const char* name, Seconds& seconds, const char* help)
+{
+    return command->add_option(name, seconds, help)->check(IS_SECONDS)->type_name("S");
 }
 
 void AddCount(CLI::App* command, const char* name, uint64_t& count, const char* help)
@@ -101,7 +107,7 @@ CLI::Option* AddChoice(CLI::App* command, const char* name, const Choices<Value>
         ->type_name("NAME");
 }
 
-const Choices<uint32_t> STREAMS = {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}};
+const Choices<uint32_t> STREAM_NAMES = {{"video", FLVD_STREAM_VIDEO}, {"audio", FLVD_STREAM_AUDIO}};
 
 void AddInfo(CLI::App* command, InfoOptions& options)
 {
@@ -112,17 +118,6 @@ void AddInfo(CLI::App* command, InfoOptions& options)
     command->footer("  flvdmx info clip.flv\n"
                     "  flvdmx info --scan --json *.flv\n"
                     "  curl http://host/clip.flv | flvdmx info -");
-}
-
-CLI::Option* AddFollow(CLI::App* command, FramesOptions& options)
-{
-    command->add_flag("--follow", options.follow,
-                      "Print frames as they arrive: the file is still being written,\nor does not exist yet");
-    return command
-        ->add_option("--timeout", options.timeoutSeconds,
-                     "With --follow: stop when the file has not grown for S seconds (default 5)")
-        ->check(IS_SECONDS)
-        ->type_name("S");
 }
 
 void AddFrames(CLI::App* command, FramesOptions& options)
@@ -136,17 +131,18 @@ void AddFrames(CLI::App* command, FramesOptions& options)
             "Print comma-separated values, with column names on the first line")
         ->excludes(json);
     command->add_flag("--keyframes", options.keyframes, "List only video keyframes");
-    AddChoice(command, "--stream", STREAMS, options.streams, "List only this stream: video or audio");
+    AddChoice(command, "--stream", STREAM_NAMES, options.streams, "List only this stream: video or audio");
     AddCount(command, "--count", options.count, "Stop after N frames");
-    AddTime(
-        command, "--from", [&options](int32_t ms) { options.fromMs = ms; },
-        "Begin at the keyframe at or before TIME; without video, at TIME");
-    AddTime(
-        command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "Omit frames later than TIME");
+    AddTime(command, "--from", options.fromMs, "Begin at the keyframe at or before TIME; without video, at TIME");
+    AddTime(command, "--to", options.toMs, "Omit frames later than TIME");
     command->add_flag("--separate-audio", options.separateAudio,
                       "Use a separate audio reader; the streams are merged by time");
-    const CLI::Option* const timeout = AddFollow(command, options);
-    command->callback([&options, timeout] {
+    command->add_flag("--follow", options.follow,
+                      "Print frames as they arrive: the file is still being written,\nor does not exist yet");
+    const CLI::Option* const timeout =
+        AddSeconds(command, "--timeout", options.timeoutSeconds,
+                   "With --follow: stop when the file has not grown for S seconds (default 5)");
+    command->parse_complete_callback([&options, timeout] {
         if (timeout->count() != 0 && !options.follow)
             throw CLI::RequiresError("--timeout", "--follow");
         if (options.keyframes && options.streams == FLVD_STREAM_AUDIO)
@@ -162,8 +158,10 @@ void AddFrames(CLI::App* command, FramesOptions& options)
                     TIME_HELP));
 }
 
-void AddSeekModes(CLI::App* command, SeekOptions& options)
+void AddSeek(CLI::App* command, SeekOptions& options)
 {
+    AddFile(command, options.file);
+    AddTime(command, "TIME", options.timeMs, "Where to seek to")->required()->type_name("");
     const Choices<uint32_t> modes = {{"backward", FLVD_SEEK_BACKWARD}, {"forward", FLVD_SEEK_FORWARD}, {"auto", 0}};
     AddChoice(command, "--mode", modes, options.direction,
               "Land on the keyframe at or before TIME (backward, the default)\n"
@@ -176,16 +174,6 @@ void AddSeekModes(CLI::App* command, SeekOptions& options)
     addBit("--relative", FLVD_SEEK_RELATIVE, "TIME is an offset from the current position and may be negative");
     addBit("--end-on-miss", FLVD_SEEK_TO_END_ON_MISS, "After a miss, go to the end of the file");
     addBit("--retry-backward", FLVD_SEEK_RETRY_BACKWARD, "Try backward after a miss");
-}
-
-void AddSeek(CLI::App* command, SeekOptions& options)
-{
-    AddFile(command, options.file);
-    AddTime(
-        command, "TIME", [&options](int32_t ms) { options.timeMs = ms; }, "Where to seek to")
-        ->required()
-        ->type_name("");
-    AddSeekModes(command, options);
     AddCount(command, "--play", options.play, "Read N frames before the seek (default 0)");
     AddCount(command, "--count", options.count, "Show N frames after the seek (default 5)");
     command->add_flag("--separate-audio", options.separateAudio, "Use a separate audio reader");
@@ -195,7 +183,7 @@ void AddSeek(CLI::App* command, SeekOptions& options)
                                 "  flvdmx seek --mode forward clip.flv 1:02:03\n"
                                 "  flvdmx seek --play 500 --relative clip.flv -10",
                                 TIME_HELP));
-    command->callback([&options] {
+    command->parse_complete_callback([&options] {
         if (options.timeMs < 0 && (options.mode & FLVD_SEEK_RELATIVE) == 0)
             throw CLI::ValidationError("TIME", "a negative time needs --relative");
     });
@@ -205,7 +193,7 @@ void AddExtract(CLI::App* command, ExtractOptions& options)
 {
     AddFile(command, options.file);
     AddOutput(command, options.out, options.force, "Where to write; - is standard output");
-    AddChoice(command, "--stream", STREAMS, options.streams, "Write only this stream: video or audio");
+    AddChoice(command, "--stream", STREAM_NAMES, options.streams, "Write only this stream: video or audio");
     command->footer(
         "If the file has one stream, or --stream selects one, OUT is the name of the file to write. Two\n"
         "streams are written to two files OUT.EXTENSION, such as OUT.h264 and OUT.aac. If OUT is an existing\n"
@@ -226,17 +214,11 @@ void AddCheck(CLI::App* command, CheckOptions& options)
     command->add_option("--jobs", options.jobs, "Check up to N files at the same time, at most 256 (default 1)")
         ->check(CLI::Range(1, 256).description(""))
         ->type_name("N");
-    command
-        ->add_option("--jump", options.jumpSeconds,
-                     "Report times that jump forward by more than S seconds (default 10)")
-        ->check(IS_SECONDS)
-        ->type_name("S");
-    command
-        ->add_option("--max-gap", options.maxGapSeconds,
-                     "Report keyframes that are more than S seconds apart, and audio\n"
-                     "and video that are more than S seconds apart in the file")
-        ->check(IS_SECONDS)
-        ->type_name("S");
+    AddSeconds(command, "--jump", options.jumpSeconds,
+               "Report times that jump forward by more than S seconds (default 10)");
+    AddSeconds(command, "--max-gap", options.maxGapSeconds,
+               "Report keyframes that are more than S seconds apart, and audio\n"
+               "and video that are more than S seconds apart in the file");
     command->footer(
         "Findings, one line per cause:\n"
         "  gap                bytes that belong to no tag\n"
@@ -302,10 +284,8 @@ void AddIndex(CLI::App* command, RewriteOptions& options)
 void AddCut(CLI::App* command, RewriteOptions& options)
 {
     AddRewrite(command, options);
-    AddTime(
-        command, "--from", [&options](int32_t ms) { options.fromMs = ms; }, "Begin at the keyframe at or before TIME");
-    AddTime(
-        command, "--to", [&options](int32_t ms) { options.toMs = ms; }, "End before the keyframe at or after TIME");
+    AddTime(command, "--from", options.fromMs, "Begin at the keyframe at or before TIME");
+    AddTime(command, "--to", options.toMs, "End before the keyframe at or after TIME");
     command->add_flag("--keep-times", options.keepTimes, "Leave the timestamps as they are instead of starting at 0");
     command->footer(fmt::format("{}\n\n"
                                 "  flvdmx cut film.flv --from 1:00 --to 2:30 -o part.flv",
@@ -356,40 +336,31 @@ void OccupyStandardStreams()
             open("/dev/null", descriptor == STDERR_FILENO ? O_RDWR | O_CLOEXEC : O_RDONLY | O_CLOEXEC);
 }
 
-// The commands, and what runs each.
-class Commands {
-public:
-    explicit Commands(CLI::App& app) : m_app(app) {}
+// Adds a command that sets the exit status when it has run.
+template <typename Options>
+void AddCommand(CLI::App& app, int& status, const char* name, const char* help, void (*describe)(CLI::App*, Options&),
+                int (*execute)(const Options&))
+{
+    const auto options = std::make_shared<Options>();
+    CLI::App* const command = app.add_subcommand(name, help)->group("Commands");
+    describe(command, *options);
+    command->final_callback([&status, execute, options] { status = execute(*options); });
+}
 
-    template <typename Options>
-    void Add(const char* name, const char* help, void (*describe)(CLI::App*, Options&), int (*execute)(const Options&))
-    {
-        const auto options = std::make_shared<Options>();
-        describe(m_app.add_subcommand(name, help)->group("Commands"), *options);
-        m_names[name] = name;
-        m_run[name] = [execute, options] { return execute(*options); };
-    }
-
-    void AddHelp()
-    {
-        CLI::App* const command = m_app.add_subcommand("help", "Print help, or help for a command")->group("Commands");
-        m_names["help"] = "help";
-        AddChoice(command, "COMMAND", m_names, m_topic, "A command")->type_name("");
-        m_run["help"] = [this] {
-            Print(m_topic.empty() ? m_app.get_formatter()->make_help(&m_app, "flvdmx", CLI::AppFormatMode::Normal)
-                                  : m_app.get_subcommand(m_topic)->help("flvdmx"));
-            return DONE;
-        };
-    }
-
-    int Run() const { return m_run.at(m_app.get_subcommands().front()->get_name())(); }
-
-private:
-    CLI::App& m_app;
-    Choices<std::string> m_names;
-    std::map<std::string, std::function<int()>> m_run;
-    std::string m_topic;
-};
+void AddHelp(CLI::App& app)
+{
+    Choices<CLI::App*> topics;
+    for (CLI::App* const command : app.get_subcommands(nullptr))
+        topics[command->get_name()] = command;
+    CLI::App* const help = app.add_subcommand("help", "Print help, or help for a command")->group("Commands");
+    topics["help"] = help;
+    const auto topic = std::make_shared<CLI::App*>(&app);
+    AddChoice(help, "COMMAND", topics, *topic, "A command")->type_name("");
+    help->final_callback([&app, topic] {
+        const std::string name = *topic == &app ? "flvdmx" : "flvdmx " + (*topic)->get_name();
+        Print(app.get_formatter()->make_help(*topic, name, CLI::AppFormatMode::Normal));
+    });
+}
 
 void SetLabels(CLI::App& app)
 {
@@ -411,17 +382,17 @@ int Run(int argc, char** argv)
     app.footer("Exit status: 0 done, 1 a file could not be read, written or played, or check found something,\n"
                "2 usage error. 'flvdmx help COMMAND' explains a command.");
     app.require_subcommand(0, 1); // a missing command is reported below, after CLI11 has rejected unknown words
-    Commands commands(app);
-    commands.Add("info", "Show what is in each file", AddInfo, RunInfo);
-    commands.Add("frames", "List the frames, one per line", AddFrames, RunFrames);
-    commands.Add("seek", "Seek, and show the position reached and the frames that follow", AddSeek, RunSeek);
-    commands.Add("extract", "Write the streams to files that players accept", AddExtract, RunExtract);
-    commands.Add("check", "Find damage, jumping timestamps and a wrong keyframe index", AddCheck, RunCheck);
-    commands.Add("plot", "Draw bit rate, keyframes and interleaving over time", AddPlot, RunPlot);
-    commands.Add("repair", "Write a valid file from everything that can be played", AddRepair, RunRepair);
-    commands.Add("index", "Copy an undamaged file and give it a keyframe index", AddIndex, RunIndex);
-    commands.Add("cut", "Write part of a file, with its own index", AddCut, RunCut);
-    commands.AddHelp();
+    int status = DONE;
+    AddCommand(app, status, "info", "Show what is in each file", AddInfo, RunInfo);
+    AddCommand(app, status, "frames", "List the frames, one per line", AddFrames, RunFrames);
+    AddCommand(app, status, "seek", "Seek, and show the position reached and the frames that follow", AddSeek, RunSeek);
+    AddCommand(app, status, "extract", "Write the streams to files that players accept", AddExtract, RunExtract);
+    AddCommand(app, status, "check", "Find damage, jumping timestamps and a wrong keyframe index", AddCheck, RunCheck);
+    AddCommand(app, status, "plot", "Draw bit rate, keyframes and interleaving over time", AddPlot, RunPlot);
+    AddCommand(app, status, "repair", "Write a valid file from everything that can be played", AddRepair, RunRepair);
+    AddCommand(app, status, "index", "Copy an undamaged file and give it a keyframe index", AddIndex, RunIndex);
+    AddCommand(app, status, "cut", "Write part of a file, with its own index", AddCut, RunCut);
+    AddHelp(app);
     try {
         app.parse(Arguments(argc, argv));
         if (app.get_subcommands().empty())
@@ -436,7 +407,7 @@ int Run(int argc, char** argv)
     } catch (const CLI::ParseError& error) {
         return Usage(app, error, {argv + 1, argv + argc});
     }
-    return commands.Run();
+    return status;
 }
 
 } // namespace

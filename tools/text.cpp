@@ -5,7 +5,9 @@
 #include <cmath>
 #include <iterator>
 #include <limits>
+#include <regex>
 
+#include <boost/nowide/utf/utf.hpp>
 #include <fmt/core.h>
 
 namespace tool {
@@ -14,71 +16,15 @@ namespace {
 
 constexpr int64_t MS_PER_SECOND = 1000;
 constexpr int64_t SIXTY = 60;
-constexpr int64_t MOST_SECONDS = std::numeric_limits<int32_t>::max() / MS_PER_SECOND + 1;
-
-bool IsDigit(char c)
-{
-    return c >= '0' && c <= '9';
-}
-
-// Consumes the digits at the start of `text`: at least one, with a value that fits a time.
-std::optional<int64_t> TakeNumber(std::string_view& text)
-{
-    int64_t value = 0;
-    size_t length = 0;
-    while (length < text.size() && IsDigit(text[length])) {
-        value = value * 10 + (text[length++] - '0');
-        if (value > MOST_SECONDS)
-            return std::nullopt;
-    }
-    text.remove_prefix(length);
-    return length > 0 ? std::optional(value) : std::nullopt;
-}
-
-// Reads digits after the decimal point as milliseconds; the fourth digit rounds.
-std::optional<int64_t> ParseFraction(std::string_view digits)
-{
-    if (digits.empty())
-        return std::nullopt;
-    int64_t tenths = 0; // of a millisecond
-    for (size_t i = 0; i < 4; ++i)
-        tenths = tenths * 10 + (i < digits.size() && IsDigit(digits[i]) ? digits[i] - '0' : 0);
-    for (const char c : digits) {
-        if (!IsDigit(c))
-            return std::nullopt;
-    }
-    return (tenths + 5) / 10;
-}
-
-// Consumes `SECONDS` or `[HH:]MM:SS`; after a colon, only 0 to 59 are valid.
-std::optional<int64_t> TakeSeconds(std::string_view& text)
-{
-    std::optional<int64_t> seconds = TakeNumber(text);
-    for (int colons = 0; seconds && !text.empty() && text.front() == ':'; ++colons) {
-        text.remove_prefix(1);
-        const std::optional<int64_t> part = TakeNumber(text);
-        if (!part || *part >= SIXTY || colons == 2)
-            return std::nullopt;
-        seconds = *seconds * SIXTY + *part;
-    }
-    return seconds;
-}
 
 // Size of the UTF-8 character at the start of `text`; 0 if it is invalid or XML forbids it.
 size_t CharacterSize(std::string_view text)
 {
-    const auto byte = [text](size_t i) { return i < text.size() ? static_cast<unsigned char>(text[i]) : 0U; };
-    const uint32_t lead = byte(0);
-    const size_t size = lead < 0x80 ? 1 : lead >> 5 == 6 ? 2 : lead >> 4 == 14 ? 3 : lead >> 3 == 30 ? 4 : 0;
-    constexpr uint32_t LEAST[] = {0, 0, 0x80, 0x800, 0x10000};
-    uint32_t value = size == 1 ? lead : lead & (0x7FU >> size);
-    for (size_t i = 1; i < size; ++i) {
-        if (byte(i) >> 6 != 2)
-            return 0;
-        value = value << 6 | (byte(i) & 0x3F);
-    }
-    const bool surrogate = value >> 11 == 0x1B;
-    return value < LEAST[size] || value > 0x10FFFF || surrogate || value >> 1 == 0x7FFF ? 0 : size;
+    constexpr uint32_t FORBIDDEN = 0xFFFE; // and 0xFFFF
+    const char* end = text.data();
+    const auto code = boost::nowide::utf::utf_traits<char>::decode(end, text.data() + text.size());
+    const bool valid = boost::nowide::utf::is_valid_codepoint(code) && code >> 1 != FORBIDDEN >> 1;
+    return valid ? static_cast<size_t>(end - text.data()) : 0;
 }
 
 bool IsControl(std::string_view character)
@@ -103,23 +49,20 @@ size_t ColumnsOf(std::string_view text)
 
 std::optional<int32_t> ParseTime(std::string_view text)
 {
-    text.remove_prefix(std::min(text.find_first_not_of(' '), text.size()));
-    const bool negative = !text.empty() && text.front() == '-';
-    if (negative || (!text.empty() && text.front() == '+'))
-        text.remove_prefix(1);
-    const std::optional<int64_t> seconds = TakeSeconds(text);
-    if (!seconds)
+    static const std::regex FORMAT(R"( {0,9}([-+]?)(?:(?:(\d{1,9}):)?(\d{1,9}):)?(\d{1,9})(\.\d{1,20})?)");
+    enum : size_t { SIGN = 1, HOURS, MINUTES, SECONDS, FRACTION };
+    std::cmatch parts;
+    if (!std::regex_match(text.data(), text.data() + text.size(), parts, FORMAT))
         return std::nullopt;
-    int64_t milliseconds = *seconds * MS_PER_SECOND;
-    if (!text.empty()) {
-        const std::optional<int64_t> fraction = text.front() == '.' ? ParseFraction(text.substr(1)) : std::nullopt;
-        if (!fraction)
-            return std::nullopt;
-        milliseconds += *fraction;
-    }
+    const auto number = [&parts](size_t part) { return parts[part].matched ? std::stoll(parts[part]) : 0; };
+    if ((parts[HOURS].matched && number(MINUTES) >= SIXTY) || (parts[MINUTES].matched && number(SECONDS) >= SIXTY))
+        return std::nullopt;
+    const int64_t seconds = (number(HOURS) * SIXTY + number(MINUTES)) * SIXTY + number(SECONDS);
+    const double fraction = parts[FRACTION].matched ? std::stod("0" + parts[FRACTION].str()) : 0;
+    const int64_t milliseconds = seconds * MS_PER_SECOND + std::llround(fraction * MS_PER_SECOND);
     if (milliseconds > std::numeric_limits<int32_t>::max())
         return std::nullopt;
-    return static_cast<int32_t>(negative ? -milliseconds : milliseconds);
+    return static_cast<int32_t>(parts[SIGN] == "-" ? -milliseconds : milliseconds);
 }
 
 std::string FormatTime(int64_t milliseconds)

@@ -164,10 +164,10 @@ private:
     friend class File;
 
     // True if this is the tag of a payload of this size, after which the reader stands at `payload_end`.
-    bool has_payload(Stream of, uint32_t size, int64_t payload_end) const
+    bool has_payload(Stream of, uint32_t payload, int64_t payload_end) const
     {
         const uint32_t type = of == Stream::video ? FLVD_TAG_TYPE_VIDEO : FLVD_TAG_TYPE_AUDIO;
-        return word(0) == (type << 24 | size) && end() == payload_end;
+        return word(0) == (type << 24 | payload) && end() == payload_end;
     }
     // Without payload, this is a byte of the back-pointer, which is 0 in a valid tag.
     uint8_t first() const { return m_bytes[header_size]; }
