@@ -9,7 +9,7 @@
 
 #include <fmt/core.h>
 
-#include "tools/text.h"
+#include "tools/report.h"
 
 namespace tool {
 

@@ -21,7 +21,6 @@
 #include "tools/input.h"
 #include "tools/progress.h"
 #include "tools/report.h"
-#include "tools/text.h"
 
 namespace tool {
 

@@ -7,7 +7,7 @@
 #include <boost/crc.hpp>
 #include <fmt/core.h>
 
-#include "tools/text.h"
+#include "tools/report.h"
 
 namespace tool {
 

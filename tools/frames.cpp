@@ -17,7 +17,6 @@
 #include "tools/played.h"
 #include "tools/progress.h"
 #include "tools/report.h"
-#include "tools/text.h"
 #include "tools/times.h"
 
 namespace tool {

@@ -18,7 +18,6 @@
 #include "tools/progress.h"
 #include "tools/report.h"
 #include "tools/tags.h"
-#include "tools/text.h"
 #include "tools/times.h"
 
 namespace tool {

@@ -18,7 +18,6 @@
 
 #include "tools/commands.h"
 #include "tools/report.h"
-#include "tools/text.h"
 
 #ifndef FLVDMX_VERSION
 #define FLVDMX_VERSION "unknown version"

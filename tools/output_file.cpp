@@ -17,7 +17,6 @@
 
 #include "tools/input.h"
 #include "tools/report.h"
-#include "tools/text.h"
 
 namespace tool {
 

@@ -11,7 +11,6 @@
 
 #include "tools/codecs.h"
 #include "tools/report.h"
-#include "tools/text.h"
 
 namespace tool {
 

@@ -17,7 +17,6 @@
 #include "tools/played.h"
 #include "tools/report.h"
 #include "tools/svg.h"
-#include "tools/text.h"
 #include "tools/timeline.h"
 
 namespace tool {

@@ -8,7 +8,7 @@
 #include <sys/ioctl.h>
 #include <unistd.h>
 
-#include "tools/text.h"
+#include "tools/report.h"
 
 namespace tool {
 

@@ -13,7 +13,6 @@
 #include "tools/input.h"
 #include "tools/played.h"
 #include "tools/report.h"
-#include "tools/text.h"
 
 namespace tool {
 

@@ -4,7 +4,7 @@
 #include <cmath>
 #include <cstdlib>
 
-#include "tools/text.h"
+#include "tools/report.h"
 
 namespace tool {
 
