@@ -125,24 +125,30 @@ std::string AvcProfileName(flvdmx::Bytes record)
     }
 }
 
+// A start code is two bytes longer than the length of a parameter set, so the record at most doubles.
+std::vector<uint8_t> AvcParameterSets(flvdmx::Bytes record)
+{
+    std::vector<uint8_t> sets(2 * record.size());
+    const int32_t size = FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()), sets.data(),
+                                                      static_cast<int32_t>(sets.size()));
+    sets.resize(size > 0 ? static_cast<size_t>(size) : 0);
+    return sets;
+}
+
 // The library reads the chroma format of High 4:2:2 (122) and lower profiles only. Later profiles have the same fields
 // in the same place, so it reads their sets under that number.
 PictureSize PictureSizeOf(const flvdmx::VideoInfo& video)
 {
-    constexpr size_t PROFILE = 1;     // AVCProfileIndication
-    constexpr size_t SET_PROFILE = 5; // profile_idc in the first set, after a start code and the NAL unit header
+    constexpr size_t PROFILE = 5; // profile_idc in the first set, after a start code and the NAL unit header
     constexpr std::array<uint8_t, 9> WITH_CHROMA_FORMAT = {44, 83, 86, 118, 128, 134, 135, 138, 244};
     constexpr uint8_t HIGH_422 = 122;
-    const auto* const known =
-        std::find(WITH_CHROMA_FORMAT.begin(), WITH_CHROMA_FORMAT.end(), flvdmx::Bytes(video.config)[PROFILE]);
-    std::vector<uint8_t> sets(2 * video.config.size()); // start codes are two bytes longer than lengths
-    const int32_t size = FLVD_GetAVCSeqHeaderFromAvcC(video.config.data(), static_cast<int32_t>(video.config.size()),
-                                                      sets.data(), static_cast<int32_t>(sets.size()));
-    flvd_video_info_t picture{};
-    if (known == WITH_CHROMA_FORMAT.end() || size <= int32_t{SET_PROFILE})
+    std::vector<uint8_t> sets = AvcParameterSets(video.config);
+    const uint8_t profile = flvdmx::Bytes(sets)[PROFILE];
+    if (std::find(WITH_CHROMA_FORMAT.begin(), WITH_CHROMA_FORMAT.end(), profile) == WITH_CHROMA_FORMAT.end())
         return {video.width, video.height};
-    sets[SET_PROFILE] = HIGH_422;
-    FLVD_ParseVideoHeader(static_cast<int32_t>(video.codec), sets.data(), size, &picture);
+    sets[PROFILE] = HIGH_422;
+    flvd_video_info_t picture{};
+    FLVD_ParseVideoHeader(static_cast<int32_t>(video.codec), sets.data(), static_cast<int32_t>(sets.size()), &picture);
     return {picture.width, picture.height};
 }
 

@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <string>
+#include <vector>
 
 #include "flvdmx/flvdmx.hpp"
 
@@ -41,6 +42,9 @@ std::string AacObjectTypeName(uint32_t objectType);
 
 /** @return the profile of an AVCDecoderConfigurationRecord, such as "High", or "profile 44" for an unknown one */
 std::string AvcProfileName(flvdmx::Bytes record);
+
+/** @return the parameter sets of such a record, each after a start code of four bytes; empty if it is damaged */
+std::vector<uint8_t> AvcParameterSets(flvdmx::Bytes record);
 
 /** Width and height in pixels; 0 if unknown. */
 struct PictureSize {

@@ -12,7 +12,6 @@
 
 #include <fmt/core.h>
 
-#include "flvdmx/layers.h"
 #include "tools/codecs.h"
 #include "tools/commands.h"
 #include "tools/frame_source.h"
@@ -82,7 +81,7 @@ public:
         constexpr size_t LEAST_RECORD_SIZE = 7;
         constexpr size_t LENGTH_SIZE_OFFSET = 4; // of lengthSizeMinusOne, two bits
         const uint32_t lengthSize = (record[LENGTH_SIZE_OFFSET] & 3U) + 1;
-        Buffer sets = ParameterSets(record);
+        Buffer sets = AvcParameterSets(record);
         if (record.size() < LEAST_RECORD_SIZE || lengthSize == 3 || sets.empty())
             return "the AVC configuration is damaged";
         m_parameterSets = std::move(sets);
@@ -119,16 +118,6 @@ public:
 
 private:
     static constexpr std::array<uint8_t, 4> START_CODE = {0, 0, 0, 1};
-
-    // A start code is two bytes longer than the length field of a parameter set, so the record at most doubles.
-    static Buffer ParameterSets(flvdmx::Bytes record)
-    {
-        Buffer sets(2 * record.size());
-        const int32_t size = FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()),
-                                                          sets.data(), static_cast<int32_t>(sets.size()));
-        sets.resize(size > 0 ? static_cast<size_t>(size) : 0);
-        return sets;
-    }
 
     Buffer m_parameterSets;
     uint32_t m_lengthSize = 4;
@@ -351,18 +340,10 @@ private:
 std::vector<StreamWriter> MakeWriters(const ExtractOptions& options, const Input& input)
 {
     std::vector<StreamWriter> writers;
-    std::string missing;
-    for (const flvdmx::Stream stream : STREAMS) {
-        if ((options.streams & static_cast<uint32_t>(stream)) == 0)
-            continue;
-        if (input.Has(stream))
+    RequireStream(input, options.streams);
+    for (const flvdmx::Stream stream : STREAMS)
+        if (input.Has(stream) && (options.streams & static_cast<uint32_t>(stream)) != 0)
             writers.emplace_back(input, stream);
-        else if (const std::string why = Played(input).WhyNoStream(stream); !why.empty())
-            missing = " that is played: " + why;
-    }
-    if (writers.empty())
-        throw FileError(input.name, fmt::format("the file has no {} stream{}",
-                                                StreamName(static_cast<flvdmx::Stream>(options.streams)), missing));
     if (options.out == STANDARD_STREAM && writers.size() > 1)
         throw FileError(input.name,
                         "standard output takes only one stream: select it with --stream video or --stream audio");

@@ -177,12 +177,7 @@ void PrintComplete(const FramesOptions& options)
     Input input(options.file, OpenOptions(options));
     input.WarnIfCutShort();
     const uint32_t streams = WantedStreams(options) & input.Streams();
-    if (streams == 0) {
-        const auto wanted = static_cast<flvdmx::Stream>(WantedStreams(options));
-        const std::string why = Played(input).WhyNoStream(wanted);
-        throw FileError(options.file, fmt::format("the file has no {} stream{}", StreamName(wanted),
-                                                  why.empty() ? "" : " that is played: " + why));
-    }
+    RequireStream(input, WantedStreams(options));
     WarnOfUnplayed(input);
     if (options.fromMs || options.toMs)
         WarnOfRestarts(input);

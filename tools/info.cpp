@@ -92,16 +92,16 @@ uint32_t IndexEntries(const Input& input)
     return index.times_offset != 0 && index.positions_offset != 0 ? index.entry_count : 0;
 }
 
-const char* SeekMethodName(flvdmx::SeekMethod method)
-{
-    constexpr std::array NAMES = {"none", "index", "scan"};
-    return NAMES[std::min<size_t>(static_cast<size_t>(method), NAMES.size() - 1)];
-}
+struct SeekMethodText {
+    const char* name;
+    const char* text;
+};
 
-const char* SeekMethodText(flvdmx::SeekMethod method)
+const SeekMethodText& TextOf(flvdmx::SeekMethod method)
 {
-    constexpr std::array TEXTS = {"none: seeking is not possible", "by the keyframe index", "by scanning"};
-    return TEXTS[std::min<size_t>(static_cast<size_t>(method), TEXTS.size() - 1)];
+    static constexpr std::array<SeekMethodText, 3> TEXTS = {
+        {{"none", "none: seeking is not possible"}, {"index", "by the keyframe index"}, {"scan", "by scanning"}}};
+    return TEXTS.at(std::min<size_t>(static_cast<size_t>(method), TEXTS.size() - 1));
 }
 
 // The sample rate in the codec byte of the audio tags. AAC and MP3 streams state their own.
@@ -295,7 +295,7 @@ Facts FileFacts(const Subject& subject)
     facts.Add("first timestamp", FormatTime(info.start_time), {{"first_timestamp_ms", info.start_time.count()}});
     const uint64_t rate = DataRate(subject);
     facts.Add("data rate", Quantity(static_cast<double>(rate), "kbit/s"), {{"data_rate_kbit", rate}});
-    facts.Add("seek method", SeekMethodText(info.seek_method), {{"seek_method", SeekMethodName(info.seek_method)}});
+    facts.Add("seek method", TextOf(info.seek_method).text, {{"seek_method", TextOf(info.seek_method).name}});
     const uint32_t entries = IndexEntries(input);
     facts.Add("keyframe index", entries == 0 ? "none" : fmt::format("{} entries", entries),
               {{"index_entries", entries}});

@@ -43,11 +43,10 @@ std::string CodecOf(const Tag& tag)
 bool IsValidAvcConfig(flvdmx::Bytes record)
 {
     constexpr auto AVC = static_cast<int32_t>(flvdmx::VideoCodec::avc);
-    std::array<uint8_t, MOST_SET_BYTES> sets{};
+    const std::vector<uint8_t> sets = AvcParameterSets(record);
     flvd_video_info_t picture{};
-    const int32_t size = FLVD_GetAVCSeqHeaderFromAvcC(record.data(), static_cast<int32_t>(record.size()), sets.data(),
-                                                      int32_t{MOST_SET_BYTES});
-    return size > 0 && FLVD_ParseVideoHeader(AVC, sets.data(), size, &picture) == 0;
+    return !sets.empty() && sets.size() <= MOST_SET_BYTES &&
+           FLVD_ParseVideoHeader(AVC, sets.data(), static_cast<int32_t>(sets.size()), &picture) == 0;
 }
 
 // The first tag of a stream that has data, if it is near the beginning, and the number of tags before it.
@@ -249,6 +248,16 @@ uint32_t AnnouncedStreams(TagReader& reader)
     const uint8_t flags = bytes != nullptr ? *bytes : 0;
     return ((flags & VIDEO_FLAG) != 0 ? uint32_t{FLVD_STREAM_VIDEO} : 0) |
            ((flags & AUDIO_FLAG) != 0 ? uint32_t{FLVD_STREAM_AUDIO} : 0);
+}
+
+void RequireStream(const Input& input, uint32_t streams)
+{
+    if ((input.Streams() & streams) != 0)
+        return;
+    const auto stream = static_cast<flvdmx::Stream>(streams);
+    const std::string why = Played(input).WhyNoStream(stream);
+    throw FileError(input.name, fmt::format("the file has no {} stream{}", StreamName(stream),
+                                            why.empty() ? "" : " that is played: " + why));
 }
 
 void WarnOfUnplayed(const Input& input, uint32_t streams)

@@ -79,6 +79,9 @@ std::string UndefinedCodec(const Input& input);
 /** @return FLVD_STREAM_* bits of the streams that the file header announces */
 uint32_t AnnouncedStreams(TagReader& reader);
 
+/** Throws FileError unless the input has one of these streams (FLVD_STREAM_* bits). */
+void RequireStream(const Input& input, uint32_t streams);
+
 /** Warns on standard error about those of these streams (FLVD_STREAM_* bits) that the file has but that are not played,
  *  and why. */
 void WarnOfUnplayed(const Input& input, uint32_t streams = FLVD_STREAM_VIDEO | FLVD_STREAM_AUDIO);
