@@ -174,6 +174,7 @@ void CheckOpened(std::vector<Subject> subjects, const CheckOptions& options, con
             progress(position);
     };
     std::vector<std::packaged_task<Json()>> tasks;
+    tasks.reserve(subjects.size());
     for (Subject& subject : subjects)
         tasks.emplace_back([&] { return Check(subject, options, show); });
     boost::asio::thread_pool pool(

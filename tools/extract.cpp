@@ -235,10 +235,11 @@ public:
 // AVC as Annex B, AAC as ADTS, PCM as WAV, MP3 unchanged, others raw.
 std::unique_ptr<StreamFormat> FormatOf(const Input& input, flvdmx::Stream stream)
 {
-    if (stream == flvdmx::Stream::video)
-        return input.info.video->codec == flvdmx::VideoCodec::avc
-                   ? std::unique_ptr<StreamFormat>(std::make_unique<AnnexB>())
-                   : std::make_unique<Raw>("video");
+    if (stream == flvdmx::Stream::video) {
+        if (input.info.video->codec == flvdmx::VideoCodec::avc)
+            return std::make_unique<AnnexB>();
+        return std::make_unique<Raw>("video");
+    }
     switch (input.info.audio->codec) {
     case flvdmx::AudioCodec::aac:
         return std::make_unique<Adts>();
