@@ -170,8 +170,8 @@ TEST_P(Sample, IsDescribedAndPlayed)
 }
 INSTANTIATE_TEST_SUITE_P(Interface, Sample, testing::ValuesIn(g_samples));
 
-// Tests values that the samples lack: negative offsets, frame types, extended timestamps, a first timestamp other than
-// 0, script data and damage between frames; sizes below and above the cache.
+// Tests frames and tag headers with values that the samples lack: negative offsets, frame types, extended timestamps, a
+// first timestamp other than 0, script data and damage between frames; sizes below and above the cache.
 TEST(Interface, DescribesEachFrame)
 {
     const auto picture = [](uint32_t ts, int32_t offset, size_t size) {
@@ -187,6 +187,13 @@ TEST(Interface, DescribesEachFrame)
         bool keyframe;
     } wanted[] = {{3, 0, 0, true},           {4, 8, -8, false}, {5, 16, 0, true}, {8, 40, 0x7FFFFF, false},
                   {9, 48, -0x800000, false}, {10, 64, 0, true}, {12, 80, 0, true}};
+    for (const Tag& tag : flv.tags) {
+        const flvdmx::Tag read(tag.offset, {&flv.bytes[static_cast<size_t>(tag.offset)], 16});
+        EXPECT_EQ(std::tuple(read.end(), read.timestamp(), read.is_script(), read.has_frame(), read.frame_size()),
+                  std::tuple(tag.end(), tag.timestamp, tag.type == 18, tag.is_frame(),
+                             tag.is_frame() ? tag.frame().size() : 0));
+        EXPECT_EQ(read.is_video() && read.has_frame() && read.is_keyframe(), tag.is_keyframe());
+    }
     const Memory memory(flv.bytes);
     for (const bool apart : {false, true}) {
         auto file = memory.open({.separate_audio_reader = apart});

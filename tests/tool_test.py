@@ -75,7 +75,6 @@ def milliseconds(text):
 
 # 350 x 242 pixels, which the library misreads.
 HIGH_444 = "01f4000dffe1001b67f4000d919b282c10f71f80880000030008000003019078a14cb001000668ebe3c44844fff8f800"
-TAGS_B = split_tags(sample_bytes("avc_bframes_aac"))[1]
 AVC, AVC_BYTES = Expected("avc_aac"), sample_bytes("avc_aac")
 HEADER, TAGS = split_tags(AVC_BYTES)
 APART = HEADER + b"".join(sorted(TAGS, key=lambda tag: -tag[0]))  # script, video, audio
@@ -156,11 +155,6 @@ class Frames(Case):
         rows = list(csv.DictReader(self.tool("frames", "--csv", sample("avc_bframes_aac")).splitlines()))
         self.assertEqual([{**row, "keyframe": bool(int(row["keyframe"]))} for row in rows],
                          [{key: value if key == "keyframe" else str(value) for key, value in o.items()} for o in objects])
-        tags = {13 + sum(map(len, TAGS_B[:i])): tag for i, tag in enumerate(TAGS_B)}
-        for o in objects:
-            tag = tags[o["position"]]
-            offset = int.from_bytes(tag[13:16], "big", signed=True) if tag[0] == 9 else 0
-            self.assertEqual((o["presentation_ms"] - o["time_ms"], o["keyframe"]), (offset, tag[11] >> 4 != 2))
         self.assertTrue(any(o["presentation_ms"] > o["time_ms"] for o in objects))
 
 
@@ -325,12 +319,8 @@ class Seek(Case):
             self.assertEqual(found["position"] == AVC.size, "--end-on-miss" in arguments)
         found = self.seek(sample("avc_aac"), "--mode", "forward", "--retry-backward", behind)
         self.assertEqual(found["landed"]["position"], AVC.keyframes[-1][1])
-
-    def test_text(self):
-        time_ms, position, _ = AVC.keyframes[1]
-        text = self.tool("seek", "--count", 2, "--mode", "forward", sample("avc_aac"), time_ms / 1000)
-        self.assertRegex(text, rf"landed +0:00:0\d\.\d{{3}}\nkeyframe +yes\nposition +byte {position}\n")
-        self.assertEqual(len(text.splitlines()), 7)
+        text = self.tool("seek", "--count", 2, "--mode", "forward", sample("avc_aac"), "0.1")
+        self.assertRegex(text, rf"\Asought .*\nlanded .*\nkeyframe +yes\nposition +byte {AVC.keyframes[1][1]}\n number(.*\n){{3}}\Z")
 
 
 class Failures(Case):
