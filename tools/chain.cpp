@@ -71,28 +71,35 @@ void Findings::Add(const char* kind, const std::string& cause, int64_t offset, c
                    const Json& more)
 {
     m_counts[kind] = m_counts.value(kind, uint64_t{0}) + 1;
-    const std::string key = std::string(kind) + ' ' + cause;
-    if (const auto known = m_causes.find(key); known != m_causes.end()) {
-        Json& finding = m_list[known->second];
-        finding["count"] = finding["count"].get<uint64_t>() + 1;
-        finding["last_offset"] = offset;
-        return;
-    }
-    ++m_total;
-    if (m_list.size() >= MOST_LISTED)
-        return;
-    if (!cause.empty())
-        m_causes[key] = m_list.size();
-    Json finding = {{"kind", kind}, {"offset", offset}, {"count", 1}};
-    finding.update(more);
-    finding["text"] = text;
-    m_list.push_back(finding);
+    if (Enter(m_list, kind, cause, offset, text, more))
+        ++m_total;
 }
 
-void Findings::Note(const char* kind, int64_t offset, const std::string& text)
+void Findings::Note(const char* kind, const std::string& cause, int64_t offset, const std::string& text)
 {
-    if (m_notes.size() < MOST_LISTED)
-        m_notes.push_back({{"kind", kind}, {"offset", offset}, {"text", text}});
+    Enter(m_notes, kind, cause, offset, text, Json::object());
+}
+
+// Returns false if an earlier entry has the same cause.
+bool Findings::Enter(Json& list, const char* kind, const std::string& cause, int64_t offset, const std::string& text,
+                     const Json& more)
+{
+    const std::string key = std::string(kind) + ' ' + cause;
+    if (const auto known = m_causes.find(key); known != m_causes.end()) {
+        Json& entry = list[known->second];
+        entry["count"] = entry["count"].get<uint64_t>() + 1;
+        entry["last_offset"] = offset;
+        return false;
+    }
+    if (list.size() >= MOST_LISTED)
+        return true;
+    if (!cause.empty())
+        m_causes[key] = list.size();
+    Json entry = {{"kind", kind}, {"offset", offset}, {"count", 1}};
+    entry.update(more);
+    entry["text"] = text;
+    list.push_back(entry);
+    return true;
 }
 
 void Findings::WriteTo(Json& object, int64_t lost) const
@@ -200,7 +207,7 @@ void Chain::CheckConfig(const Tag& tag)
         return;
     std::vector<uint8_t>& config = LaneOf(tag).config;
     if (!config.empty() && config != bytes)
-        m_findings.Note("configuration", tag.position,
+        m_findings.Note("configuration", StreamName(tag.stream()), tag.position,
                         fmt::format("the {} configuration changes", StreamName(tag.stream())));
     config = std::move(bytes);
 }
@@ -227,7 +234,7 @@ void Chain::CheckTime(const Tag& tag)
     else if (step == Times::Step::back || (step == Times::Step::alone && !known))
         AddJump(here);
     else if (step == Times::Step::pause)
-        m_findings.Note("pause", tag.position,
+        m_findings.Note("pause", StreamName(tag.stream()), tag.position,
                         fmt::format("no {} frames from {} to {}", StreamName(tag.stream()), FormatTime(here.from),
                                     FormatTime(tag.timestamp())));
 }

@@ -39,18 +39,21 @@ public:
              const Json& more = Json::object());
 
     /** Adds something that is worth knowing but is not a fault. */
-    void Note(const char* kind, int64_t offset, const std::string& text);
+    void Note(const char* kind, const std::string& cause, int64_t offset, const std::string& text);
 
     /** Adds the members sound, lost_bytes, counts, findings, unlisted and notes.
      *  @param lost bytes that are not played */
     void WriteTo(Json& object, int64_t lost) const;
 
 private:
+    bool Enter(Json& list, const char* kind, const std::string& cause, int64_t offset, const std::string& text,
+               const Json& more);
+
     uint64_t m_total = 0; // findings, combined ones counted once
     Json m_counts = Json::object();
     Json m_list = Json::array();
     Json m_notes = Json::array();
-    std::map<std::string, size_t> m_causes; // index in the list
+    std::map<std::string, size_t> m_causes; // index in its list
 };
 
 /** Scans a file from the first tag to the end. */

@@ -72,7 +72,7 @@ Json CheckTags(Subject& subject, const CheckOptions& options, const TagReader::P
     if (const std::string fault = ConfigFault(input); !fault.empty())
         findings.Add("no_configuration", "", input.Instance().data_offset, fault);
     if (const std::string note = UndefinedCodec(input); !note.empty())
-        findings.Note("codec", input.Instance().data_offset, note);
+        findings.Note("codec", "", input.Instance().data_offset, note);
     if (input.Instance().file_shorter_than_meta != 0)
         findings.Add("cut_short", "", played.Reader().FileSize(), "the metadata announces a larger file");
     Json object = {{"file", input.name},
@@ -104,7 +104,7 @@ std::string CountsText(const Json& counts)
 
 std::string LineText(const Json& finding)
 {
-    const uint64_t count = finding.value("count", uint64_t{1});
+    const auto count = finding["count"].get<uint64_t>();
     const std::string more =
         count > 1 ? fmt::format("; {} of these, the last at byte {}", count, finding["last_offset"].get<int64_t>())
                   : "";
