@@ -64,7 +64,8 @@ std::vector<uint8_t> TagReader::Payload(const Tag& tag)
 std::vector<uint8_t> TagReader::Config(const Tag& tag)
 {
     const std::vector<uint8_t> payload = Payload(tag);
-    return {payload.begin() + std::min<ptrdiff_t>(tag.codec_header_size(), tag.data_size()), payload.end()};
+    const size_t header = std::min<size_t>(tag.codec_header_size(), payload.size());
+    return {payload.begin() + static_cast<ptrdiff_t>(header), payload.end()};
 }
 
 std::optional<Tag> TagReader::At(int64_t position)
