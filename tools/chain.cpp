@@ -137,7 +137,7 @@ void Chain::Walk()
 
 void Chain::See(const Part& part)
 {
-    const bool skipped = m_played.IsSkipped(part);
+    const bool skipped = m_played.CountIfSkipped(part);
     if (part.kind == Part::Kind::damage)
         return AddDamage(part);
     if (part.kind == Part::Kind::unlinked)

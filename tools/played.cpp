@@ -105,7 +105,7 @@ Played::Played(const Input& input, TagReader::Progress progress)
 void Played::Walk(const std::function<bool(const Tag&)>& see)
 {
     m_reader.Walk(m_reader.FirstTag(), m_input.Instance().data_end,
-                  [&](const Part& part) { return IsSkipped(part) || see(part.tag); });
+                  [&](const Part& part) { return CountIfSkipped(part) || see(part.tag); });
 }
 
 void Played::Take(const flvdmx::Frame& frame)
@@ -121,7 +121,7 @@ void Played::Take(const flvdmx::Frame& frame)
 void Played::Inspect(int64_t end)
 {
     m_reader.Walk(m_end, end, [this](const Part& part) {
-        if (!IsSkipped(part) && part.tag.has_frame()) // a long damage before it has confused the library
+        if (!CountIfSkipped(part) && part.tag.has_frame()) // a long damage before it has confused the library
             m_damage.Add(part, "");
         return true;
     });
@@ -137,7 +137,7 @@ void Played::Loss::Add(const Part& part, const std::string& reason)
 }
 
 // A wrong back-pointer does not matter after script data at the beginning.
-bool Played::IsSkipped(const Part& part)
+bool Played::CountIfSkipped(const Part& part)
 {
     const bool isFirstScript =
         part.kind == Part::Kind::unlinked && part.begin == m_reader.FirstTag() && part.tag.is_script();

@@ -21,13 +21,12 @@ public:
 
     TagReader& Reader() { return m_reader; }
 
-    /** Calls `see` with each tag that is played, and with script data and codec configurations, until it returns false.
-     */
+    /** Calls `see` with each tag that is played, script data and codec configurations included, until it returns
+     *  false. */
     void Walk(const std::function<bool(const Tag&)>& see);
 
     /** For commands that play the file: counts what was skipped before a frame. Call it with every frame, in file
-     * order.
-     */
+     *  order. */
     void Take(const flvdmx::Frame& frame);
     /** The same for what was skipped after the last frame. */
     void Finish() { Inspect(m_input.Instance().data_end); }
@@ -36,8 +35,8 @@ public:
     /** Warns on standard error about what was skipped. */
     void Warn() const;
 
-    /** @return true if a part is not played; counts it */
-    bool IsSkipped(const Part& part);
+    /** @return true if a part is not played, and then counts it */
+    bool CountIfSkipped(const Part& part);
 
     /** @return why a valid tag is not played, such as "it is too short for a frame"; empty if it is played */
     std::string WhyNot(const Tag& tag);
