@@ -193,7 +193,7 @@ class Check(Case):
         ruined = documents[-1]  # not all findings are listed
         self.assertEqual((ruined["counts"], len(ruined["findings"]), ruined["unlisted"]), ({"gap": 1500}, 1000, 500))
         text = self.tool("check", sample("aac_only"), "--jobs", 9)
-        self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, 0 of them not playable\n")
+        self.assertEqual(text, f"{sample('aac_only')}: ok; 66 tags, 9549 bytes, all playable\n")
 
     def test_jobs_end_when_the_pipe_is_closed(self):
         files = [self.write("ruined.flv", RUINED)] * 20

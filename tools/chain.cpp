@@ -271,7 +271,7 @@ void Chain::CheckKeyframes(int64_t position, int64_t time)
 {
     if (m_keyframe && time - *m_keyframe > *m_limits.maxGapMs)
         m_findings.Add("keyframe_distance", "all", position,
-                       fmt::format("no keyframe from {} to {}", FormatTime(*m_keyframe), FormatTime(time)));
+                       fmt::format("no keyframe between {} and {}", FormatTime(*m_keyframe), FormatTime(time)));
     m_keyframe = time;
 }
 

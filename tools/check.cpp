@@ -102,29 +102,30 @@ std::string CountsText(const Json& counts)
     return text;
 }
 
-std::string LineText(const Json& finding)
+std::string LineText(const Json& finding, const char* prefix = "")
 {
     const auto count = finding["count"].get<uint64_t>();
     const std::string more =
         count > 1 ? fmt::format("; {} of these, the last at byte {}", count, finding["last_offset"].get<int64_t>())
                   : "";
-    return fmt::format("  byte {:<12} {:<17}  {}{}\n", finding["offset"].get<int64_t>(),
-                       finding["kind"].get<std::string>(), finding["text"].get<std::string>(), more);
+    return fmt::format("  byte {:<12} {:<17}  {}{}{}\n", finding["offset"].get<int64_t>(),
+                       finding["kind"].get<std::string>(), prefix, finding["text"].get<std::string>(), more);
 }
 
 std::string Text(const std::string& file, const Json& result)
 {
     const Json& findings = result["findings"];
-    std::string text = fmt::format("{}: {}; {}, {} bytes, {} of them not playable\n", DisplayName(file),
+    const auto lost = result["lost_bytes"].get<int64_t>();
+    std::string text = fmt::format("{}: {}; {}, {} bytes, {}\n", DisplayName(file),
                                    findings.empty() ? "ok" : CountsText(result["counts"]),
                                    Plural(result["tags"].get<uint64_t>(), "tag"), result["size"].get<int64_t>(),
-                                   result["lost_bytes"].get<int64_t>());
+                                   lost == 0 ? "all playable" : fmt::format("{} of them not playable", lost));
     for (const Json& finding : findings)
         text += LineText(finding);
     if (const auto unlisted = result["unlisted"].get<uint64_t>(); unlisted > 0)
         text += fmt::format("  and {} more\n", unlisted);
     for (const Json& note : result["notes"])
-        text += LineText(note);
+        text += LineText(note, "note: ");
     return text;
 }
 

@@ -358,13 +358,12 @@ int RunExtract(const ExtractOptions& options)
     Input input(options.file);
     input.WarnIfCutShort();
     std::vector<StreamWriter> writers = MakeWriters(options, input);
-    ProgressBar progress(options.file, input.Instance().data_end);
+    ReadProgress progress(options.file, input.info.size);
     for (StreamWriter& writer : writers)
         writer.Open(options, writers.size() > 1);
     input.file.accept_all_times();
     Played played(input);
     while (const std::optional<flvdmx::Frame> frame = NextFrame(input)) {
-        progress.ShowDone(frame->position);
         played.Take(*frame);
         for (StreamWriter& writer : writers)
             if (writer.Stream() == frame->stream)

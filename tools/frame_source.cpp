@@ -30,7 +30,7 @@ bool IsBefore(const FrameSource::Frame& a, const FrameSource::Frame& b)
 } // namespace
 
 const char* const FrameRecord::HEADING =
-    " number  stream  key           time          shown      size      position     crc32\n";
+    " number  stream  key          time         shown      size    position     crc32\n";
 const char* const FrameRecord::CSV_HEADING = "number,stream,keyframe,time_ms,presentation_ms,size,position,crc32\n";
 
 FrameRecord::FrameRecord(const flvdmx::Frame& frame)
@@ -42,7 +42,7 @@ FrameRecord::FrameRecord(const flvdmx::Frame& frame)
 
 std::string FrameRecord::Line(uint64_t number) const
 {
-    return fmt::format("{:>7}  {:<6}  {:<3}  {:>13}  {:>13}  {:>8}  {:>12}  {:08x}\n", number, StreamName(stream),
+    return fmt::format("{:>7}  {:<6}  {:<3}  {:>12}  {:>12}  {:>8}  {:>10}  {:08x}\n", number, StreamName(stream),
                        keyframe && IsVideo() ? "key" : "", FormatTime(timeMs), FormatTime(shownMs), size, position,
                        crc);
 }

@@ -86,9 +86,11 @@ public:
 
     bool Started() const { return m_started; }
 
-    // Prints a held frame that is exactly at the requested time, if no later frame has released it.
+    // Erases the progress, and prints a held frame that is exactly at the requested time, if no later one has released
+    // it.
     void Finish()
     {
+        m_progress.Wipe();
         const auto sought = [this](const FrameRecord& frame) { return frame.timeMs == *m_options.fromMs; };
         if (std::any_of(m_held.begin(), m_held.end(), sought))
             ShowHeld();
@@ -161,17 +163,6 @@ uint32_t WantedStreams(const FramesOptions& options)
     return options.keyframes ? options.streams & FLVD_STREAM_VIDEO : options.streams;
 }
 
-// If every seek fails, as in large damage, the file is read from the beginning: the printer waits for the time.
-void SeekToStart(Input& input, int32_t ms)
-{
-    const flvdmx::error error = input.file.seek(flvdmx::Milliseconds(ms), flvdmx::SeekMode::backward).error();
-    if (error.kind() == flvdmx::Kind::miss)
-        throw FileError(input.name,
-                        fmt::format("there is no frame at {}: the last one is at {}", FormatTime(ms),
-                                    FormatTime(input.info.duration)),
-                        error);
-}
-
 void PrintComplete(const FramesOptions& options)
 {
     Input input(options.file, OpenOptions(options));
@@ -181,14 +172,16 @@ void PrintComplete(const FramesOptions& options)
     WarnOfUnplayed(input);
     if (options.fromMs || options.toMs)
         WarnOfRestarts(input);
-    if (options.fromMs)
-        SeekToStart(input, *options.fromMs);
+    ReadProgress progress(input.name, input.info.size);
+    if (options.fromMs) // if this fails, as in large damage, the file is read from the beginning up to the time
+        static_cast<void>(input.SeekToStart(*options.fromMs));
     input.file.accept_all_times();
     Played played(input);
     FrameSource source(input, streams, &played);
     FramePrinter printer(options, streams);
     while (!printer.Done()) {
         const std::optional<FrameRecord> frame = source.Next();
+        progress.Hide(); // it is shown only while nothing is printed
         if (!frame)
             break;
         printer.Take(*frame);
@@ -200,6 +193,7 @@ void PrintComplete(const FramesOptions& options)
         played.Walk([](const Tag&) { return true; }); // two readers do not deliver frames in file order
     else
         played.Finish();
+    progress.Wipe();
     played.Warn();
 }
 
@@ -213,7 +207,7 @@ uint32_t Announced(const Input& input)
 // never played, so the open waits for all streams that the file header announces.
 Input OpenGrowing(const FramesOptions& options, Growth& growth)
 {
-    for (;;) {
+    for (bool told = false;;) {
         flvdmx::result<flvdmx::File> file = flvdmx::File::open(PathOf(options.file), Host(), OpenOptions(options));
         const flvdmx::error error = file.error();
         if (file) {
@@ -223,7 +217,10 @@ Input OpenGrowing(const FramesOptions& options, Growth& growth)
                 return input;
             continue;
         }
-        if ((error.kind() != flvdmx::Kind::not_yet && error.system_error() != ENOENT) || !growth.Wait())
+        const bool absent = error.system_error() == ENOENT;
+        if (absent && !std::exchange(told, true))
+            Complain(options.file, "note: waiting for the file");
+        if ((error.kind() != flvdmx::Kind::not_yet && !absent) || !growth.Wait())
             throw FileError(options.file, OpenFailureText(options.file, error), error);
     }
 }
@@ -234,7 +231,10 @@ void WarnOfRest(const Input& input, const Growth& growth)
     const int64_t rest = growth.Size() - std::max(__FLV_DMX__fioTell64(instance.main_reader),
                                                   __FLV_DMX__fioTell64(instance.audio_reader));
     if (rest > 0)
-        Complain(input.name, fmt::format("warning: the last {} bytes are not a complete frame", rest));
+        Complain(input.name,
+                 fmt::format("warning: the last {} bytes are not a complete frame, or are damaged; without --follow, "
+                             "'flvdmx frames' reads across damage",
+                             rest));
 }
 
 void PrintGrowing(const FramesOptions& options)

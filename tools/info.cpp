@@ -41,8 +41,8 @@ FileScan ScanFile(Input& input)
 {
     FileScan scan;
     Times times;
-    ProgressBar bar(input.name, input.info.size);
-    Played played(input, [&bar](int64_t position) { bar.ShowDone(position); });
+    const ReadProgress progress(input.name, input.info.size);
+    Played played(input);
     input.file.accept_all_times();
     int64_t first = 0; // keyframes
     int64_t last = 0;
@@ -230,7 +230,7 @@ Facts AudioFacts(const Subject& subject, const flvdmx::AudioInfo& audio)
     const uint32_t size = IsPcm(audio.codec) ? subject.input.PcmSampleSize() : audio.sample_size;
     facts.Add("  sample size", IsPcm(audio.codec) ? fmt::format("{} bits", size) : "", {{"sample_size", size}});
     facts.Add("  channels", std::to_string(audio.channels), {{"channels", audio.channels}});
-    facts.Add("  data rate", Quantity(audio.data_rate, "kbit/s"), {{"data_rate_kbit", audio.data_rate}});
+    facts.Add("  stated data rate", Quantity(audio.data_rate, "kbit/s"), {{"data_rate_kbit", audio.data_rate}});
     if (subject.scan)
         facts.Add("  frames", std::to_string(subject.scan->audioFrames), {{"frames", subject.scan->audioFrames}});
     facts.AddConfig(audio.config);

@@ -15,6 +15,7 @@
 
 #include "flvdmx/posix_host.h"
 #include "tools/played.h"
+#include "tools/progress.h"
 #include "tools/report.h"
 
 namespace tool {
@@ -56,11 +57,30 @@ std::string HeaderFailureText(const std::string& path)
     return "not an FLV file: it does not start with the signature FLV";
 }
 
+const flvd_init_t& PosixFunctions()
+{
+    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
+    return host.functions();
+}
+
+uint32_t ReadAndShow(void* buffer, uint32_t size, uint32_t count, void* handle)
+{
+    ReadProgress::ShowRead(PosixFunctions().file_tell64(handle));
+    return PosixFunctions().file_read(buffer, size, count, handle);
+}
+
+flvdmx::Host MakeHost()
+{
+    flvd_init_t functions = PosixFunctions();
+    functions.file_read = ReadAndShow;
+    return flvdmx::Host(functions);
+}
+
 } // namespace
 
 const flvdmx::Host& Host()
 {
-    static const flvdmx::Host host = flvdmx::make_host(flvd_posix_host_fill);
+    static const flvdmx::Host host = MakeHost();
     return host;
 }
 
@@ -120,6 +140,29 @@ Input::Input(const std::string& file_name, const flvdmx::Options& options) : nam
 uint32_t Input::Streams() const
 {
     return (info.video ? uint32_t{FLVD_STREAM_VIDEO} : 0) | (info.audio ? uint32_t{FLVD_STREAM_AUDIO} : 0);
+}
+
+flvdmx::result<flvdmx::Milliseconds> Input::Seek(flvdmx::Milliseconds time, flvdmx::SeekMode mode)
+{
+    const auto reached = file.seek(time, mode);
+    if (reached.error().kind() != flvdmx::Kind::failed || Instance().seek_method != FLVD_SEEK_BY_INDEX)
+        return reached;
+    file.ignore_index();
+    const auto scanned = file.seek(time, mode);
+    if (scanned.error().kind() != flvdmx::Kind::failed)
+        Complain(name, "warning: the keyframe index leads to no keyframe there, so the tags were searched instead");
+    return scanned;
+}
+
+flvdmx::result<flvdmx::Milliseconds> Input::SeekToStart(int32_t ms)
+{
+    const auto reached = Seek(flvdmx::Milliseconds(ms), flvdmx::SeekMode::backward);
+    if (reached.error().kind() == flvdmx::Kind::miss)
+        throw FileError(
+            name,
+            fmt::format("there is no frame at {}: the last one is at {}", FormatTime(ms), FormatTime(info.duration)),
+            reached.error());
+    return reached;
 }
 
 int64_t Input::Rest() const

@@ -43,6 +43,13 @@ struct Input {
     /** @return bits per sample of PCM audio, by that byte */
     uint32_t PcmSampleSize() const { return (audioFormat & 2) != 0 ? 16 : 8; }
 
+    /** Seeks as File::seek() does, but from tag to tag if the keyframe index turns out to be wrong, with a warning. */
+    flvdmx::result<flvdmx::Milliseconds> Seek(flvdmx::Milliseconds time, flvdmx::SeekMode mode);
+
+    /** Seeks to the keyframe at or before a time; throws FileError if the time is after the last frame.
+     *  @return the time reached; Kind::failed */
+    flvdmx::result<flvdmx::Milliseconds> SeekToStart(int32_t ms);
+
     /** @return the number of bytes after the last complete tag; 0 for a growing file */
     int64_t Rest() const;
 

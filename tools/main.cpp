@@ -29,6 +29,12 @@ namespace {
 
 constexpr const char* TIME_HELP = "TIME is a number of seconds (12.5) or [HH:]MM:SS[.FRACTION].";
 
+// Without the blank that protects a dash: see Arguments().
+std::string Trimmed(const std::string& text)
+{
+    return text.substr(std::min(text.find_first_not_of(' '), text.size()));
+}
+
 // Validators return what is wrong with a value; an empty text accepts it.
 const CLI::Validator IS_TIME(
     [](const std::string& text) {
@@ -37,11 +43,18 @@ const CLI::Validator IS_TIME(
     },
     "", "time");
 
+// A negative time makes sense only where it is an offset.
+const CLI::Validator IS_POSITION(
+    [](const std::string& text) {
+        return ParseTime(text).value_or(0) >= 0 ? "" : fmt::format("'{}' is before the beginning", Trimmed(text));
+    },
+    "", "position");
+
 // Rejects signs, which the conversion to an unsigned number accepts.
 const CLI::Validator IS_COUNT(
     [](const std::string& text) {
         const bool digits = text.find_first_not_of("0123456789") == std::string::npos;
-        return digits ? std::string() : fmt::format("'{}' is not a whole number of 0 or more", text);
+        return digits ? std::string() : fmt::format("'{}' is not a whole number of 0 or more", Trimmed(text));
     },
     "", "count");
 
@@ -51,7 +64,7 @@ const CLI::Validator IS_SECONDS(
     [](const std::string& text) {
         double seconds = -1;
         const bool valid = CLI::detail::lexical_cast(text, seconds) && seconds >= 0 && seconds <= MOST_SECONDS;
-        return valid ? std::string() : fmt::format("'{}' is not a number of seconds", text);
+        return valid ? std::string() : fmt::format("'{}' is not a number of seconds", Trimmed(text));
     },
     "", "seconds");
 
@@ -75,6 +88,19 @@ template <typename Time> CLI::Option* AddTime(CLI::App* command, const char* nam
 {
     const auto parse = [&time](const std::string& text) { time = ParseTime(text).value_or(0); };
     return command->add_option_function<std::string>(name, parse, help)->check(IS_TIME)->type_name("TIME");
+}
+
+// The options of commands that work on a part of a file.
+template <typename Options> void AddRange(CLI::App* command, Options& options, const char* fromHelp, const char* toHelp)
+{
+    AddTime(command, "--from", options.fromMs, fromHelp)->check(IS_POSITION);
+    AddTime(command, "--to", options.toMs, toHelp)->check(IS_POSITION);
+}
+
+template <typename Options> void CheckRange(const Options& options)
+{
+    if (options.fromMs && options.toMs && *options.fromMs > *options.toMs)
+        throw CLI::ValidationError("--to", "this is earlier than --from");
 }
 
 template <typename Seconds>
@@ -113,7 +139,7 @@ void AddInfo(CLI::App* command, InfoOptions& options)
     command->add_option("FILE", options.files, "FLV files; - is standard input")->required()->type_name("");
     command->add_flag("--json", options.json, "Print one JSON document");
     command->add_flag("--scan", options.scan,
-                      "Read the whole file: count frames and skipped bytes,\nand measure keyframe distances");
+                      "Go through the whole file: count frames and\nskipped bytes, and measure keyframe distances");
     command->footer("  flvdmx info clip.flv\n"
                     "  flvdmx info --scan --json *.flv\n"
                     "  curl http://host/clip.flv | flvdmx info -");
@@ -127,34 +153,34 @@ void AddFrames(CLI::App* command, FramesOptions& options)
     command
         ->add_flag_callback(
             "--csv", [&options] { options.format = Format::csv; },
-            "Print comma-separated values, with column names on the first line")
+            "Print comma-separated values, with column names\non the first line")
         ->excludes(json);
     command->add_flag("--keyframes", options.keyframes, "List only video keyframes");
     AddChoice(command, "--stream", STREAM_NAMES, options.streams, "List only this stream: video or audio");
     AddCount(command, "--count", options.count, "Stop after N frames");
-    AddTime(command, "--from", options.fromMs, "Begin at the keyframe at or before TIME; without video, at TIME");
-    AddTime(command, "--to", options.toMs, "Omit frames later than TIME");
+    AddRange(command, options, "Begin at the keyframe at or before TIME;\nwithout video, at TIME",
+             "Omit frames later than TIME");
     command->add_flag("--separate-audio", options.separateAudio,
-                      "Use a separate audio reader; the streams are merged by time");
+                      "Use a separate audio reader; the streams are\nmerged by time");
     command->add_flag("--follow", options.follow,
-                      "Print frames as they arrive: the file is still being written,\nor does not exist yet");
+                      "Print frames as they arrive: the file is still\nbeing written, or does not exist yet");
     const CLI::Option* const timeout =
         AddSeconds(command, "--timeout", options.timeoutSeconds,
-                   "With --follow: stop when the file has not grown for S seconds (default 5)");
+                   "With --follow: stop when the file has not grown\nfor S seconds (default 5)");
     command->parse_complete_callback([&options, timeout] {
         if (timeout->count() != 0 && !options.follow)
             throw CLI::RequiresError("--timeout", "--follow");
         if (options.keyframes && options.streams == FLVD_STREAM_AUDIO)
             throw CLI::ValidationError("--keyframes", "only video frames are keyframes");
+        CheckRange(options);
     });
-    command->footer(
-        fmt::format("Each line holds number, stream, whether it is a video keyframe, time, presentation time, size in\n"
-                    "bytes, position in the file, and CRC-32 of the bytes.\n{}\n\n"
-                    "  flvdmx frames clip.flv\n"
-                    "  flvdmx frames --stream video --from 1:30 --to 1:35 clip.flv\n"
-                    "  flvdmx frames --keyframes --csv clip.flv >keyframes.csv\n"
-                    "  flvdmx frames --follow --timeout 10 recording.flv",
-                    TIME_HELP));
+    command->footer(fmt::format("Each line holds number, stream, whether it is a video keyframe, time,\n"
+                                "presentation time, size in bytes, position in the file, and CRC-32.\n{}\n\n"
+                                "  flvdmx frames clip.flv\n"
+                                "  flvdmx frames --stream video --from 1:30 --to 1:35 clip.flv\n"
+                                "  flvdmx frames --keyframes --csv clip.flv >keyframes.csv\n"
+                                "  flvdmx frames --follow --timeout 10 recording.flv",
+                                TIME_HELP));
 }
 
 void AddSeek(CLI::App* command, SeekOptions& options)
@@ -163,14 +189,15 @@ void AddSeek(CLI::App* command, SeekOptions& options)
     AddTime(command, "TIME", options.timeMs, "Where to seek to")->required()->type_name("");
     const Choices<uint32_t> modes = {{"backward", FLVD_SEEK_BACKWARD}, {"forward", FLVD_SEEK_FORWARD}, {"auto", 0}};
     AddChoice(command, "--mode", modes, options.direction,
-              "Land on the keyframe at or before TIME (backward, the default)\n"
-              "or at or after it (forward); auto: forward, unless TIME is\n"
-              "before the current position");
+              "Land on the keyframe at or before TIME (backward,\n"
+              "the default) or at or after it (forward);\n"
+              "auto: forward, unless TIME is before the current\n"
+              "position");
     const auto addBit = [&](const char* name, uint32_t bit, const char* help) {
         command->add_flag_callback(
             name, [&options, bit] { options.mode |= bit; }, help);
     };
-    addBit("--relative", FLVD_SEEK_RELATIVE, "TIME is an offset from the current position and may be negative");
+    addBit("--relative", FLVD_SEEK_RELATIVE, "TIME is an offset from the current position,\nand may be negative");
     addBit("--end-on-miss", FLVD_SEEK_TO_END_ON_MISS, "After a miss, go to the end of the file");
     addBit("--retry-backward", FLVD_SEEK_RETRY_BACKWARD, "Try backward after a miss");
     AddCount(command, "--play", options.play, "Read N frames before the seek (default 0)");
@@ -193,15 +220,15 @@ void AddExtract(CLI::App* command, ExtractOptions& options)
     AddFile(command, options.file);
     AddOutput(command, options.out, options.force, "Where to write; - is standard output");
     AddChoice(command, "--stream", STREAM_NAMES, options.streams, "Write only this stream: video or audio");
-    command->footer(
-        "If the file has one stream, or --stream selects one, OUT is the name of the file to write. Two\n"
-        "streams are written to two files OUT.EXTENSION, such as OUT.h264 and OUT.aac. If OUT is an existing\n"
-        "folder, the files in it are named after FILE.\n"
-        "Extensions: h264 (AVC as Annex B), aac (ADTS), mp3, wav (PCM). Other codecs are written raw,\n"
-        "one frame after the other, with the extension video or audio.\n\n"
-        "  flvdmx extract clip.flv -o clip\n"
-        "  flvdmx extract --stream audio clip.flv -o sound.aac\n"
-        "  flvdmx extract --stream video clip.flv -o - | player -");
+    command->footer(R"(If the file has one stream, or --stream selects one, OUT is the name of the file
+to write. Two streams are written to two files OUT.EXTENSION, such as OUT.h264
+and OUT.aac. If OUT is an existing folder, the files in it are named after FILE.
+Extensions: h264 (AVC as Annex B), aac (ADTS), mp3, wav (PCM). Other codecs are
+written raw, one frame after the other, with the extension video or audio.
+
+  flvdmx extract clip.flv -o clip
+  flvdmx extract --stream audio clip.flv -o sound.aac
+  flvdmx extract --stream video clip.flv -o - | player -)");
 }
 
 void AddCheck(CLI::App* command, CheckOptions& options)
@@ -210,37 +237,43 @@ void AddCheck(CLI::App* command, CheckOptions& options)
         ->required()
         ->type_name("");
     command->add_flag("--json", options.json, "Print one JSON document");
-    command->add_option("--jobs", options.jobs, "Check up to N files at the same time, at most 256 (default 1)")
+    command->add_option("--jobs", options.jobs, "Check up to N files at the same time, at most 256\n(default 1)")
         ->check(CLI::Range(1, 256).description(""))
         ->type_name("N");
     AddSeconds(command, "--jump", options.jumpSeconds,
-               "Report times that jump forward by more than S seconds (default 10)");
+               "Report times that jump forward by more than\nS seconds (default 10)");
     AddSeconds(command, "--max-gap", options.maxGapSeconds,
-               "Report keyframes that are more than S seconds apart, and audio\n"
-               "and video that are more than S seconds apart in the file");
-    command->footer(
-        "Findings, one line per cause:\n"
-        "  gap                bytes that belong to no tag\n"
-        "  cut_short          the end of the last tag, or of the data that the metadata announces, is missing\n"
-        "  back_pointer       the back-pointer of a tag is wrong\n"
-        "  no_back_pointer    the back-pointer of a tag is missing\n"
-        "  passed_over        tags that players skip: they belong to a stream or codec that is not played,\n"
-        "                     are later than the last timestamp, or are empty or too short\n"
-        "  jump               time jumps back, or forward by more than --jump, within a stream;\n"
-        "                     or a single tag has a wrong time\n"
-        "  index              an entry does not point to a keyframe, or its time is wrong by more than\n"
-        "                     a second\n"
-        "  keyframe_distance  keyframes, or the last one and the end, are more than --max-gap apart\n"
-        "  interleaving       audio and video at the same position in the file are more than --max-gap\n"
-        "                     apart in time\n"
-        "  no_configuration   AAC audio starts without its configuration\n"
-        "  not_playable       the file cannot be opened for playing\n"
-        "Notes, which are not faults:\n"
-        "  configuration      a codec configuration changes\n"
-        "  codec              FLV does not define a codec of the file\n"
-        "  pause              one stream has no frames for longer than --jump, while the other one has\n"
-        "The first 1000 findings of a file are listed; all are counted.\n\n"
-        "Exit status: 0 no findings, 1 a file has findings or could not be read, 2 usage error.");
+               "Report keyframes that are more than S seconds\n"
+               "apart, and audio and video that are more than\n"
+               "S seconds apart in the file");
+    command->footer(R"(Findings, one line per cause:
+  gap                bytes that belong to no tag
+  cut_short          the end of the last tag, or of the data that the metadata
+                     announces, is missing
+  back_pointer       the back-pointer of a tag is wrong
+  no_back_pointer    the back-pointer of a tag is missing
+  passed_over        tags that players skip: their stream or codec is not
+                     played, or they are later than the last timestamp, empty
+                     or too short
+  jump               time jumps back, or forward by more than --jump, within a
+                     stream; or a single tag has a wrong time
+  index              an entry does not point to a keyframe, or its time is
+                     wrong by more than a second
+  keyframe_distance  keyframes, or the last one and the end, are more than
+                     --max-gap apart
+  interleaving       audio and video at the same position in the file are more
+                     than --max-gap apart in time
+  no_configuration   AAC audio starts without its configuration
+  not_playable       the file cannot be opened for playing
+Notes, which are not faults, one line per stream:
+  configuration      a codec configuration changes
+  codec              FLV does not define a codec of the file
+  pause              one stream has no frames for longer than --jump, while the
+                     other one has
+The first 1000 findings of a file are listed; all are counted.
+
+Exit status: 0 no findings, 1 a file has findings or could not be read,
+2 usage error.)");
 }
 
 void AddPlot(CLI::App* command, PlotOptions& options)
@@ -259,7 +292,7 @@ void AddRewrite(CLI::App* command, RewriteOptions& options)
         options.dryRun = true;
         out->required(false);
     };
-    command->add_flag_callback("--dry-run", dryRun, "Report what would be written, and write nothing; needs no OUT")
+    command->add_flag_callback("--dry-run", dryRun, "Report what would be written, and write nothing;\nneeds no OUT")
         ->trigger_on_parse();
 }
 
@@ -267,10 +300,12 @@ void AddRepair(CLI::App* command, RewriteOptions& options)
 {
     AddRewrite(command, options);
     command->add_flag("--keep-times", options.keepTimes, "Leave timestamps that restart or jump as they are");
-    command->footer("Frames, codec configurations and cue points are kept; damage and other bytes are dropped. The\n"
-                    "metadata gets a new duration, file size and keyframe index. Timestamps that go back by more than\n"
-                    "a second or forward by more than ten are made continuous, and single wrong ones are replaced.\n\n"
-                    "  flvdmx repair recording.flv -o repaired.flv");
+    command->footer(R"(Frames, codec configurations and cue points are kept; damage and other bytes are
+dropped. The metadata gets a new duration, file size and keyframe index.
+Timestamps that go back by more than a second or forward by more than ten are
+made continuous, and single wrong ones are replaced.
+
+  flvdmx repair recording.flv -o repaired.flv)");
 }
 
 void AddIndex(CLI::App* command, RewriteOptions& options)
@@ -283,9 +318,9 @@ void AddIndex(CLI::App* command, RewriteOptions& options)
 void AddCut(CLI::App* command, RewriteOptions& options)
 {
     AddRewrite(command, options);
-    AddTime(command, "--from", options.fromMs, "Begin at the keyframe at or before TIME");
-    AddTime(command, "--to", options.toMs, "End before the keyframe at or after TIME");
-    command->add_flag("--keep-times", options.keepTimes, "Leave the timestamps as they are instead of starting at 0");
+    AddRange(command, options, "Begin at the keyframe at or before TIME", "End before the keyframe at or after TIME");
+    command->parse_complete_callback([&options] { CheckRange(options); });
+    command->add_flag("--keep-times", options.keepTimes, "Leave the timestamps as they are instead of\nstarting at 0");
     command->footer(fmt::format("{}\n\n"
                                 "  flvdmx cut film.flv --from 1:00 --to 2:30 -o part.flv",
                                 TIME_HELP));
@@ -308,8 +343,9 @@ std::vector<std::string> Arguments(int argc, char** argv)
 std::string DashAdvice(const std::vector<std::string>& arguments)
 {
     std::error_code failure;
+    const auto end = std::find(arguments.begin(), arguments.end(), "--");
     for (const std::string& text : arguments)
-        if (text.size() > 1 && text.front() == '-' && std::filesystem::exists(text, failure))
+        if (end == arguments.end() && text.size() > 1 && text.front() == '-' && std::filesystem::exists(text, failure))
             return fmt::format("Put '--' before a file name that begins with a dash: flvdmx COMMAND -- {}\n",
                                Printable(text));
     return "";
@@ -375,21 +411,21 @@ int Run(int argc, char** argv)
     app.set_help_flag("-h,--help", "Print help");
     app.set_version_flag("-V,--version", "flvdmx " FLVDMX_VERSION, "Print the version");
     app.add_flag_callback("--verbose", ShowCodes,
-                          "With any command: if something fails, also print the library's\nerror code and line number")
+                          "With any command: if something fails, also print\nthe library's error code and line number")
         ->trigger_on_parse();
     app.fallthrough();
-    app.footer("Exit status: 0 done, 1 a file could not be read, written or played, or check found something,\n"
-               "2 usage error. 'flvdmx help COMMAND' explains a command.");
+    app.footer("Exit status: 0 done, 1 a file could not be read, written or played, or check\n"
+               "found something, 2 usage error. 'flvdmx help COMMAND' explains a command.");
     app.require_subcommand(0, 1); // a missing command is reported below, after CLI11 has rejected unknown words
     int status = DONE;
     AddCommand(app, status, "info", "Show what is in each file", AddInfo, RunInfo);
     AddCommand(app, status, "frames", "List the frames, one per line", AddFrames, RunFrames);
-    AddCommand(app, status, "seek", "Seek, and show the position reached and the frames that follow", AddSeek, RunSeek);
+    AddCommand(app, status, "seek", "Seek, and show where that leads", AddSeek, RunSeek);
     AddCommand(app, status, "extract", "Write the streams to files that players accept", AddExtract, RunExtract);
-    AddCommand(app, status, "check", "Find damage, jumping timestamps and a wrong keyframe index", AddCheck, RunCheck);
-    AddCommand(app, status, "plot", "Draw bit rate, keyframes and interleaving over time", AddPlot, RunPlot);
-    AddCommand(app, status, "repair", "Write a valid file from everything that can be played", AddRepair, RunRepair);
-    AddCommand(app, status, "index", "Copy an undamaged file and give it a keyframe index", AddIndex, RunIndex);
+    AddCommand(app, status, "check", "Find damage, jumping times, a wrong index", AddCheck, RunCheck);
+    AddCommand(app, status, "plot", "Draw bit rate, keyframes and interleaving", AddPlot, RunPlot);
+    AddCommand(app, status, "repair", "Write a valid file from what can be played", AddRepair, RunRepair);
+    AddCommand(app, status, "index", "Copy an undamaged file, with a keyframe index", AddIndex, RunIndex);
     AddCommand(app, status, "cut", "Write part of a file, with its own index", AddCut, RunCut);
     AddHelp(app);
     try {

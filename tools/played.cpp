@@ -81,6 +81,8 @@ std::string AvcConfigFault(TagReader& reader, const Tag& tag)
 std::string WhyNotFound(TagReader& reader, const FirstTag& first)
 {
     const Tag& tag = *first.tag;
+    if (tag.end() > reader.FileSize())
+        return "its first tag is cut short";
     const uint8_t* const back = reader.Bytes(tag.data_end(), Tag::back_pointer_size);
     if (back == nullptr || BigEndian(back, Tag::back_pointer_size) != tag.data_size() + Tag::header_size)
         return "the back-pointer of its first tag is wrong";

@@ -40,7 +40,7 @@ constexpr const char* STYLE =
     "text{font:13px 'DejaVu Sans',Verdana,Arial,sans-serif;fill:#333}"
     ".title{font-size:19px;font-weight:bold}.about,.tick{font-size:12px;fill:#666}.heading{font-size:14px;font-weight:"
     "bold}"
-    ".left{text-anchor:end}.mid{text-anchor:middle}"
+    ".left,.legend{text-anchor:end}.mid{text-anchor:middle}"
     "line{stroke:#e4e4e4}.axis{stroke:#777}"
     "path{fill:none;stroke-linejoin:round}"
     ".video{stroke:#1f6fb4;stroke-width:1.6}.audio{stroke:#dd7715;stroke-width:1.6}"
@@ -211,8 +211,8 @@ private:
         constexpr double CHARACTER = 7.6;
         double x = RIGHT;
         for (auto entry = entries.rbegin(); entry != entries.rend(); ++entry) {
-            x -= static_cast<double>(entry->second.size()) * CHARACTER;
             m_svg.Text(x, y, "legend", entry->second);
+            x -= static_cast<double>(entry->second.size()) * CHARACTER;
             m_svg.Add("<path class=\"{}\" d=\"M{:.1f} {:.1f}h22\" style=\"stroke-width:3\"/>", entry->first, x - 28,
                       y - 4);
             x -= 46;
@@ -397,6 +397,8 @@ int RunPlot(const PlotOptions& options)
     OutputFile file(options.out, options.file, options.force);
     input.file.accept_all_times();
     const Timeline timeline = ReadTimeline(input, COLUMNS);
+    if (timeline.video.frames + timeline.audio.frames == 0)
+        throw FileError(options.file, "there are no frames to draw");
     file.Write(Plot(input, timeline).Draw());
     file.Finish();
     return DONE;

@@ -2,6 +2,7 @@
 #include "tools/progress.h"
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
 
 #include <fmt/core.h>
@@ -28,6 +29,8 @@ size_t TerminalColumns()
     return (known ? size.ws_col : UNKNOWN) - 1;
 }
 
+ReadProgress* g_readProgress = nullptr;
+
 } // namespace
 
 Progress::Progress() : Progress(isatty(STDERR_FILENO) != 0 && isatty(STDOUT_FILENO) == 0, Clock::duration::zero()) {}
@@ -51,7 +54,7 @@ void Progress::ShowLine(const std::string& name, const std::string& text)
                stderr);
     std::fflush(stderr);
     m_shown = true;
-    m_next = Clock::now() + INTERVAL;
+    Postpone(INTERVAL);
 }
 
 void Progress::Show(uint64_t frames, int64_t timeMs)
@@ -71,8 +74,31 @@ void ProgressBar::ShowDone(int64_t done)
         return;
     const auto width = std::min(BAR_WIDTH, static_cast<int64_t>(TerminalColumns()) / 3);
     const double share = std::clamp(static_cast<double>(done) / static_cast<double>(m_total), 0.0, 1.0);
-    const std::string bar(static_cast<size_t>(share * static_cast<double>(width)), '#');
+    const std::string bar(static_cast<size_t>(std::lround(share * static_cast<double>(width))), '#');
     ShowLine(m_name, fmt::format(" [{:<{}}] {:3.0f}%", bar, width, share * 100));
+}
+
+ReadProgress::ReadProgress(const std::string& name, int64_t size, int passes)
+    : ProgressBar(name, size * passes), m_size(size)
+{
+    g_readProgress = this;
+}
+
+ReadProgress::~ReadProgress()
+{
+    g_readProgress = nullptr;
+}
+
+void ReadProgress::Hide()
+{
+    Wipe();
+    Postpone(BAR_DELAY);
+}
+
+void ReadProgress::ShowRead(int64_t position)
+{
+    if (g_readProgress != nullptr)
+        g_readProgress->ShowDone(g_readProgress->m_pass + position);
 }
 
 } // namespace tool

@@ -27,6 +27,7 @@ protected:
     using Clock = std::chrono::steady_clock;
 
     Progress(bool visible, Clock::duration delay) : m_visible(visible), m_next(Clock::now() + delay) {}
+    void Postpone(Clock::duration delay) { m_next = Clock::now() + delay; }
     bool IsDue() const { return m_visible && Clock::now() >= m_next; }
     void ShowLine(const std::string& name, const std::string& text); /**< the name is shortened to fit the terminal */
 
@@ -48,6 +49,29 @@ public:
 private:
     const std::string m_name;
     const int64_t m_total;
+};
+
+/** A bar that follows the position at which the library reads, also during a long search. Only one may exist at a time,
+ *  and no other thread may read. */
+class ReadProgress : public ProgressBar {
+public:
+    /** @param passes how often the file will be read */
+    ReadProgress(const std::string& name, int64_t size, int passes = 1);
+    ~ReadProgress();
+    ReadProgress(const ReadProgress&) = delete;
+    ReadProgress& operator=(const ReadProgress&) = delete;
+
+    void NextPass() { m_pass += m_size; }
+
+    /** Makes room for output; the bar reappears if there is no output for a second. */
+    void Hide();
+
+    /** Shows that the file is being read at this position. */
+    static void ShowRead(int64_t position);
+
+private:
+    const int64_t m_size;
+    int64_t m_pass = 0; // bytes of the previous passes
 };
 
 } // namespace tool

@@ -38,7 +38,7 @@ struct RemuxOptions {
     int64_t toMs = std::numeric_limits<int64_t>::max();   // first time not to copy
     uint32_t firstTimestamp = UINT32_MAX; // of the frames, once known; for the configurations at the beginning
 
-    bool HasEnd() const { return toMs != std::numeric_limits<int64_t>::max(); }
+    bool IsWhole() const { return fromMs == RemuxOptions().fromMs && toMs == RemuxOptions().toMs; }
 };
 
 // What was copied.
@@ -52,7 +52,7 @@ struct RemuxReport {
 };
 
 using TakeTag = std::function<void(const NewTag&)>;
-using Pass = std::function<RemuxReport(const TakeTag& take, const TagReader::Progress& progress)>;
+using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
 size_t TrackOf(const Tag& tag)
 {
@@ -68,8 +68,8 @@ NewTag MakeTag(const Tag& tag, uint32_t timestamp, std::vector<uint8_t> payload)
 // `firstTimestamp` changes only the timestamps of some of them.
 class Remuxer {
 public:
-    Remuxer(const Input& input, const RemuxOptions& options, const TakeTag& take, const TagReader::Progress& progress)
-        : m_input(input), m_options(options), m_take(take), m_played(input, progress)
+    Remuxer(const Input& input, const RemuxOptions& options, const TakeTag& take)
+        : m_input(input), m_options(options), m_take(take), m_played(input)
     {
         if (input.info.video)
             m_tracks[0].config = input.info.video->config;
@@ -89,7 +89,10 @@ public:
             return !HasEnded(0) || !HasEnded(1);
         });
         m_report.jumps = m_times.Jumps();
-        m_report.bytesSkipped += m_played.BytesSkipped() + (m_options.HasEnd() ? 0 : m_input.Rest());
+        if (m_options.IsWhole())
+            m_report.bytesSkipped += m_played.BytesSkipped() + m_input.Rest();
+        else
+            m_report.bytesSkipped += m_skipped - m_skippedBefore;
         return m_report;
     }
 
@@ -140,6 +143,9 @@ private:
         for (size_t i = 0; i < m_tracks.size(); ++i)
             if (isFirst || (i == TrackOf(tag) && track.pending))
                 PutConfig(i, isFirst ? std::min(timestamp, m_options.firstTimestamp) : timestamp);
+        m_skipped = m_played.BytesSkipped();
+        if (isFirst)
+            m_skippedBefore = m_skipped;
         ++m_report.frames.at(TrackOf(tag));
         m_report.firstTimestamp = std::min(m_report.firstTimestamp, timestamp);
         m_take(MakeTag(tag, timestamp, m_played.Reader().Payload(tag)));
@@ -176,6 +182,8 @@ private:
     Played m_played;
     std::array<Track, 2> m_tracks; // video, audio
     Times m_times;
+    int64_t m_skippedBefore = 0; // bytes, before the first frame copied
+    int64_t m_skipped = 0;       // before the last one
     RemuxReport m_report;
 };
 
@@ -221,13 +229,13 @@ std::vector<flvdmx::RawProperty> PropertiesOf(const Input& input)
 }
 
 // Copies the tags of an undamaged file unchanged, except its metadata.
-RemuxReport CopyTags(const Input& input, const TakeTag& take, const TagReader::Progress& progress)
+RemuxReport CopyTags(const Input& input, const TakeTag& take)
 {
     constexpr uint32_t JITTER_MS = 1000; // larger steps back are jumps
     const auto refuse = [&input](const std::string& fault) {
         throw FileError(input.name, fault + ": use 'flvdmx repair'");
     };
-    TagReader reader(input.name, input.file.instance(), progress);
+    TagReader reader(input.name, input.file.instance());
     const int64_t metadata = FindMetadata(input).position;
     RemuxReport report;
     std::array<uint32_t, 2> latest{}; // timestamps of video and audio
@@ -266,45 +274,51 @@ void WarnOfWhatIsNotPlayed(const RewriteOptions& options, const Input& input, co
 }
 
 // Runs a pass that measures and, unless it is a dry run, one that writes.
-RemuxReport Write(const RewriteOptions& options, const Input& input, const Pass& pass)
+void Write(const RewriteOptions& options, const Input& input, const Pass& pass)
 {
     std::optional<OutputFile> out; // first of all, so that output that cannot be written fails at once
     if (!options.dryRun)
         out.emplace(options.out, options.file, options.force);
-    ProgressBar bar(options.file, options.dryRun ? input.info.size : 2 * input.info.size);
+    ReadProgress progress(options.file, input.info.size, options.dryRun ? 1 : 2);
     FlvLayout layout;
-    const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); }, [&](int64_t at) { bar.ShowDone(at); });
+    const RemuxReport report = pass([&](const NewTag& tag) { layout.Add(tag); });
     if (report.IsEmpty())
         throw FileError(options.file, "there are no frames to write");
     if (out) {
         const std::vector<uint8_t> beginning = layout.Beginning(PropertiesOf(input));
         out->Write(beginning.data(), beginning.size());
         const uint64_t size = beginning.size() + layout.Size();
-        const auto write = [&](const NewTag& tag) {
+        progress.NextPass();
+        pass([&](const NewTag& tag) {
             if (out->Written() < size) // a file that is still being written may have more tags by now
                 WriteTag(*out, tag);
-        };
-        pass(write, [&](int64_t at) { bar.ShowDone(input.info.size + at); });
+        });
         if (out->Written() != size)
             throw FileError(options.file, "the file changed while it was read");
         out->Finish();
     }
-    bar.Wipe();
+    progress.Wipe();
     WarnOfWhatIsNotPlayed(options, input, report);
-    if (options.out == STANDARD_STREAM && !options.dryRun)
-        return report;
-    Print(fmt::format("{}: {} and {}, {}, {} in the index{}\n", out ? Printable(options.out) : "would write",
-                      Plural(report.frames[0], "video frame"), Plural(report.frames[1], "audio frame"),
-                      FormatTime(layout.Duration()), Plural(layout.Keyframes(), "keyframe"),
-                      out ? fmt::format(", {} bytes", out->Written()) : ""));
-    return report;
+    const bool hasVideo = report.frames[0] != 0;
+    if (options.dryRun || options.out != STANDARD_STREAM)
+        Print(fmt::format("{}: {} and {}, {}{}{}\n", out ? Printable(options.out) : "would write",
+                          Plural(report.frames[0], "video frame"), Plural(report.frames[1], "audio frame"),
+                          FormatTime(layout.Duration()),
+                          hasVideo ? fmt::format(", {} in the index", Plural(layout.Keyframes(), "keyframe")) : "",
+                          out ? fmt::format(", {} bytes", out->Written()) : ""));
+    if (report.jumps != 0)
+        Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
+                         Plural(report.jumps, "place")));
+    if (report.bytesSkipped != 0)
+        Tell(fmt::format("{}: {} skipped\n", Printable(options.file),
+                         Plural(static_cast<uint64_t>(report.bytesSkipped), "byte")));
 }
 
 // The first pass finds the first timestamp for the second one.
 Pass RemuxPass(const Input& input, RemuxOptions remux)
 {
-    return [&input, remux](const TakeTag& take, const TagReader::Progress& progress) mutable {
-        const RemuxReport report = Remuxer(input, remux, take, progress).Run();
+    return [&input, remux](const TakeTag& take) mutable {
+        const RemuxReport report = Remuxer(input, remux, take).Run();
         remux.firstTimestamp = report.firstTimestamp;
         return report;
     };
@@ -346,7 +360,7 @@ RemuxOptions CutOptions(const RewriteOptions& options, Input& input)
                                                     StreamName(stream), REMEDY));
     RemuxOptions remux;
     if (options.fromMs) {
-        const auto from = input.file.seek(flvdmx::Milliseconds(*options.fromMs), flvdmx::SeekMode::backward);
+        const auto from = input.SeekToStart(*options.fromMs);
         if (!from)
             throw FileError(options.file, from.error());
         remux.fromMs = from->count();
@@ -355,7 +369,7 @@ RemuxOptions CutOptions(const RewriteOptions& options, Input& input)
     const int64_t start = input.info.start_time.count();
     remux.offsetMs = options.keepTimes ? start : -std::max<int64_t>(remux.fromMs, 0);
     if (options.toMs) {
-        const auto to = input.file.seek(flvdmx::Milliseconds(*options.toMs), flvdmx::SeekMode::forward);
+        const auto to = input.Seek(flvdmx::Milliseconds(*options.toMs), flvdmx::SeekMode::forward);
         if (!to && to.error().kind() != flvdmx::Kind::miss) // a miss: no keyframe follows
             throw FileError(options.file, to.error());
         if (to)
@@ -375,22 +389,14 @@ int RunRepair(const RewriteOptions& options)
     RemuxOptions remux;
     remux.continuous = !options.keepTimes;
     remux.offsetMs = input.info.start_time.count();
-    const RemuxReport report = Write(options, input, RemuxPass(input, remux));
-    if (report.jumps != 0)
-        Tell(fmt::format("{}: timestamps made continuous in {}\n", Printable(options.file),
-                         Plural(report.jumps, "place")));
-    if (report.bytesSkipped != 0)
-        Tell(fmt::format("{}: {} skipped\n", Printable(options.file),
-                         Plural(static_cast<uint64_t>(report.bytesSkipped), "byte")));
+    Write(options, input, RemuxPass(input, remux));
     return DONE;
 }
 
 int RunIndex(const RewriteOptions& options)
 {
     const Input input(options.file);
-    Write(options, input, [&input](const TakeTag& take, const TagReader::Progress& progress) {
-        return CopyTags(input, take, progress);
-    });
+    Write(options, input, [&input](const TakeTag& take) { return CopyTags(input, take); });
     return DONE;
 }
 

@@ -198,7 +198,7 @@ int RunSeek(const SeekOptions& options)
     Play(input, options.play);
     const int64_t current = CurrentTime(input);
     const auto mode = static_cast<SeekMode>(options.mode | options.direction);
-    const auto reached = input.file.seek(Milliseconds(options.timeMs), mode);
+    const auto reached = input.Seek(Milliseconds(options.timeMs), mode);
     if (reached.error().kind() == flvdmx::Kind::miss)
         throw Miss(options, input, options.timeMs + (IsRelative(options) ? current : 0), current, reached.error());
     if (!reached)

@@ -36,8 +36,8 @@ std::vector<Point> ReadPoints(const Input& input, Timeline& timeline)
 {
     std::vector<Point> points;
     Times times;
-    ProgressBar bar(input.name, input.Instance().data_end);
-    Played played(input, [&bar](int64_t position) { bar.ShowDone(position); });
+    ReadProgress progress(input.name, input.info.size);
+    Played played(input);
     int64_t skipped = 0;
     played.Walk([&](const Tag& tag) {
         if (!tag.has_frame())
@@ -49,7 +49,7 @@ std::vector<Point> ReadPoints(const Input& input, Timeline& timeline)
                           tag.frame_size(), tag.is_video(), IsVideoKeyframe(tag), loss, times.Jumps() > jumps});
         return true;
     });
-    bar.Wipe();
+    progress.Wipe();
     played.Warn();
     timeline.durationMs = times.Latest();
     timeline.bytesSkipped = played.BytesSkipped();
