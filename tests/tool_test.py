@@ -308,6 +308,14 @@ class Seek(Case):
             found = json.loads(run("seek", "--json", sample("avc_aac"), text).stdout)
             self.assertEqual(found["time_ms"], time_ms, text)
 
+    def test_wrong_index(self):
+        data = sample_bytes("avc_aac_index")
+        positions = data.index(b"filepositions") + 18
+        path = self.write("in.flv", data[:positions] + bytes(9) * 4 + data[positions + 36:])
+        keyframe = Expected("avc_aac_index").keyframes[2]
+        landed = self.seek(path, keyframe[0] / 1000 + 0.1, stderr=".*the tags were searched instead\n")["landed"]
+        self.assertEqual((landed["time_ms"], landed["position"]), keyframe[:2])
+
     def test_miss_messages(self):
         behind = (AVC.keyframes[-1][0] + 10) / 1000
         for arguments, miss, words in (

@@ -147,7 +147,7 @@ struct Frame {
 /** The video stream. Fields that are not known are 0. */
 struct VideoInfo {
     VideoCodec codec = VideoCodec::unknown; /**< of its frames */
-    uint32_t width = 0;                     /**< pixels */
+    uint32_t width = 0;                     /**< pixels; wrong for AVC profiles after High 4:2:2, as is the height */
     uint32_t height = 0;                    /**< pixels */
     double frame_rate = 0.0;                /**< frames per second, from the metadata */
     std::string fourcc;                     /**< as in flvd_video_info_t, empty for an unknown codec */
@@ -379,6 +379,23 @@ public:
     }
 
     /**
+     * Visits the valid tags of the file in order, script data and codec configurations included: of a growing file
+     * those written so far. Crosses damage. Does not change the playing position.
+     *
+     * @param see bool(const Tag&): called for each tag; return false to end the visit. It must not use this File.
+     * @return Kind::none; Kind::failed
+     */
+    template <typename See> error for_each_tag(See&& see)
+    {
+        if (const error failed = leave(); failed.kind() != Kind::none)
+            return failed;
+        const int32_t code = walk(m_return.reader, m_instance->data_offset, std::numeric_limits<int64_t>::max(),
+                                  FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT, see);
+        go_back();
+        return is_failure(code) ? error(Kind::failed, code, 0) : error();
+    }
+
+    /**
      * Returns the next frame, as flvd_next_frame() does: it crosses damage of any length.
      *
      * When the codec configuration of a stream changes, the first frame after the change reports the new one. A seek
@@ -557,6 +574,7 @@ private:
     friend FrameRange; // takes frames without a copy
 
     static constexpr int64_t smallest_tag_size = Tag::header_size + 1 + Tag::back_pointer_size; // of a frame
+    static constexpr int64_t search_range = 1 << 20;      // bytes after which a search gives up
     static constexpr uint32_t metadata_tags = 102;        // an open examines the same number
     static constexpr uint32_t script_data_max = 1u << 20; // bytes read from one script tag
     static constexpr uint32_t config_max = 1u << 16;      // bytes; longer configurations are not reported
@@ -815,8 +833,8 @@ private:
             if (result == FLVD_ERR_NOT_FOUND) {
                 if (again && position <= from)
                     return FLVD_ERR_POSITION;
-                from = again ? position : from;
-                again = !again;
+                again = !again && position - from < search_range;
+                from = again ? from : position;
                 continue;
             }
             const Tag tag = peek_tag(reader, position);

@@ -1,6 +1,11 @@
 /*
  * Tags, the pieces that an FLV file consists of: streams, codecs, and the tag header (FLV file format, version 10.1,
- * annex E.4). For C++17. You rarely need tags to play a file, since flvdmx::File delivers frames.
+ * annex E.4). For C++17. You rarely need tags to play a file, since flvdmx::File delivers frames; to look at them:
+ *
+ *     file.for_each_tag([](const flvdmx::Tag& tag) {
+ *         std::printf("%lld: %u bytes\n", static_cast<long long>(tag.position), tag.data_size());
+ *         return true;
+ *     });
  */
 #ifndef FLVDMX_TAG_HPP
 #define FLVDMX_TAG_HPP
@@ -121,21 +126,16 @@ public:
 
     /** The first byte of the payload: frame type and CodecID, or sound format; 0 without payload. */
     uint8_t codec_byte() const { return data_size() != 0 ? first() : uint8_t{0}; }
-    VideoCodec video_codec() const { return static_cast<VideoCodec>(codec_byte() & 15); } /**< of a video tag */
-    AudioCodec audio_codec() const { return static_cast<AudioCodec>(codec_byte() >> 4); } /**< of an audio tag */
-    bool is_avc() const
-    {
-        return is_video() && (first() & 15) == static_cast<uint8_t>(VideoCodec::avc);
-    } /**< AVC video */
-    bool is_aac() const
-    {
-        return is_audio() && first() >> 4 == static_cast<uint8_t>(AudioCodec::aac);
-    } /**< AAC audio */
-    uint32_t codec_header_size() const
-    {
-        return is_avc() ? 5 : is_aac() ? 2 : 1;
-    } /**< bytes of payload before a frame */
-
+    /** CodecID of a video tag. */
+    VideoCodec video_codec() const { return static_cast<VideoCodec>(codec_byte() & 15); }
+    /** SoundFormat of an audio tag. */
+    AudioCodec audio_codec() const { return static_cast<AudioCodec>(codec_byte() >> 4); }
+    /** True for AVC video. */
+    bool is_avc() const { return is_video() && (first() & 15) == static_cast<uint8_t>(VideoCodec::avc); }
+    /** True for AAC audio. */
+    bool is_aac() const { return is_audio() && first() >> 4 == static_cast<uint8_t>(AudioCodec::aac); }
+    /** @return the bytes of payload before the frame: codec, packet type, composition time offset */
+    uint32_t codec_header_size() const { return is_avc() ? 5 : is_aac() ? 2 : 1; }
     /** True for a video tag with the header of enhanced FLV, in which a FourCC names the codec. */
     bool is_enhanced() const { return is_video() && codec_byte() >= 0x80; }
     /** The FourCC of enhanced FLV; valid while the Tag lives. */
