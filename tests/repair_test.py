@@ -87,6 +87,7 @@ class Repair(Rewritten):
     def test_metadata_and_configurations(self):
         """Properties are kept unless they are wrong now; each frame has its configuration."""
         script = (b"\2\0\x0d@setDataFrame\2\0\x0aonMetaData\x08\0\0\0\4\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09"
+                  b"\0\3big\x0c\0\x90\0\0" + bytes(9 << 20) +  # too large to leave room for the index
                   b"\0\x08datasize\5\0\x08duration\0\x7f\xef" + bytes(6) + b"\0\0\x09")
         config = next(tag for tag in TAGS if tag[0] == 9)
         changed = retag(config, config[11:14] + bytes(2) + config[16:17] + b"\x4d" + config[18:-4])
@@ -95,11 +96,19 @@ class Repair(Rewritten):
         out = self.rewrite("repair", self.write("in.flv", HEADER + b"".join(tags)))
         data = out.read_bytes()
         self.assertIn(b"\0\5title\2\0\1T\0\4cues\x0a\0\0\0\1\3\0\1a\5\0\0\x09", data)
-        counts = {name: data.count(name) for name in (b"duration", b"onCuePoint", b"datasize", b"@setDataFrame")}
-        self.assertEqual(list(counts.values()), [1, 1, 0, 0], counts)
+        counts = {name: data.count(name) for name in (b"duration", b"onCuePoint", b"datasize", b"@setDataFrame", b"big")}
+        self.assertEqual(list(counts.values()), [1, 1, 0, 0, 0], counts)
         for kind in (8, 9):  # a configuration comes before the first frame that needs it
             self.assertEqual([tag[11:] for tag in split_tags(data)[1] if tag[0] == kind],
                              [tag[11:] for tag in tags if tag[0] == kind and tag[12] != 2])  # 2: end of sequence
+
+    def test_what_misleads(self):
+        """A damaged configuration before the first frame, and a size that ends where a later tag starts."""
+        bad = retag(TAGS[1], TAGS[1][11:16] + b"\0")
+        long = TAGS[40][:1] + (sum(map(len, TAGS[40:43])) - 15).to_bytes(3, "big") + TAGS[40][4:]
+        for tags in (TAGS[:2] + [bad] + TAGS[2:], TAGS[:40] + [long] + TAGS[41:]):
+            path = self.write("in.flv", HEADER + b"".join(tags))
+            self.assertSamePayloads(self.rewrite("repair", path), path)
 
     def test_late_streams(self):
         """A stream or configuration that comes after the tags that players search is found in the new file."""
@@ -132,20 +141,20 @@ class Repair(Rewritten):
 
 class IndexAndCut(Rewritten):
     def test_index(self):
-        path = self.write("in.flv", sample_bytes("avc_aac"))
-        out = self.rewrite("index", path)
-        self.assertEqual(split_tags(out.read_bytes())[1][1:], TAGS[1:])
+        tags = [tag[:8] + b"\0\0\5" + tag[11:] for tag in TAGS]  # StreamID
+        out = self.rewrite("index", self.write("in.flv", HEADER + b"".join(tags)))
+        self.assertEqual(split_tags(out.read_bytes())[1][1:], tags[1:])
         self.assertIn("3 entries", self.tool("info", out))
 
     def test_cut(self):
         """Consecutive parts contain every frame once."""
         whole = self.frames(sample("avc_aac_index"))
         path = self.write("in.flv", sample_bytes("avc_aac_index"))
-        for times in (("--from", "0", "--to", "1"), ("--from", "1.3"), ("--to", "0.5")):
+        for times, end in ((("--from", "0", "--to", "1"), 1223), (("--from", "1.3"), 10_000), (("--to", "0.5"), 823),
+                           (("--to", "0.423"), 423)):
             out = self.rewrite("cut", path, "--keep-times", *times)
             first = min(time_of(tag) for tag in split_tags(out.read_bytes())[1][1:])
             kept = [(kind, time + first, *rest) for kind, time, *rest in self.frames(out)]
-            end = 1223 if "1" in times else 823 if "0.5" in times else 10_000
             self.assertEqual(sorted(kept), sorted((k, t, *r) for k, t, *r in whole if first <= t < end))
             moved = self.frames(self.rewrite("cut", path, *times))
             self.assertEqual([f[1] for f in moved], [f[1] - first for f in kept])

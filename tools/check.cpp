@@ -12,8 +12,6 @@
 #include <utility>
 #include <vector>
 
-#include <boost/asio/post.hpp>
-#include <boost/asio/thread_pool.hpp>
 #include <fmt/core.h>
 
 #include "tools/chain.h"
@@ -178,12 +176,21 @@ void CheckOpened(std::vector<Subject> subjects, const CheckOptions& options, con
     tasks.reserve(subjects.size());
     for (Subject& subject : subjects)
         tasks.emplace_back([&] { return Check(subject, options, show); });
-    boost::asio::thread_pool pool(
-        options.jobs); // when destroyed, drops tasks that have not begun and awaits the others
+    std::atomic<size_t> next = 0;
+    const auto work = [&] {
+        for (size_t task = 0; !stopped && (task = next++) < tasks.size();)
+            tasks[task]();
+    };
+    std::vector<std::future<void>> crew; // when destroyed, they wait
     const auto stop = [](std::atomic<bool>* flag) { *flag = true; };
     const std::unique_ptr<std::atomic<bool>, decltype(stop)> stopper(&stopped, stop);
-    for (std::packaged_task<Json()>& task : tasks)
-        boost::asio::post(pool, [&task] { task(); });
+    try {
+        while (crew.size() < std::min<size_t>(options.jobs, tasks.size()))
+            crew.push_back(std::async(std::launch::async, work));
+    } catch (const std::system_error&) { // no more threads
+        if (crew.empty())
+            work();
+    }
     for (size_t i = 0; i < tasks.size(); ++i)
         take(subjects[i], tasks[i].get_future().get());
 }

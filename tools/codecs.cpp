@@ -143,10 +143,10 @@ PictureSize PictureSizeOf(const flvdmx::VideoInfo& video)
     constexpr std::array<uint8_t, 9> WITH_CHROMA_FORMAT = {44, 83, 86, 118, 128, 134, 135, 138, 244};
     constexpr uint8_t HIGH_422 = 122;
     std::vector<uint8_t> sets = AvcParameterSets(video.config);
-    const uint8_t profile = flvdmx::Bytes(sets)[PROFILE];
-    if (std::find(WITH_CHROMA_FORMAT.begin(), WITH_CHROMA_FORMAT.end(), profile) == WITH_CHROMA_FORMAT.end())
+    if (sets.size() <= PROFILE)
         return {video.width, video.height};
-    sets[PROFILE] = HIGH_422;
+    const auto* const known = std::find(WITH_CHROMA_FORMAT.begin(), WITH_CHROMA_FORMAT.end(), sets[PROFILE]);
+    sets[PROFILE] = known == WITH_CHROMA_FORMAT.end() ? sets[PROFILE] : HIGH_422;
     flvd_video_info_t picture{};
     FLVD_ParseVideoHeader(static_cast<int32_t>(video.codec), sets.data(), static_cast<int32_t>(sets.size()), &picture);
     return {picture.width, picture.height};

@@ -20,7 +20,8 @@ using flvdmx::Amf0;
 constexpr size_t FILE_HEADER_SIZE = 9;
 constexpr uint8_t HAS_AUDIO = 4; // TypeFlags
 constexpr uint8_t HAS_VIDEO = 1;
-constexpr size_t INDEX_MAX = 65536; // entries; with more keyframes, every nth one is listed
+constexpr size_t MOST_PROPERTY_BYTES = 8 << 20; // copied from the old file: a tag has room for 16 MiB
+constexpr size_t INDEX_MAX = 65536;             // entries; with more keyframes, every nth one is listed
 constexpr double MS_PER_SECOND = 1000;
 
 // Properties that are written anew, and others that describe the old file.
@@ -60,13 +61,13 @@ void PutObjectEnd(Buffer& out)
     out.push_back(Amf0::object_end);
 }
 
-Buffer TagHeader(uint8_t type, size_t dataSize, uint32_t timestamp)
+Buffer TagHeader(uint8_t type, size_t dataSize, uint32_t timestamp, uint32_t streamId = 0)
 {
     Buffer header = {type};
     PutInteger(header, dataSize, 3);
     PutInteger(header, timestamp & 0xFFFFFF, 3);
     PutInteger(header, timestamp >> 24, 1);
-    PutInteger(header, 0, 3); // StreamID
+    PutInteger(header, streamId, 3);
     return header;
 }
 
@@ -117,10 +118,14 @@ std::vector<uint8_t> FlvLayout::ScriptPayload(const std::vector<flvdmx::RawPrope
                                               uint64_t firstTag) const
 {
     std::vector<flvdmx::RawProperty> all;
-    std::copy_if(properties.begin(), properties.end(), std::back_inserter(all),
-                 [](const flvdmx::RawProperty& property) {
-                     return std::find(DROPPED.begin(), DROPPED.end(), property.name) == DROPPED.end();
-                 });
+    size_t size = 0;
+    for (const flvdmx::RawProperty& property : properties) {
+        const bool dropped = std::find(DROPPED.begin(), DROPPED.end(), property.name) != DROPPED.end();
+        if (dropped || property.value.size() > MOST_PROPERTY_BYTES - size)
+            continue;
+        size += property.value.size();
+        all.push_back(property);
+    }
     all.push_back(NumberProperty("duration", Duration() / MS_PER_SECOND));
     all.push_back(NumberProperty("filesize", static_cast<double>(firstTag + m_size)));
     all.push_back(NumberProperty("lasttimestamp", m_lastTimestamp / MS_PER_SECOND));
@@ -156,7 +161,7 @@ std::vector<uint8_t> FlvLayout::Beginning(const std::vector<flvdmx::RawProperty>
 
 void WriteTag(OutputFile& file, const NewTag& tag)
 {
-    Buffer bytes = TagHeader(tag.type, tag.payload.size(), tag.timestamp);
+    Buffer bytes = TagHeader(tag.type, tag.payload.size(), tag.timestamp, tag.streamId);
     Put(bytes, tag.payload);
     PutInteger(bytes, Tag::header_size + tag.payload.size(), Tag::back_pointer_size);
     file.Write(bytes.data(), bytes.size());

@@ -21,6 +21,7 @@ struct NewTag {
     std::vector<uint8_t> payload;
     bool frame = false;    /**< its time contributes to the duration */
     bool keyframe = false; /**< listed in the index */
+    uint32_t streamId = 0;
 };
 
 /** @return a property with this number */

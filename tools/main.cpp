@@ -32,7 +32,7 @@ constexpr const char* TIME_HELP = "TIME is a number of seconds (12.5) or [HH:]MM
 // Without the blank that protects a dash: see Arguments().
 std::string Trimmed(const std::string& text)
 {
-    return text.substr(std::min(text.find_first_not_of(' '), text.size()));
+    return text.size() > 1 && text[0] == ' ' && text[1] == '-' ? text.substr(1) : text;
 }
 
 // Validators return what is wrong with a value; an empty text accepts it.
@@ -71,15 +71,27 @@ const CLI::Validator IS_SECONDS(
 const CLI::Validator IS_NAME([](const std::string& text) { return text.empty() ? "the name is empty" : ""; }, "",
                              "name");
 
+const CLI::Validator TRIM(
+    [](std::string& text) {
+        text = Trimmed(text);
+        return std::string();
+    },
+    "", "trim");
+
 void AddFile(CLI::App* command, std::string& file)
 {
-    command->add_option("FILE", file, "FLV file; - is standard input")->required()->type_name("");
+    command->add_option("FILE", file, "FLV file; - is standard input")->required()->transform(TRIM)->type_name("");
+}
+
+void AddFiles(CLI::App* command, std::vector<std::string>& files, const char* help)
+{
+    command->add_option("FILE", files, help)->required()->transform(TRIM)->type_name("");
 }
 
 CLI::Option* AddOutput(CLI::App* command, std::string& out, bool& force, const char* help)
 {
     CLI::Option* const output =
-        command->add_option("-o,--output", out, help)->required()->check(IS_NAME)->type_name("OUT");
+        command->add_option("-o,--output", out, help)->required()->check(IS_NAME)->transform(TRIM)->type_name("OUT");
     command->add_flag("--force", force, "Overwrite an existing file");
     return output;
 }
@@ -136,7 +148,7 @@ const Choices<uint32_t> STREAM_NAMES = {{"video", FLVD_STREAM_VIDEO}, {"audio", 
 
 void AddInfo(CLI::App* command, InfoOptions& options)
 {
-    command->add_option("FILE", options.files, "FLV files; - is standard input")->required()->type_name("");
+    AddFiles(command, options.files, "FLV files; - is standard input");
     command->add_flag("--json", options.json, "Print one JSON document");
     command->add_flag("--scan", options.scan,
                       "Go through the whole file: count frames and\nskipped bytes, and measure keyframe distances");
@@ -233,9 +245,7 @@ written raw, one frame after the other, with the extension video or audio.
 
 void AddCheck(CLI::App* command, CheckOptions& options)
 {
-    command->add_option("FILE", options.files, "FLV files, or folders of them; - is standard input")
-        ->required()
-        ->type_name("");
+    AddFiles(command, options.files, "FLV files, or folders of them; - is standard input");
     command->add_flag("--json", options.json, "Print one JSON document");
     command->add_option("--jobs", options.jobs, "Check up to N files at the same time, at most 256\n(default 1)")
         ->check(CLI::Range(1, 256).description(""))

@@ -39,16 +39,6 @@ std::string CodecOf(const Tag& tag)
     return fmt::format("enhanced FLV ({}FourCC '{}')", named == NAMES.end() ? "" : (*named)[1], tag.fourcc());
 }
 
-// As the library tests the first configuration, without which it does not find an AVC stream.
-bool IsValidAvcConfig(flvdmx::Bytes record)
-{
-    constexpr auto AVC = static_cast<int32_t>(flvdmx::VideoCodec::avc);
-    const std::vector<uint8_t> sets = AvcParameterSets(record);
-    flvd_video_info_t picture{};
-    return !sets.empty() && sets.size() <= MOST_SET_BYTES &&
-           FLVD_ParseVideoHeader(AVC, sets.data(), static_cast<int32_t>(sets.size()), &picture) == 0;
-}
-
 // The first tag of a stream that has data, if it is near the beginning, and the number of tags before it.
 struct FirstTag {
     std::optional<Tag> tag;
@@ -202,6 +192,18 @@ const std::string& Played::WhyNoStream(flvdmx::Stream stream)
     return *why;
 }
 
+// Tests AVC as the library tests the first configuration, without which it does not find the stream.
+bool IsValidConfig(flvdmx::Stream stream, flvdmx::Bytes config)
+{
+    constexpr auto AVC = static_cast<int32_t>(flvdmx::VideoCodec::avc);
+    if (stream == flvdmx::Stream::audio)
+        return config.size() > 1;
+    const std::vector<uint8_t> sets = AvcParameterSets(config);
+    flvd_video_info_t picture{};
+    return !sets.empty() && sets.size() <= MOST_SET_BYTES &&
+           FLVD_ParseVideoHeader(AVC, sets.data(), static_cast<int32_t>(sets.size()), &picture) == 0;
+}
+
 std::optional<Tag> FindStart(TagReader& reader, flvdmx::Stream stream)
 {
     std::optional<Tag> start;
@@ -210,8 +212,8 @@ std::optional<Tag> FindStart(TagReader& reader, flvdmx::Stream stream)
         const Tag& tag = part.tag;
         if (part.kind != Part::Kind::tag || tag.stream() != stream || tag.data_size() == 0 || tag.is_enhanced())
             return true;
-        const std::vector<uint8_t> config = tag.is_config() ? reader.Config(tag) : std::vector<uint8_t>();
-        found = tag.is_aac() ? config.size() > 1 : !tag.is_avc() || IsValidAvcConfig(config);
+        const bool needsConfig = tag.is_avc() || tag.is_aac();
+        found = !needsConfig || (tag.is_config() && IsValidConfig(stream, reader.Config(tag)));
         if (found || (!start && tag.is_aac()))
             start = tag;
         return !found;

@@ -69,6 +69,9 @@ private:
  *          needs none; without configuration, the first AAC frame */
 std::optional<Tag> FindStart(TagReader& reader, flvdmx::Stream stream);
 
+/** @return true if a stream can start with this configuration */
+bool IsValidConfig(flvdmx::Stream stream, flvdmx::Bytes config);
+
 /** @return what is wrong with the first codec configurations of the input; empty if nothing */
 std::string ConfigFault(const Input& input);
 

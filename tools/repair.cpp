@@ -72,9 +72,9 @@ public:
         : m_input(input), m_options(options), m_take(take), m_played(input)
     {
         if (input.info.video)
-            m_tracks[0].config = input.info.video->config;
+            m_tracks[0].config = m_tracks[0].first = input.info.video->config;
         if (input.info.audio)
-            m_tracks[1].config = input.info.audio->config;
+            m_tracks[1].config = m_tracks[1].first = input.info.audio->config;
     }
 
     RemuxReport Run()
@@ -99,8 +99,9 @@ public:
 private:
     // A stream of the file.
     struct Track {
-        std::vector<uint8_t> config{}; // empty for codecs without one
-        bool pending = false;          // it has changed since the last frame
+        std::vector<uint8_t> first{};   // configuration; empty for codecs without one
+        std::vector<uint8_t> config{};  // the current one
+        std::vector<uint8_t> written{}; // the last one in the new file
         bool hasEnded = false;
     };
 
@@ -114,12 +115,9 @@ private:
 
     void TakeConfig(const Tag& tag)
     {
-        Track& track = m_tracks.at(TrackOf(tag));
         std::vector<uint8_t> config = m_played.Reader().Config(tag);
-        if (config.empty() || config == track.config)
-            return;
-        track.config = std::move(config);
-        track.pending = true;
+        if (!config.empty())
+            m_tracks.at(TrackOf(tag)).config = std::move(config);
     }
 
     void TakeFrame(const Tag& tag)
@@ -140,9 +138,13 @@ private:
         }
         const uint32_t timestamp = Timestamp(time);
         const bool isFirst = m_report.IsEmpty();
-        for (size_t i = 0; i < m_tracks.size(); ++i)
-            if (isFirst || (i == TrackOf(tag) && track.pending))
-                PutConfig(i, isFirst ? std::min(timestamp, m_options.firstTimestamp) : timestamp);
+        if (isFirst)
+            for (size_t i = 0; i < m_tracks.size(); ++i)
+                PutConfig(i,
+                          IsValidConfig(STREAMS.at(i), m_tracks.at(i).config) ? m_tracks.at(i).config
+                                                                              : m_tracks.at(i).first,
+                          std::min(timestamp, m_options.firstTimestamp));
+        PutConfig(TrackOf(tag), track.config, timestamp);
         m_skipped = m_played.BytesSkipped();
         if (isFirst)
             m_skippedBefore = m_skipped;
@@ -163,17 +165,17 @@ private:
         m_take(MakeTag(tag, Timestamp(follows ? m_times.Near(placed) : placed), std::move(payload)));
     }
 
-    void PutConfig(size_t track, uint32_t timestamp)
+    void PutConfig(size_t track, const std::vector<uint8_t>& config, uint32_t timestamp)
     {
         constexpr uint8_t AVC_KEYFRAME = 0x17;
-        const std::vector<uint8_t>& config = m_tracks.at(track).config;
+        if (config == m_tracks.at(track).written)
+            return;
+        m_tracks.at(track).written = config;
         std::vector<uint8_t> payload = {m_input.audioFormat, 0};
         if (track == 0)
             payload = {AVC_KEYFRAME, 0, 0, 0, 0};
         payload.insert(payload.end(), config.begin(), config.end());
-        m_tracks.at(track).pending = false;
-        if (!config.empty())
-            m_take({track == 0 ? uint8_t{FLVD_TAG_TYPE_VIDEO} : uint8_t{FLVD_TAG_TYPE_AUDIO}, timestamp, payload});
+        m_take({track == 0 ? uint8_t{FLVD_TAG_TYPE_VIDEO} : uint8_t{FLVD_TAG_TYPE_AUDIO}, timestamp, payload});
     }
 
     const Input& m_input;
@@ -252,8 +254,10 @@ RemuxReport CopyTags(const Input& input, const TakeTag& take)
             time = std::max(time, tag.timestamp());
             ++report.frames.at(TrackOf(tag));
         }
+        NewTag copy = MakeTag(tag, tag.timestamp(), reader.Payload(tag));
+        copy.streamId = tag.stream_id();
         if (part.begin != metadata)
-            take(MakeTag(tag, tag.timestamp(), reader.Payload(tag)));
+            take(copy);
         return true;
     });
     return report;
@@ -267,10 +271,14 @@ void WarnOfWhatIsNotPlayed(const RewriteOptions& options, const Input& input, co
     std::error_code unknown;
     if (options.dryRun || options.out == STANDARD_STREAM || !std::filesystem::is_regular_file(options.out, unknown))
         return;
-    const Input result(options.out);
-    WarnOfUnplayed(result);
-    if (const std::string fault = ConfigFault(result); !fault.empty())
-        Complain(options.out, "warning: " + fault);
+    try {
+        const Input result(options.out);
+        WarnOfUnplayed(result);
+        if (const std::string fault = ConfigFault(result); !fault.empty())
+            Complain(options.out, "warning: " + fault);
+    } catch (const FileError& error) {
+        Complain(options.out, fmt::format("warning: this new file cannot be played: {}", error.what()));
+    }
 }
 
 // Runs a pass that measures and, unless it is a dry run, one that writes.
@@ -358,6 +366,7 @@ RemuxOptions CutOptions(const RewriteOptions& options, Input& input)
         if (const bool known = input.Has(stream); AdoptLateStream(input, stream) && !known)
             throw FileError(input.name, fmt::format("the configuration of the {} is not at the beginning: {}",
                                                     StreamName(stream), REMEDY));
+    input.file.ignore_index(); // its times may differ from those of the tags
     RemuxOptions remux;
     if (options.fromMs) {
         const auto from = input.SeekToStart(*options.fromMs);

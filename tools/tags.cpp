@@ -100,11 +100,12 @@ Part TagReader::PartAt(int64_t position, int64_t to)
         return {Part::Kind::tag, position, tag->end(), *tag};
     if (tag && tag->is_script() && tag->end() <= to && position == FirstTag())
         return {Part::Kind::unlinked, position, tag->end(), *tag};
+    const std::optional<Tag> found = Find(position + 1, to);
     if (tag)
         for (const int64_t next : {tag->end(), tag->data_end()})
-            if (next <= to && (CouldFollow(next) || (next == tag->end() && next == m_size)))
+            if (next <= to && (!found || found->position >= next) &&
+                (CouldFollow(next) || (next == tag->end() && next == m_size)))
                 return {Part::Kind::unlinked, position, next, *tag};
-    const std::optional<Tag> found = Find(position + 1, to);
     return {Part::Kind::damage, position, found ? found->position : to, tag.value_or(Tag())};
 }
 
@@ -120,8 +121,19 @@ void TagReader::Walk(int64_t from, int64_t to, const std::function<bool(const Pa
     }
 }
 
-// One search of the library covers a limited range, so it is repeated while the reader advances.
+// Many tags without a valid back-pointer may come before the same valid tag: it is searched once.
 std::optional<Tag> TagReader::Find(int64_t from, int64_t to)
+{
+    const bool known = m_found.from >= 0 && from >= m_found.from && from <= m_found.end;
+    if (!known || (!m_found.tag && to > m_found.end)) {
+        const std::optional<Tag> tag = Search(from, to);
+        m_found = {from, tag ? tag->position : to, tag};
+    }
+    return m_found.tag && m_found.tag->position < to ? m_found.tag : std::nullopt;
+}
+
+// One search of the library covers a limited range, so it is repeated while the reader advances.
+std::optional<Tag> TagReader::Search(int64_t from, int64_t to)
 {
     constexpr uint32_t ALL_KINDS = FLVD_TAG_VIDEO | FLVD_TAG_AUDIO | FLVD_TAG_SCRIPT;
     int64_t reached = from - 1;

@@ -76,6 +76,7 @@ public:
 
 private:
     Part PartAt(int64_t position, int64_t to);
+    std::optional<Tag> Search(int64_t from, int64_t to);
     bool IsLinked(const Tag& tag);
     bool CouldFollow(int64_t position);
 
@@ -87,6 +88,11 @@ private:
     const Progress m_progress;
     const std::unique_ptr<fio_file_t, Closer> m_reader;
     int64_t m_size = 0;
+    struct {
+        int64_t from = -1;
+        int64_t end = -1; // no valid tag starts before it
+        std::optional<Tag> tag{};
+    } m_found; // by the last search
 };
 
 } // namespace tool
