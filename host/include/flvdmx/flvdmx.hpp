@@ -827,12 +827,11 @@ private:
             flvd_tag_info_t info;
             const int32_t result = FLVD_GetCurrTagInfo(m_instance, reader, &info, wanted, is_growing() ? 0 : 1);
             const int64_t position = __FLV_DMX__fioTell64(reader);
-            if (position < 0)
+            // Nothing found: the search gave up after its range, or a host call failed. A retry tells them apart.
+            const bool found = result != FLVD_ERR_NOT_FOUND;
+            if (position < 0 || (!found && again && position <= from))
                 return FLVD_ERR_POSITION;
-            // The search gave up after 1 MiB, or a host call failed. A retry tells them apart.
-            if (result == FLVD_ERR_NOT_FOUND) {
-                if (again && position <= from)
-                    return FLVD_ERR_POSITION;
+            if (!found) {
                 again = !again && position - from < search_range;
                 from = again ? from : position;
                 continue;
