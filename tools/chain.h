@@ -91,7 +91,7 @@ private:
     void AddAlone(Lane& lane);
     void CheckKeyframes(int64_t position, int64_t time);
     void CheckGaps(const Tag& tag);
-    Lane& LaneOf(const Tag& tag) { return m_lanes.at(tag.is_video() ? 0 : 1); }
+    Lane& LaneOf(const Tag& tag) { return m_lanes.at(IndexOf(tag.stream())); }
 
     Played& m_played;
     TagReader& m_reader;

@@ -184,7 +184,7 @@ std::string Played::WhyNotInStream(const Tag& tag) const
 
 const std::string& Played::WhyNoStream(flvdmx::Stream stream)
 {
-    std::optional<std::string>& why = m_noStream.at(stream == flvdmx::Stream::video ? 0 : 1);
+    std::optional<std::string>& why = m_noStream.at(IndexOf(stream));
     if (!why) {
         const FirstTag first = m_input.Has(stream) ? FirstTag{} : FindFirst(m_reader, stream);
         why = first.tag ? WhyNotFound(m_reader, first) : "";
@@ -289,7 +289,7 @@ bool SeemsToRestart(const Input& input)
         const std::optional<Tag> tag = reader.Find(position, position + NEAR);
         if (!tag || tag->is_script())
             continue;
-        uint32_t& time = latest.at(tag->is_video() ? 0 : 1);
+        uint32_t& time = latest.at(IndexOf(tag->stream()));
         if (tag->timestamp() + JITTER_MS < time || tag->timestamp() > input.Instance().last_ts + JITTER_MS)
             return true;
         time = std::max(time, tag->timestamp());

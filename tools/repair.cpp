@@ -54,11 +54,6 @@ struct RemuxReport {
 using TakeTag = std::function<void(const NewTag&)>;
 using Pass = std::function<RemuxReport(const TakeTag& take)>;
 
-size_t TrackOf(const Tag& tag)
-{
-    return tag.is_video() ? 0 : 1;
-}
-
 NewTag MakeTag(const Tag& tag, uint32_t timestamp, std::vector<uint8_t> payload)
 {
     return {tag.type(), timestamp, std::move(payload), tag.has_frame(), IsVideoKeyframe(tag)};
@@ -117,12 +112,12 @@ private:
     {
         std::vector<uint8_t> config = m_played.Reader().Config(tag);
         if (!config.empty())
-            m_tracks.at(TrackOf(tag)).config = std::move(config);
+            m_tracks.at(IndexOf(tag.stream())).config = std::move(config);
     }
 
     void TakeFrame(const Tag& tag)
     {
-        Track& track = m_tracks.at(TrackOf(tag));
+        Track& track = m_tracks.at(IndexOf(tag.stream()));
         int64_t time = m_input.TimeOf(tag);
         track.hasEnded = track.hasEnded || time >= m_options.toMs;
         if (!IsWanted(time))
@@ -144,11 +139,11 @@ private:
                           IsValidConfig(STREAMS.at(i), m_tracks.at(i).config) ? m_tracks.at(i).config
                                                                               : m_tracks.at(i).first,
                           std::min(timestamp, m_options.firstTimestamp));
-        PutConfig(TrackOf(tag), track.config, timestamp);
+        PutConfig(IndexOf(tag.stream()), track.config, timestamp);
         m_skipped = m_played.BytesSkipped();
         if (isFirst)
             m_skippedBefore = m_skipped;
-        ++m_report.frames.at(TrackOf(tag));
+        ++m_report.frames.at(IndexOf(tag.stream()));
         m_report.firstTimestamp = std::min(m_report.firstTimestamp, timestamp);
         m_take(MakeTag(tag, timestamp, m_played.Reader().Payload(tag)));
     }
@@ -248,11 +243,11 @@ RemuxReport CopyTags(const Input& input, const TakeTag& take)
         if (part.kind == Part::Kind::unlinked)
             refuse(fmt::format("the back-pointer of the tag at byte {} is wrong", part.begin));
         if (tag.has_frame()) {
-            uint32_t& time = latest.at(TrackOf(tag));
+            uint32_t& time = latest.at(IndexOf(tag.stream()));
             if (time > tag.timestamp() && time - tag.timestamp() > JITTER_MS)
                 refuse(fmt::format("timestamps jump at byte {}", part.begin));
             time = std::max(time, tag.timestamp());
-            ++report.frames.at(TrackOf(tag));
+            ++report.frames.at(IndexOf(tag.stream()));
         }
         NewTag copy = MakeTag(tag, tag.timestamp(), reader.Payload(tag));
         copy.streamId = tag.stream_id();

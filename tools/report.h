@@ -100,6 +100,12 @@ void Tell(const std::string& text);
 
 inline constexpr std::array STREAMS = {flvdmx::Stream::video, flvdmx::Stream::audio};
 
+/** @return the index in STREAMS, and in arrays with an element per stream */
+constexpr size_t IndexOf(flvdmx::Stream stream)
+{
+    return stream == flvdmx::Stream::video ? 0 : 1;
+}
+
 /** @return "video" or "audio" */
 const char* StreamName(flvdmx::Stream stream);
 

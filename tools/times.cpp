@@ -5,6 +5,8 @@
 #include <cstdlib>
 #include <utility>
 
+#include "tools/report.h"
+
 namespace tool {
 
 namespace {
@@ -97,7 +99,7 @@ Times::Step Times::Classify(Lane& lane, int64_t timestamp)
 
 Times::Step Times::Take(flvdmx::Stream stream, int64_t timestamp)
 {
-    Lane& lane = m_lanes.at(stream == flvdmx::Stream::video ? 0 : 1);
+    Lane& lane = m_lanes.at(IndexOf(stream));
     if (!lane.started) {
         const bool first = !m_lanes[0].started && !m_lanes[1].started;
         if (first && timestamp > INT32_MAX) // soon to wrap around: starts at 0 instead

@@ -17,7 +17,6 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
-#include <cstring>
 #include <string_view>
 
 namespace flvdmx {
@@ -107,7 +106,7 @@ public:
     /** Takes the tag whose header starts with `bytes`. Missing bytes count as 0; nothing is checked. */
     Tag(int64_t at, Bytes bytes) : position(at)
     {
-        std::memcpy(m_bytes.data(), bytes.data(), std::min(bytes.size(), bytes_used));
+        std::copy_n(bytes.begin(), std::min(bytes.size(), bytes_used), m_bytes.begin());
     }
 
     uint8_t type() const { return m_bytes[0]; }                       /**< FLVD_TAG_TYPE_* in valid files */
