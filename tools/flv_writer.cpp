@@ -4,8 +4,6 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
-#include <iterator>
-#include <utility>
 
 #include "flvdmx/layers.h"
 #include "tools/tags.h"

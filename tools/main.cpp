@@ -3,7 +3,6 @@
 #include <csignal>
 #include <exception>
 #include <filesystem>
-#include <functional>
 #include <map>
 #include <memory>
 #include <string>

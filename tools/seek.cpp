@@ -1,9 +1,7 @@
 // `flvdmx seek`: seeks, and shows where the readers landed and the frames that follow.
-#include <algorithm>
 #include <iterator>
 #include <limits>
 #include <optional>
-#include <utility>
 #include <vector>
 
 #include <fmt/core.h>

@@ -105,8 +105,9 @@ public:
     }
 
     /**
-     * Copies the properties of "onMetaData", all of them and without interpretation, up to the first one that is
-     * damaged or cut short.
+     * Copies the properties of "onMetaData" without interpretation, the keyframe index included, up to the first one
+     * that is damaged or cut short. To write them: the string "onMetaData", the marker and count of an ECMA array, each
+     * name (its length in 2 bytes, then its bytes) and value, an empty name and object_end.
      *
      * @param payload of a script tag
      * @return the properties in file order; nothing if this is other script data
